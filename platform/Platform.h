@@ -1,0 +1,64 @@
+#pragma once
+
+#include <string>
+
+#include "platform/AppAudioTap.h"
+#include "platform/Applications.h"
+#include "platform/AssetWriter.h"
+#include "platform/Bundles.h"
+#include "platform/Clock.h"
+#include "platform/DeviceCapture.h"
+#include "platform/Executor.h"
+#include "platform/ExportSession.h"
+#include "platform/FileSystem.h"
+#include "platform/IPC.h"
+#include "platform/ScreenCapture.h"
+#include "platform/Sounds.h"
+#include "platform/SystemServices.h"
+#include "platform/Timer.h"
+#include "platform/UserAlert.h"
+
+namespace qv::platform {
+
+/// The services of this process, gathered. The process entry (or a test) builds one, installs it
+/// before anything else runs, and keeps it until everything else has ended. The pointers are
+/// borrowed; none is null in a daemon, a test sets those that it needs.
+struct Platform {
+  Clock* clock = &systemClock();
+  TimerService* timers = &systemTimers();
+  Executor* globalQueue = &qv::platform::globalQueue();
+  Executor* backgroundQueue = &qv::platform::globalBackgroundQueue();
+  /// What stands before every absolute path of the system; empty on a device. No trailing "/".
+  std::string deviceRoot;
+
+  IPCService* ipc = nullptr;
+  KeepAliveService* keepAlive = nullptr;
+  ScreenCaptureService* screenCapture = nullptr;
+  DeviceCaptureService* deviceCapture = nullptr;
+  AppAudioTapService* appAudioTap = nullptr;
+  AssetWriterService* assetWriter = nullptr;
+  ExportService* exportService = nullptr;
+  ApplicationService* applications = nullptr;
+  RenderServer* renderServer = nullptr;
+  UserAlertService* userAlerts = nullptr;
+  SystemSounds* sounds = nullptr;
+  ScreenReader* screenReader = nullptr;
+  FileSystem* fileSystem = nullptr;
+  BundleService* bundles = nullptr;
+  Localization* localization = nullptr;
+  PreferenceStore* preferences = nullptr;
+  DeviceInfoQuery* deviceInfo = nullptr;
+  PurgeableSpaceService* purgeableSpace = nullptr;
+  PhotoLibrary* photoLibrary = nullptr;
+  MetricsReporter* metrics = nullptr;
+
+  /// The installed platform. Aborts when there is none.
+  static Platform& current();
+  /// Installs `platform` (borrowed); nullptr uninstalls.
+  static void install(Platform* platform);
+};
+
+/// `path` under the device root.
+std::string pathUnderDeviceRoot(const std::string& path);
+
+}  // namespace qv::platform
