@@ -23,17 +23,22 @@ class FakeBundle final : public platform::Bundle {
 
   platform::Dictionary info;
   platform::Dictionary localizedInfo;
-  /// Resource file names by localization, e.g. {"en", {"Localizable.strings"}}.
+  /// Whether resources stand in "Resources" below the bundle, or in the bundle itself.
+  bool hasResourceDirectory = true;
+  /// Resource file names by localization, e.g. {"en", {"Localizable.strings"}}; those under the
+  /// empty localization stand in the resource directory itself.
   std::map<std::string, std::vector<std::string>, std::less<>> resources;
 
   const std::string& path() const override { return path_; }
-  std::string resourcePath() const override { return path_ + "/Resources"; }
+  std::string resourcePath() const override { return hasResourceDirectory ? path_ + "/Resources" : path_; }
   const std::string& bundleIdentifier() const override { return identifier_; }
   const platform::Dictionary& infoDictionary() const override { return info; }
   platform::Dictionary localizedInfoDictionary() const override { return localizedInfo; }
   std::vector<std::string> localizations() const override {
     std::vector<std::string> names;
-    for (const auto& [name, files] : resources) names.push_back(name);
+    for (const auto& [name, files] : resources) {
+      if (!name.empty()) names.push_back(name);
+    }
     return names;
   }
   std::optional<std::string> pathForResource(std::string_view name, std::string_view type,
@@ -43,7 +48,8 @@ class FakeBundle final : public platform::Bundle {
     if (it == resources.end() || std::find(it->second.begin(), it->second.end(), file) == it->second.end()) {
       return std::nullopt;
     }
-    return resourcePath() + "/" + it->first + ".lproj/" + file;
+    const std::string directory = localization.empty() ? "" : "/" + it->first + ".lproj";
+    return resourcePath() + directory + "/" + file;
   }
 
  private:
