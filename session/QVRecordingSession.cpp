@@ -53,6 +53,7 @@ void QVRecordingSession::startSessionWithHandler(std::function<void()> handler) 
   writer->setBroadcastConfig(broadcastConfiguration_);
   writer->setSystemRecording(systemRecording_);
   movieWriter_.store(writer);
+  movieURL_ = writer->outputURL();
   writer->startWritingHandler(std::move(whenReady));
 }
 
@@ -157,8 +158,9 @@ void QVRecordingSession::trimFinishedMovie(const URL& movie, double startClipDur
                            });
 }
 
-void QVRecordingSession::completeMovieAfterFailure(std::function<void()> handler) {
-  const auto writer = movieWriter_.exchange(nullptr);
+void QVRecordingSession::completeMovieAfterFailure(uint64_t generation, std::function<void()> handler) {
+  // A later recording has a writer of its own; its start has let go of the failed one's file.
+  const auto writer = generation_ == generation ? movieWriter_.exchange(nullptr) : nullptr;
   if (!writer) {
     handler();
     return;
@@ -169,9 +171,9 @@ void QVRecordingSession::completeMovieAfterFailure(std::function<void()> handler
 void QVRecordingSession::finishAndCleanupSessionFilesWithHandler(std::function<void()> handler) {
   QV_LOG(logs::kSession, "QVRecordingSession: cleanupSessionFiles");
   stopRecordingWithNotification(false, std::nullopt);
-  // The file that is being written, where there is one: the names of some kinds change with time.
+  // The last recording's own file: a name made now could be another one.
   const auto writer = movieWriter_.exchange(nullptr);
-  const URL movie = writer ? writer->outputURL() : outputURL();
+  const URL movie = movieURL_.value_or(outputURL());
   const auto remove = [movie, handler = std::move(handler)] {
     _srRemoveFile(movie, [handler](const std::optional<Error>& error) {
       if (error) {

@@ -120,7 +120,7 @@ class QVRecordingSession final : public platform::ScreenCaptureControllerDelegat
   /// Ends the recording and removes its movie. The handler runs on a background queue.
   void finishAndCleanupSessionFilesWithHandler(std::function<void()> handler);
   /// After a failure ended the recording: completes what was written, so that it can be played.
-  void completeMovieAfterFailure(std::function<void()> handler);
+  void completeMovieAfterFailure(uint64_t generation, std::function<void()> handler);
   void stopAllCapture();
   void notifyRecordingMayBeStopped();
   void notifyRecordingResumed();
@@ -219,6 +219,7 @@ class QVRecordingSession final : public platform::ScreenCaptureControllerDelegat
   std::optional<std::string> bundleIDOfFirstForegroundApp_;
   std::optional<platform::URL> interruptedMovieURL_;
   std::optional<QVBroadcastConfiguration> broadcastConfiguration_;
+  std::optional<platform::URL> movieURL_;
   platform::Guarded<std::optional<platform::Date>> captureStartTime_;
 
   platform::Guarded<std::weak_ptr<QVRecordingSessionDelegate>> delegate_;
