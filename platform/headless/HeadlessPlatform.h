@@ -13,8 +13,8 @@ struct HeadlessOptions {
   /// Answers alerts.
   AlertPolicy alertPolicy = alertAnswerFromEnvironment;
   /// The process id of a bundle identifier, for reports about applications; may be empty.
-  HeadlessApplications::ProcessLookup processOfBundleIdentifier;
-  std::optional<std::string> frontmostApplication;
+  HeadlessApplications::ProcessLookup processOfBundleIdentifier = nullptr;
+  std::optional<std::string> frontmostApplication = std::nullopt;
   bool hasMicrophone = true;
 };
 
