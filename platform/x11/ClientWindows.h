@@ -1,0 +1,16 @@
+#pragma once
+
+#include <sys/types.h>
+
+#include <optional>
+
+#include "platform/x11/XcbConnection.h"
+
+namespace qv::platform {
+
+/// The process that owns a window, as the server knows it from the client's socket: not a claim
+/// that the client makes. Nothing for 0, the root, a window that does not exist, a remote client,
+/// and whatever the server answers ambiguously.
+std::optional<pid_t> processOfWindow(XcbConnection& connection, xcb_window_t window);
+
+}  // namespace qv::platform
