@@ -17,14 +17,15 @@ constexpr double kTimeToLive = 86400.0;  // seconds
 constexpr int32_t kUrgencyStopsRecording = 3;
 }  // namespace
 
-std::shared_ptr<QVRecordingManager> QVRecordingManager::create() {
-  std::shared_ptr<QVRecordingManager> manager(new QVRecordingManager);
+std::shared_ptr<QVRecordingManager> QVRecordingManager::create(QVCaptureManager& captureManager) {
+  std::shared_ptr<QVRecordingManager> manager(new QVRecordingManager(captureManager));
   manager->registerPurgeableSpace();
   return manager;
 }
 
-QVRecordingManager::QVRecordingManager()
-    : platform_(platform::Platform::current()), sequence_("com.tarnwick.quorveld.manager", *platform_.globalQueue) {
+QVRecordingManager::QVRecordingManager(QVCaptureManager& captureManager)
+    : platform_(platform::Platform::current()),
+      captureManager_(captureManager), sequence_("com.tarnwick.quorveld.manager", *platform_.globalQueue) {
   _srSetupTempDirectory();
   publicListener_ = platform_.ipc->createListener(kServiceName);
   publicListener_->setDelegate(this, sequence_);
@@ -62,7 +63,7 @@ std::shared_ptr<QVRecordingSession> QVRecordingManager::recordingSessionForBundl
   const auto found = bundleIDToRecordingSessionLookup_.find(*bundleID);
   if (found != bundleIDToRecordingSessionLookup_.end()) return found->second;
   QV_LOG(logs::kDaemon, "no session, creating a new one");
-  auto session = std::make_shared<QVRecordingSession>(*bundleID, sequence_);
+  auto session = std::make_shared<QVRecordingSession>(*bundleID, sequence_, captureManager_);
   bundleIDToRecordingSessionLookup_.emplace(*bundleID, session);
   return session;
 }

@@ -41,7 +41,7 @@ class QVRecordingManager final : public platform::IPCListenerDelegate,
                                  public std::enable_shared_from_this<QVRecordingManager> {
  public:
   /// Sets up the temporary store and everything of the start-up but the listener.
-  static std::shared_ptr<QVRecordingManager> create();
+  static std::shared_ptr<QVRecordingManager> create(QVCaptureManager& captureManager);
   ~QVRecordingManager() override;
 
   /// Opens the listener: from now on clients are admitted. An error when the service is taken.
@@ -78,7 +78,7 @@ class QVRecordingManager final : public platform::IPCListenerDelegate,
   using FinishHandler = QVRecordingSession::FinishHandler;
   using RequestMember = void (QVRecordingManager::*)(const platform::IPCArguments&, const platform::IPCReply&);
 
-  QVRecordingManager();
+  explicit QVRecordingManager(QVCaptureManager& captureManager);
   void registerPurgeableSpace();
   int64_t purgeableSpace();
   int64_t purge(int32_t urgency);
@@ -167,6 +167,7 @@ class QVRecordingManager final : public platform::IPCListenerDelegate,
   void checkAndPlaySystemRecordSound(const Session& session, bool isRecordingOn);
 
   platform::Platform& platform_;
+  QVCaptureManager& captureManager_;
   platform::SerialQueue sequence_;
   std::unique_ptr<platform::IPCListener> publicListener_;
   std::unique_ptr<platform::ApplicationStateMonitor> applicationStateMonitor_;

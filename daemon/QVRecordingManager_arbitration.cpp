@@ -107,7 +107,7 @@ void QVRecordingManager::replaceSessionAfterMediaServicesReset(const Session& se
   const auto registered = bundleIDToRecordingSessionLookup_.find(session->bundleID());
   if (!session->shouldStop() || registered == bundleIDToRecordingSessionLookup_.end()) return;
   if (registered->second != session || session->isRecording()) return;
-  auto fresh = std::make_shared<QVRecordingSession>(session->bundleID(), sequence_);
+  auto fresh = std::make_shared<QVRecordingSession>(session->bundleID(), sequence_, captureManager_);
   fresh->setClientProxy(session->clientProxy());
   fresh->setHasUserConsentForCamera(session->hasUserConsentForCamera());
   fresh->setHasUserConsentForMicrophone(session->hasUserConsentForMicrophone());

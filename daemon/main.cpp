@@ -34,7 +34,7 @@ int main() {
   QV_LOG(logs::kDaemon, "quorveld Starting!");
   qv::PlatformChoice choice;
   qv::platform::Platform::install(&choice.platform());
-  const auto manager = qv::QVRecordingManager::create();
+  const auto manager = qv::QVRecordingManager::create(qv::QVCaptureManager::sharedManager());
   if (const auto error = manager->finishStartup()) {
     QV_LOG_ERROR(logs::kDaemon, "the service cannot be opened: %s", error->description().c_str());
     qv::platform::flushLog();

@@ -18,8 +18,9 @@ constexpr int64_t kActionPaused = 2;
 constexpr int64_t kActionResumed = 3;
 }  // namespace
 
-QVRecordingSession::QVRecordingSession(std::string bundleID, platform::SerialQueue& sequence)
-    : sequence_(sequence), captureManager_(QVCaptureManager::sharedManager()), bundleID_(std::move(bundleID)) {}
+QVRecordingSession::QVRecordingSession(std::string bundleID, platform::SerialQueue& sequence,
+                                       QVCaptureManager& captureManager)
+    : sequence_(sequence), captureManager_(captureManager), bundleID_(std::move(bundleID)) {}
 
 QVRecordingSession::~QVRecordingSession() = default;
 

@@ -58,7 +58,7 @@ class QVRecordingSession final : public platform::ScreenCaptureControllerDelegat
   using FinishHandler = std::function<void(const std::optional<platform::URL>&, const std::optional<platform::Error>&)>;
 
   /// `sequence` is the manager's: lifecycle steps that follow a wait run there.
-  QVRecordingSession(std::string bundleID, platform::SerialQueue& sequence);
+  QVRecordingSession(std::string bundleID, platform::SerialQueue& sequence, QVCaptureManager& captureManager);
   ~QVRecordingSession() override;
 
   // --- Configuration, by the manager.
