@@ -94,7 +94,8 @@ std::vector<std::string> ICULocalization::preferredLanguages() {
   const auto add = [&](std::string tag) {
     if (!tag.empty() && std::find(tags.begin(), tags.end(), tag) == tags.end()) tags.push_back(std::move(tag));
   };
-  for (const Value& tag : preferences_.valueForKey(kDomain, kLanguagesKey).asArray()) add(tag.asString());
+  const Value languages = preferences_.valueForKey(kDomain, kLanguagesKey);
+  for (const Value& tag : languages.asArray()) add(tag.asString());
   if (!tags.empty()) return tags;
 
   std::string locale;
