@@ -36,6 +36,7 @@ class ManualExecutor final : public platform::Executor {
     return true;
   }
   /// Runs everything, what it brings about included.
+  void runUntilIdle() { runAll(); }
   void runAll() {
     while (runOne()) {
     }
