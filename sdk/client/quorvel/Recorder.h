@@ -178,7 +178,8 @@ struct AudioSample {
 
 /// What happens without having been asked for. Every entry may be empty.
 struct Events {
-  /// The recording ended, and not by this application's stop: with an error, and with the movie where
+  /// The recording ended, and neither by this application's stop nor because a later start of its own
+  /// took its place: with an error, and with the movie where
   /// one was saved. A recording that was interrupted in the background may be told again, then with
   /// its movie, when the application is in front again.
   std::function<void(StopResult)> stopped = {};
