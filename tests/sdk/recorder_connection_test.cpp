@@ -143,22 +143,24 @@ TEST_F(RecorderConnection, TheApplicationsExecutorGetsEveryCallback) {
   EXPECT_EQ(takeLog(), (Log{"connected", "stop ok "}));
 }
 
-/// On real threads: the destructor waits for the handler that runs, and no other begins.
+/// On real threads: the destructor waits for the handler that runs, and none runs afterwards.
 TEST(RecorderDestruction, WaitsForTheRunningHandler) {
   auto ipc = std::make_shared<fakes::FakeIPCService>(platform::globalQueue());
   std::promise<void> entered, release;
   std::atomic<bool> done = false;
-  quorvel::RecorderOptions options;
-  auto recorder = std::make_unique<RecorderClient>(ipc, platform::systemTimers(), platform::globalQueue(), options);
+  auto destroyed = std::make_shared<std::atomic<bool>>(false);
+  auto recorder = std::make_unique<RecorderClient>(ipc, platform::systemTimers(), platform::globalQueue(),
+                                                   quorvel::RecorderOptions{});
   recorder->stop([&](const quorvel::StopResult&) {
     entered.set_value();
     release.get_future().wait();
     done = true;
   });
   entered.get_future().wait();
-  recorder->stop([](const quorvel::StopResult&) { FAIL() << "after the destructor began"; });
+  recorder->stop([destroyed](const quorvel::StopResult&) { EXPECT_FALSE(*destroyed); });
   std::thread releaser([&] { release.set_value(); });
   recorder.reset();
+  *destroyed = true;
   EXPECT_TRUE(done);
   releaser.join();
 }
