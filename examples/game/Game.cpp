@@ -11,14 +11,23 @@
 
 namespace comet {
 
+namespace {
+
+using namespace std::chrono_literals;
+
+/// A device takes a moment to see which application has come to the front.
+constexpr auto kTimeToComeToFront = 200ms;
+constexpr auto kLongestWaitForFocus = 3s;
+
+}  // namespace
+
 Game::Game(MainLoop& loop, const Options& options) : loop_(loop), options_(options) {
   if (!options.headless) {
-    window_ = Window::create(
-        options.width, options.height, "Comet Run",
-        {.key = [this](char key) { handleKey(key); },
-         .active = [this](bool active) { active ? recorder_->didBecomeActive() : recorder_->didResignActive(); },
-         .exposed = [this] { shown_ = false; },
-         .closed = [this] { loop_.quit(); }});
+    window_ = Window::create(options.width, options.height, "Comet Run",
+                             {.key = [this](char key) { handleKey(key); },
+                              .active = [this](bool active) { setActive(active); },
+                              .exposed = [this] { shown_ = false; },
+                              .closed = [this] { loop_.quit(); }});
     if (!window_) {
       std::printf("error code=0 text=no usable display; try --headless\n");
       ok_ = false;
@@ -29,14 +38,25 @@ Game::Game(MainLoop& loop, const Options& options) : loop_(loop), options_(optio
     loop_.everyFrame(options.framesPerSecond, [this](Instant frame, Instant next) { showFrame(frame, next); });
   }
   recorder_ = quorvel::Recorder::create(recorderOptions());
-  if (!window_) recorder_->didBecomeActive();
-  if (options.start) {
-    scriptWaits_ = !options.script.empty();
-    start(options.capture);
+  if (window_) {
+    loop_.at(now() + kLongestWaitForFocus, [this] { begin(); });
   } else {
-    stepEnd_ = now();
-    nextStep();
+    setActive(true);
   }
+}
+
+void Game::setActive(bool active) {
+  active ? recorder_->didBecomeActive() : recorder_->didResignActive();
+  if (active && !begun_) loop_.at(now() + kTimeToComeToFront, [this] { begin(); });
+}
+
+/// Only an application that is in front may start a recording, so this waits for the focus.
+void Game::begin() {
+  begun_ = true;
+  stepEnd_ = now();
+  if (!options_.start) return nextStep();
+  scriptWaits_ = true;
+  start(options_.capture);
 }
 
 // Recording -----------------------------------------------------------------------------------------

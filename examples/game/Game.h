@@ -37,6 +37,8 @@ class Game {
   void report(const quorvel::Error& error);
 
   // The game
+  void begin();
+  void setActive(bool active);
   void handleKey(char key);
   void drawAhead(Instant frame);
   void showFrame(Instant frame, Instant next);
@@ -58,6 +60,7 @@ class Game {
   uint64_t videoFrames_ = 0, audioSamples_ = 0, microphoneSamples_ = 0;
   std::vector<double> latencies_;  // milliseconds from capture to arrival, of each frame
 
+  bool begun_ = false;
   bool scriptWaits_ = false;  // for an answer
   size_t step_ = 0;
   Instant stepEnd_{0};

@@ -140,9 +140,12 @@ void Window::handle(const xcb_generic_event_t& event) {
   } else if (type == XCB_EXPOSE) {
     events_.exposed();
   } else if (type == XCB_FOCUS_IN || type == XCB_FOCUS_OUT) {
-    // A grab of the keyboard, e.g. for a hot key, does not take us from the front.
-    const uint8_t mode = reinterpret_cast<const xcb_focus_in_event_t&>(event).mode;
-    if (mode == XCB_NOTIFY_MODE_NORMAL || mode == XCB_NOTIFY_MODE_WHILE_GRABBED) events_.active(type == XCB_FOCUS_IN);
+    // A grab of the keyboard, e.g. for a hot key, does not take us from the front, and the pointer
+    // resting on us does not bring us there.
+    const auto& focus = reinterpret_cast<const xcb_focus_in_event_t&>(event);
+    const bool ofWindow = focus.detail != XCB_NOTIFY_DETAIL_POINTER && focus.detail != XCB_NOTIFY_DETAIL_POINTER_ROOT;
+    const bool ofGrab = focus.mode == XCB_NOTIFY_MODE_GRAB || focus.mode == XCB_NOTIFY_MODE_UNGRAB;
+    if (ofWindow && !ofGrab) events_.active(type == XCB_FOCUS_IN);
   } else if (type == XCB_KEY_PRESS) {
     events_.key(letter(reinterpret_cast<const xcb_key_press_event_t&>(event).detail));
   } else if (type == XCB_CLIENT_MESSAGE) {
