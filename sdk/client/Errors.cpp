@@ -1,8 +1,8 @@
 #include "sdk/client/Errors.h"
 
-#include <algorithm>
-#include <cerrno>
 #include <iterator>
+
+#include "platform/IPC.h"
 
 namespace quorvel {
 
@@ -59,13 +59,6 @@ const char* libraryText(quorvel::ErrorCode code) {
   }
 }
 
-bool isLossOfConnection(const platform::Error& error) {
-  constexpr int kLosses[] = {ECONNRESET, ECONNABORTED, ECONNREFUSED, ENOTCONN, EPIPE, ESHUTDOWN, ECANCELED};
-  if (error.domain == platform::kPosixErrorDomain)
-    return std::any_of(std::begin(kLosses), std::end(kLosses), [&](int loss) { return loss == error.code; });
-  return error.domain == "org.freedesktop.DBus.Error.Disconnected";
-}
-
 }  // namespace
 
 quorvel::Error errorFromDaemon(const platform::Error& error) {
@@ -81,9 +74,12 @@ quorvel::Error libraryError(quorvel::ErrorCode code, const std::string& detail) 
 }
 
 quorvel::Error errorForFailedCall(const platform::Error& error) {
-  if (isLossOfConnection(error)) return libraryError(quorvel::kErrorConnectionInterrupted);
+  const bool ofMessaging = error.domain == platform::kIPCErrorDomain;
+  if (ofMessaging && error.code == static_cast<int64_t>(platform::IPCErrorCode::ConnectionInvalid))
+    return libraryError(quorvel::kErrorConnectionInterrupted);
+  const std::string name = valueForKey(error.userInfo, platform::kIPCRemoteErrorNameKey).asString(error.domain);
   const std::string message = error.localizedDescription();
-  return libraryError(quorvel::kErrorUnknown, message.empty() ? error.domain : error.domain + ": " + message);
+  return libraryError(quorvel::kErrorUnknown, message.empty() ? name : name + ": " + message);
 }
 
 }  // namespace qv::client

@@ -112,18 +112,17 @@ void RecorderSession::lost() {
   tell(events_.interrupted);
 }
 
-void RecorderSession::noteStopped(const StopResult& result) {
+bool RecorderSession::isWordOfReplaced(const StopResult& result) {
   const bool wasInterrupted = result.error && result.error->code == quorvel::kErrorInterrupted;
-  if (wasInterrupted && !replaced_.empty()) {
-    const uint64_t ended = replaced_.front();
-    replaced_.pop_front();
-    if (ended != recordingNumber_) return;
-  }
-  recording_ = false;
+  if (!wasInterrupted || replaced_.empty()) return false;
+  const uint64_t ended = replaced_.front();
+  replaced_.pop_front();
+  return ended != recordingNumber_;
 }
 
 void RecorderSession::daemonStopped(StopResult result) {
-  noteStopped(result);
+  if (isWordOfReplaced(result)) return;
+  recording_ = false;
   tell(events_.stopped, std::move(result));
 }
 

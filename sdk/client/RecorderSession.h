@@ -40,7 +40,8 @@ class RecorderSession : public std::enable_shared_from_this<RecorderSession> {
   void connected();
   void lost();
   void daemonStopped(quorvel::StopResult result);
-  void noteStopped(const quorvel::StopResult& result);
+  /// Whether this tells the end of a recording in whose place another of ours already goes on.
+  bool isWordOfReplaced(const quorvel::StopResult& result);
   template <typename... Parameters, typename... Given>
   void tell(const std::function<void(Parameters...)>& event, Given... arguments);
 

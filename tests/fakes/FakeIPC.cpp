@@ -1,6 +1,5 @@
 #include "tests/fakes/FakeIPC.h"
 
-#include <cerrno>
 #include <chrono>
 #include <optional>
 
@@ -62,8 +61,26 @@ void FakeIPCMail::send(std::function<void()> delivery) {
 
 namespace {
 
-Error namedError(const std::string& name, const std::string& message) {
-  return {name, 0, {{platform::kLocalizedDescriptionKey, platform::Value(message)}}};
+Error ipcError(platform::IPCErrorCode code, const std::string& name, const std::string& message) {
+  return {platform::kIPCErrorDomain,
+          static_cast<int64_t>(code),
+          {{platform::kLocalizedDescriptionKey, platform::Value(message)},
+           {platform::kIPCRemoteErrorNameKey, platform::Value(name)}}};
+}
+
+/// An error reply, sorted as the real messaging does.
+Error errorReply(const std::string& name, const std::string& message) {
+  using Code = platform::IPCErrorCode;
+  const Code code = name == kNoReplyErrorName         ? Code::NoReply
+                    : name == kUnknownMethodErrorName ? Code::UnknownOperation
+                                                      : Code::RemoteError;
+  return ipcError(code, name, message);
+}
+
+Error localError(platform::IPCErrorCode code, const std::string& message) {
+  return {platform::kIPCErrorDomain,
+          static_cast<int64_t>(code),
+          {{platform::kLocalizedDescriptionKey, platform::Value(message)}}};
 }
 
 std::optional<IPCArguments> argumentsFor(const IPCArguments& values, const std::vector<std::string>& signatures) {
@@ -102,7 +119,7 @@ struct FakeIPCConnection::End : std::enable_shared_from_this<End> {
   std::weak_ptr<FakeIPCConnection> connection;
   std::shared_ptr<FakeIPCMail> mail;
   std::unique_ptr<SerialQueue> queue;
-  bool resumed = false, ended = false, acceptsMalformedReplies = false;
+  bool resumed = false, ended = false, checksMessages = true;
   std::vector<std::function<void()>> inbox;  // until `resumed`
   IPCInterface exportedInterface, remoteInterface;
   std::shared_ptr<IPCExportedObject> exportedObject;
@@ -124,7 +141,7 @@ class ReplySink final : public IPCReply::Sink {
     if (const Answer answer = take()) answer(std::move(values), {});
   }
   void fail(std::string errorName, std::string message) override {
-    if (const Answer answer = take()) answer(std::nullopt, namedError(errorName, message));
+    if (const Answer answer = take()) answer(std::nullopt, errorReply(errorName, message));
   }
 
  private:
@@ -169,7 +186,7 @@ void FakeIPCConnection::End::receiveCall(const std::string& interface, const std
     });
   };
   if (!operation || !object) {
-    answer(std::nullopt, namedError(kUnknownMethodErrorName, member));
+    answer(std::nullopt, errorReply(kUnknownMethodErrorName, member));
     return;
   }
   IPCReply reply;
@@ -193,10 +210,10 @@ std::optional<FakeIPCConnection::End::Pending> FakeIPCConnection::End::takePendi
 void FakeIPCConnection::End::receiveReply(uint64_t serial, IPCArguments values) {
   const auto call = takePending(serial);
   if (!call) return;
-  if (!acceptsMalformedReplies && call->reply) {
+  if (checksMessages && call->reply) {
     auto typed = argumentsFor(values, *call->reply);
     if (!typed) {
-      if (call->errorHandler) call->errorHandler(namedError(kInvalidArgumentsErrorName, "malformed reply"));
+      if (call->errorHandler) call->errorHandler(localError(platform::IPCErrorCode::RemoteError, "malformed reply"));
       return;
     }
     values = std::move(*typed);
@@ -224,7 +241,8 @@ void FakeIPCConnection::End::end(bool byPeer) {
     inbox.clear();
     queue->async([handler = std::move(handler), failed = std::move(failed)] {
       for (const auto& [serial, call] : failed) {
-        if (call.errorHandler) call.errorHandler(Error::posix(ECONNRESET));
+        if (call.errorHandler)
+          call.errorHandler(localError(platform::IPCErrorCode::ConnectionInvalid, "the connection was lost"));
       }
       if (handler) handler();
     });
@@ -291,9 +309,9 @@ void FakeIPCConnection::resume() {
 
 void FakeIPCConnection::invalidate() { end_->end(false); }
 
-void FakeIPCConnection::setAcceptsMalformedReplies(bool accepts) {
+void FakeIPCConnection::setChecksMessages(bool checks) {
   std::lock_guard lock(end_->mutex);
-  end_->acceptsMalformedReplies = accepts;
+  end_->checksMessages = checks;
 }
 
 bool FakeIPCConnection::isEnded() const {
@@ -308,11 +326,11 @@ void FakeIPCConnection::call(std::string_view member, IPCArguments arguments, Co
     if (!errorHandler) return;
     end_->queue->async([errorHandler, error = std::move(error)] { errorHandler(error); });
   };
-  if (end_->ended) return refuse(Error::posix(ENOTCONN));
+  if (end_->ended) return refuse(localError(platform::IPCErrorCode::ConnectionInvalid, "the connection has ended"));
   const IPCOperation* operation = end_->remoteInterface.operation(member);
-  if (!operation) return refuse(namedError(kUnknownMethodErrorName, std::string(member)));
-  auto typed = argumentsFor(arguments, operation->arguments);
-  if (!typed) return refuse(namedError(kInvalidArgumentsErrorName, std::string(member)));
+  if (!operation) return refuse(localError(platform::IPCErrorCode::UnknownOperation, std::string(member)));
+  auto typed = end_->checksMessages ? argumentsFor(arguments, operation->arguments) : std::move(arguments);
+  if (!typed) return refuse(localError(platform::IPCErrorCode::InvalidArguments, std::string(member)));
   const uint64_t serial = end_->nextSerial++;
   end_->pending[serial] = {operation->reply, std::move(completion), std::move(errorHandler)};
   const std::string interface = end_->remoteInterface.name;

@@ -15,10 +15,9 @@
 
 namespace qv::fakes {
 
-/// The error names that the fake answers with, those of the real messaging.
+/// The names of the error replies that the messaging itself makes.
 inline constexpr const char kNoReplyErrorName[] = "com.tarnwick.quorveld.Error.NoReply";
 inline constexpr const char kUnknownMethodErrorName[] = "org.freedesktop.DBus.Error.UnknownMethod";
-inline constexpr const char kInvalidArgumentsErrorName[] = "org.freedesktop.DBus.Error.InvalidArgs";
 
 /// Brings messages from one end to the other: at once, or, while held, one by one as the test says.
 ///
@@ -71,8 +70,9 @@ class FakeIPCConnection final : public platform::IPCConnection, public std::enab
   void call(std::string_view member, platform::IPCArguments arguments, Completion completion,
             ErrorHandler errorHandler) override;
 
-  /// Lets replies to this end through as they are, so that a test can send what no honest peer would.
-  void setAcceptsMalformedReplies(bool accepts);
+  /// While off, what this end sends and what replies bring it is let through as it is: a test can
+  /// so be a peer that no honest one would be.
+  void setChecksMessages(bool checks);
   [[nodiscard]] bool isEnded() const;
 
  private:
@@ -99,6 +99,8 @@ class FakeIPCService final : public platform::IPCService {
   void setClientPeer(platform::IPCPeer peer);
   /// What clients see of the services that they connect to from now on.
   void setServerPeer(platform::IPCPeer peer);
+  /// See FakeIPCConnection::setChecksMessages; for both ends of the connections made from now on.
+  void setChecksMessages(bool checks);
   [[nodiscard]] FakeIPCMail& mail() { return *mail_; }
   /// How often `connect` was called, with success or without.
   [[nodiscard]] size_t connectCount() const;
@@ -114,6 +116,7 @@ class FakeIPCService final : public platform::IPCService {
   platform::IPCPeer clientPeer_;
   platform::IPCPeer serverPeer_;
   size_t connectCount_ = 0;
+  bool checksMessages_ = true;
 };
 
 /// An exported object that records its calls. `answer`, if set, is called for each of them, on the

@@ -114,6 +114,8 @@ Result<std::shared_ptr<IPCConnection>> FakeIPCService::connectTo(const std::stri
   const auto it = listeners_.find(key);
   if (it == listeners_.end()) return Error::posix(ECONNREFUSED, key);
   auto [client, server] = FakeIPCConnection::makePair(executor_, mail_, serverPeer_, clientPeer_, named);
+  client->setChecksMessages(checksMessages_);
+  server->setChecksMessages(checksMessages_);
   it->second->accept(std::move(server));
   return std::shared_ptr<IPCConnection>(std::move(client));
 }
@@ -126,6 +128,11 @@ void FakeIPCService::setClientPeer(IPCPeer peer) {
 void FakeIPCService::setServerPeer(IPCPeer peer) {
   std::lock_guard lock(mutex_);
   serverPeer_ = std::move(peer);
+}
+
+void FakeIPCService::setChecksMessages(bool checks) {
+  std::lock_guard lock(mutex_);
+  checksMessages_ = checks;
 }
 
 size_t FakeIPCService::connectCount() const {

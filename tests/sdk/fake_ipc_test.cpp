@@ -46,7 +46,7 @@ class FakeIPCTest : public ::testing::Test, protected platform::IPCListenerDeleg
   void call(const char* member, IPCArguments arguments) {
     client_->call(
         member, std::move(arguments), [this](const IPCArguments&) { events_.push_back("completed"); },
-        [this](const Error& error) { events_.push_back("failed " + error.domain); });
+        [this](const Error& error) { events_.push_back("failed " + std::to_string(error.code)); });
   }
 
   ManualExecutor executor_;
@@ -76,9 +76,7 @@ TEST_F(FakeIPCTest, RefusesWhatTheWireCouldNotCarry) {
   executor_.runAll();
   object_->takeCall();  // dropped unanswered
   executor_.runAll();
-  EXPECT_EQ(events_, (std::vector<std::string>{std::string("failed ") + kInvalidArgumentsErrorName,
-                                               std::string("failed ") + kUnknownMethodErrorName,
-                                               std::string("failed ") + kNoReplyErrorName}));
+  EXPECT_EQ(events_, (std::vector<std::string>{"failed 4", "failed 3", "failed 5"}));
 }
 
 TEST_F(FakeIPCTest, ALossIsToldOnceAndEndsCalls) {
@@ -89,7 +87,7 @@ TEST_F(FakeIPCTest, ALossIsToldOnceAndEndsCalls) {
   client_->invalidate();
   call("stopRecordingWithHandler", {});
   executor_.runAll();
-  EXPECT_EQ(events_, (std::vector<std::string>{"server invalidated", "failed posix", "interrupted", "failed posix"}));
+  EXPECT_EQ(events_, (std::vector<std::string>{"server invalidated", "failed 1", "interrupted", "failed 1"}));
 }
 
 TEST_F(FakeIPCTest, HeldMessagesArriveAsTheTestSays) {

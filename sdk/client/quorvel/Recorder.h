@@ -70,7 +70,7 @@ using Dictionary = Value::Dictionary;
 
 struct StartOptions {
   /// The windows (layer contexts) to record, all of this application. X11 window ids on X11.
-  std::vector<uint32_t> windows;
+  std::vector<uint32_t> windows = {};
   /// Size of the movie's picture in pixels.
   double width = 0, height = 0;
   bool microphone = false;  ///< ask for the microphone too
@@ -102,10 +102,10 @@ struct StopResult {
 };
 
 struct BroadcastOptions {
-  std::string hostBundleID;
-  std::string extensionBundleID;
-  std::vector<uint8_t> configuration;  ///< an archived broadcast configuration
-  Dictionary userInfo;                 ///< handed to the extension
+  std::string hostBundleID = {};
+  std::string extensionBundleID = {};
+  std::vector<uint8_t> configuration = {};  ///< an archived broadcast configuration
+  Dictionary userInfo = {};                 ///< handed to the extension
 };
 
 /// PNG images; empty where there is none.
@@ -178,30 +178,31 @@ struct AudioSample {
 
 /// What happens without having been asked for. Every entry may be empty.
 struct Events {
-  /// The recording ended, and not by this application's stop: with an error, and with the movie where
+  /// The recording ended, and neither by this application's stop nor because a later start of its own
+  /// took its place: with an error, and with the movie where
   /// one was saved. A recording that was interrupted in the background may be told again, then with
   /// its movie, when the application is in front again.
-  std::function<void(StopResult)> stopped;
+  std::function<void(StopResult)> stopped = {};
   /// The daemon went away: once for each loss. Outstanding requests have ended by then, and so has the
   /// recording. The next request connects anew.
-  std::function<void()> interrupted;
+  std::function<void()> interrupted = {};
   /// A connection to the daemon was made: the first, or one after an interruption.
-  std::function<void()> connected;
-  std::function<void(bool recording)> recordingStateChanged;
-  std::function<void(Dictionary)> broadcastServiceInfoChanged;
-  std::function<void(std::string url)> broadcastURLChanged;
-  std::function<void(VideoFrame)> videoFrame;
-  std::function<void(AudioSample)> audioSample;
-  std::function<void(Error)> recordingLockInterrupted;
-  std::function<void(std::string time)> recordingTimerChanged;
+  std::function<void()> connected = {};
+  std::function<void(bool recording)> recordingStateChanged = {};
+  std::function<void(Dictionary)> broadcastServiceInfoChanged = {};
+  std::function<void(std::string url)> broadcastURLChanged = {};
+  std::function<void(VideoFrame)> videoFrame = {};
+  std::function<void(AudioSample)> audioSample = {};
+  std::function<void(Error)> recordingLockInterrupted = {};
+  std::function<void(std::string time)> recordingTimerChanged = {};
 };
 
 struct RecorderOptions {
-  Events events;
+  Events events = {};
   /// Where handlers and events run, one at a time and in order. Empty: on a thread of the library.
   /// Otherwise a function that queues the work given to it, e.g. to the application's main loop; it
   /// is called from threads of the library, must not block, and must keep the order.
-  std::function<void(std::function<void()>)> executor;
+  std::function<void(std::function<void()>)> executor = {};
 };
 
 /// Records this application through the device's recording daemon.
