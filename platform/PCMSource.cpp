@@ -106,4 +106,11 @@ PCMPacer::PCMPacer(PCMFormat format, std::unique_ptr<PCMSource> source, Callback
 
 PCMPacer::~PCMPacer() { run_->stopped = true; }
 
+void PCMPacer::stop() {
+  run_->stopped = true;
+  thread_.stop();
+}
+
+bool PCMPacer::isStopped() const { return run_->stopped; }
+
 }  // namespace qv::platform

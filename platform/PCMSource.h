@@ -51,8 +51,8 @@ struct PCMBlock {
 /// The first frame is of the moment of construction. A thread that was held up renders what it
 /// missed, up to a second; of more it leaves out all but the last 100 ms.
 ///
-/// Threading: `opened`, `sink` and `closed` are called on the pacer's thread; destruction is that of a
-/// PacedThread.
+/// Threading: `opened`, `sink` and `closed` are called on the pacer's thread; `stop` and destruction are
+/// those of a PacedThread.
 class PCMPacer {
  public:
   struct Callbacks {
@@ -62,6 +62,8 @@ class PCMPacer {
   };
   PCMPacer(PCMFormat format, std::unique_ptr<PCMSource> source, Callbacks callbacks);
   ~PCMPacer();
+  void stop();
+  [[nodiscard]] bool isStopped() const;
 
  private:
   struct Run;

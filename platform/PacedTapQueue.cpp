@@ -1,6 +1,7 @@
 #include "platform/PacedTapQueue.h"
 
 #include <algorithm>
+#include <atomic>
 #include <cstring>
 #include <deque>
 #include <mutex>
@@ -26,6 +27,7 @@ struct Tap {
 
   uint64_t beginRun();
   void setRunning(uint64_t ofRun, bool now);
+  void setNotRunning();
   void take(uint64_t ofRun, const PCMBlock& block);
   bool fill(const PCMBlock& block, size_t& offset);
 
@@ -41,10 +43,17 @@ struct Tap {
   bool running = false;
 };
 
+/// With the lock held.
 uint64_t Tap::beginRun() {
-  std::lock_guard lock(mutex);
   for (QueueBuffer* buffer : enqueued) buffer->byteSize = 0;
   return ++run;
+}
+
+void Tap::setNotRunning() {
+  std::unique_lock lock(mutex);
+  const uint64_t current = run;
+  lock.unlock();
+  setRunning(current, false);
 }
 
 void Tap::setRunning(uint64_t ofRun, bool now) {
@@ -134,10 +143,15 @@ class PacedTapQueue final : public AppAudioTapQueue {
  private:
   const TapSourceFactory factory_;
   const std::shared_ptr<Tap> tap_;
-  std::unique_ptr<PCMPacer> pacer_;
+  /// A callback may enqueue, stop or dispose while the owner does, so what they share is locked.
+  std::shared_ptr<PCMPacer> currentPacer() {
+    std::lock_guard lock(tap_->mutex);
+    return pacer_;
+  }
+
+  std::shared_ptr<PCMPacer> pacer_;  // stopped but kept after a stop from a callback
   int32_t process_ = 0;
-  uint64_t run_ = 0;
-  bool disposed_ = false;
+  std::atomic<bool> disposed_ = false;
 };
 
 auto find(Tap& tap, const QueueBuffer* buffer) {
@@ -178,29 +192,36 @@ int32_t PacedTapQueue::freeBuffer(QueueBuffer* buffer) {
 int32_t PacedTapQueue::start() {
   if (disposed_) return kTapDisposed;
   if (process_ < 1) return kTapNoProcess;
-  if (pacer_) return 0;
+  const auto former = currentPacer();  // ends after the lock below
+  if (former && !former->isStopped()) return 0;
   auto source = factory_(process_, tap_->format);
   if (!source) return kTapNotAvailable;
-  run_ = tap_->beginRun();
-  PCMPacer::Callbacks callbacks{.opened = [tap = tap_, run = run_] { tap->setRunning(run, true); },
-                                .sink = [tap = tap_, run = run_](const PCMBlock& b) { tap->take(run, b); },
-                                .closed = [tap = tap_, run = run_] { tap->setRunning(run, false); }};
-  pacer_ = std::make_unique<PCMPacer>(tap_->format, std::move(source), std::move(callbacks));
+  // The thread's first act is to take this lock: a callback finds the pacer in its place.
+  std::lock_guard lock(tap_->mutex);
+  const uint64_t run = tap_->beginRun();
+  PCMPacer::Callbacks callbacks{.opened = [tap = tap_, run] { tap->setRunning(run, true); },
+                                .sink = [tap = tap_, run](const PCMBlock& block) { tap->take(run, block); },
+                                .closed = [tap = tap_, run] { tap->setRunning(run, false); }};
+  pacer_ = std::make_shared<PCMPacer>(tap_->format, std::move(source), std::move(callbacks));
   return 0;
 }
 
 int32_t PacedTapQueue::stopImmediately() {
-  pacer_.reset();
+  const auto pacer = currentPacer();
+  if (!pacer) return 0;
+  pacer->stop();
   // The thread has said so already, unless this is a callback on it.
-  tap_->setRunning(run_, false);
+  tap_->setNotRunning();
   return 0;
 }
 
 int32_t PacedTapQueue::dispose() {
   if (disposed_) return 0;
-  disposed_ = true;
   stopImmediately();
+  disposed_ = true;
+  std::shared_ptr<PCMPacer> pacer;
   std::lock_guard lock(tap_->mutex);
+  pacer.swap(pacer_);
   tap_->listener = nullptr;
   tap_->enqueued.clear();
   tap_->buffers.clear();
