@@ -1,0 +1,1 @@
+#include "platform/mp4/Salvage.h"
