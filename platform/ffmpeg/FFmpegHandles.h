@@ -1,8 +1,13 @@
 #pragma once
 
+#include <cstdint>
+
 extern "C" {
 #include <libavcodec/avcodec.h>
-#include <libavutil/audio_fifo.h>
+#include <libavfilter/avfilter.h>
+#include <libavfilter/buffersink.h>
+#include <libavfilter/buffersrc.h>
+#include <libavformat/avformat.h>
 #include <libavutil/channel_layout.h>
 #include <libavutil/opt.h>
 #include <libswresample/swresample.h>
@@ -27,6 +32,10 @@ struct ResamplerDeleter {
 };
 using CodecContext = std::unique_ptr<AVCodecContext, CodecContextDeleter>;
 using Frame = std::unique_ptr<AVFrame, FrameDeleter>;
+struct FilterGraphDeleter {
+  void operator()(AVFilterGraph* graph) const { avfilter_graph_free(&graph); }
+};
+using FilterGraph = std::unique_ptr<AVFilterGraph, FilterGraphDeleter>;
 using Packet = std::unique_ptr<AVPacket, PacketDeleter>;
 using Resampler = std::unique_ptr<SwrContext, ResamplerDeleter>;
 

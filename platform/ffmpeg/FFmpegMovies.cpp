@@ -11,6 +11,7 @@
 
 #include "platform/Log.h"
 #include "platform/ffmpeg/FFmpegAssetWriter.h"
+#include "platform/ffmpeg/FFmpegExportSession.h"
 #include "platform/ffmpeg/FFmpegHandles.h"
 #include "platform/ffmpeg/FFmpegWriterInput.h"
 
@@ -57,6 +58,17 @@ Result<std::unique_ptr<AssetWriter>> FFmpegAssetWriterService::createAssetWriter
 std::shared_ptr<WriterInput> FFmpegAssetWriterService::createWriterInput(MediaType type,
                                                                          const Dictionary& outputSettings) {
   return std::make_shared<FFmpegWriterInput>(type, outputSettings);
+}
+
+FFmpegExportService::FFmpegExportService() { routeLibraryLog(); }
+
+std::shared_ptr<MovieAsset> FFmpegExportService::openMovie(const URL& url) {
+  return std::make_shared<FFmpegMovieAsset>(url);
+}
+
+std::shared_ptr<ExportSession> FFmpegExportService::createExportSession(std::shared_ptr<MovieAsset> asset,
+                                                                        ExportPreset preset) {
+  return std::make_shared<FFmpegExportSession>(std::move(asset), preset);
 }
 
 }  // namespace qv::platform::ffmpeg

@@ -26,4 +26,14 @@ class FFmpegAssetWriterService final : public AssetWriterService {
   const MovieFileFactory createFile_;
 };
 
+/// Trims and mixes by libavformat and libavfilter.
+///
+/// Threading: thread-safe.
+class FFmpegExportService final : public ExportService {
+ public:
+  FFmpegExportService();
+  std::shared_ptr<MovieAsset> openMovie(const URL& url) override;
+  std::shared_ptr<ExportSession> createExportSession(std::shared_ptr<MovieAsset> asset, ExportPreset preset) override;
+};
+
 }  // namespace qv::platform::ffmpeg

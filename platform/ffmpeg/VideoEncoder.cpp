@@ -96,11 +96,21 @@ std::optional<Error> VideoEncoder::encode(const PixelBuffer& image, int64_t tick
     picture.strides[plane] = frame_->linesize[plane];
   }
   converter_.convert(image, picture);
-  frame_->pts = tick;
+  return sendAt(*frame_, tick, out);
+}
+
+std::optional<Error> VideoEncoder::encode(const AVFrame& picture, int64_t tick, std::vector<mp4::EncodedSample>& out) {
+  const Frame reference(av_frame_clone(&picture));
+  if (!reference) return encoderError("picture", AVERROR(ENOMEM));
+  return sendAt(*reference, tick, out);
+}
+
+std::optional<Error> VideoEncoder::sendAt(AVFrame& frame, int64_t tick, std::vector<mp4::EncodedSample>& out) {
+  frame.pts = tick;
   const bool isLate = tick - lastKeyFrame_ >= kMaximumKeyFrameTicks;
-  frame_->pict_type = isLate ? AV_PICTURE_TYPE_I : AV_PICTURE_TYPE_NONE;
+  frame.pict_type = isLate ? AV_PICTURE_TYPE_I : AV_PICTURE_TYPE_NONE;
   if (isLate) lastKeyFrame_ = tick;
-  return send(frame_.get(), out);
+  return send(&frame, out);
 }
 
 std::optional<Error> VideoEncoder::flush(std::vector<mp4::EncodedSample>& out) { return send(nullptr, out); }

@@ -25,11 +25,14 @@ class VideoEncoder {
   [[nodiscard]] mp4::MovieTrack track(uint32_t trackID, const AffineTransform& transform) const;
   /// `tick` is the time in mp4::kMovieTimescale; it rises from call to call. What is ready is added to `out`.
   std::optional<Error> encode(const PixelBuffer& image, int64_t tick, std::vector<mp4::EncodedSample>& out);
+  /// The same for a picture of the encoder's size that is 4:2:0 already.
+  std::optional<Error> encode(const AVFrame& picture, int64_t tick, std::vector<mp4::EncodedSample>& out);
   /// No more pictures follow.
   std::optional<Error> flush(std::vector<mp4::EncodedSample>& out);
 
  private:
   VideoEncoder(const VideoSettings& settings, CodecContext context);
+  std::optional<Error> sendAt(AVFrame& frame, int64_t tick, std::vector<mp4::EncodedSample>& out);
   std::optional<Error> send(const AVFrame* frame, std::vector<mp4::EncodedSample>& out);
   void receive(std::vector<mp4::EncodedSample>& out);
 

@@ -70,6 +70,11 @@ std::optional<Error> MovieWriter::writeFragment(const std::vector<std::vector<En
   return layout_ == Layout::Fragmented ? syncFile() : std::nullopt;
 }
 
+void MovieWriter::setTrackStart(size_t index, int64_t mediaStart, uint64_t startDelay) {
+  tracks_[index].mediaStart = mediaStart;
+  tracks_[index].startDelay = startDelay;
+}
+
 void MovieWriter::adopt(uint64_t placeholderOffset, uint64_t size, std::vector<TrackIndex> index) {
   placeholderOffset_ = placeholderOffset;
   size_ = size;

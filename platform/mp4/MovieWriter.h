@@ -52,6 +52,8 @@ class MovieWriter {
   std::optional<Error> writeHeader();
   /// One fragment: `samples[i]` belong to the track at i, in decode order.
   std::optional<Error> writeFragment(const std::vector<std::vector<EncodedSample>>& samples);
+  /// Corrects where the track at `index` begins, before the finish of a plain file.
+  void setTrackStart(size_t index, int64_t mediaStart, uint64_t startDelay);
   /// Also after an error, to make the most of what is there.
   std::optional<Error> finish(const MovieEnd& end);
 
@@ -66,7 +68,7 @@ class MovieWriter {
   std::optional<Error> syncFile();
 
   std::unique_ptr<MovieFile> file_;
-  const std::vector<MovieTrack> tracks_;
+  std::vector<MovieTrack> tracks_;
   const Layout layout_;
   std::vector<TrackIndex> index_;
   uint64_t size_ = 0;

@@ -18,17 +18,28 @@ void TrackIndex::shorten(std::vector<Run>& runs) {
 }
 
 void TrackIndex::add(const EncodedSample& sample, uint64_t offset, bool startsChunk) {
+  addEntry(sample.decodeTime, sample.compositionOffset, sample.duration, static_cast<uint32_t>(sample.data.size()),
+           sample.isSync, offset, startsChunk);
+}
+
+void TrackIndex::add(int64_t decodeTime, uint32_t duration, uint32_t size, bool isSync, uint64_t offset,
+                     bool startsChunk) {
+  addEntry(decodeTime, 0, duration, size, isSync, offset, startsChunk);
+}
+
+void TrackIndex::addEntry(int64_t decodeTime, int32_t compositionOffset, uint32_t duration, uint32_t size, bool isSync,
+                          uint64_t offset, bool startsChunk) {
   if (isEmpty()) {
-    firstDecodeTime_ = sample.decodeTime;
+    firstDecodeTime_ = decodeTime;
   } else {
-    extend(durations_, static_cast<uint32_t>(sample.decodeTime - lastDecodeTime_));
+    extend(durations_, static_cast<uint32_t>(decodeTime - lastDecodeTime_));
   }
   if (startsChunk || chunks_.empty()) chunks_.push_back({offset, static_cast<uint32_t>(count())});
-  sizes_.push_back(static_cast<uint32_t>(sample.data.size()));
-  extend(compositionOffsets_, static_cast<uint32_t>(sample.compositionOffset));
-  if (sample.isSync) syncSamples_.push_back(static_cast<uint32_t>(count()));
-  lastDecodeTime_ = sample.decodeTime;
-  lastDuration_ = sample.duration;
+  sizes_.push_back(size);
+  extend(compositionOffsets_, static_cast<uint32_t>(compositionOffset));
+  if (isSync) syncSamples_.push_back(static_cast<uint32_t>(count()));
+  lastDecodeTime_ = decodeTime;
+  lastDuration_ = duration;
 }
 
 void TrackIndex::dropLast() {

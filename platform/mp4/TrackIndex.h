@@ -17,6 +17,9 @@ class TrackIndex {
   /// Samples come in decode order; `startsChunk` where the one before is not its neighbour in the file.
   void add(const EncodedSample& sample, uint64_t offset, bool startsChunk);
 
+  /// The same for a sample without reordering whose bytes are not at hand.
+  void add(int64_t decodeTime, uint32_t duration, uint32_t size, bool isSync, uint64_t offset, bool startsChunk);
+
   [[nodiscard]] size_t count() const { return sizes_.size(); }
   [[nodiscard]] bool isEmpty() const { return sizes_.empty(); }
   [[nodiscard]] int64_t firstDecodeTime() const { return firstDecodeTime_; }
@@ -41,6 +44,8 @@ class TrackIndex {
     uint64_t offset;
     uint32_t firstSample;
   };
+  void addEntry(int64_t decodeTime, int32_t compositionOffset, uint32_t duration, uint32_t size, bool isSync,
+                uint64_t offset, bool startsChunk);
   static void extend(std::vector<Run>& runs, uint32_t value);
   static void shorten(std::vector<Run>& runs);
   void dropLast();
