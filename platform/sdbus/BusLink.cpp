@@ -42,10 +42,7 @@ void BusLink::setExportedInterface(const IPCInterface& interface) {
 void BusLink::resume() { postToSelf(&BusLink::open); }
 
 void BusLink::open() {
-  {
-    std::lock_guard lock(mutex_);
-    if (ended_) return;
-  }
+  // Opened even when it has been invalidated since: what was sent before that still goes out.
   if (bus_ || !socket_.isValid()) return;
   context_->links.insert(shared_from_this());
   const int r = prepareBus();
@@ -164,7 +161,7 @@ void BusLink::send(Outgoing message) {
   // A broken connection shows in the next step of sd-bus, once what the peer sent has been read.
   const bool isBroken = r == -ENOTCONN || r == -EPIPE || r == -ECONNRESET;
   if (message.kind != Outgoing::Kind::Call) {
-    QV_LOG_ERROR(logs::kIPC, "cannot send an answer: %s", std::strerror(-r));
+    if (!isBroken) QV_LOG_ERROR(logs::kIPC, "cannot send an answer: %s", std::strerror(-r));
     return;
   }
   std::lock_guard lock(mutex_);

@@ -59,8 +59,7 @@ TEST_F(ConnectionTest, SendsNoneAsTheEmptyValueOfItsType) {
   EXPECT_EQ(back[8], Value(Dictionary{}));
   EXPECT_EQ(back[10], Value(Array{Value(0.0), Value(0.0)}));
   // An entry that is none is an absent key.
-  EXPECT_EQ(valuesOf(call(*client, "echo", {Value(Dictionary{{"gone", Value()}})})),
-            IPCArguments{Value(Dictionary{})});
+  EXPECT_EQ(valuesOf(call(*client, "echo", {Value(Dictionary{{"gone", Value()}})})), IPCArguments{Value(Dictionary{})});
 }
 
 TEST_F(ConnectionTest, RepairsTextsThatAreNotUTF8) {
@@ -68,7 +67,8 @@ TEST_F(ConnectionTest, RepairsTextsThatAreNotUTF8) {
   listen();
   const auto client = connectClient();
   EXPECT_EQ(valuesOf(call(*client, "echo", {Value(std::string("a\xFF\0b\xED\xA0\x80", 7))})),
-            IPCArguments{Value("a\xEF\xBF\xBD\xEF\xBF\xBD" "b\xEF\xBF\xBD\xEF\xBF\xBD\xEF\xBF\xBD")});
+            IPCArguments{Value("a\xEF\xBF\xBD\xEF\xBF\xBD"
+                               "b\xEF\xBF\xBD\xEF\xBF\xBD\xEF\xBF\xBD")});
 }
 
 TEST_F(ConnectionTest, CarriesDescriptorsBothWays) {
@@ -78,15 +78,16 @@ TEST_F(ConnectionTest, CarriesDescriptorsBothWays) {
   const Value payload(Dictionary{{"frame", Value(Array{Value(descriptorFor("pixels")), Value(uint32_t{16})})}});
   const IPCArguments back = valuesOf(call(*client, "echo", {payload}));
   ASSERT_EQ(back.size(), 1u);
-  const Array& frame = valueForKey(back[0].asDictionary(), "frame").asArray();
+  const Array frame = valueForKey(back[0].asDictionary(), "frame").asArray();
   ASSERT_EQ(frame.size(), 2u);
   ASSERT_TRUE(frame[0].getIf<SharedFileDescriptor>());
   EXPECT_EQ(readAll(*frame[0].getIf<SharedFileDescriptor>()), "pixels");
-  EXPECT_EQ(codeOf(call(*client, "everything", [] {
-              IPCArguments arguments(13);
-              arguments[12] = Value(Array{Value(SharedFileDescriptor())});
-              return arguments;
-            }())),
+  EXPECT_EQ(codeOf(call(*client, "everything",
+                        [] {
+                          IPCArguments arguments(13);
+                          arguments[12] = Value(Array{Value(SharedFileDescriptor())});
+                          return arguments;
+                        }())),
             code(IPCErrorCode::InvalidArguments));
 }
 
