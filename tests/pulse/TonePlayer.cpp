@@ -8,7 +8,6 @@
 #include <time.h>
 #include <unistd.h>
 
-#include <atomic>
 #include <cmath>
 #include <cstdio>
 #include <iostream>
