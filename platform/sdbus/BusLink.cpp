@@ -66,7 +66,7 @@ int BusLink::prepareBus() {
     if ((r = sd_id128_randomize(&id)) < 0 || (r = sd_bus_set_server(bus, 1, id)) < 0) return r;
     if ((r = addBusObject(bus)) < 0) return r;
   }
-  if ((r = sd_bus_add_filter(bus, nullptr, &BusLink::onReply, this)) < 0) return r;
+  if ((r = sd_bus_add_filter(bus, nullptr, &BusLink::onMessage, this)) < 0) return r;
   if (exported_) {
     r = sd_bus_add_object_vtable(bus, nullptr, kObjectPath, exported_->name().c_str(), exportedMethods_.data(), this);
     if (r < 0) return r;
@@ -123,6 +123,10 @@ void BusLink::flush() {
     if (budget-- == 0) {
       std::lock_guard lock(mutex_);
       scheduleFlush();
+      break;
+    }
+    if (mustHearPeerFirst()) {
+      if (probeCookie_ == 0 && sendPing(probeCookie_) < 0) QV_LOG_ERROR(logs::kIPC, "cannot probe the peer");
       break;
     }
     auto message = nextOutgoing();
@@ -217,16 +221,26 @@ int BusLink::sendAnswer(Outgoing& message) {
   return sd_bus_reply_method_errorf(call.message.get(), kInvalidReplyError, "%s", std::strerror(-r));
 }
 
+/// A peer that is still authenticating (we have finished first) takes descriptors for an attack, and
+/// gives up. So the first of them waits until the peer has said anything; a ping makes it.
+bool BusLink::mustHearPeerFirst() {
+  if (heardPeer_ || role_ != Role::Accepted) return false;
+  std::lock_guard lock(mutex_);
+  return !outbox_.empty() && outbox_.front().hasDescriptors;
+}
+
+int BusLink::sendPing(uint64_t& cookie) {
+  sd_bus_message* ping = nullptr;
+  const int r =
+      sd_bus_message_new_method_call(bus_.get(), &ping, nullptr, kObjectPath, "org.freedesktop.DBus.Peer", "Ping");
+  if (r < 0) return r;
+  const MessageHandle handle(ping);
+  return sd_bus_send(bus_.get(), ping, &cookie);
+}
+
 /// The peer's answer to this shows that it has read all that was sent before.
 void BusLink::sendDrainMarker() {
-  if (!everSent_) return close();
-  sd_bus_message* ping = nullptr;
-  int r = sd_bus_message_new_method_call(bus_.get(), &ping, nullptr, kObjectPath, "org.freedesktop.DBus.Peer", "Ping");
-  if (r >= 0) {
-    const MessageHandle handle(ping);
-    r = sd_bus_send(bus_.get(), ping, &drainCookie_);
-  }
-  if (r < 0) close();
+  if (!everSent_ || sendPing(drainCookie_) < 0) close();
 }
 
 void BusLink::drain() {

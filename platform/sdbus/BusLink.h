@@ -87,6 +87,7 @@ class BusLink final : public std::enable_shared_from_this<BusLink> {
     std::string errorName;
     std::string errorMessage;
     size_t bytes = 0;
+    bool hasDescriptors = false;
   };
   struct ReceivedCall {
     MessageHandle message;
@@ -116,7 +117,9 @@ class BusLink final : public std::enable_shared_from_this<BusLink> {
   void send(Outgoing message);
   int sendCall(Outgoing& message);
   int sendAnswer(Outgoing& message);
+  int sendPing(uint64_t& cookie);
   void sendDrainMarker();
+  [[nodiscard]] bool mustHearPeerFirst();
   void updateWatch();
   void watchTimeout();
   void lost(int error);
@@ -125,7 +128,7 @@ class BusLink final : public std::enable_shared_from_this<BusLink> {
 
   // BusLink_receive.cpp: I/O thread
   static int onMethod(sd_bus_message* message, void* link, sd_bus_error* error);
-  static int onReply(sd_bus_message* message, void* link, sd_bus_error* error);
+  static int onMessage(sd_bus_message* message, void* link, sd_bus_error* error);
   int receiveCall(sd_bus_message* message, sd_bus_error* error);
   void receiveReply(sd_bus_message* message);
   void deliverCall(const IPCOperation& operation, IPCArguments arguments, uint64_t token);
@@ -177,6 +180,8 @@ class BusLink final : public std::enable_shared_from_this<BusLink> {
   size_t sentBytes_ = 0;       ///< of what sd-bus may still hold
   size_t sentMediaBytes_ = 0;  ///< of it, media
   bool everSent_ = false;
+  bool heardPeer_ = false;  ///< a message came, so the peer has finished authenticating
+  uint64_t probeCookie_ = 0;
   bool draining_ = false;
   uint64_t drainCookie_ = 0;
   int receiveFailure_ = 0;

@@ -49,7 +49,8 @@ void BusLink::addCall(const IPCOperation& operation, IPCArguments arguments, con
     return;
   }
   const uint64_t id = ++lastCall_;
-  Outgoing message{Outgoing::Kind::Call, id, &operation, std::move(arguments), call.expectsReply, {}, {}, cost.bytes};
+  Outgoing message{Outgoing::Kind::Call, id, &operation, std::move(arguments), call.expectsReply, {}, {}, cost.bytes,
+                   cost.descriptors > 0};
   if (call.isFrame) {
     ++framesInFlight_;
   } else if (operation.isMedia && call.expectsReply) {
@@ -72,8 +73,9 @@ bool BusLink::admitsMedia(const MessageCost& cost, bool expectsReply) const {
 }
 
 void BusLink::answer(uint64_t token, IPCArguments values) {
-  const size_t bytes = costOf(values).bytes;
-  pushAnswer({Outgoing::Kind::Answer, token, nullptr, std::move(values), false, {}, {}, bytes});
+  const MessageCost cost = costOf(values);
+  pushAnswer(
+      {Outgoing::Kind::Answer, token, nullptr, std::move(values), false, {}, {}, cost.bytes, cost.descriptors > 0});
 }
 
 void BusLink::answerError(uint64_t token, std::string name, std::string message) {

@@ -60,7 +60,8 @@ int BusLink::onMethod(sd_bus_message* message, void* link, sd_bus_error* error) 
   return static_cast<BusLink*>(link)->receiveCall(message, error);
 }
 
-int BusLink::onReply(sd_bus_message* message, void* link, sd_bus_error*) {
+int BusLink::onMessage(sd_bus_message* message, void* link, sd_bus_error*) {
+  static_cast<BusLink*>(link)->heardPeer_ = true;
   uint8_t type = 0;
   if (sd_bus_message_get_type(message, &type) < 0) return 0;
   if (type != SD_BUS_MESSAGE_METHOD_RETURN && type != SD_BUS_MESSAGE_METHOD_ERROR) return 0;

@@ -201,7 +201,7 @@ TEST_F(PeersTest, GarbageEndsItsConnectionOnly) {
   delegate_.object->serve = echo();
   listen();
   const auto client = connectClient();
-  (void)delegate_.connections.next();
+  const auto honest = delegate_.connections.next();
   using namespace std::string_literals;
   {
     RawPeer peer(socketPath());

@@ -54,7 +54,7 @@ TEST_F(StockClientsTest, GdbusCalls) {
 }
 
 TEST_F(StockClientsTest, APythonClientIsServedAndCalledBack) {
-  if (run("python3 -c 'import dbus, gi'").status != 0) GTEST_SKIP() << "no python3-dbus here";
+  if (run("/usr/bin/python3 -c 'import dbus, gi'").status != 0) GTEST_SKIP() << "no python3-dbus here";
   delegate_.object->serve = [](const Call& served) {
     served.connection->call("notify", {Value(uint32_t{9})}, {}, {});
     served.reply(served.arguments);
@@ -82,7 +82,7 @@ back = daemon.echo(dbus.types.UnixFd(read, variant_level=1))
 print(os.read(back.take(), 7).decode())
 loop.run()
 )";
-  const Ran ran = run("python3 " + script + " " + address());
+  const Ran ran = run("/usr/bin/python3 " + script + " " + address());
   EXPECT_NE(ran.output.find("through\n"), std::string::npos) << ran.output;
   EXPECT_NE(ran.output.find("notified 9\n"), std::string::npos) << ran.output;
 }
