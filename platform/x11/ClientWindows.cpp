@@ -38,4 +38,26 @@ std::optional<pid_t> processOfWindow(XcbConnection& connection, xcb_window_t win
   return process;
 }
 
+std::map<xcb_window_t, pid_t> processesOfWindows(XcbConnection& connection, const std::vector<xcb_window_t>& windows) {
+  if (windows.empty() || !connection.hasExtension(xcb_res_id)) return {};
+  std::vector<xcb_res_client_id_spec_t> specs;
+  for (const xcb_window_t window : windows)
+    if (window != XCB_NONE) specs.push_back({window, XCB_RES_CLIENT_ID_MASK_LOCAL_CLIENT_PID});
+  auto reply = connection.await<xcb_res_query_client_ids_reply_t>(
+      xcb_res_query_client_ids(connection.get(), static_cast<uint32_t>(specs.size()), specs.data()));
+  if (!reply) return {};
+  // An entry names its client by the base of the client's range of ids.
+  std::map<uint32_t, pid_t> byClient;
+  for (auto entries = xcb_res_query_client_ids_ids_iterator(reply.get()); entries.rem > 0;
+       xcb_res_client_id_value_next(&entries))
+    if (xcb_res_client_id_value_value_length(entries.data) >= 1)
+      byClient[entries.data->spec.client] = static_cast<pid_t>(*xcb_res_client_id_value_value(entries.data));
+  std::map<xcb_window_t, pid_t> processes;
+  for (const xcb_window_t window : windows) {
+    auto client = byClient.find(window & ~connection.setup().resource_id_mask);
+    if (client != byClient.end() && client->second > 0) processes[window] = client->second;
+  }
+  return processes;
+}
+
 }  // namespace qv::platform

@@ -11,6 +11,7 @@
 #include "platform/Clock.h"
 #include "platform/Result.h"
 #include "platform/ScreenCapture.h"
+#include "platform/UserAlert.h"
 
 namespace qv::platform {
 
@@ -37,7 +38,9 @@ class X11Platform {
   X11Platform& operator=(const X11Platform&) = delete;
 
   ScreenCaptureService& screenCapture();
+  ApplicationService& applications();
   RenderServer& renderServer();
+  UserAlertService& alerts();
 
  private:
   struct Services;

@@ -1,4 +1,3 @@
-#include <sys/wait.h>
 #include <unistd.h>
 
 #include "platform/x11/X11Platform.h"
@@ -14,39 +13,6 @@ class RenderServerTest : public XServerTest {
     EXPECT_TRUE(platform);
     return platform ? std::move(platform.value()) : nullptr;
   }
-};
-
-/// A process that shows one window until it is destroyed.
-class WindowProcess {
- public:
-  explicit WindowProcess(const std::string& display) {
-    int ends[2];
-    EXPECT_EQ(::pipe(ends), 0);
-    pid_ = ::fork();
-    if (pid_ == 0) {
-      XClient client(display);
-      const xcb_window_t window = client.show({});
-      if (::write(ends[1], &window, sizeof window) != sizeof window) ::_exit(1);
-      ::pause();
-      ::_exit(0);
-    }
-    ::close(ends[1]);
-    EXPECT_EQ(::read(ends[0], &window_, sizeof window_), static_cast<ssize_t>(sizeof window_));
-    ::close(ends[0]);
-  }
-  ~WindowProcess() { kill(); }
-  void kill() {
-    if (pid_ <= 0) return;
-    ::kill(pid_, SIGKILL);
-    ::waitpid(pid_, nullptr, 0);
-    pid_ = -1;
-  }
-  [[nodiscard]] pid_t pid() const { return pid_; }
-  [[nodiscard]] xcb_window_t window() const { return window_; }
-
- private:
-  pid_t pid_ = -1;
-  xcb_window_t window_ = 0;
 };
 
 TEST_F(RenderServerTest, NamesTheProcessThatMadeTheWindow) {

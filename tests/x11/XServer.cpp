@@ -29,11 +29,14 @@ std::vector<char*> pointers(const std::vector<std::string>& strings) {
 }  // namespace
 
 ChildProcess::ChildProcess(const std::vector<std::string>& arguments, const std::vector<std::string>& environment,
-                           int inheritedFd) {
+                           int inheritedFd, int outputFd) {
   posix_spawn_file_actions_t actions;
   posix_spawn_file_actions_init(&actions);
   posix_spawn_file_actions_addopen(&actions, 0, "/dev/null", O_RDONLY, 0);
-  posix_spawn_file_actions_addopen(&actions, 1, "/dev/null", O_WRONLY, 0);
+  if (outputFd >= 0)
+    posix_spawn_file_actions_adddup2(&actions, outputFd, 1);
+  else
+    posix_spawn_file_actions_addopen(&actions, 1, "/dev/null", O_WRONLY, 0);
   posix_spawn_file_actions_addopen(&actions, 2, "/dev/null", O_WRONLY, 0);
   if (inheritedFd >= 0) posix_spawn_file_actions_adddup2(&actions, inheritedFd, inheritedFd);
   auto argv = pointers(arguments);
@@ -181,6 +184,52 @@ void XClient::setCursor(xcb_window_t window, uint16_t side, uint32_t rgb) {
   xcb_change_window_attributes(connection_, window, XCB_CW_CURSOR, &cursor);
   xcb_free_gc(connection_, context);
   sync();
+}
+
+xcb_window_t XClient::focused() {
+  auto* reply = xcb_get_input_focus_reply(connection_, xcb_get_input_focus(connection_), nullptr);
+  const xcb_window_t window = reply == nullptr ? XCB_NONE : reply->focus;
+  std::free(reply);
+  return window;
+}
+
+std::string XClient::property(xcb_window_t window, const char* name) {
+  auto* atom = xcb_intern_atom_reply(
+      connection_, xcb_intern_atom(connection_, 0, static_cast<uint16_t>(std::strlen(name)), name), nullptr);
+  auto* reply = xcb_get_property_reply(
+      connection_, xcb_get_property(connection_, 0, window, atom->atom, XCB_ATOM_ANY, 0, 1024), nullptr);
+  std::string value;
+  if (reply != nullptr)
+    value.assign(static_cast<const char*>(xcb_get_property_value(reply)),
+                 static_cast<size_t>(xcb_get_property_value_length(reply)));
+  std::free(reply);
+  std::free(atom);
+  return value;
+}
+
+void XClient::waitForWindowManager() {
+  const uint32_t mask = XCB_EVENT_MASK_PROPERTY_CHANGE;
+  xcb_change_window_attributes(connection_, screen_->root, XCB_CW_EVENT_MASK, &mask);
+  while (property(screen_->root, "_NET_SUPPORTING_WM_CHECK").empty()) std::free(xcb_wait_for_event(connection_));
+}
+
+xcb_window_t XClient::waitForFocusedWindow(const std::string& title) {
+  while (true) {
+    const xcb_window_t window = focused();
+    if (window > XCB_INPUT_FOCUS_POINTER_ROOT && property(window, "_NET_WM_NAME") == title) return window;
+    ::usleep(10'000);  // the server tells nobody of a focus that moves between other clients' windows
+  }
+}
+
+WindowProcess::WindowProcess(const std::string& display) {
+  int ends[2];
+  if (::pipe2(ends, O_CLOEXEC) != 0) throw std::runtime_error("pipe");
+  process_ = std::make_unique<ChildProcess>(std::vector<std::string>{X11_TEST_WINDOW_PROGRAM, display},
+                                            std::vector<std::string>{}, -1, ends[1]);
+  pid_ = process_->pid();
+  ::close(ends[1]);
+  if (::read(ends[0], &window_, sizeof window_) != sizeof window_) throw std::runtime_error("no window");
+  ::close(ends[0]);
 }
 
 void XServerTest::SetUpTestSuite() {

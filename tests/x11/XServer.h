@@ -18,9 +18,9 @@ namespace qv::platform::testing {
 /// A child process of the test; killed and waited for at the end.
 class ChildProcess {
  public:
-  /// `inheritedFd` (if any) stays open in the child.
+  /// `inheritedFd` (if any) stays open in the child, `outputFd` (if any) becomes its output.
   explicit ChildProcess(const std::vector<std::string>& arguments, const std::vector<std::string>& environment = {},
-                        int inheritedFd = -1);
+                        int inheritedFd = -1, int outputFd = -1);
   ~ChildProcess() { kill(); }
   ChildProcess(const ChildProcess&) = delete;
   ChildProcess& operator=(const ChildProcess&) = delete;
@@ -76,14 +76,36 @@ class XClient {
   void map(xcb_window_t window);
   void destroy(xcb_window_t window);
   void focus(xcb_window_t window);
+  /// The window that has the keyboard focus.
+  [[nodiscard]] xcb_window_t focused();
+  /// Returns when a window manager has announced itself.
+  void waitForWindowManager();
+  /// Returns when another client has mapped a top-level window of this title that has the focus.
+  xcb_window_t waitForFocusedWindow(const std::string& title);
   void setCursor(xcb_window_t window, uint16_t side, uint32_t rgb);
   [[nodiscard]] xcb_connection_t* connection() const { return connection_; }
   [[nodiscard]] xcb_window_t root() const { return screen_->root; }
   void sync();
 
  private:
+  std::string property(xcb_window_t window, const char* name);
+
   xcb_connection_t* connection_;
   xcb_screen_t* screen_;
+};
+
+/// A process of its own that shows one window, 200 x 200, until it is killed.
+class WindowProcess {
+ public:
+  explicit WindowProcess(const std::string& display);
+  void kill() { process_->kill(); }
+  [[nodiscard]] pid_t pid() const { return pid_; }
+  [[nodiscard]] xcb_window_t window() const { return window_; }
+
+ private:
+  std::unique_ptr<ChildProcess> process_;
+  pid_t pid_ = -1;
+  xcb_window_t window_ = 0;
 };
 
 /// Skips, visibly, where there is no X server to start. One server per suite.
