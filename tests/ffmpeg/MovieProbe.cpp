@@ -72,7 +72,7 @@ std::vector<DecodedPicture> decodePictures(const std::string& path) {
 
 std::vector<float> decodeSound(const std::string& path, int track) {
   const std::string raw = run("ffmpeg -v error -nostdin -i '" + path + "' -map 0:a:" + std::to_string(track) +
-                              " -f f32le -ac 1 -ar 44100 - 2>/dev/null");
+                              " -af 'pan=mono|c0=c0' -f f32le -ar 44100 - 2>/dev/null");
   std::vector<float> sound(raw.size() / sizeof(float));
   std::memcpy(sound.data(), raw.data(), sound.size() * sizeof(float));
   return sound;

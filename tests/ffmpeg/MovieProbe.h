@@ -31,7 +31,7 @@ struct DecodedPicture {
 };
 /// Every picture that is shown, its number read off the decoded pixels.
 std::vector<DecodedPicture> decodePictures(const std::string& path);
-/// The sound of the n-th audio track as shown, mono at 44100 Hz.
+/// The sound of the n-th audio track as shown, its left side at 44100 Hz.
 std::vector<float> decodeSound(const std::string& path, int track);
 /// Where each beep begins, in seconds.
 std::vector<double> beeps(const std::vector<float>& sound);
