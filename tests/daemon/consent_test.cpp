@@ -18,8 +18,6 @@ class ConsentTest : public DaemonTest {
   }
 };
 
-bool operator==(const std::optional<TestClient::Answer>& answer, std::nullopt_t) { return !answer.has_value(); }
-
 TEST_F(ConsentTest, TwoButtonsRecordOrDecline) {
   auto client = game();
   EXPECT_EQ(startAnswering(client, {}, UserAlertAnswer::Other).code(), errorcode::kUserDeclined);
