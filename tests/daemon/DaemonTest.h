@@ -27,8 +27,9 @@ class TestClient {
     connection_ = *device.ipc.connect(kServiceName);
     connection_->setRemoteInterface(daemonProtocol());
     connection_->setExportedInterface(clientProtocol(), object_);
-    connection_->setInvalidationHandler([this] { ended_ = true; });
-    connection_->setInterruptionHandler([this] { ended_ = true; });
+    // Handlers may come after this object has gone.
+    connection_->setInvalidationHandler([seen = seen_] { seen->ended = true; });
+    connection_->setInterruptionHandler([seen = seen_] { seen->ended = true; });
     connection_->resume();
     device.run();
   }
@@ -36,6 +37,9 @@ class TestClient {
   struct Answer {
     platform::IPCArguments values;
     std::optional<platform::Error> failure;  ///< of the call itself
+    [[nodiscard]] std::string failureName() const {
+      return failure ? valueForKey(failure->userInfo, platform::kIPCRemoteErrorNameKey).asString() : std::string();
+    }
     [[nodiscard]] int64_t code(size_t at = 0) const {
       const auto error = platform::decodeError(values.at(at).asDictionary());
       return error ? error->code : 0;
@@ -48,16 +52,20 @@ class TestClient {
   };
 
   void send(const char* member, platform::IPCArguments arguments = {}) {
-    answer_.reset();
+    seen_->answer.reset();
     connection_->call(
         member, std::move(arguments),
-        [this](const platform::IPCArguments& values) { answer_ = Answer{values, std::nullopt}; },
-        [this](const platform::Error& error) { answer_ = Answer{{}, error}; });
+        [seen = seen_](const platform::IPCArguments& values) {
+          seen->answer = Answer{values, std::nullopt};
+        },
+        [seen = seen_](const platform::Error& error) {
+          seen->answer = Answer{{}, error};
+        });
     device_.run();
   }
   std::optional<Answer> request(const char* member, platform::IPCArguments arguments = {}) {
     send(member, std::move(arguments));
-    return answer_;
+    return seen_->answer;
   }
   std::optional<Answer> start(const StartOptions& o) {
     using platform::Value;
@@ -88,8 +96,8 @@ class TestClient {
     return codes;
   }
   [[nodiscard]] const std::string& lastMovie() const { return lastMovie_; }
-  [[nodiscard]] const std::optional<Answer>& answer() const { return answer_; }
-  [[nodiscard]] bool isEnded() const { return ended_; }
+  [[nodiscard]] const std::optional<Answer>& answer() const { return seen_->answer; }
+  [[nodiscard]] bool isEnded() const { return seen_->ended; }
   [[nodiscard]] const std::string& bundleID() const { return bundleID_; }
   fakes::RecordingExportedObject& object() { return *object_; }
 
@@ -99,9 +107,12 @@ class TestClient {
   const pid_t pid_;
   const std::shared_ptr<fakes::RecordingExportedObject> object_ = std::make_shared<fakes::RecordingExportedObject>();
   std::shared_ptr<platform::IPCConnection> connection_;
-  std::optional<Answer> answer_;
   std::string lastMovie_;
-  bool ended_ = false;
+  struct Seen {
+    std::optional<Answer> answer;
+    bool ended = false;
+  };
+  const std::shared_ptr<Seen> seen_ = std::make_shared<Seen>();
 };
 
 /// The daemon on a device of fakes, with two applications installed and in front.

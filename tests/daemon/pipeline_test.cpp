@@ -84,7 +84,7 @@ TEST_F(PipelineTest, AnEndedRecordingLeavesItsTimesBehind) {
 
 TEST_F(PipelineTest, OrientationAndTransformOfAllFlags) {
   const uint32_t orientations[] = {1, 4, 2, 3, 8, 5, 7, 6};
-  const AffineTransform transforms[] = {{1, 0, 0, 1},   {1, 0, 0, -1}, {-1, 0, 0, 1},  {-1, 0, 0, -1},
+  const AffineTransform transforms[] = {{1, 0, 0, 1},  {1, 0, 0, -1}, {-1, 0, 0, 1},  {-1, 0, 0, -1},
                                         {0, 1, -1, 0}, {0, 1, 1, 0},  {0, -1, -1, 0}, {0, -1, 1, 0}};
   for (uint64_t flags = 0; flags < 8; ++flags) {
     EXPECT_EQ(orientationFromVellTransform(flags), orientations[flags]);
@@ -102,10 +102,10 @@ TEST_F(PipelineTest, AudioOfTheApplicationAndAMutedMicrophoneReachTheirTracks) {
   frame(10);
   ASSERT_TRUE(device_.tap.fill(100, 2 * kSecond, 100));
   const auto sendMicrophone = [&](int64_t nanoseconds) {
-    device_.deviceCapture.send(platform::SampleBuffer::makeAudio(
-        std::make_shared<platform::DataBlock>(std::vector<uint8_t>(20, 9)),
-        captureManager_.createAudioFormatDescription(), 10,
-        platform::MediaTime::make(nanoseconds, platform::kHostTimescale)));
+    device_.deviceCapture.send(
+        platform::SampleBuffer::makeAudio(std::make_shared<platform::DataBlock>(std::vector<uint8_t>(20, 9)),
+                                          captureManager_.createAudioFormatDescription(), 10,
+                                          platform::MediaTime::make(nanoseconds, platform::kHostTimescale)));
     device_.run();
   };
   sendMicrophone(2 * kSecond);

@@ -54,20 +54,20 @@ TEST_F(RequestsTest, ACallerWithoutBundleIsServedAsFarAsItGoes) {
   TestClient client(device_, "", 900);
   EXPECT_EQ(client.start()->code(), errorcode::kFailedToStart);
   EXPECT_TRUE(client.state().empty());
-  EXPECT_EQ(client.stop()->failure->domain, requesterror::kNotRecording);
+  EXPECT_EQ(client.stop()->failureName(), requesterror::kNotRecording);
   EXPECT_GT(device_.log.countContaining("Info.json"), 0u);
 }
 
 TEST_F(RequestsTest, RequestsWithoutAnAnswerFailByName) {
   auto client = game();
-  EXPECT_EQ(client.stop()->failure->domain, requesterror::kNotRecording);
+  EXPECT_EQ(client.stop()->failureName(), requesterror::kNotRecording);
   client.start();
-  EXPECT_EQ(client.request("discardRecordingWithHandler")->failure->domain, requesterror::kRecording);
+  EXPECT_EQ(client.request("discardRecordingWithHandler")->failureName(), requesterror::kRecording);
   EXPECT_TRUE(client.isRecording());
   EXPECT_EQ(client
                 .request("setupBroadcastWithHostBundleID",
                          {Value("a"), Value("b"), Value(platform::Data{}), Value(platform::Dictionary{})})
-                ->failure->domain,
+                ->failureName(),
             requesterror::kNoExtension);
   EXPECT_TRUE(client.request("getSystemBroadcastExtensionInfo")->values[0].asArray().empty());
 }

@@ -229,6 +229,8 @@ void FakeIPCConnection::End::receiveError(uint64_t serial, const Error& error) {
 void FakeIPCConnection::End::end(bool byPeer) {
   std::function<void()> handler;
   std::map<uint64_t, Pending> failed;
+  // Released after the lock: it may own this very connection.
+  std::shared_ptr<IPCExportedObject> released;
   {
     std::lock_guard lock(mutex);
     if (ended) return;
@@ -237,7 +239,7 @@ void FakeIPCConnection::End::end(bool byPeer) {
     failed.swap(pending);
     interruptionHandler = nullptr;
     invalidationHandler = nullptr;
-    exportedObject = nullptr;
+    released.swap(exportedObject);
     inbox.clear();
     queue->async([handler = std::move(handler), failed = std::move(failed)] {
       for (const auto& [serial, call] : failed) {
