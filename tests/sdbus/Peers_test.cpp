@@ -108,10 +108,9 @@ TEST_F(PeersTest, APeerThatNeverReadsLosesMediaFirstAndIsThenCutOff) {
   const auto server = admit(peer);
   Events<int64_t> failures;
   for (uint32_t i = 0; i < 100; ++i) sendNumbered(*server, "sample", i, failures);
-  EXPECT_EQ(failures.next(), code(IPCErrorCode::MessageDropped));
+  // All but what the socket's buffer and the media bound took.
+  for (int i = 0; i < 80; ++i) EXPECT_EQ(failures.next(), code(IPCErrorCode::MessageDropped));
   EXPECT_TRUE(delegate_.ended.isEmpty());
-  // At most the socket's buffer and the media bound were taken.
-  EXPECT_GT(failures.count(), 80u);
   Events<int64_t> controlFailures;
   constexpr uint32_t kFarBeyondTheBound = 20000;
   for (uint32_t i = 0; i < kFarBeyondTheBound; ++i) sendNumbered(*server, "notify", i, controlFailures);

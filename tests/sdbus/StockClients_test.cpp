@@ -76,6 +76,7 @@ class Client(dbus.service.Object):
 connection = dbus.connection.Connection(sys.argv[1])
 client = Client(connection, path)
 daemon = dbus.Interface(connection.get_object(None, path, introspect=False), name)
+daemon.echo('first')  # the library knows after one answer that descriptors may be sent
 read, write = os.pipe()
 os.write(write, b'through')
 back = daemon.echo(dbus.types.UnixFd(read, variant_level=1))
