@@ -1,0 +1,72 @@
+#include <unistd.h>
+
+#include "platform/x11/X11Platform.h"
+#include "tests/x11/XServer.h"
+
+namespace qv::platform::testing {
+namespace {
+
+class RenderServerTest : public XServerTest {
+ protected:
+  std::unique_ptr<X11Platform> connect() {
+    auto platform = X11Platform::connect(display(), {});
+    EXPECT_TRUE(platform);
+    return platform ? std::move(platform.value()) : nullptr;
+  }
+};
+
+TEST_F(RenderServerTest, NamesTheProcessThatMadeTheWindow) {
+  auto platform = connect();
+  WindowProcess other(display());
+  XClient own(display());
+  const auto window = own.show({});
+  EXPECT_EQ(platform->renderServer().ownerOfContext(window), ::getpid());
+  EXPECT_EQ(platform->renderServer().ownerOfContext(other.window()), other.pid());
+}
+
+TEST_F(RenderServerTest, NamesNobodyForWhatIsNoWindowOfAClient) {
+  auto platform = connect();
+  auto& renderServer = platform->renderServer();
+  XClient own(display());
+  const auto window = own.show({});
+  EXPECT_EQ(renderServer.ownerOfContext(0), std::nullopt);
+  EXPECT_EQ(renderServer.ownerOfContext(0xdeadbeef), std::nullopt);
+  EXPECT_EQ(renderServer.ownerOfContext(own.root()), std::nullopt);
+  EXPECT_EQ(renderServer.ownerOfContext(window + 77), std::nullopt) << "an unused id of a living client";
+  own.destroy(window);
+  EXPECT_EQ(renderServer.ownerOfContext(window), std::nullopt);
+}
+
+TEST_F(RenderServerTest, NamesNobodyForAWindowOfADeadProcess) {
+  auto platform = connect();
+  WindowProcess other(display());
+  other.kill();
+  // The dead client's range of ids goes to the next client: its windows are not the old ones.
+  XClient successor(display());
+  successor.sync();
+  EXPECT_EQ(platform->renderServer().ownerOfContext(other.window()), std::nullopt);
+}
+
+TEST_F(RenderServerTest, ConnectsAnewAfterTheServerCameBack) {
+  EXPECT_FALSE(X11Platform::connect(":4242", {}));
+  XServer mortal;
+  auto platform = X11Platform::connect(mortal.display(), {});
+  ASSERT_TRUE(platform);
+  auto& renderServer = platform.value()->renderServer();
+  mortal.kill();
+  EXPECT_EQ(renderServer.ownerOfContext(0x200001), std::nullopt);
+  ChildProcess again({"Xvfb", mortal.display(), "-screen", "0", "640x480x24", "-nolisten", "tcp", "-noreset"});
+  std::unique_ptr<XClient> client;
+  while (!client) {
+    try {
+      client = std::make_unique<XClient>(mortal.display());
+    } catch (const std::runtime_error&) {
+      ::usleep(20'000);  // there is nothing to wait on before the server listens
+    }
+  }
+  const auto window = client->show({});
+  EXPECT_EQ(renderServer.ownerOfContext(window), ::getpid());
+}
+
+}  // namespace
+}  // namespace qv::platform::testing

@@ -1,0 +1,124 @@
+#pragma once
+
+#include <gtest/gtest.h>
+#include <sys/types.h>
+#include <xcb/xcb.h>
+
+#include <condition_variable>
+#include <cstdint>
+#include <initializer_list>
+#include <memory>
+#include <mutex>
+#include <optional>
+#include <string>
+#include <vector>
+
+namespace qv::platform::testing {
+
+/// A child process of the test; killed and waited for at the end.
+class ChildProcess {
+ public:
+  /// `inheritedFd` (if any) stays open in the child, `outputFd` (if any) becomes its output.
+  explicit ChildProcess(const std::vector<std::string>& arguments, const std::vector<std::string>& environment = {},
+                        int inheritedFd = -1, int outputFd = -1);
+  ~ChildProcess() { kill(); }
+  ChildProcess(const ChildProcess&) = delete;
+  ChildProcess& operator=(const ChildProcess&) = delete;
+  [[nodiscard]] pid_t pid() const { return pid_; }
+  /// Kills it and waits for its end.
+  void kill();
+  /// Waits for it to end by itself; its exit status, or -1.
+  int wait();
+
+ private:
+  pid_t pid_ = -1;
+};
+
+bool hasProgram(const std::string& name);
+
+/// An X server without hardware, 640 x 480.
+class XServer {
+ public:
+  static constexpr uint16_t kWidth = 640, kHeight = 480;
+  XServer();
+  [[nodiscard]] const std::string& display() const { return display_; }
+  void kill() { process_->kill(); }
+
+ private:
+  std::unique_ptr<ChildProcess> process_;
+  std::string display_;
+};
+
+/// A client of the X server, that shows windows of plain colours. Every call is complete in the
+/// server when it returns.
+class XClient {
+ public:
+  explicit XClient(const std::string& display);
+  ~XClient();
+  XClient(const XClient&) = delete;
+  XClient& operator=(const XClient&) = delete;
+  struct WindowOptions {
+    int16_t x = 0, y = 0;
+    uint16_t width = 100, height = 80;
+    uint32_t color = 0;
+    bool hasAlpha = false;  ///< `color` then carries premultiplied alpha
+    xcb_window_t parent = XCB_NONE;
+    uint16_t border = 0;
+  };
+  /// Mapped, filled with its colour.
+  xcb_window_t show(const WindowOptions& options);
+  void fill(xcb_window_t window, uint32_t color);
+  void fillRect(xcb_window_t window, uint32_t color, int16_t x, int16_t y, uint16_t width, uint16_t height);
+  void resize(xcb_window_t window, uint16_t width, uint16_t height);
+  void move(xcb_window_t window, int16_t x, int16_t y);
+  void raise(xcb_window_t window);
+  void unmap(xcb_window_t window);
+  void map(xcb_window_t window);
+  void destroy(xcb_window_t window);
+  void focus(xcb_window_t window);
+  /// The window that has the keyboard focus.
+  [[nodiscard]] xcb_window_t focused();
+  /// Returns when a window manager has announced itself.
+  void waitForWindowManager();
+  /// Returns when another client has mapped a top-level window of this title that has the focus.
+  xcb_window_t waitForFocusedWindow(const std::string& title);
+  void setCursor(xcb_window_t window, uint16_t side, uint32_t rgb);
+  [[nodiscard]] xcb_connection_t* connection() const { return connection_; }
+  [[nodiscard]] xcb_window_t root() const { return screen_->root; }
+  void sync();
+
+ private:
+  std::string property(xcb_window_t window, const char* name);
+
+  xcb_connection_t* connection_;
+  xcb_screen_t* screen_;
+};
+
+/// A process of its own that shows one window, 200 x 200, until it is killed.
+class WindowProcess {
+ public:
+  explicit WindowProcess(const std::string& display);
+  void kill() { process_->kill(); }
+  [[nodiscard]] pid_t pid() const { return pid_; }
+  [[nodiscard]] xcb_window_t window() const { return window_; }
+
+ private:
+  std::unique_ptr<ChildProcess> process_;
+  pid_t pid_ = -1;
+  xcb_window_t window_ = 0;
+};
+
+/// Skips, visibly, where there is no X server to start. One server per suite.
+class XServerTest : public ::testing::Test {
+ protected:
+  static void SetUpTestSuite();
+  static void TearDownTestSuite();
+  void SetUp() override;
+  static XServer& server() { return *server_; }
+  static const std::string& display() { return server_->display(); }
+
+ private:
+  static inline std::unique_ptr<XServer> server_;
+};
+
+}  // namespace qv::platform::testing
