@@ -36,7 +36,8 @@ class Bundle {
   [[nodiscard]] virtual Dictionary localizedInfoDictionary() const = 0;
   /// Names of the ".lproj" directories, sorted.
   [[nodiscard]] virtual std::vector<std::string> localizations() const = 0;
-  /// The path of a resource `name`.`type` of one localization; nothing when it does not exist.
+  /// The path of a resource `name`.`type` of one localization, or, with the empty localization, in
+  /// the resource directory itself; nothing when it does not exist.
   [[nodiscard]] virtual std::optional<std::string> pathForResource(std::string_view name, std::string_view type,
                                                                    std::string_view localization) const = 0;
 };

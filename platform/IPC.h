@@ -16,6 +16,19 @@
 
 namespace qv::platform {
 
+/// The domain of the errors that this layer itself gives to error handlers. The user information has
+/// the text, and under kIPCRemoteErrorNameKey the D-Bus name of an error reply.
+inline constexpr const char kIPCErrorDomain[] = "com.tarnwick.quorveld.IPC";
+inline constexpr const char kIPCRemoteErrorNameKey[] = "remoteErrorName";
+enum class IPCErrorCode : int64_t {
+  ConnectionInvalid = 1,  ///< the peer is gone, or the connection was ended
+  MessageDropped = 2,     ///< a media message, at the bound of a peer that does not keep up
+  UnknownOperation = 3,   ///< the interface, or the peer, has no such operation
+  InvalidArguments = 4,   ///< arguments that do not fit the operation or cannot be sent
+  NoReply = 5,            ///< the peer let the call go unanswered
+  RemoteError = 6,        ///< any other error reply, or a malformed reply
+};
+
 /// One operation of an interface, as it stands on the wire (docs/protocol.md).
 ///
 /// `arguments` and `reply` are D-Bus signatures, one complete type per argument. `reply` is

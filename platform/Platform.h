@@ -1,5 +1,6 @@
 #pragma once
 
+#include <cstdint>
 #include <string>
 
 #include "platform/AppAudioTap.h"
@@ -56,6 +57,9 @@ struct Platform {
   static Platform& current();
   /// Installs `platform` (borrowed); nullptr uninstalls.
   static void install(Platform* platform);
+  /// Counts the installations so far: whoever keeps something of the installed platform for the
+  /// life of the process keeps this number with it, and asks anew when it has changed.
+  static uint64_t installation();
 };
 
 /// `path` under the device root.

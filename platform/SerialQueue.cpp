@@ -11,7 +11,10 @@ struct SerialQueue::State : std::enable_shared_from_this<SerialQueue::State> {
       : label(std::move(name)), executor(runs), target(std::move(above)) {}
 
   void enqueue(std::function<void()> work);
+  void scheduleDrain(std::unique_lock<std::mutex>& lock);
   void drain();
+  void runQueuedItems(std::unique_lock<std::mutex>& lock);
+  void waitForTurn(std::unique_lock<std::mutex>& lock, const std::function<void()>& work);
   void runItem(const std::function<void()>& work);
   void runSync(const std::function<void()>& work);
   bool isCurrent() const;
@@ -21,7 +24,8 @@ struct SerialQueue::State : std::enable_shared_from_this<SerialQueue::State> {
   const std::shared_ptr<State> target;  // of any other
   std::mutex mutex;
   std::deque<std::function<void()>> items;
-  bool busy = false;  // an item runs, or a drain is posted
+  bool running = false;    // some thread runs the items
+  bool scheduled = false;  // a drain is posted
 };
 
 namespace {
@@ -47,28 +51,36 @@ void SerialQueue::State::enqueue(std::function<void()> work) {
     target->enqueue([self = shared_from_this(), work = std::move(work)] { self->runItem(work); });
     return;
   }
-  {
-    std::lock_guard lock(mutex);
-    items.push_back(std::move(work));
-    if (busy) return;
-    busy = true;
-  }
+  std::unique_lock lock(mutex);
+  items.push_back(std::move(work));
+  scheduleDrain(lock);
+}
+
+/// Posts a drain unless somebody runs the items already. Releases the lock.
+void SerialQueue::State::scheduleDrain(std::unique_lock<std::mutex>& lock) {
+  if (running || scheduled || items.empty()) return;
+  scheduled = true;
+  lock.unlock();
   executor->post([self = shared_from_this()] { self->drain(); });
 }
 
 void SerialQueue::State::drain() {
-  for (;;) {
-    std::function<void()> work;
-    {
-      std::lock_guard lock(mutex);
-      if (items.empty()) {
-        busy = false;
-        return;
-      }
-      work = std::move(items.front());
-      items.pop_front();
-    }
+  std::unique_lock lock(mutex);
+  scheduled = false;
+  if (running) return;
+  running = true;
+  runQueuedItems(lock);
+  running = false;
+}
+
+void SerialQueue::State::runQueuedItems(std::unique_lock<std::mutex>& lock) {
+  while (!items.empty()) {
+    auto work = std::move(items.front());
+    items.pop_front();
+    lock.unlock();
     runItem(work);
+    work = nullptr;
+    lock.lock();
   }
 }
 
@@ -77,34 +89,34 @@ void SerialQueue::State::runSync(const std::function<void()>& work) {
     target->runSync([this, &work] { runItem(work); });
     return;
   }
-  {
-    std::unique_lock lock(mutex);
-    if (!busy) {
-      busy = true;
-      lock.unlock();
-      runItem(work);
-      lock.lock();
-      if (items.empty()) {
-        busy = false;
-        return;
-      }
-      lock.unlock();
-      executor->post([self = shared_from_this()] { self->drain(); });
-      return;
-    }
+  std::unique_lock lock(mutex);
+  if (running) {
+    waitForTurn(lock, work);
+    return;
   }
+  running = true;
+  runQueuedItems(lock);
+  lock.unlock();
+  runItem(work);
+  lock.lock();
+  running = false;
+  scheduleDrain(lock);
+}
+
+void SerialQueue::State::waitForTurn(std::unique_lock<std::mutex>& lock, const std::function<void()>& work) {
   std::mutex doneMutex;
   std::condition_variable doneCondition;
   bool done = false;
-  enqueue([&] {
+  items.push_back([&] {
     work();
     // Notify under the lock: the waiter may destroy the condition as soon as it can see `done`.
-    std::lock_guard lock(doneMutex);
+    std::lock_guard doneLock(doneMutex);
     done = true;
     doneCondition.notify_one();
   });
-  std::unique_lock lock(doneMutex);
-  doneCondition.wait(lock, [&] { return done; });
+  lock.unlock();
+  std::unique_lock doneLock(doneMutex);
+  doneCondition.wait(doneLock, [&] { return done; });
 }
 
 SerialQueue::SerialQueue(std::string label, Executor& executor)

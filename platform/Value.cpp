@@ -96,19 +96,19 @@ std::string Value::asString(std::string fallback) const {
   return v ? *v : fallback;
 }
 
-const Array& Value::asArray() const {
+const Array& Value::asArray() const& {
   static const Array kEmpty;
   const auto* v = getIf<Array>();
   return v ? *v : kEmpty;
 }
 
-const Dictionary& Value::asDictionary() const {
+const Dictionary& Value::asDictionary() const& {
   static const Dictionary kEmpty;
   const auto* v = getIf<Dictionary>();
   return v ? *v : kEmpty;
 }
 
-const Data& Value::asData() const {
+const Data& Value::asData() const& {
   static const Data kEmpty;
   const auto* v = getIf<Data>();
   return v ? *v : kEmpty;

@@ -4,6 +4,7 @@
 #include <map>
 #include <string>
 #include <string_view>
+#include <utility>
 #include <variant>
 #include <vector>
 
@@ -84,9 +85,13 @@ class Value {
   [[nodiscard]] double asDouble(double fallback = 0) const;
   [[nodiscard]] std::string asString(std::string fallback = {}) const;
   /// Empty containers where the value is of another kind.
-  [[nodiscard]] const Array& asArray() const;
-  [[nodiscard]] const Dictionary& asDictionary() const;
-  [[nodiscard]] const Data& asData() const;
+  [[nodiscard]] const Array& asArray() const&;
+  [[nodiscard]] const Dictionary& asDictionary() const&;
+  [[nodiscard]] const Data& asData() const&;
+  /// Of a temporary, by value: nothing dangles.
+  [[nodiscard]] Array asArray() && { return std::as_const(*this).asArray(); }
+  [[nodiscard]] Dictionary asDictionary() && { return std::as_const(*this).asDictionary(); }
+  [[nodiscard]] Data asData() && { return std::as_const(*this).asData(); }
 
   /// Equal kind and content; descriptors are equal only where they are the same object.
   bool operator==(const Value& other) const;

@@ -1,0 +1,81 @@
+#include "daemon/QVRecordingManager.h"
+#include "daemon/client/QVClientProtocol.h"
+#include "daemon/client/QVDaemonProtocol.h"
+#include "platform/Log.h"
+
+namespace qv {
+
+using platform::IPCConnection;
+namespace logs = platform::logs;
+
+bool QVRecordingManager::listenerShouldAcceptNewConnection(platform::IPCListener&,
+                                                           const std::shared_ptr<IPCConnection>& connection) {
+  QV_LOG(logs::kDaemon, "QVRecordingManager: shouldAcceptNewConnection:");
+  const pid_t processID = connection->processIdentifier();
+  if (processID == 0) return false;
+  const std::optional<std::string> bundleID = connection->peer().bundleIdentifier;
+  QV_LOG(logs::kDaemon, "accepted client connection PID: %d", static_cast<int>(processID));
+  connection->setExportedInterface(daemonProtocol(), shared_from_this());
+  connection->setRemoteInterface(clientProtocol());
+  connection->setTargetQueue(sequence_);
+  const std::weak_ptr<IPCConnection> weakConnection = connection;
+  connection->setInterruptionHandler([weakSelf = weak_from_this(), weakConnection] {
+    if (const auto self = weakSelf.lock()) self->connectionEnded(weakConnection, "connection INTERRUPTED");
+  });
+  connection->setInvalidationHandler([weakSelf = weak_from_this(), weakConnection] {
+    if (const auto self = weakSelf.lock()) self->connectionEnded(weakConnection, "connection INVALID");
+  });
+  connections_.emplace(connection, bundleID);
+  if (const Session session = recordingSessionForBundleID(bundleID)) adoptConnection(session, *bundleID, connection);
+  connection->resume();
+  if (bundleID) exemptions_.expireAcknowledgementExemptionsForBundleID(*bundleID, platform_.clock->now());
+  return true;
+}
+
+/// An application that connects anew replaces its former connection; the end of that one must not
+/// tear down the session.
+void QVRecordingManager::adoptConnection(const Session& session, const std::string& bundleID,
+                                         const std::shared_ptr<IPCConnection>& connection) {
+  if (const auto proxy = session->clientProxy()) {
+    if (const auto former = proxy->connection()) {
+      former->setInvalidationHandler(nullptr);
+      former->setInterruptionHandler(nullptr);
+      former->invalidate();
+      connections_.erase(former);
+    }
+    proxy->setConnection(nullptr);
+    // Nobody is left to be told how the former connection's start ended.
+    cancelPendingStart(bundleID);
+  }
+  session->setClientProxy(std::make_shared<QVClientProxy>(bundleID, connection));
+}
+
+void QVRecordingManager::connectionEnded(const std::weak_ptr<IPCConnection>& weakConnection, const char* line) {
+  QV_LOG(logs::kDaemon, "%s", line);
+  const auto connection = weakConnection.lock();
+  const auto known = connections_.find(connection);
+  if (known == connections_.end()) return;
+  const std::optional<std::string> bundleID = known->second;
+  connections_.erase(known);
+  applicationDisconnectedWithBundleID(bundleID, connection);
+}
+
+void QVRecordingManager::applicationDisconnectedWithBundleID(const std::optional<std::string>& bundleID,
+                                                             const std::shared_ptr<IPCConnection>& connection) {
+  QV_LOG(logs::kDaemon, "QVRecordingManager: applicationDisconnected");
+  if (!bundleID) return;
+  const auto found = bundleIDToRecordingSessionLookup_.find(*bundleID);
+  if (found == bundleIDToRecordingSessionLookup_.end()) return;
+  const Session session = found->second;
+  const auto proxy = session->clientProxy();
+  if (proxy && proxy->connection() != connection) return;
+  cancelPendingStart(*bundleID);
+  if (session->isSystemRecording() && session->isRecording()) {
+    if (proxy) proxy->setConnection(nullptr);
+    return;
+  }
+  stopRecordingSession(session, 0, 0, nullptr);
+  removeSessionForBundleID(*bundleID);
+}
+
+}  // namespace qv

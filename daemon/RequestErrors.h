@@ -1,0 +1,15 @@
+#pragma once
+
+/// Names of the D-Bus errors with which a call fails whose completion handler is never called, so
+/// that no client waits for ever.
+namespace qv::requesterror {
+
+/// A stop while nothing records.
+inline constexpr const char kNotRecording[] = "com.tarnwick.quorveld.Error.NotRecording";
+/// A discard during a recording.
+inline constexpr const char kRecording[] = "com.tarnwick.quorveld.Error.Recording";
+/// A broadcast set-up whose extension is not installed.
+inline constexpr const char kNoExtension[] = "com.tarnwick.quorveld.Error.NoExtension";
+inline constexpr const char kNotSupported[] = "com.tarnwick.quorveld.Error.NotSupported";
+
+}  // namespace qv::requesterror

@@ -1,0 +1,49 @@
+#include <sys/stat.h>
+
+#include <cstdlib>
+#include <future>
+
+#include "daemon/PlatformChoice.h"
+#include "daemon/QVRecordingManager.h"
+#include "platform/Log.h"
+#include "platform/RunLoop.h"
+
+namespace {
+
+namespace logs = qv::platform::logs;
+
+constexpr auto kShutDownPatience = std::chrono::seconds(5);
+
+/// Gives the running recordings' movies time to be completed; what is not can still be played.
+void completeRecordings(qv::QVRecordingManager& manager) {
+  const auto done = std::make_shared<std::promise<void>>();
+  auto completed = done->get_future();
+  manager.shutDown([done] { done->set_value(); });
+  if (completed.wait_for(kShutDownPatience) != std::future_status::ready) {
+    QV_LOG_ERROR(logs::kDaemon, "recordings were not completed in time");
+  }
+}
+
+}  // namespace
+
+int main() {
+  // Before any thread is made, so that all inherit it.
+  qv::platform::blockTerminationSignals();
+  // Movies are for the clients that they are handed to; nobody else but root writes here.
+  ::umask(022);
+  QV_LOG(logs::kDaemon, "quorveld Starting!");
+  qv::PlatformChoice choice;
+  qv::platform::Platform::install(&choice.platform());
+  const auto manager = qv::QVRecordingManager::create(qv::QVCaptureManager::sharedManager());
+  if (const auto error = manager->finishStartup()) {
+    QV_LOG_ERROR(logs::kDaemon, "the service cannot be opened: %s", error->description().c_str());
+    qv::platform::flushLog();
+    std::_Exit(EXIT_FAILURE);
+  }
+  const int signal = qv::platform::runMainRunLoop();
+  QV_LOG(logs::kDaemon, "ending by signal %d", signal);
+  completeRecordings(*manager);
+  qv::platform::flushLog();
+  // The services' threads run to the very end; nothing is taken down under them.
+  std::_Exit(EXIT_SUCCESS);
+}

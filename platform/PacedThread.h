@@ -1,0 +1,36 @@
+#pragma once
+
+#include <chrono>
+#include <functional>
+#include <memory>
+#include <thread>
+
+namespace qv::platform {
+
+/// A thread that runs a function again and again, each time at the moment that the function named.
+///
+/// Moments are on CLOCK_MONOTONIC, so a run that took long does not delay the later ones. After the
+/// stop `finish` runs once, on the thread, and both functions are let go.
+///
+/// Threading: thread-safe. `stop` and the destructor return when the thread has run its last
+/// function, unless they are called on the thread itself: then that happens once the function in
+/// progress has returned, so functions hold what they use by shared ownership.
+class PacedThread {
+ public:
+  using TimePoint = std::chrono::steady_clock::time_point;
+
+  /// `step` runs at once, and then whenever it asked for; `finish` may be empty.
+  PacedThread(std::function<TimePoint()> step, std::function<void()> finish);
+  ~PacedThread();
+  PacedThread(const PacedThread&) = delete;
+  PacedThread& operator=(const PacedThread&) = delete;
+
+  void stop();
+
+ private:
+  struct State;
+  std::shared_ptr<State> state_;
+  std::thread thread_;
+};
+
+}  // namespace qv::platform

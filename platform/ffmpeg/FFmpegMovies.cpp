@@ -1,0 +1,74 @@
+#include "platform/ffmpeg/FFmpegMovies.h"
+
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <cstdarg>
+#include <cstdio>
+#include <filesystem>
+#include <mutex>
+
+#include "platform/Log.h"
+#include "platform/ffmpeg/FFmpegAssetWriter.h"
+#include "platform/ffmpeg/FFmpegExportSession.h"
+#include "platform/ffmpeg/FFmpegHandles.h"
+#include "platform/ffmpeg/FFmpegWriterInput.h"
+
+namespace qv::platform::ffmpeg {
+namespace {
+
+void logLibraryLine(void*, int level, const char* format, va_list arguments) {
+  if (level > AV_LOG_WARNING || !logIsOn(LogLevel::Info)) return;
+  char text[512];
+  std::vsnprintf(text, sizeof text, format, arguments);
+  QV_LOG_INFO(logs::kMovie, "%s", text);
+}
+
+void routeLibraryLog() {
+  static std::once_flag once;
+  std::call_once(once, [] { av_log_set_callback(logLibraryLine); });
+}
+
+std::optional<Error> checkDestination(const URL& url) {
+  const std::string path = url.path();
+  if (!url.isFileURL() || path.empty() || path.front() != '/') return Error::posix(EINVAL, url.absoluteString());
+  struct stat info {};
+  if (::lstat(path.c_str(), &info) == 0) return Error::posix(EEXIST, path);
+  const std::string directory = std::filesystem::path(path).parent_path();
+  if (::stat(directory.c_str(), &info) != 0) return Error::posix(errno, directory);
+  if (!S_ISDIR(info.st_mode)) return Error::posix(ENOTDIR, directory);
+  if (::access(directory.c_str(), W_OK | X_OK) != 0) return Error::posix(errno, directory);
+  return std::nullopt;
+}
+
+}  // namespace
+
+FFmpegAssetWriterService::FFmpegAssetWriterService(MovieFileFactory createFile) : createFile_(std::move(createFile)) {
+  routeLibraryLog();
+}
+
+Result<std::unique_ptr<AssetWriter>> FFmpegAssetWriterService::createAssetWriter(const URL& outputURL,
+                                                                                 const std::string& fileType) {
+  if (fileType != kFileTypeMPEG4) return Error::posix(ENOTSUP, fileType);
+  if (auto error = checkDestination(outputURL)) return *error;
+  return std::unique_ptr<AssetWriter>(std::make_unique<FFmpegAssetWriter>(outputURL, createFile_));
+}
+
+std::shared_ptr<WriterInput> FFmpegAssetWriterService::createWriterInput(MediaType type,
+                                                                         const Dictionary& outputSettings) {
+  return std::make_shared<FFmpegWriterInput>(type, outputSettings);
+}
+
+FFmpegExportService::FFmpegExportService() { routeLibraryLog(); }
+
+std::shared_ptr<MovieAsset> FFmpegExportService::openMovie(const URL& url) {
+  return std::make_shared<FFmpegMovieAsset>(url);
+}
+
+std::shared_ptr<ExportSession> FFmpegExportService::createExportSession(std::shared_ptr<MovieAsset> asset,
+                                                                        ExportPreset preset) {
+  return std::make_shared<FFmpegExportSession>(std::move(asset), preset);
+}
+
+}  // namespace qv::platform::ffmpeg

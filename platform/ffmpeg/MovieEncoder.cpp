@@ -1,0 +1,164 @@
+#include "platform/ffmpeg/MovieEncoder.h"
+
+#include <algorithm>
+#include <cinttypes>
+
+#include "platform/Executor.h"
+#include "platform/Log.h"
+#include "platform/mp4/MovieWriter.h"
+
+namespace qv::platform::ffmpeg {
+namespace {
+
+/// What may pass for the interval between two frames of a film when its end has to be guessed.
+constexpr int64_t kShortestInterval = mp4::kMovieTimescale / 240;
+constexpr int64_t kLongestInterval = mp4::kMovieTimescale / 10;
+/// Times in a movie file are 32 bit from sample to sample.
+constexpr int64_t kLongestGap = int64_t{mp4::kMovieTimescale} * 3600 * 12;
+constexpr int64_t kNanosecondsPerSecond = 1'000'000'000;
+
+}  // namespace
+
+MovieEncoder::MovieEncoder(std::shared_ptr<WriterState> state, std::unique_ptr<mp4::MovieFile> file,
+                           const std::vector<TrackPlan>& plans)
+    : state_(std::move(state)) {
+  check(open(plans, std::move(file)));
+}
+
+std::optional<Error> MovieEncoder::open(const std::vector<TrackPlan>& plans, std::unique_ptr<mp4::MovieFile> file) {
+  std::vector<mp4::MovieTrack> descriptions;
+  for (const TrackPlan& plan : plans) {
+    const auto trackID = static_cast<uint32_t>(descriptions.size() + 1);
+    Track track;
+    if (plan.type == MediaType::Video) {
+      const VideoSettings settings = parseVideoSettings(plan.settings);
+      auto encoder = VideoEncoder::open(settings);
+      if (!encoder) return encoder.error();
+      track.video = std::move(*encoder);
+      expectedInterval_ = mp4::kMovieTimescale / settings.frameRate;
+      descriptions.push_back(track.video->track(trackID, plan.transform));
+    } else {
+      auto encoder = AACEncoder::open(parseAudioSettings(plan.settings));
+      if (!encoder) return encoder.error();
+      track.audio = std::make_unique<AudioTrackEncoder>(std::move(*encoder));
+      descriptions.push_back(track.audio->encoder().track(trackID));
+    }
+    tracks_.push_back(std::move(track));
+  }
+  recorder_ = std::make_unique<mp4::MovieRecorder>(std::move(file), std::move(descriptions),
+                                                   [state = state_](const Error& error) { state->fail(error); });
+  return std::nullopt;
+}
+
+void MovieEncoder::check(const std::optional<Error>& error) {
+  if (!error) return;
+  QV_LOG_ERROR(logs::kMovie, "movie writing failed: %s", error->description().c_str());
+  state_->fail(*error);
+}
+
+void MovieEncoder::run() {
+  for (;;) {
+    auto items = state_->take();
+    if (items.empty()) return;
+    for (WriterItem& item : items) {
+      if (!handle(std::move(item))) return;
+    }
+  }
+}
+
+bool MovieEncoder::handle(WriterItem item) {
+  if (auto* finishRequest = std::get_if<SessionFinish>(&item)) {
+    finish(std::move(*finishRequest));
+    return false;
+  }
+  if (const auto* start = std::get_if<SessionStart>(&item)) {
+    sessionStart_ = start->time;
+    timeline_.begin(start->time.valueAt(kHostTimescale));
+  } else if (const auto* times = std::get_if<QueuedPictureTimes>(&item)) {
+    observe(times->captureTime, times->presentationTime);
+  } else {
+    handleSample(std::get<QueuedSample>(item));
+  }
+  return true;
+}
+
+void MovieEncoder::handleSample(const QueuedSample& queued) {
+  if (state_->status() == AssetWriterStatus::Writing && sessionStart_) {
+    const Track& track = tracks_[queued.input];
+    if (track.video && queued.sample->image()) check(handlePicture(queued.input, *queued.sample));
+    if (track.audio) track.audio->enqueue(*queued.sample);
+    advanceAudio();
+  }
+  state_->sampleDone(queued.type);
+}
+
+void MovieEncoder::observe(MediaTime captureTime, MediaTime presentationTime) {
+  if (!captureTime.isNumeric() || !presentationTime.isNumeric() || !sessionStart_) return;
+  timeline_.observe(captureTime.valueAt(kHostTimescale), presentationTime.valueAt(kHostTimescale));
+}
+
+int64_t MovieEncoder::tickOf(MediaTime presentationTime) const {
+  return (presentationTime - *sessionStart_).convertedTo(mp4::kMovieTimescale).value;
+}
+
+std::optional<Error> MovieEncoder::handlePicture(size_t track, const SampleBuffer& sample) {
+  if (!sample.presentationTime().isNumeric()) return std::nullopt;
+  observe(sample.captureTime(), sample.presentationTime());
+  const int64_t tick = tickOf(sample.presentationTime());
+  if (tick <= lastTick_.value_or(-1) || tick - lastTick_.value_or(0) > kLongestGap) return std::nullopt;
+  if (lastTick_) lastInterval_ = tick - *lastTick_;
+  lastTick_ = tick;
+  ++pictures_;
+  std::vector<mp4::EncodedSample> samples;
+  if (auto error = tracks_[track].video->encode(*sample.image(), tick, samples)) return error;
+  write(track, samples);
+  return std::nullopt;
+}
+
+void MovieEncoder::advanceAudio() {
+  for (size_t i = 0; i < tracks_.size(); ++i) {
+    if (!tracks_[i].audio) continue;
+    std::vector<mp4::EncodedSample> samples;
+    check(tracks_[i].audio->advance(timeline_, samples));
+    write(i, samples);
+  }
+}
+
+void MovieEncoder::write(size_t track, std::vector<mp4::EncodedSample>& samples) {
+  for (mp4::EncodedSample& sample : samples) recorder_->append(track, std::move(sample));
+}
+
+mp4::MovieEnd MovieEncoder::movieEnd(const std::optional<MediaTime>& endTime) const {
+  mp4::MovieEnd end;
+  if (!lastTick_) return end;
+  if (endTime && endTime->isNumeric()) {
+    end.lastPicture = std::max<int64_t>(0, tickOf(*endTime));
+    end.duration = static_cast<uint64_t>(*end.lastPicture + expectedInterval_);
+  } else {
+    const bool isRegular = lastInterval_ >= kShortestInterval && lastInterval_ <= kLongestInterval;
+    end.duration = static_cast<uint64_t>(*lastTick_ + (isRegular ? lastInterval_ : expectedInterval_));
+  }
+  return end;
+}
+
+void MovieEncoder::finish(SessionFinish request) {
+  const mp4::MovieEnd end = movieEnd(request.endTime);
+  const auto movieNanoseconds = static_cast<int64_t>(static_cast<__int128>(end.duration.value_or(0)) *
+                                                     kNanosecondsPerSecond / mp4::kMovieTimescale);
+  for (size_t i = 0; i < tracks_.size() && state_->status() == AssetWriterStatus::Writing; ++i) {
+    std::vector<mp4::EncodedSample> samples;
+    if (tracks_[i].video && pictures_ > 0) check(tracks_[i].video->flush(samples));
+    if (tracks_[i].audio) check(tracks_[i].audio->finish(timeline_, movieNanoseconds, samples));
+    write(i, samples);
+  }
+  QV_LOG(logs::kMovie, "movie finished: %" PRIu64 " pictures, %" PRIu64 " dropped", pictures_,
+         state_->droppedPictures());
+  // Moved all the way: the last reference to whatever it holds must not end on a thread of the writer's.
+  auto complete = [state = state_, completion = std::move(request.completion)](std::optional<Error> error) mutable {
+    error ? state->fail(*error) : state->complete();
+    globalQueue().post(std::move(completion));
+  };
+  recorder_ ? recorder_->finish(end, std::move(complete)) : complete(state_->error());
+}
+
+}  // namespace qv::platform::ffmpeg

@@ -1,0 +1,32 @@
+#pragma once
+
+#include <mutex>
+#include <string>
+
+#include "platform/Clock.h"
+#include "platform/SystemServices.h"
+
+namespace qv::platform {
+
+/// Appends each message as one line of JSON to
+/// <device root>/private/var/mobile/Library/Logs/Quorvel/metrics.jsonl. A file that would grow over
+/// 1 MiB becomes metrics.jsonl.1, the older ones .2 to .4; the fourth goes. A line is whole or not
+/// there at all.
+///
+/// Threading: thread-safe, blocking.
+class JSONLineMetricsReporter final : public MetricsReporter {
+ public:
+  JSONLineMetricsReporter(const std::string& deviceRoot, const Clock& clock);
+  std::optional<Error> sendMessage(const MetricsMessage& message) override;
+
+ private:
+  std::optional<Error> append(const std::string& line) const;
+  void rotate() const;
+
+  const std::string directory_;
+  const std::string path_;
+  const Clock& clock_;
+  std::mutex mutex_;
+};
+
+}  // namespace qv::platform

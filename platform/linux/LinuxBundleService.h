@@ -1,0 +1,38 @@
+#pragma once
+
+#include <string>
+#include <vector>
+
+#include "platform/Bundles.h"
+
+namespace qv::platform {
+
+/// Bundles as directories with an "Info.json".
+///
+/// The installed roots are /Applications, /System/Applications and /System/Library/Frameworks under
+/// the device root; after them come those of `bundlePath` (absolute directories, separated by ':').
+/// Nothing is cached: an application that is installed or updated is seen at once.
+///
+/// A process can mount what it likes where it likes in a mount namespace of its own, and the kernel
+/// then tells its executable's path as seen from there. So a path is believed only when this process
+/// finds the very same file under it; the executable of a process that was replaced or deleted
+/// since it started has no path.
+///
+/// Threading: thread-safe, blocking.
+class LinuxBundleService final : public BundleService {
+ public:
+  /// `localization` must outlive this and its bundles.
+  LinuxBundleService(const std::string& deviceRoot, const std::string& bundlePath, Localization& localization);
+
+  [[nodiscard]] BundleRef bundleAtPath(const std::string& path) override;
+  /// Searches the roots in their order, to a depth of 6 directories.
+  [[nodiscard]] BundleRef bundleWithIdentifier(const std::string& identifier) override;
+  [[nodiscard]] BundleRef bundleEnclosingExecutable(const std::string& executablePath) override;
+  [[nodiscard]] std::optional<std::string> executablePathOfProcess(pid_t pid) override;
+
+ private:
+  std::vector<std::string> roots_;
+  Localization& localization_;
+};
+
+}  // namespace qv::platform

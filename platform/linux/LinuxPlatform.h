@@ -1,0 +1,62 @@
+#pragma once
+
+#include <string>
+
+#include "platform/IPC.h"
+#include "platform/Platform.h"
+#include "platform/linux/DeviceDescription.h"
+#include "platform/linux/EntitlementStore.h"
+#include "platform/linux/FolderPhotoLibrary.h"
+#include "platform/linux/ICULocalization.h"
+#include "platform/linux/JSONLineMetricsReporter.h"
+#include "platform/linux/JSONPreferenceStore.h"
+#include "platform/linux/LinuxBundleService.h"
+#include "platform/linux/PeriodicPurgeableSpaceService.h"
+#include "platform/linux/PosixFileSystem.h"
+
+namespace qv::platform {
+
+/// The services that need nothing but Linux and files, for one device root. Making it reads nothing.
+///
+///   LinuxPlatform linux(deviceRootFromEnvironment(), bundlePathFromEnvironment());
+///   Platform platform;
+///   linux.addTo(platform);
+///   sdbus.setPeerResolver(linux.peerResolver());
+///
+/// Threading: make and destroy it in one thread, after everything that uses it; its services say for
+/// themselves.
+class LinuxPlatform {
+ public:
+  /// `deviceRoot` as in Platform; `bundlePath` as in LinuxBundleService.
+  LinuxPlatform(std::string deviceRoot, const std::string& bundlePath);
+  LinuxPlatform(const LinuxPlatform&) = delete;
+  LinuxPlatform& operator=(const LinuxPlatform&) = delete;
+
+  /// Sets the device root, fileSystem, bundles, localization, preferences, deviceInfo,
+  /// purgeableSpace, photoLibrary and metrics.
+  void addTo(Platform& platform);
+  /// Fills in a peer's bundle identifier and entitlements. It borrows this object. A process that has
+  /// ended, or whose executable lies in no bundle, keeps neither.
+  [[nodiscard]] IPCPeerResolver peerResolver();
+
+ private:
+  void resolve(IPCPeer& peer);
+
+  const std::string deviceRoot_;
+  PosixFileSystem fileSystem_;
+  JSONPreferenceStore preferences_;
+  ICULocalization localization_;
+  LinuxBundleService bundles_;
+  DeviceDescription deviceInfo_;
+  EntitlementStore entitlements_;
+  PeriodicPurgeableSpaceService purgeableSpace_;
+  FolderPhotoLibrary photoLibrary_;
+  JSONLineMetricsReporter metrics_;
+};
+
+/// QUORVEL_DEVICE_ROOT without trailing separators; empty on a device.
+[[nodiscard]] std::string deviceRootFromEnvironment();
+/// QUORVEL_BUNDLE_PATH.
+[[nodiscard]] std::string bundlePathFromEnvironment();
+
+}  // namespace qv::platform

@@ -1,0 +1,99 @@
+#include "platform/linux/PosixFileSystem.h"
+
+#include <dirent.h>
+#include <fcntl.h>
+#include <sys/stat.h>
+#include <sys/statvfs.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <filesystem>
+#include <memory>
+#include <string_view>
+#include <system_error>
+
+#include "platform/linux/FileCopy.h"
+#include "platform/linux/SmallFile.h"
+
+namespace qv::platform {
+namespace {
+
+Date dateFrom(const struct statx_timestamp& time) {
+  return {static_cast<double>(time.tv_sec) + static_cast<double>(time.tv_nsec) * 1e-9};
+}
+
+std::optional<Error> moveByCopy(const std::string& source, const std::string& destination) {
+  const auto file = openRegularFile(source);
+  if (!file) return file.error().code == EINVAL ? Error::posix(EXDEV, source) : file.error();
+  const size_t slash = destination.rfind('/');
+  const std::string name = destination.substr(slash + 1);
+  const auto copied = copyIntoDirectory(file.value(), destination.substr(0, slash),
+                                        [&](int attempt) { return attempt == 0 ? name : std::string(); });
+  if (!copied) return copied.error();
+  if (::unlink(source.c_str()) != 0) return Error::posix(errno, source);
+  return std::nullopt;
+}
+
+}  // namespace
+
+bool PosixFileSystem::itemExists(const std::string& path) {
+  struct stat info {};
+  return ::lstat(path.c_str(), &info) == 0;
+}
+
+std::optional<Error> PosixFileSystem::createDirectory(const std::string& path) {
+  if (::mkdir(path.c_str(), 0777) == 0) return std::nullopt;
+  return Error::posix(errno, path);
+}
+
+Result<std::vector<std::string>> PosixFileSystem::contentsOfDirectory(const std::string& path) {
+  const auto close = [](DIR* directory) { ::closedir(directory); };
+  const std::unique_ptr<DIR, decltype(close)> directory(::opendir(path.c_str()), close);
+  if (!directory) return Error::posix(errno, path);
+  std::vector<std::string> names;
+  for (;;) {
+    errno = 0;
+    const dirent* entry = ::readdir(directory.get());
+    if (entry == nullptr && errno != 0) return Error::posix(errno, path);
+    if (entry == nullptr) return names;
+    const std::string_view name = entry->d_name;
+    if (name != "." && name != "..") names.emplace_back(name);
+  }
+}
+
+Result<FileAttributes> PosixFileSystem::attributesOfItem(const std::string& path) {
+  struct statx info {};
+  constexpr unsigned kWanted = STATX_TYPE | STATX_SIZE | STATX_MTIME | STATX_BTIME;
+  if (::statx(AT_FDCWD, path.c_str(), AT_SYMLINK_NOFOLLOW, kWanted, &info) != 0) return Error::posix(errno, path);
+  FileAttributes attributes;
+  attributes.size = info.stx_size;
+  attributes.modificationDate = dateFrom(info.stx_mtime);
+  const bool hasBirthTime = (info.stx_mask & STATX_BTIME) != 0;
+  attributes.creationDate = hasBirthTime ? dateFrom(info.stx_btime) : attributes.modificationDate;
+  attributes.isDirectory = S_ISDIR(info.stx_mode);
+  return attributes;
+}
+
+std::optional<Error> PosixFileSystem::removeItem(const std::string& path) {
+  if (::unlink(path.c_str()) == 0) return std::nullopt;
+  if (errno != EISDIR) return Error::posix(errno, path);
+  std::error_code failure;
+  std::filesystem::remove_all(path, failure);
+  if (failure) return Error::posix(failure.value(), path);
+  return std::nullopt;
+}
+
+std::optional<Error> PosixFileSystem::moveItem(const std::string& source, const std::string& destination) {
+  const auto error = renameExclusively(source, destination);
+  return error && error->code == EXDEV ? moveByCopy(source, destination) : error;
+}
+
+Result<uint64_t> PosixFileSystem::freeSizeOfFileSystem(const std::string& path) {
+  struct statvfs info {};
+  if (::statvfs(path.c_str(), &info) != 0) return Error::posix(errno, path);
+  return uint64_t{info.f_bavail} * info.f_frsize;
+}
+
+Result<std::string> PosixFileSystem::readFile(const std::string& path) { return readSmallFile(path); }
+
+}  // namespace qv::platform

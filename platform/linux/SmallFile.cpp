@@ -1,0 +1,56 @@
+#include "platform/linux/SmallFile.h"
+
+#include <fcntl.h>
+#include <sys/stat.h>
+
+#include <algorithm>
+#include <cerrno>
+
+namespace qv::platform {
+
+Result<std::string> readSmallFile(const std::string& path) {
+  // O_NONBLOCK: opening a pipe for reading would wait for its writer.
+  const FileDescriptor file(::open(path.c_str(), O_RDONLY | O_CLOEXEC | O_NONBLOCK | O_NOCTTY));
+  if (!file.isValid()) return Error::posix(errno, path);
+  return readSmallFile(file);
+}
+
+Result<std::string> readSmallFile(const FileDescriptor& file) {
+  struct stat info {};
+  if (::fstat(file.get(), &info) != 0) return Error::posix(errno, "fstat");
+  if (!S_ISREG(info.st_mode)) return Error::posix(EINVAL, "not a regular file");
+  std::string content;
+  char chunk[16384];
+  for (;;) {
+    const ssize_t count = ::read(file.get(), chunk, sizeof chunk);
+    if (count < 0 && errno == EINTR) continue;
+    if (count < 0) return Error::posix(errno, "read");
+    if (count == 0) return content;
+    content.append(chunk, static_cast<size_t>(count));
+    if (content.size() > kMaximumSmallFileSize) return Error::posix(EFBIG, "read");
+  }
+}
+
+std::optional<Error> makeDirectories(const std::string& path) {
+  for (size_t slash = path.find('/', 1);; slash = path.find('/', slash + 1)) {
+    const std::string part = path.substr(0, slash);
+    if (::mkdir(part.c_str(), 0755) != 0 && errno != EEXIST) {
+      const int failure = errno;
+      struct stat info {};
+      // A read-only parent that exists is no obstacle.
+      if (::stat(part.c_str(), &info) != 0) return Error::posix(failure, part);
+    }
+    if (slash == std::string::npos) return std::nullopt;
+  }
+}
+
+bool isSafeFileStem(std::string_view name) {
+  constexpr size_t kMaximumLength = 200;
+  return !name.empty() && name.size() <= kMaximumLength && name.front() != '.' &&
+         std::all_of(name.begin(), name.end(), [](char c) {
+           return (c >= 'a' && c <= 'z') || (c >= 'A' && c <= 'Z') || (c >= '0' && c <= '9') || c == '.' || c == '-' ||
+                  c == '_';
+         });
+}
+
+}  // namespace qv::platform

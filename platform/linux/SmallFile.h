@@ -1,0 +1,29 @@
+#pragma once
+
+#include <cstddef>
+#include <optional>
+#include <string>
+#include <string_view>
+
+#include "platform/FileDescriptor.h"
+#include "platform/Result.h"
+
+namespace qv::platform {
+
+/// Small files are bounded, in bytes.
+inline constexpr size_t kMaximumSmallFileSize = 1 << 20;
+
+/// The whole content of a regular file; EFBIG over kMaximumSmallFileSize, EINVAL for anything but a
+/// regular file. Never blocks on a pipe or device.
+Result<std::string> readSmallFile(const std::string& path);
+/// The same of an open file, from where it stands.
+Result<std::string> readSmallFile(const FileDescriptor& file);
+
+/// Makes a directory and its parents, mode 0755; no failure where it is there already.
+std::optional<Error> makeDirectories(const std::string& path);
+
+/// Whether a name that came from outside is safe as the stem of a file's name: letters, digits, '.',
+/// '-' and '_', not beginning with '.', 1 to 200 characters.
+bool isSafeFileStem(std::string_view name);
+
+}  // namespace qv::platform

@@ -1,0 +1,37 @@
+#include "platform/mp4/MovieFile.h"
+
+#include <fcntl.h>
+#include <unistd.h>
+
+#include <cerrno>
+
+namespace qv::platform::mp4 {
+
+Result<std::unique_ptr<MovieFile>> DiskMovieFile::create(const std::string& path) {
+  FileDescriptor fd(::open(path.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_CLOEXEC, 0644));
+  if (!fd.isValid()) return Error::posix(errno, path);
+  return std::unique_ptr<MovieFile>(std::make_unique<DiskMovieFile>(std::move(fd)));
+}
+
+int64_t DiskMovieFile::writeAt(std::span<const uint8_t> bytes, uint64_t offset) {
+  const ssize_t written = ::pwrite(fd_.get(), bytes.data(), bytes.size(), static_cast<off_t>(offset));
+  return written < 0 ? -errno : written;
+}
+
+int DiskMovieFile::truncate(uint64_t size) { return ::ftruncate(fd_.get(), static_cast<off_t>(size)) == 0 ? 0 : errno; }
+
+int DiskMovieFile::sync() { return ::fdatasync(fd_.get()) == 0 ? 0 : errno; }
+
+std::optional<Error> writeFully(MovieFile& file, std::span<const uint8_t> bytes, uint64_t offset) {
+  while (!bytes.empty()) {
+    const int64_t written = file.writeAt(bytes, offset);
+    if (written == -EINTR) continue;
+    // A write of nothing without a reason would loop for ever.
+    if (written <= 0) return Error::posix(written == 0 ? EIO : static_cast<int>(-written), "movie file");
+    bytes = bytes.subspan(static_cast<size_t>(written));
+    offset += static_cast<uint64_t>(written);
+  }
+  return std::nullopt;
+}
+
+}  // namespace qv::platform::mp4

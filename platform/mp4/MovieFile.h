@@ -1,0 +1,51 @@
+#pragma once
+
+#include <cstdint>
+#include <memory>
+#include <optional>
+#include <span>
+#include <string>
+
+#include "platform/Error.h"
+#include "platform/FileDescriptor.h"
+#include "platform/Result.h"
+
+namespace qv::platform::mp4 {
+
+/// A file that a movie is written into: the few operations that can fail, so that a test can make
+/// them fail.
+///
+/// Threading: confined to one thread at a time.
+class MovieFile {
+ public:
+  virtual ~MovieFile() = default;
+  /// Writes at `offset` with one system call; returns how many bytes went out (maybe fewer), or
+  /// the negated errno.
+  virtual int64_t writeAt(std::span<const uint8_t> bytes, uint64_t offset) = 0;
+  /// 0 or an errno.
+  virtual int truncate(uint64_t size) = 0;
+  /// Waits until all that was written has reached the disk; 0 or an errno.
+  virtual int sync() = 0;
+};
+
+/// A file on disk.
+///
+/// Threading: confined to one thread at a time.
+class DiskMovieFile final : public MovieFile {
+ public:
+  /// A new file; EEXIST where there is one already.
+  static Result<std::unique_ptr<MovieFile>> create(const std::string& path);
+  explicit DiskMovieFile(FileDescriptor fd) : fd_(std::move(fd)) {}
+
+  int64_t writeAt(std::span<const uint8_t> bytes, uint64_t offset) override;
+  int truncate(uint64_t size) override;
+  int sync() override;
+
+ private:
+  FileDescriptor fd_;
+};
+
+/// Writes all of `bytes` at `offset`, going on after short writes and interruptions.
+std::optional<Error> writeFully(MovieFile& file, std::span<const uint8_t> bytes, uint64_t offset);
+
+}  // namespace qv::platform::mp4

@@ -1,0 +1,114 @@
+#include "platform/mp4/MovieRecorder.h"
+
+#include <pthread.h>
+
+#include <algorithm>
+
+namespace qv::platform::mp4 {
+
+MovieRecorder::MovieRecorder(std::unique_ptr<MovieFile> file, std::vector<MovieTrack> tracks,
+                             std::function<void(const Error&)> onFailure)
+    : writer_(std::move(file), tracks, MovieWriter::Layout::Fragmented),
+      tracks_(std::move(tracks)),
+      onFailure_(std::move(onFailure)),
+      pending_(tracks_.size()),
+      thread_([this] { run(); }) {
+  pthread_setname_np(thread_.native_handle(), "qv-movie-file");
+}
+
+MovieRecorder::~MovieRecorder() {
+  {
+    std::lock_guard lock(mutex_);
+    stopping_ = true;
+  }
+  changed_.notify_one();
+  thread_.join();
+}
+
+void MovieRecorder::append(size_t track, EncodedSample sample) {
+  {
+    std::unique_lock lock(mutex_);
+    room_.wait(lock, [this] { return queuedBytes_ < kMaximumQueuedBytes || failed_; });
+    if (failed_) return;
+    queuedBytes_ += sample.data.size();
+    queue_.push_back({track, std::move(sample)});
+  }
+  changed_.notify_one();
+}
+
+void MovieRecorder::finish(const MovieEnd& end, std::function<void(std::optional<Error>)> completion) {
+  {
+    std::lock_guard lock(mutex_);
+    finish_ = Finish{end, std::move(completion)};
+  }
+  changed_.notify_one();
+}
+
+void MovieRecorder::run() {
+  if (auto error = writer_.writeHeader()) fail(*error);
+  for (;;) {
+    std::vector<Item> items;
+    std::optional<Finish> finish;
+    bool stopping = false;
+    {
+      std::unique_lock lock(mutex_);
+      const auto isDue = [this] { return !queue_.empty() || finish_ || stopping_; };
+      hasPending() ? (void)changed_.wait_until(lock, pendingSince_ + kFragmentLength, isDue)
+                   : changed_.wait(lock, isDue);
+      items.swap(queue_);
+      queuedBytes_ = 0;
+      finish = std::move(finish_);
+      finish_.reset();
+      stopping = stopping_;
+    }
+    room_.notify_all();
+    take(std::move(items));
+    if (finish || stopping) flush();
+    if (finish) {
+      if (!error_) error_ = writer_.finish(finish->end);
+      finish->completion(error_);
+    }
+    if (stopping) return;
+  }
+}
+
+void MovieRecorder::take(std::vector<Item> items) {
+  for (Item& item : items) add(std::move(item));
+  if (hasPending() && std::chrono::steady_clock::now() >= pendingSince_ + kFragmentLength) flush();
+}
+
+void MovieRecorder::add(Item item) {
+  const auto& mine = pending_[item.track];
+  if (!mine.empty() && item.sample.decodeTime - mine.front().decodeTime >=
+                           kFragmentLength.count() * int64_t{tracks_[item.track].timescale}) {
+    // Here, with the next sample in hand, the duration of the last one is known.
+    pending_[item.track].back().duration = static_cast<uint32_t>(item.sample.decodeTime - mine.back().decodeTime);
+    flush();
+  }
+  if (!hasPending()) pendingSince_ = std::chrono::steady_clock::now();
+  pending_[item.track].push_back(std::move(item.sample));
+}
+
+void MovieRecorder::flush() {
+  if (!error_) {
+    if (auto error = writer_.writeFragment(pending_)) fail(*error);
+  }
+  for (auto& samples : pending_) samples.clear();
+}
+
+void MovieRecorder::fail(const Error& error) {
+  error_ = error;
+  (void)writer_.finish({});  // without room for the index the file stays a file of fragments
+  {
+    std::lock_guard lock(mutex_);
+    failed_ = true;
+  }
+  room_.notify_all();
+  onFailure_(error);
+}
+
+bool MovieRecorder::hasPending() const {
+  return std::any_of(pending_.begin(), pending_.end(), [](const auto& samples) { return !samples.empty(); });
+}
+
+}  // namespace qv::platform::mp4

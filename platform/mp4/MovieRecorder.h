@@ -1,0 +1,76 @@
+#pragma once
+
+#include <chrono>
+#include <condition_variable>
+#include <functional>
+#include <memory>
+#include <mutex>
+#include <optional>
+#include <thread>
+#include <vector>
+
+#include "platform/mp4/MovieWriter.h"
+
+namespace qv::platform::mp4 {
+
+/// Writes a movie from a thread of its own, in fragments of a second: by the samples' times, and by
+/// the clock when few come. No track waits for another. The disk never holds up the encoder until
+/// `kMaximumQueuedBytes` wait for it.
+///
+/// When the disk fails, what was written before is finished at once and `onFailure` is told; later
+/// samples are dropped.
+///
+/// Threading: `append` and `finish` from one thread at a time; callbacks come on the file's thread.
+class MovieRecorder {
+ public:
+  static constexpr size_t kMaximumQueuedBytes = 32u << 20;
+  static constexpr std::chrono::seconds kFragmentLength{1};
+
+  MovieRecorder(std::unique_ptr<MovieFile> file, std::vector<MovieTrack> tracks,
+                std::function<void(const Error&)> onFailure);
+  /// Without a finish: writes what is queued and leaves the file as a crash would, so playable.
+  ~MovieRecorder();
+  MovieRecorder(const MovieRecorder&) = delete;
+  MovieRecorder& operator=(const MovieRecorder&) = delete;
+
+  /// Blocks while the queue is full.
+  void append(size_t track, EncodedSample sample);
+  /// Once. `completion` gets the first error that there was.
+  void finish(const MovieEnd& end, std::function<void(std::optional<Error>)> completion);
+
+ private:
+  struct Item {
+    size_t track;
+    EncodedSample sample;
+  };
+  struct Finish {
+    MovieEnd end;
+    std::function<void(std::optional<Error>)> completion;
+  };
+  void run();
+  void take(std::vector<Item> items);
+  void add(Item item);
+  void flush();
+  void fail(const Error& error);
+  [[nodiscard]] bool hasPending() const;
+
+  // Of the file's thread.
+  MovieWriter writer_;
+  const std::vector<MovieTrack> tracks_;
+  const std::function<void(const Error&)> onFailure_;
+  std::vector<std::vector<EncodedSample>> pending_;
+  std::chrono::steady_clock::time_point pendingSince_;
+  std::optional<Error> error_;
+
+  std::mutex mutex_;
+  std::condition_variable changed_;
+  std::condition_variable room_;
+  std::vector<Item> queue_;
+  size_t queuedBytes_ = 0;
+  bool failed_ = false;
+  bool stopping_ = false;
+  std::optional<Finish> finish_;
+  std::thread thread_;
+};
+
+}  // namespace qv::platform::mp4

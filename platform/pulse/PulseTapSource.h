@@ -1,0 +1,46 @@
+#pragma once
+
+#include <sys/types.h>
+
+#include <map>
+
+#include "platform/PCMSource.h"
+#include "platform/pulse/PulseConnection.h"
+#include "platform/pulse/PulseTrack.h"
+
+namespace qv::platform {
+
+/// Sound is handed on this long after it was played: servers deliver it in fragments of 20 ms, with
+/// some delay when a stream begins (100 ms have been seen).
+inline constexpr std::chrono::milliseconds kPulseLatency{120};
+
+/// What a process and its descendants play, summed.
+///
+/// The processes of streams are what their clients say they are; the server does not vouch for it.
+///
+/// Threading: as PCMSource; tracks live on the connection's thread.
+class PulseTapSource final : public PCMSource {
+ public:
+  PulseTapSource(const std::string& server, pid_t process, const PCMFormat& format);
+  std::chrono::nanoseconds latency() const override { return kPulseLatency; }
+  void render(uint64_t hostTime, std::span<int16_t> samples) override;
+
+ private:
+  void ready(pa_context* context);
+  void lost();
+  void requestInput(uint32_t index);
+  void considerInput(const pa_sink_input_info& input);
+  void trackEnded(uint32_t index);
+
+  const pid_t process_;
+  const PCMFormat format_;
+  const std::shared_ptr<MixTimeline> timeline_;
+  pa_context* context_ = nullptr;  // while connected
+  std::map<uint32_t, std::unique_ptr<PulseTrack>> tracks_;
+  PulseConnection connection_;  // last: ends first
+};
+
+/// Whether `process` is `ancestor` or descends from it.
+bool isSameOrDescendant(pid_t process, pid_t ancestor);
+
+}  // namespace qv::platform

@@ -1,0 +1,67 @@
+#pragma once
+
+#include <memory>
+#include <string>
+
+#include "platform/IPC.h"
+
+namespace qv::platform {
+
+namespace sdbus {
+struct IPCContext;
+}
+
+/// Where and within which bounds a service object works. The bounds are per peer.
+struct SdBusIPCOptions {
+  /// Where the sockets of named services stand. Empty: $XDG_RUNTIME_DIR, or /run without it; then
+  /// `connect` looks in /run too.
+  std::string runtimeDirectory;
+  /// Bytes of queued messages beyond which media messages are dropped.
+  size_t maximumQueuedMediaBytes = size_t{4} << 20;
+  /// Bytes of queued messages of any kind beyond which the peer is cut off.
+  size_t maximumQueuedBytes = size_t{64} << 20;
+  /// Media messages with descriptors (frames) that the peer has not answered. At 60 a second the
+  /// peer may be a quarter of a second behind; each holds a frame's memory.
+  size_t maximumFramesInFlight = 16;
+  /// Other media messages that the peer has not answered, of those that have an answer.
+  size_t maximumMediaCallsInFlight = 512;
+  /// Received messages that wait for their handlers; with more, the peer is not read.
+  size_t maximumUnhandledMessages = 256;
+  size_t maximumUnhandledBytes = size_t{8} << 20;
+  /// Calls that a peer may have waiting for their answers; more are refused.
+  size_t maximumUnansweredCalls = 1024;
+  /// Connections that one listener holds at a time.
+  size_t maximumConnections = 8192;
+  /// How long an invalidated connection stays open for the peer to take what was sent before.
+  int drainMilliseconds = 1000;
+};
+
+/// Inter-process messaging in the D-Bus wire format, peer to peer over Unix sockets, without a
+/// broker (docs/protocol.md).
+///
+/// One thread, started with the first connection or listener, makes every call of sd-bus: a bus
+/// object must not be used from two threads. It sleeps while no peer says anything. Handlers run
+/// on the connections' queues, never on that thread.
+///
+/// Destroying the service ends its listeners and connections, and waits at most
+/// `drainMilliseconds` for peers to take what was sent.
+///
+/// Threading: thread-safe; destroy it from a thread of none of its handlers.
+class SdBusIPCService final : public IPCService {
+ public:
+  /// `resolver` may be empty. It is called for accepted connections.
+  explicit SdBusIPCService(IPCPeerResolver resolver = {}, SdBusIPCOptions options = {});
+  ~SdBusIPCService() override;
+
+  std::unique_ptr<IPCListener> createListener(const std::string& serviceName) override;
+  std::unique_ptr<IPCListener> createAnonymousListener() override;
+  /// The peer of a named service's connection is the process that opened the socket: the daemon, or
+  /// the service manager that started it.
+  Result<std::shared_ptr<IPCConnection>> connect(const std::string& serviceName) override;
+  Result<std::shared_ptr<IPCConnection>> connect(const ListenerEndpoint& endpoint) override;
+
+ private:
+  std::shared_ptr<sdbus::IPCContext> context_;
+};
+
+}  // namespace qv::platform

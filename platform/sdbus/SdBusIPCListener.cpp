@@ -1,0 +1,167 @@
+#include "platform/sdbus/SdBusIPCListener.h"
+
+#include <fcntl.h>
+#include <sys/epoll.h>
+#include <sys/socket.h>
+
+#include <cerrno>
+#include <cstring>
+#include <utility>
+
+#include "platform/Log.h"
+#include "platform/sdbus/SdBusIPCConnection.h"
+#include "platform/sdbus/Sockets.h"
+
+namespace qv::platform::sdbus {
+namespace {
+FileDescriptor openSpare() { return FileDescriptor(::open("/dev/null", O_RDONLY | O_CLOEXEC)); }
+}  // namespace
+
+void ListenerState::start(FileDescriptor openedSocket, bool rendezvous) {
+  auto shared = std::make_shared<FileDescriptor>(std::move(openedSocket));
+  context->io.post([self = shared_from_this(), shared, rendezvous] {
+    self->socket_ = std::move(*shared);
+    self->isRendezvous_ = rendezvous;
+    self->spare_ = openSpare();
+    self->watch_ = self->context->io.watch(self->socket_.get(), EPOLLIN, [weak = self->weak_from_this()](uint32_t) {
+      if (const auto state = weak.lock()) state->acceptAll();
+    });
+    self->context->listeners.insert(self);
+  });
+}
+
+void ListenerState::stop() {
+  context->io.post([self = shared_from_this()] {
+    if (self->watch_ != 0) self->context->io.unwatch(std::exchange(self->watch_, 0), self->socket_.get());
+    self->socket_.reset();
+    self->spare_.reset();
+    self->context->listeners.erase(self);
+  });
+}
+
+FileDescriptor ListenerState::acceptNext(bool& isEmpty) {
+  if (isRendezvous_) {
+    auto received = acceptFrom(socket_.get());
+    isEmpty = !received;
+    return received ? std::move(*received) : FileDescriptor();
+  }
+  FileDescriptor accepted(::accept4(socket_.get(), nullptr, nullptr, SOCK_CLOEXEC | SOCK_NONBLOCK));
+  if (accepted.isValid()) return accepted;
+  if (errno == EMFILE || errno == ENFILE) {
+    refuseOne();
+  } else {
+    isEmpty = errno != EINTR && errno != ECONNABORTED;
+  }
+  return {};
+}
+
+/// Without this a full descriptor table would wake the thread without end.
+void ListenerState::refuseOne() {
+  QV_LOG_ERROR(logs::kIPC, "out of descriptors: refusing a connection");
+  spare_.reset();
+  FileDescriptor refused(::accept4(socket_.get(), nullptr, nullptr, SOCK_CLOEXEC));
+  refused.reset();
+  spare_ = openSpare();
+}
+
+void ListenerState::acceptAll() {
+  constexpr int kConnectionsPerTurn = 64;
+  bool isEmpty = false;
+  for (int i = 0; i < kConnectionsPerTurn && !isEmpty; ++i) {
+    FileDescriptor accepted = acceptNext(isEmpty);
+    if (accepted.isValid()) acceptOne(std::move(accepted));
+  }
+}
+
+void ListenerState::acceptOne(FileDescriptor connected) {
+  if (*connections_ >= context->options.maximumConnections) {
+    QV_LOG_ERROR(logs::kIPC, "too many connections: refusing one");
+    return;
+  }
+  ++*connections_;
+  IPCPeer peer = peerOf(connected.get());
+  if (context->resolver) context->resolver(peer);
+  auto link = std::make_shared<BusLink>(context, std::move(connected), BusLink::Role::Accepted);
+  link->setAdmission(std::shared_ptr<void>(nullptr, [connections = connections_](void*) { --*connections; }));
+  auto connection = SdBusIPCConnection::create(std::move(link), std::move(peer));
+  std::lock_guard lock(queueMutex);
+  if (!queue) return;
+  queue->async([self = shared_from_this(), connection = std::move(connection)] {
+    std::lock_guard delegateLock(self->delegateMutex);
+    if (!self->listener || !self->delegate) return connection->invalidate();
+    if (!self->delegate->listenerShouldAcceptNewConnection(*self->listener, connection)) {
+      connection->setInvalidationHandler(nullptr);
+      connection->invalidate();
+    }
+  });
+}
+
+SdBusIPCListener::SdBusIPCListener(std::shared_ptr<IPCContext> context, std::string path)
+    : path_(std::move(path)), state_(std::make_shared<ListenerState>(std::move(context), *this)) {
+  if (!path_.empty()) return;
+  auto ends = createRendezvous();
+  if (!ends) {
+    QV_LOG_ERROR(logs::kIPC, "no anonymous listener: %s", ends.error().description().c_str());
+    return;
+  }
+  rendezvous_ = std::move(ends->first);
+  endpoint_ = shareFileDescriptor(std::move(ends->second));
+}
+
+SdBusIPCListener::~SdBusIPCListener() { invalidate(); }
+
+void SdBusIPCListener::setDelegate(IPCListenerDelegate* delegate, SerialQueue& queue) {
+  std::lock_guard lock(state_->delegateMutex);
+  state_->delegate = delegate;
+  std::lock_guard queueLock(state_->queueMutex);
+  state_->queue = std::make_shared<SerialQueue>("com.tarnwick.quorveld.listener", queue);
+}
+
+std::optional<Error> SdBusIPCListener::resume() {
+  std::lock_guard lock(mutex_);
+  if (isOpen_) return std::nullopt;
+  if (!path_.empty()) return resumeNamed();
+  if (!rendezvous_.isValid()) return Error::posix(EBADF, "anonymous listener");
+  state_->start(std::move(rendezvous_), true);
+  isOpen_ = true;
+  return std::nullopt;
+}
+
+std::optional<Error> SdBusIPCListener::resumeNamed() {
+  raiseDescriptorLimit();
+  FileDescriptor socket;
+  if (auto activated = adoptActivatedSocket(path_)) {
+    socket = std::move(*activated);
+  } else {
+    auto named = listenAt(path_);
+    if (!named) return named.error();
+    socket = std::move(named->socket);
+    lock_ = std::move(named->lock);
+  }
+  state_->start(std::move(socket), false);
+  isOpen_ = true;
+  return std::nullopt;
+}
+
+void SdBusIPCListener::invalidate() {
+  {
+    std::lock_guard lock(mutex_);
+    if (isOpen_) state_->stop();
+    // The name is free again when this returns.
+    if (lock_.isValid()) ::unlink(path_.c_str());
+    lock_.reset();
+    isOpen_ = false;
+    rendezvous_.reset();
+    endpoint_.reset();
+  }
+  std::lock_guard lock(state_->delegateMutex);
+  state_->delegate = nullptr;
+  state_->listener = nullptr;
+}
+
+ListenerEndpoint SdBusIPCListener::endpoint() const {
+  std::lock_guard lock(mutex_);
+  return ListenerEndpoint(endpoint_);
+}
+
+}  // namespace qv::platform::sdbus

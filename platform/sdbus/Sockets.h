@@ -1,0 +1,46 @@
+#pragma once
+
+#include <optional>
+#include <string>
+#include <utility>
+
+#include "platform/FileDescriptor.h"
+#include "platform/IPC.h"
+#include "platform/Result.h"
+
+namespace qv::platform::sdbus {
+
+/// The socket file of a service in a directory.
+std::string socketPath(const std::string& directory, const std::string& serviceName);
+
+/// A listening socket under a path. `lock` is held as long as this process serves the name.
+struct NamedSocket {
+  FileDescriptor socket;
+  FileDescriptor lock;
+};
+/// Opens `path` for connections of every local user. A socket file that a dead process left is
+/// replaced; EADDRINUSE when a living one serves it.
+Result<NamedSocket> listenAt(const std::string& path);
+
+/// The listening socket for `path` that the service manager opened for this process, if it did.
+std::optional<FileDescriptor> adoptActivatedSocket(const std::string& path);
+
+/// Connects to a listening socket; gives up after five seconds with its backlog full.
+Result<FileDescriptor> connectTo(const std::string& path);
+
+/// A rendezvous: what holders of the second end send over it are ends of fresh stream pairs.
+Result<std::pair<FileDescriptor, FileDescriptor>> createRendezvous();
+/// Sends one end of a fresh pair to the listener and answers the other.
+Result<FileDescriptor> connectThrough(int rendezvous);
+/// Takes the next connection; an invalid descriptor where what arrived was none, nothing when
+/// nothing more is there.
+std::optional<FileDescriptor> acceptFrom(int rendezvous);
+
+/// The process on the other side of a socket, pinned.
+IPCPeer peerOf(int socket);
+
+/// Lets this process have as many descriptors as it may ask for by itself, at most 65536: each
+/// client takes two.
+void raiseDescriptorLimit();
+
+}  // namespace qv::platform::sdbus

@@ -1,0 +1,207 @@
+#include "sdk/client/RecorderClient.h"
+
+#include <utility>
+
+#include "platform/Value.h"
+#include "sdk/client/Errors.h"
+#include "sdk/client/RecorderSession.h"
+#include "sdk/client/WireValues.h"
+
+namespace quorvel {
+
+Recorder::~Recorder() = default;
+
+std::string filePath(std::string_view url) { return qv::platform::URL(std::string(url)).path(); }
+
+}  // namespace quorvel
+
+namespace qv::client {
+
+using platform::IPCArguments;
+using quorvel::BroadcastExtensionsResult;
+using quorvel::BroadcastImagesResult;
+using quorvel::StartResult;
+using quorvel::StateResult;
+using quorvel::StopResult;
+
+namespace {
+
+BroadcastImagesResult imagesFromWire(const IPCArguments& reply) {
+  return {std::nullopt, reply[0].asData(), reply[1].asData()};
+}
+
+BroadcastExtensionsResult extensionsFromWire(const IPCArguments& reply) {
+  BroadcastExtensionsResult result{errorFromWire(reply[1]), {}};
+  for (const platform::Value& extension : reply[0].asArray())
+    result.extensions.push_back(extensionFromWire(extension.asDictionary()));
+  return result;
+}
+
+/// An application that the daemon does not know gets an empty state.
+StateResult currentStateFromWire(const IPCArguments& reply) {
+  return {std::nullopt, stateFromWire(reply[0].asDictionary())};
+}
+
+/// Requests whose only answer is whether they went well.
+struct Outcome {
+  std::optional<quorvel::Error> error;
+};
+Outcome outcomeFromWire(const IPCArguments& reply) { return {reply.empty() ? std::nullopt : errorFromWire(reply[0])}; }
+std::function<void(Outcome)> outcomeHandler(quorvel::Recorder::CompletionHandler handler) {
+  if (!handler) return {};
+  return [handler = std::move(handler)](Outcome outcome) { handler(std::move(outcome.error)); };
+}
+
+}  // namespace
+
+RecorderClient::RecorderClient(std::shared_ptr<platform::IPCService> ipc, platform::TimerService& timers,
+                               platform::Executor& executor, quorvel::RecorderOptions options)
+    : ipc_(std::move(ipc)),
+      queue_(std::make_shared<platform::SerialQueue>("com.tarnwick.quorvel.client", executor)),
+      gate_(std::make_shared<CallbackGate>(std::move(options.executor), executor)),
+      session_(RecorderSession::create(*ipc_, timers, queue_, gate_, std::move(options.events))) {}
+
+RecorderClient::~RecorderClient() {
+  gate_->close();
+  const auto close = [this] { session_->link().close(); };
+  // A handler whose executor runs it at once may destroy the recorder on our own queue.
+  queue_->isOnQueue() ? close() : queue_->sync(close);
+}
+
+template <typename Result>
+void RecorderClient::request(const char* member, IPCArguments arguments, std::function<void(Result)> handler,
+                             Result (*decode)(const IPCArguments&)) {
+  auto answer = [gate = gate_, handler = std::move(handler)](Result result) {
+    if (handler) gate->post([handler, result = std::move(result)]() mutable { handler(std::move(result)); });
+  };
+  queue_->async(std::weak_ptr(session_), [member, arguments = std::move(arguments), answer = std::move(answer),
+                                          decode](RecorderSession& session) mutable {
+    session.link().request(
+        member, std::move(arguments), [answer, decode](const IPCArguments& reply) { answer(decode(reply)); },
+        [answer](quorvel::Error error) {
+          Result result{};
+          result.error = std::move(error);
+          answer(std::move(result));
+        });
+  });
+}
+
+void RecorderClient::send(const char* member, IPCArguments arguments, FailureHandler onFailure) {
+  queue_->async(std::weak_ptr(session_), [member, arguments = std::move(arguments),
+                                          fail = failure(std::move(onFailure))](RecorderSession& session) mutable {
+    session.link().send(member, std::move(arguments), std::move(fail));
+  });
+}
+
+RecorderClient::FailureHandler RecorderClient::failure(FailureHandler onFailure) const {
+  return [gate = gate_, onFailure = std::move(onFailure)](quorvel::Error error) {
+    if (onFailure) gate->post([onFailure, error = std::move(error)]() mutable { onFailure(std::move(error)); });
+  };
+}
+
+void RecorderClient::start(quorvel::StartOptions options, std::function<void(StartResult)> handler) {
+  // The endpoint is the caller's only during this call.
+  auto arguments = startArguments(options);
+  if (!arguments) {
+    gate_->post([handler = std::move(handler)] {
+      if (handler) handler({libraryError(quorvel::kErrorUnknown, "the listener endpoint is not a descriptor")});
+    });
+    return;
+  }
+  queue_->async(std::weak_ptr(session_),
+                [arguments = std::move(*arguments), handler = std::move(handler)](RecorderSession& session) mutable {
+                  session.start(std::move(arguments), std::move(handler));
+                });
+}
+
+void RecorderClient::stop(std::function<void(StopResult)> handler) {
+  queue_->async(std::weak_ptr(session_), [handler = std::move(handler)](RecorderSession& session) mutable {
+    session.stop("stopRecordingWithHandler", {}, std::move(handler));
+  });
+}
+
+void RecorderClient::stop(quorvel::StopOptions options, std::function<void(StopResult)> handler) {
+  queue_->async(std::weak_ptr(session_), [options, handler = std::move(handler)](RecorderSession& session) mutable {
+    session.stop("stopRecordingWithStartClipDuration", {options.startClip.count(), options.endClip.count()},
+                 std::move(handler));
+  });
+}
+
+void RecorderClient::pause(FailureHandler onFailure) { send("pauseRecording", {}, std::move(onFailure)); }
+
+void RecorderClient::resume(uint32_t window, FailureHandler onFailure) {
+  send("resumeRecordingWithWindowLayerContextID", {window}, std::move(onFailure));
+}
+
+void RecorderClient::setMicrophoneEnabled(bool enabled, FailureHandler onFailure) {
+  send("setMicrophoneEnabled", {enabled}, std::move(onFailure));
+}
+
+void RecorderClient::updateProcessIDForAudioCapture(pid_t pid, FailureHandler onFailure) {
+  send("updateProcessIDForAudioCaptureWithPID", {static_cast<int32_t>(pid)}, std::move(onFailure));
+}
+
+void RecorderClient::discard(CompletionHandler handler) {
+  request<Outcome>("discardRecordingWithHandler", {}, outcomeHandler(std::move(handler)), outcomeFromWire);
+}
+
+void RecorderClient::saveVideoToCameraRoll(std::string movieURL, CompletionHandler handler) {
+  request<Outcome>("saveVideoToCameraRoll", {std::move(movieURL)}, outcomeHandler(std::move(handler)), outcomeFromWire);
+}
+
+void RecorderClient::currentState(std::function<void(StateResult)> handler) {
+  request<StateResult>("synchronousGetCurrentState", {}, std::move(handler), currentStateFromWire);
+}
+
+void RecorderClient::didBecomeActive(FailureHandler onFailure) { tellActive(true, std::move(onFailure)); }
+void RecorderClient::didResignActive(FailureHandler onFailure) { tellActive(false, std::move(onFailure)); }
+
+void RecorderClient::tellActive(bool active, FailureHandler onFailure) {
+  queue_->async(std::weak_ptr(session_),
+                [active, fail = failure(std::move(onFailure))](RecorderSession& session) mutable {
+                  session.tellActive(active, std::move(fail));
+                });
+}
+
+void RecorderClient::keepConnected(bool keep) {
+  queue_->async(std::weak_ptr(session_), [keep](RecorderSession& session) { session.link().setKeepsConnected(keep); });
+}
+
+void RecorderClient::setupBroadcast(quorvel::BroadcastOptions options, CompletionHandler handler) {
+  request<Outcome>("setupBroadcastWithHostBundleID",
+                   {std::move(options.hostBundleID), std::move(options.extensionBundleID),
+                    std::move(options.configuration), toWire(options.userInfo)},
+                   outcomeHandler(std::move(handler)), outcomeFromWire);
+}
+
+void RecorderClient::currentBroadcastImages(std::function<void(BroadcastImagesResult)> handler) {
+  request<BroadcastImagesResult>("getCurrentBroadcastImages", {}, std::move(handler), imagesFromWire);
+}
+
+void RecorderClient::systemBroadcastExtensions(std::function<void(BroadcastExtensionsResult)> handler) {
+  request<BroadcastExtensionsResult>("getSystemBroadcastExtensionInfo", {}, std::move(handler), extensionsFromWire);
+}
+
+void RecorderClient::setBroadcastURL(std::string url, FailureHandler onFailure) {
+  send("setBroadcastURL", {std::move(url)}, std::move(onFailure));
+}
+
+void RecorderClient::setHasUserConsentForCamera(bool consent, FailureHandler onFailure) {
+  send("setHasUserConsentForCamera", {consent}, std::move(onFailure));
+}
+
+void RecorderClient::setHasUserConsentForMicrophone(bool consent, FailureHandler onFailure) {
+  send("setHasUserConsentForMicrophone", {consent}, std::move(onFailure));
+}
+
+void RecorderClient::setMicrophoneEnabledPersistent(bool enabled, FailureHandler onFailure) {
+  send("setMicrophoneEnabledPersistent", {enabled}, std::move(onFailure));
+}
+
+void RecorderClient::reportCameraUsage(int32_t cameraPosition, FailureHandler onFailure) {
+  send("reportCameraUsage", {cameraPosition}, std::move(onFailure));
+}
+
+uint64_t RecorderClient::droppedSamples() const { return gate_->droppedSamples(); }
+
+}  // namespace qv::client

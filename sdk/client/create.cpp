@@ -1,0 +1,34 @@
+#include <memory>
+#include <mutex>
+
+#include "platform/Executor.h"
+#include "platform/Timer.h"
+#include "platform/sdbus/SdBusIPC.h"
+#include "sdk/client/RecorderClient.h"
+
+namespace quorvel {
+
+namespace {
+
+/// One messaging service, with its thread, for all recorders of the process; it goes with the last.
+std::shared_ptr<qv::platform::IPCService> sharedMessaging() {
+  static std::mutex mutex;
+  static std::weak_ptr<qv::platform::IPCService> shared;
+  std::lock_guard lock(mutex);
+  auto service = shared.lock();
+  if (!service) {
+    // An application's only peer is the daemon, which it does not have to identify.
+    service = std::make_shared<qv::platform::SdBusIPCService>([](qv::platform::IPCPeer&) {});
+    shared = service;
+  }
+  return service;
+}
+
+}  // namespace
+
+std::unique_ptr<Recorder> Recorder::create(RecorderOptions options) {
+  return std::make_unique<qv::client::RecorderClient>(sharedMessaging(), qv::platform::systemTimers(),
+                                                      qv::platform::globalQueue(), std::move(options));
+}
+
+}  // namespace quorvel

@@ -1,0 +1,288 @@
+#pragma once
+
+// The quorvel client library: record this application's own screen and sound.
+//
+//   auto recorder = quorvel::Recorder::create();
+//   recorder->start({.windows = {window}, .width = 1280, .height = 720},
+//                   [](quorvel::StartResult started) { ... });
+//   ...
+//   recorder->stop([](quorvel::StopResult stopped) { play(stopped.movieURL); });
+//
+// Link with `pkg-config --cflags --libs quorvel`. docs/app-developers.md is the guide.
+
+#include <sys/types.h>
+
+#include <chrono>
+#include <cstdint>
+#include <functional>
+#include <map>
+#include <memory>
+#include <optional>
+#include <span>
+#include <string>
+#include <string_view>
+#include <variant>
+#include <vector>
+
+#define QUORVEL_API __attribute__((visibility("default")))
+
+namespace quorvel {
+
+/// What `Error::code` may be in `kErrorDomain`, and what to do about it.
+enum ErrorCode : int64_t {
+  kErrorUnknown = -5800,                  ///< Anything else; the text says more. Log it.
+  kErrorUserDeclined = -5801,             ///< The user said no. Do not ask again by yourself.
+  kErrorDisabled = -5802,                 ///< Recording is switched off on this device.
+  kErrorFailedToStart = -5803,            ///< Not in front, or a window that is not yours.
+  kErrorFailed = -5804,                   ///< The recording broke off.
+  kErrorInsufficientStorage = -5805,      ///< Too little free space; tell the user.
+  kErrorInterrupted = -5806,              ///< Another recording took over, or the app left the front.
+  kErrorContentResize = -5807,            ///< The picture's size changed during the recording.
+  kErrorInvalidBroadcastSession = -5808,  ///< No broadcast was set up, or its extension is gone.
+  kErrorSystemDormancy = -5809,           ///< The device went to sleep.
+  kErrorEntitlements = -5810,             ///< The application lacks the right to do this.
+  kErrorActivePhoneCall = -5811,
+  kErrorFailedToSave = -5812,  ///< The movie could not be written.
+  kErrorDashvex = -5813,
+  kErrorConnectionInvalid = -5814,      ///< The daemon cannot be reached. Try again later.
+  kErrorConnectionInterrupted = -5815,  ///< The daemon went away meanwhile; a recording is lost.
+  kErrorNoContextIDMatch = -5816,       ///< Resumed with a window that is not yours; recording ended.
+  kErrorMediaServicesFailed = -5817,    ///< Screen or sound capture failed.
+  kErrorMixingFailure = -5818,
+};
+
+inline constexpr const char kErrorDomain[] = "com.tarnwick.Quorvel.QVRecordingErrorDomain";
+
+struct Error {
+  int64_t code = kErrorUnknown;
+  std::string key;   ///< its name, e.g. "RECORDING_ERROR_USER_DECLINED"
+  std::string text;  ///< for the user, in the user's language where it comes from the daemon
+  std::string domain = kErrorDomain;
+};
+
+/// One entry of user information: nothing, a flag, a number, a text, bytes, or a container of these.
+struct Value {
+  using Array = std::vector<Value>;
+  using Dictionary = std::map<std::string, Value>;
+  std::variant<std::monostate, bool, int64_t, double, std::string, std::vector<uint8_t>, Array, Dictionary> content;
+};
+using Dictionary = Value::Dictionary;
+
+struct StartOptions {
+  /// The windows (layer contexts) to record, all of this application. X11 window ids on X11.
+  std::vector<uint32_t> windows = {};
+  /// Size of the movie's picture in pixels.
+  double width = 0, height = 0;
+  bool microphone = false;  ///< ask for the microphone too
+  bool camera = false;      ///< ask for the camera too
+  bool broadcast = false;   ///< send to the extension of `setupBroadcast` instead of into a movie
+  bool system = false;      ///< the whole screen; needs an entitlement
+  bool capture = false;     ///< no movie: the samples come to `Events::videoFrame` and `audioSample`
+  /// A broadcast extension's endpoint, where the application has one. Borrowed: it is duplicated.
+  int listenerEndpoint = -1;
+};
+
+/// `microphone` and `camera` are what the user agreed to; they may be less than was asked.
+struct StartResult {
+  std::optional<Error> error;
+  bool microphone = false;
+  bool camera = false;
+};
+
+/// Cuts seconds off the movie's start and end, in whole seconds, where both are positive.
+struct StopOptions {
+  std::chrono::duration<double> startClip{0};
+  std::chrono::duration<double> endClip{0};
+};
+
+/// A movie, or an error. Neither after a capture or a broadcast: there is no movie then.
+struct StopResult {
+  std::optional<Error> error;
+  std::string movieURL;  ///< "file:///..."; empty for no movie. See filePath().
+};
+
+struct BroadcastOptions {
+  std::string hostBundleID = {};
+  std::string extensionBundleID = {};
+  std::vector<uint8_t> configuration = {};  ///< an archived broadcast configuration
+  Dictionary userInfo = {};                 ///< handed to the extension
+};
+
+/// PNG images; empty where there is none.
+struct BroadcastImagesResult {
+  std::optional<Error> error;
+  std::vector<uint8_t> hostApp;
+  std::vector<uint8_t> extension;
+};
+
+struct BroadcastExtension {
+  std::string displayName;
+  std::string bundleID;
+  std::vector<uint8_t> icon;  ///< PNG
+};
+struct BroadcastExtensionsResult {
+  std::optional<Error> error;
+  std::vector<BroadcastExtension> extensions;
+};
+
+struct State {
+  bool recording = false;
+  bool broadcasting = false;
+  bool microphoneEnabled = false;
+  bool systemRecording = false;
+  bool userConsentForMicrophone = false;
+  bool userConsentForCamera = false;
+  bool microphoneEnabledPersistent = false;
+  std::optional<std::string> broadcastURL;
+};
+struct StateResult {
+  std::optional<Error> error;
+  State state;
+};
+
+/// Times of samples are on CLOCK_MONOTONIC. A pause is taken out of the times of video, not of
+/// those of audio: after each pause the two lie apart by the pause's length.
+using SampleTime = std::chrono::nanoseconds;
+
+/// A captured picture. Copies share it. The pixels are shared with the daemon, which has few such
+/// frames: the last copy that goes gives the frame back, so let go of it within a frame or two, and
+/// copy out what you want to keep.
+struct VideoFrame {
+  std::span<const uint8_t> pixels;  ///< BGRX, 4 bytes a pixel, `stride` bytes a row, read-only
+  uint32_t width = 0, height = 0, stride = 0;
+  SampleTime presentationTime{0};
+  std::optional<SampleTime> duration;
+  std::shared_ptr<const void> surface;  ///< keeps `pixels` readable
+};
+
+struct AudioFormat {
+  double sampleRate = 0;  ///< frames per second
+  uint32_t channels = 0;  ///< interleaved
+  uint32_t bitsPerChannel = 0;
+  uint32_t bytesPerFrame = 0;
+  bool isFloat = false;
+  bool isSigned = false;
+  bool isBigEndian = false;
+};
+
+/// A run of captured sound, linear PCM.
+struct AudioSample {
+  enum class Source { Application, Microphone };
+  Source source = Source::Application;
+  std::vector<uint8_t> bytes;
+  AudioFormat format;
+  int64_t frameCount = 0;
+  SampleTime presentationTime{0};
+  std::optional<SampleTime> duration;
+};
+
+/// What happens without having been asked for. Every entry may be empty.
+struct Events {
+  /// The recording ended, and neither by this application's stop nor because a later start of its own
+  /// took its place: with an error, and with the movie where
+  /// one was saved. A recording that was interrupted in the background may be told again, then with
+  /// its movie, when the application is in front again.
+  std::function<void(StopResult)> stopped = {};
+  /// The daemon went away: once for each loss. Outstanding requests have ended by then, and so has the
+  /// recording. The next request connects anew.
+  std::function<void()> interrupted = {};
+  /// A connection to the daemon was made: the first, or one after an interruption.
+  std::function<void()> connected = {};
+  std::function<void(bool recording)> recordingStateChanged = {};
+  std::function<void(Dictionary)> broadcastServiceInfoChanged = {};
+  std::function<void(std::string url)> broadcastURLChanged = {};
+  std::function<void(VideoFrame)> videoFrame = {};
+  std::function<void(AudioSample)> audioSample = {};
+  std::function<void(Error)> recordingLockInterrupted = {};
+  std::function<void(std::string time)> recordingTimerChanged = {};
+};
+
+struct RecorderOptions {
+  Events events = {};
+  /// Where handlers and events run, one at a time and in order. Empty: on a thread of the library.
+  /// Otherwise a function that queues the work given to it, e.g. to the application's main loop; it
+  /// is called from threads of the library, must not block, and must keep the order.
+  std::function<void(std::function<void()>)> executor = {};
+};
+
+/// Records this application through the device's recording daemon.
+///
+/// One per application. Making it does nothing yet: the first request connects. One recording goes
+/// on at a time on the device: a start ends any other, also an own one.
+///
+/// Every request with a handler ends in one call of it, with an error where the daemon cannot be
+/// reached (kErrorConnectionInvalid) or goes away meanwhile (kErrorConnectionInterrupted). A start
+/// waits for the user's answer, so it may take long. Requests without an answer take a function that
+/// is called only when the request could not be delivered.
+///
+/// Handlers and events do not run inside the call that brings them about, and never after the
+/// destructor has returned: it waits for one that is running, except in that one itself. Destroying
+/// the recorder ends the connection, and with it the recording: its movie is deleted.
+///
+/// Threading: thread-safe. Handlers and events run as RecorderOptions::executor says.
+class QUORVEL_API Recorder {
+ public:
+  using FailureHandler = std::function<void(Error)>;
+  using CompletionHandler = std::function<void(std::optional<Error>)>;
+
+  static std::unique_ptr<Recorder> create(RecorderOptions options = {});
+  virtual ~Recorder();
+  Recorder(const Recorder&) = delete;
+  Recorder& operator=(const Recorder&) = delete;
+
+  // Recording
+
+  /// Asks the user where needed, and starts. The application must be in front.
+  virtual void start(StartOptions options, std::function<void(StartResult)> handler) = 0;
+  virtual void stop(std::function<void(StopResult)> handler) = 0;
+  virtual void stop(StopOptions options, std::function<void(StopResult)> handler) = 0;
+  virtual void pause(FailureHandler onFailure = {}) = 0;
+  /// `window` is recorded from here on; it must be this application's, or the recording ends.
+  virtual void resume(uint32_t window, FailureHandler onFailure = {}) = 0;
+  /// During a recording: silence on and off.
+  virtual void setMicrophoneEnabled(bool enabled, FailureHandler onFailure = {}) = 0;
+  /// Records the sound of process `pid` from here on, e.g. of a helper that plays it.
+  virtual void updateProcessIDForAudioCapture(pid_t pid, FailureHandler onFailure = {}) = 0;
+  /// Deletes the last recording's movie. An error during a recording.
+  virtual void discard(CompletionHandler handler) = 0;
+  /// Moves the movie of a stop to the user's photo library.
+  virtual void saveVideoToCameraRoll(std::string movieURL, CompletionHandler handler) = 0;
+  virtual void currentState(std::function<void(StateResult)> handler) = 0;
+
+  // The application's place
+
+  /// Tell when the application comes to the front and when it leaves it. The library repeats the
+  /// last of the two on each new connection, so a failure needs no second try.
+  virtual void didBecomeActive(FailureHandler onFailure = {}) = 0;
+  virtual void didResignActive(FailureHandler onFailure = {}) = 0;
+  /// While on, a lost daemon is looked for again (after 0.25 s, then less and less often, every 30 s at
+  /// last). Off by default: then only the next request connects.
+  virtual void keepConnected(bool keep) = 0;
+
+  // Broadcasts
+
+  virtual void setupBroadcast(BroadcastOptions options, CompletionHandler handler) = 0;
+  virtual void currentBroadcastImages(std::function<void(BroadcastImagesResult)> handler) = 0;
+  virtual void systemBroadcastExtensions(std::function<void(BroadcastExtensionsResult)> handler) = 0;
+  virtual void setBroadcastURL(std::string url, FailureHandler onFailure = {}) = 0;
+
+  // Remembered by the daemon for this application
+
+  virtual void setHasUserConsentForCamera(bool consent, FailureHandler onFailure = {}) = 0;
+  virtual void setHasUserConsentForMicrophone(bool consent, FailureHandler onFailure = {}) = 0;
+  virtual void setMicrophoneEnabledPersistent(bool enabled, FailureHandler onFailure = {}) = 0;
+  virtual void reportCameraUsage(int32_t cameraPosition, FailureHandler onFailure = {}) = 0;
+
+  /// Captured samples that were dropped because the application's handlers did not keep up.
+  [[nodiscard]] virtual uint64_t droppedSamples() const = 0;
+
+ protected:
+  Recorder() = default;
+};
+
+/// The path of a "file:///..." URL; empty for any other.
+[[nodiscard]] QUORVEL_API std::string filePath(std::string_view url);
+/// The name of a code, e.g. "RECORDING_ERROR_USER_DECLINED".
+[[nodiscard]] QUORVEL_API std::string_view errorKey(int64_t code);
+
+}  // namespace quorvel

@@ -1,0 +1,107 @@
+#include "tests/daemon/DaemonTest.h"
+
+namespace qv {
+namespace {
+
+using platform::UserAlertAnswer;
+using platform::Value;
+
+class ConsentTest : public DaemonTest {
+ protected:
+  /// The answer to a start whose alert was answered in this way.
+  TestClient::Answer startAnswering(TestClient& client, const TestClient::StartOptions& options,
+                                    UserAlertAnswer answer) {
+    EXPECT_EQ(client.start(options), std::nullopt);
+    device_.alerts.answer(answer);
+    device_.run();
+    return *client.answer();
+  }
+};
+
+bool operator==(const std::optional<TestClient::Answer>& answer, std::nullopt_t) { return !answer.has_value(); }
+
+TEST_F(ConsentTest, TwoButtonsRecordOrDecline) {
+  auto client = game();
+  EXPECT_EQ(startAnswering(client, {}, UserAlertAnswer::Other).code(), errorcode::kUserDeclined);
+  EXPECT_EQ(startAnswering(client, {}, UserAlertAnswer::Cancelled).code(), errorcode::kUserDeclined);
+  EXPECT_EQ(openTransactions(), 0);
+  EXPECT_EQ(startAnswering(client, {}, UserAlertAnswer::Default).code(), 0);
+  const auto& request = device_.alerts.shown.back()->request;
+  EXPECT_EQ(request.header, "ACKNOWLEDGEMENT_ALERT_TITLE");
+  EXPECT_TRUE(request.alternateButton.empty());
+  EXPECT_EQ(device_.alerts.shown.size(), 3u);
+  client.stop();
+  EXPECT_EQ(client.start()->code(), 0);  // exempt now
+  EXPECT_EQ(device_.alerts.shown.size(), 3u);
+}
+
+TEST_F(ConsentTest, ThreeButtonsKeepOrDropTheMicrophone) {
+  auto client = game();
+  const TestClient::StartOptions withMicrophone{.microphone = true};
+  EXPECT_EQ(startAnswering(client, withMicrophone, UserAlertAnswer::Default).code(), errorcode::kUserDeclined);
+  auto answer = startAnswering(client, withMicrophone, UserAlertAnswer::Other);
+  EXPECT_EQ(answer.code(), 0);
+  EXPECT_FALSE(answer.values[1].asBool());
+  client.stop();
+  // Allowed without the microphone only, so it is asked again.
+  answer = startAnswering(client, withMicrophone, UserAlertAnswer::Alternate);
+  EXPECT_TRUE(answer.values[1].asBool());
+  client.stop();
+  EXPECT_EQ(client.start(withMicrophone)->code(), 0);
+}
+
+TEST_F(ConsentTest, ExemptionLastsEightMinutesInTheBackground) {
+  auto client = game();
+  startAnswering(client, {}, UserAlertAnswer::Default);
+  client.stop();
+  client.request("clientDidResignActive");
+  device_.clock.advanceSeconds(480);
+  client.request("clientDidResignActive");  // the first date stays
+  client.request("clientDidBecomeActive");
+  EXPECT_EQ(client.start()->code(), 0);
+  client.stop();
+  device_.clock.advanceSeconds(1);
+  client.request("clientDidBecomeActive");
+  EXPECT_EQ(client.start(), std::nullopt);
+  client.disconnect();
+  EXPECT_FALSE(device_.alerts.shown.back()->visible);
+}
+
+TEST_F(ConsentTest, AClientThatDiesDuringItsAlertLeavesNothingBehind) {
+  auto dying = game();
+  dying.start();
+  dying.disconnect();
+  EXPECT_FALSE(device_.alerts.shown.back()->visible);
+  device_.alerts.answer(UserAlertAnswer::Default);  // an answer that came at the same moment
+  device_.run();
+  EXPECT_EQ(openTransactions(), 0);
+  EXPECT_TRUE(device_.movies.movies.empty());
+  auto next = chat();
+  EXPECT_EQ(startAnswering(next, {}, UserAlertAnswer::Default).code(), 0);
+}
+
+TEST_F(ConsentTest, AnAlertThatCannotBeShownDeclines) {
+  device_.alerts.fails = true;
+  auto client = game();
+  EXPECT_EQ(client.start()->code(), errorcode::kUserDeclined);
+  EXPECT_TRUE(device_.log.contains("error showing acknowledgement alert"));
+}
+
+TEST_F(ConsentTest, OthersAreServedWhileOneIsAsked) {
+  auto asked = game();
+  auto other = chat();
+  EXPECT_EQ(asked.start(), std::nullopt);
+  EXPECT_EQ(asked.start()->code(), errorcode::kFailedToStart);  // one start at a time
+  EXPECT_EQ(other.state().size(), 7u);
+  EXPECT_EQ(startAnswering(other, {}, UserAlertAnswer::Default).code(), 0);
+  // The first alert is answered last: its application takes over.
+  device_.alerts.shown.front()->handler(UserAlertAnswer::Default);
+  device_.run();
+  EXPECT_TRUE(asked.isRecording());
+  EXPECT_FALSE(other.isRecording());
+  EXPECT_EQ(other.takeEnds().size(), 1u);
+  EXPECT_EQ(openTransactions(), 1);
+}
+
+}  // namespace
+}  // namespace qv

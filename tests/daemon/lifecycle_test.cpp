@@ -1,0 +1,154 @@
+#include "tests/daemon/DaemonTest.h"
+
+namespace qv {
+namespace {
+
+using platform::Size;
+using platform::Value;
+
+class LifecycleTest : public DaemonTest {
+ protected:
+  LifecycleTest() { suppressAlert(); }
+  std::shared_ptr<QVRecordingSession> session() {
+    return std::make_shared<QVRecordingSession>("com.example.game", queue_, captureManager_);
+  }
+  platform::SerialQueue queue_{"test", device_.executor};
+};
+
+TEST_F(LifecycleTest, SizesAreClampedByDeviceAndPreference) {
+  const auto subject = session();
+  EXPECT_EQ(subject->_maximumSizeWithSize({3840, 2160}), (Size{1920, 1080}));
+  EXPECT_EQ(subject->_maximumSizeWithSize({1080, 2400}), (Size{864, 1920}));
+  EXPECT_EQ(subject->_maximumSizeWithSize({1000, 800}), (Size{1000, 800}));
+  device_.deviceInfo.idiom = platform::UserInterfaceIdiom::Tablet;
+  device_.deviceInfo.integers["ChipID"] = 0x8960;
+  EXPECT_EQ(subject->_maximumSizeWithSize({2048, 1536}), (Size{1600, 1200}));
+  device_.preferences.set("com.tarnwick.quorveld", "QVFullResCapture", Value(true));
+  EXPECT_EQ(subject->_maximumSizeWithSize({3840, 2160}), (Size{3840, 2160}));
+}
+
+TEST_F(LifecycleTest, FileNamesHoldWhateverAnAppIsCalled) {
+  const auto name = [&](const std::string& displayName) {
+    device_.bundles.addApplication("Game", "com.example.game")->info[platform::bundleinfo::kDisplayName] =
+        Value(displayName);
+    return session()->outputPath().substr(std::string(fakes::kStore).size() + 2);
+  };
+  EXPECT_EQ(name("Comet Run"), "Comet Run.mp4");
+  EXPECT_EQ(name("../../etc/cron"), "_.:..:etc:cron.mp4");
+  EXPECT_EQ(name(""), "com.example.game.mp4");
+  EXPECT_LE(name(std::string(400, 'x')).size(), 255u);
+  const auto system = session();
+  system->setSystemRecording(true);
+  const std::string path = system->outputPath();
+  EXPECT_NE(path.find("/ScreenRecording_"), std::string::npos);
+  EXPECT_EQ(path.find(':'), std::string::npos);
+}
+
+TEST_F(LifecycleTest, PauseStopsTheSourcesAndResumeKeepsTheFile) {
+  auto client = game();
+  client.start();
+  sendFrame(kSecond);
+  client.request("pauseRecording");
+  client.request("pauseRecording");
+  EXPECT_FALSE(device_.screen.last().running);
+  EXPECT_TRUE(device_.tap.tap->disposed);
+  EXPECT_EQ(device_.screen.mode, platform::DisplayCloneMode::Off);
+  device_.applications.owners[5] = 100;
+  client.request("resumeRecordingWithWindowLayerContextID", {Value(uint32_t{5})});
+  EXPECT_TRUE(device_.screen.last().running);
+  EXPECT_EQ(device_.screen.contexts, std::set<uint32_t>{5});
+  EXPECT_EQ(device_.movies.movies.size(), 1u);
+}
+
+TEST_F(LifecycleTest, ResumeWithAForeignWindowEndsTheRecordingWithItsMovie) {
+  auto client = game();
+  client.start();
+  sendFrame(kSecond);
+  client.request("pauseRecording");
+  client.request("resumeRecordingWithWindowLayerContextID", {Value(uint32_t{77})});
+  EXPECT_EQ(client.takeEnds(), std::vector<int64_t>{errorcode::kNoContextIDMatch});
+  EXPECT_TRUE(client.lastMovie().ends_with("Game.mp4"));
+  EXPECT_EQ(openTransactions(), 0);
+}
+
+TEST_F(LifecycleTest, AStopBeforeTheFirstFrameSaysThatNothingWasSaved) {
+  auto client = game();
+  client.start();
+  EXPECT_EQ(client.stop()->code(1), errorcode::kFailedToSave);
+  client.start({.capture = true});
+  EXPECT_EQ(client.stop()->code(1), 0);
+}
+
+TEST_F(LifecycleTest, ATapThatRunsTooLateDoesNotStartTheScreen) {
+  auto client = game();
+  client.start();
+  const auto listener = device_.tap.tap->listener;
+  client.request("pauseRecording");
+  EXPECT_FALSE(device_.screen.last().running);
+  if (listener) listener();
+  device_.run();
+  EXPECT_FALSE(device_.screen.last().running);
+}
+
+TEST_F(LifecycleTest, CaptureFailuresEndTheRecordingAndTheNextOneWorks) {
+  auto client = game();
+  client.start();
+  sendFrame(kSecond);
+  auto& controller = device_.screen.last();
+  const auto delegate = controller.delegate.lock();
+  delegate->screenCaptureControllerMediaServicesWereReset(controller);
+  device_.run();
+  EXPECT_EQ(client.takeEnds(), std::vector<int64_t>{errorcode::kMediaServicesFailed});
+  EXPECT_EQ(device_.movies.last().status, platform::AssetWriterStatus::Completed);
+  EXPECT_EQ(openTransactions(), 0);
+  EXPECT_EQ(client.start()->code(), 0);
+  sendFrame(2 * kSecond);
+  EXPECT_EQ(device_.movies.video().samples.size(), 1u);
+  EXPECT_EQ(client.stop()->code(1), 0);
+}
+
+TEST_F(LifecycleTest, ARefusedFrameEndsTheRecording) {
+  device_.movies.startFails = true;
+  auto client = game();
+  client.start();
+  sendFrame(kSecond);
+  EXPECT_EQ(client.takeEnds(), std::vector<int64_t>{errorcode::kFailedToSave});
+  const auto& payload = device_.metrics.messages.back().payload;
+  EXPECT_EQ(valueForKey(payload, "EndReason").asInteger(), errorcode::kFailedToSave);
+  EXPECT_EQ(openTransactions(), 0);
+}
+
+TEST_F(LifecycleTest, MetricsCountBothStretchesOfAPausedRecording) {
+  auto client = game();
+  client.start();
+  device_.clock.advanceSeconds(7.25);
+  sendFrame(kSecond);
+  client.request("pauseRecording");
+  device_.clock.advanceSeconds(100);
+  device_.applications.owners[5] = 100;
+  client.request("resumeRecordingWithWindowLayerContextID", {Value(uint32_t{5})});
+  device_.clock.advanceSeconds(5.25);
+  client.request("reportCameraUsage", {Value(int32_t{2})});
+  client.stop();
+  const auto& message = device_.metrics.messages.back();
+  EXPECT_EQ(message.serviceName, "InAppRecording");
+  EXPECT_EQ(message.payload.size(), 15u);
+  EXPECT_EQ(valueForKey(message.payload, "ActiveDuration").asInteger(), 13);
+  EXPECT_EQ(valueForKey(message.payload, "VideoFrameCount").asInteger(), 1);
+  EXPECT_TRUE(valueForKey(message.payload, "FrontCameraUsed").asBool());
+  EXPECT_FALSE(valueForKey(message.payload, "BackCameraUsed").asBool());
+}
+
+TEST_F(LifecycleTest, ShuttingDownCompletesTheMovie) {
+  auto client = game();
+  client.start();
+  sendFrame(kSecond);
+  bool down = false;
+  manager_->shutDown([&] { down = true; });
+  device_.run();
+  EXPECT_TRUE(down);
+  EXPECT_EQ(device_.movies.last().status, platform::AssetWriterStatus::Completed);
+}
+
+}  // namespace
+}  // namespace qv

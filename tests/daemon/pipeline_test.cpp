@@ -1,0 +1,158 @@
+#include <cstring>
+
+#include "tests/daemon/DaemonTest.h"
+
+namespace qv {
+namespace {
+
+using platform::AffineTransform;
+using platform::Value;
+
+class PipelineTest : public DaemonTest {
+ protected:
+  PipelineTest() : client_(game()) {
+    suppressAlert();
+    device_.applications.owners[5] = 100;
+  }
+  void pause() { client_.request("pauseRecording"); }
+  void resume() { client_.request("resumeRecordingWithWindowLayerContextID", {Value(uint32_t{5})}); }
+  /// In tenths of a second.
+  void frame(int64_t tenths) { sendFrame(tenths * kSecond / 10); }
+  std::vector<int64_t> writtenTenths() {
+    auto times = device_.movies.video().times();
+    for (int64_t& time : times) time /= kSecond / 10;
+    return times;
+  }
+  TestClient client_;
+};
+
+TEST_F(PipelineTest, PausesLeaveNoGapInTheVideo) {
+  client_.start();
+  frame(100);
+  frame(101);
+  pause();
+  resume();
+  frame(250);  // takes the time of the last frame, which the writer has already
+  frame(251);
+  frame(300);
+  pause();
+  resume();
+  frame(400);
+  frame(401);
+  EXPECT_EQ(writtenTenths(), (std::vector<int64_t>{100, 101, 102, 151, 152}));
+  const auto& last = device_.movies.video().samples.back();
+  EXPECT_EQ(last->captureTime().value, 401 * kSecond / 10);
+}
+
+TEST_F(PipelineTest, APauseRightAfterAResumeCountsFromThatFrame) {
+  client_.start();
+  frame(100);
+  frame(101);
+  pause();
+  resume();
+  frame(250);
+  pause();
+  resume();
+  frame(400);
+  frame(401);
+  EXPECT_EQ(writtenTenths(), (std::vector<int64_t>{100, 101, 102}));
+}
+
+TEST_F(PipelineTest, APauseBeforeTheFirstFrameShiftsNothing) {
+  client_.start();
+  pause();
+  resume();
+  frame(100);
+  frame(101);
+  EXPECT_EQ(writtenTenths(), (std::vector<int64_t>{100, 101}));
+}
+
+TEST_F(PipelineTest, AnEndedRecordingLeavesItsTimesBehind) {
+  client_.start();
+  frame(100);
+  pause();
+  resume();
+  frame(200);
+  auto& controller = device_.screen.last();
+  controller.delegate.lock()->screenCaptureControllerWasPreempted(controller);
+  device_.run();
+  EXPECT_EQ(client_.takeEnds(), std::vector<int64_t>{errorcode::kInterrupted});
+  client_.start();
+  frame(300);
+  EXPECT_EQ(writtenTenths(), std::vector<int64_t>{300});
+}
+
+TEST_F(PipelineTest, OrientationAndTransformOfAllFlags) {
+  const uint32_t orientations[] = {1, 4, 2, 3, 8, 5, 7, 6};
+  const AffineTransform transforms[] = {{1, 0, 0, 1},   {1, 0, 0, -1}, {-1, 0, 0, 1},  {-1, 0, 0, -1},
+                                        {0, 1, -1, 0}, {0, 1, 1, 0},  {0, -1, -1, 0}, {0, -1, 1, 0}};
+  for (uint64_t flags = 0; flags < 8; ++flags) {
+    EXPECT_EQ(orientationFromVellTransform(flags), orientations[flags]);
+    EXPECT_EQ(_affineTransformFromVellTransformFlags(flags), transforms[flags]) << flags;
+  }
+  EXPECT_EQ(orientationFromVellTransform(9), 1u);
+  client_.start();
+  sendFrame(kSecond, 5);
+  EXPECT_EQ(device_.movies.video().transform, AffineTransform::identity());
+}
+
+TEST_F(PipelineTest, AudioOfTheApplicationAndAMutedMicrophoneReachTheirTracks) {
+  device_.deviceInfo.audioCaptureDevice = true;
+  client_.start({.microphone = true});
+  frame(10);
+  ASSERT_TRUE(device_.tap.fill(100, 2 * kSecond, 100));
+  const auto sendMicrophone = [&](int64_t nanoseconds) {
+    device_.deviceCapture.send(platform::SampleBuffer::makeAudio(
+        std::make_shared<platform::DataBlock>(std::vector<uint8_t>(20, 9)),
+        captureManager_.createAudioFormatDescription(), 10,
+        platform::MediaTime::make(nanoseconds, platform::kHostTimescale)));
+    device_.run();
+  };
+  sendMicrophone(2 * kSecond);
+  client_.request("setMicrophoneEnabled", {Value(false)});
+  sendMicrophone(3 * kSecond);
+  EXPECT_EQ(device_.movies.appAudio().samples.size(), 1u);
+  const auto& microphone = device_.movies.microphone().samples;
+  ASSERT_EQ(microphone.size(), 2u);
+  EXPECT_EQ(microphone[0]->data()->bytes()[0], 9);
+  EXPECT_EQ(microphone[1]->data()->bytes()[0], 0);
+}
+
+TEST_F(PipelineTest, AnotherTappedProcessReplacesTheTap) {
+  client_.start();
+  frame(10);
+  client_.request("updateProcessIDForAudioCaptureWithPID", {Value(int32_t{123})});
+  EXPECT_EQ(device_.tap.tap->process, 123);
+  ASSERT_TRUE(device_.tap.fill(100, 2 * kSecond, 100));
+  device_.run();
+  EXPECT_EQ(device_.movies.appAudio().samples.size(), 1u);
+  client_.request("updateProcessIDForAudioCaptureWithPID", {Value(int32_t{0})});
+  EXPECT_FALSE(device_.tap.tap->running);
+  EXPECT_EQ(device_.tap.taps.size(), 2u);
+}
+
+TEST_F(PipelineTest, CaptureHandsFramesAndAudioToTheClient) {
+  client_.start({.capture = true});
+  frame(10);
+  ASSERT_TRUE(device_.tap.fill(100, 2 * kSecond, 100));
+  device_.run();
+  ASSERT_EQ(client_.object().members(),
+            (std::vector<std::string>{"captureHandlerWithSample", "captureHandlerWithAudioSample"}));
+  const auto video = client_.object().takeCall();
+  const auto frame = QVSharedFrameObject::decodeFromIPC(video.arguments[0]);
+  ASSERT_TRUE(frame.sharedFrame());
+  EXPECT_EQ(frame.sharedFrame()->layout().width, 4u);
+  platform::SampleTimingInfo timing;
+  ASSERT_EQ(video.arguments[1].asData().size(), sizeof timing);
+  std::memcpy(&timing, video.arguments[1].asData().data(), sizeof timing);
+  EXPECT_EQ(timing.presentationTimeStamp, platform::MediaTime::make(1, 1));
+  const auto audio = client_.object().takeCall();
+  EXPECT_EQ(audio.arguments[0].asData().size(), 200u);
+  EXPECT_EQ(audio.arguments[1].asData().size(), 40u);
+  EXPECT_EQ(audio.arguments[2].asInteger(), 100);
+  EXPECT_EQ(audio.arguments[3].asInteger(), 2);
+  EXPECT_TRUE(device_.movies.last().inputs[0]->samples.empty());
+}
+
+}  // namespace
+}  // namespace qv

@@ -1,0 +1,367 @@
+#pragma once
+
+#include <algorithm>
+#include <array>
+#include <functional>
+#include <map>
+#include <memory>
+#include <set>
+#include <string>
+#include <vector>
+
+#include "platform/AppAudioTap.h"
+#include "platform/AssetWriter.h"
+#include "platform/DeviceCapture.h"
+#include "platform/ExportSession.h"
+#include "platform/ScreenCapture.h"
+
+namespace qv::fakes {
+
+/// 4 x 2 pixels at a host time in nanoseconds.
+inline platform::SampleBufferRef makeFrame(int64_t nanoseconds) {
+  auto frame = platform::SharedFrame::create({4, 2, 16, platform::PixelFormat::BGRX});
+  return platform::SampleBuffer::makeVideo(std::make_shared<platform::PixelBuffer>(std::move(*frame)),
+                                           platform::MediaTime::make(nanoseconds, platform::kHostTimescale),
+                                           platform::MediaTime::invalid());
+}
+
+/// Frames come when a test sends them, in the test's thread.
+class FakeScreenCaptureController final : public platform::ScreenCaptureController {
+ public:
+  FakeScreenCaptureController(platform::Size of, platform::MediaTime minimumInterval)
+      : size(of), interval(minimumInterval) {}
+  void setDelegate(std::weak_ptr<platform::ScreenCaptureControllerDelegate> to) override { delegate = std::move(to); }
+  void startCapture() override { running = true; }
+  void stopCapture() override { running = false; }
+
+  void send(const platform::SampleBufferRef& sample, uint64_t flags = 0) {
+    if (const auto to = delegate.lock(); to && running) {
+      to->screenCaptureControllerDidReceiveSampleBuffer(*this, sample, flags);
+    }
+  }
+  void sendAt(int64_t nanoseconds, uint64_t flags = 0) { send(makeFrame(nanoseconds), flags); }
+
+  const platform::Size size;
+  const platform::MediaTime interval;
+  std::weak_ptr<platform::ScreenCaptureControllerDelegate> delegate;
+  bool running = false;
+};
+
+class FakeScreenCapture final : public platform::ScreenCaptureService, public platform::DisplayCloneService {
+ public:
+  std::unique_ptr<platform::ScreenCaptureController> createController(platform::Size size,
+                                                                      platform::MediaTime interval) override {
+    auto controller = std::make_unique<FakeScreenCaptureController>(size, interval);
+    controllers.push_back(controller.get());
+    return controller;
+  }
+  platform::DisplayCloneService& displayClone() override { return *this; }
+  void setMirroringMode(platform::DisplayCloneMode to) override { mode = to; }
+  void setCloneContexts(std::set<uint32_t> to) override { contexts = std::move(to); }
+  /// The newest controller; valid as long as its session.
+  FakeScreenCaptureController& last() { return *controllers.back(); }
+
+  std::vector<FakeScreenCaptureController*> controllers;
+  platform::DisplayCloneMode mode = platform::DisplayCloneMode::Off;
+  std::set<uint32_t> contexts;
+};
+
+class FakeDeviceCapture final : public platform::DeviceCaptureService, public platform::AudioSession {
+ public:
+  struct Input final : platform::CaptureDeviceInput {};
+  struct Output final : platform::AudioDataOutput {
+    void setSampleDelegate(platform::CaptureOutputDelegate* to, platform::SerialQueue* on) override {
+      delegate = to;
+      queue = on;
+    }
+    platform::CaptureOutputDelegate* delegate = nullptr;
+    platform::SerialQueue* queue = nullptr;
+  };
+  struct Session final : platform::DeviceCaptureSession {
+    void setUsesApplicationAudioSession(bool) override {}
+    void setAutomaticallyConfiguresApplicationAudioSession(bool) override {}
+    bool canAddInput(const std::shared_ptr<platform::CaptureDeviceInput>& input) const override {
+      return input != nullptr;
+    }
+    void addInput(std::shared_ptr<platform::CaptureDeviceInput>) override { ++inputs; }
+    void removeInput(const std::shared_ptr<platform::CaptureDeviceInput>&) override { --inputs; }
+    bool canAddOutput(const std::shared_ptr<platform::CaptureOutput>& output) const override {
+      return output != nullptr;
+    }
+    void addOutput(std::shared_ptr<platform::CaptureOutput>) override { ++outputs; }
+    void removeOutput(const std::shared_ptr<platform::CaptureOutput>&) override { --outputs; }
+    void startRunning() override { setRunning(true); }
+    void stopRunning() override { setRunning(false); }
+    bool isRunning() const override { return running; }
+    void setRunningObserver(std::function<void()> to) override { observer = std::move(to); }
+    void setRunning(bool to) {
+      running = to;
+      if (const auto call = observer) call();
+    }
+    int inputs = 0, outputs = 0;
+    bool running = false;
+    std::function<void()> observer;
+  };
+
+  std::shared_ptr<platform::DeviceCaptureSession> createSession() override {
+    return session = std::make_shared<Session>();
+  }
+  std::shared_ptr<platform::CaptureDeviceInput> createDefaultAudioInput() override {
+    return hasInput ? std::make_shared<Input>() : nullptr;
+  }
+  std::shared_ptr<platform::AudioDataOutput> createAudioDataOutput() override {
+    return output = std::make_shared<Output>();
+  }
+  platform::AudioSession& audioSession() override { return *this; }
+  int32_t setCategory(platform::AudioSessionCategory, uint32_t options) override {
+    categoryOptions = options;
+    return 0;
+  }
+  void setInterruptionObserver(std::function<void(uint32_t)> to) override { interruption = std::move(to); }
+  /// Delivers on the output's queue, as a device does.
+  void send(const platform::SampleBufferRef& sample) {
+    output->queue->async([to = output, sample] { to->delegate->captureOutputDidOutputSampleBuffer(*to, sample); });
+  }
+
+  bool hasInput = true;
+  uint32_t categoryOptions = 0;
+  std::shared_ptr<Session> session;
+  std::shared_ptr<Output> output;
+  std::function<void(uint32_t)> interruption;
+};
+
+/// The queue of the newest tap is driven by the test.
+class FakeAppAudioTap final : public platform::AppAudioTapService {
+ public:
+  struct State {
+    int32_t process = 0;
+    bool running = false, disposed = false;
+    platform::AppAudioInputCallback callback;
+    std::function<void()> listener;
+    std::vector<platform::QueueBuffer*> enqueued;
+    std::vector<uint32_t> capacities;
+    int freed = 0;
+  };
+  struct Queue final : platform::AppAudioTapQueue {
+    Queue(FakeAppAudioTap& fake, platform::AudioStreamDescription format, std::shared_ptr<State> tap)
+        : service(fake), description(format), state(std::move(tap)) {}
+    int32_t setTappedProcess(int32_t process) override {
+      state->process = process;
+      return service.status("setTappedProcess");
+    }
+    int32_t streamDescription(platform::AudioStreamDescription& to) override {
+      to = service.reportedFormat.value_or(description);
+      return 0;
+    }
+    int32_t maximumOutputPacketSize(uint32_t& bytes) override {
+      bytes = service.packetSize;
+      return 0;
+    }
+    int32_t allocateBuffer(uint32_t size, platform::QueueBuffer*& buffer) override {
+      memory.push_back(std::make_unique<std::vector<uint8_t>>(size));
+      buffers.push_back(std::make_unique<platform::QueueBuffer>(platform::QueueBuffer{size, memory.back()->data(), 0}));
+      state->capacities.push_back(size);
+      buffer = buffers.back().get();
+      return 0;
+    }
+    int32_t enqueueBuffer(platform::QueueBuffer* buffer) override {
+      state->enqueued.push_back(buffer);
+      return 0;
+    }
+    int32_t addIsRunningListener(std::function<void()> to) override {
+      state->listener = std::move(to);
+      return 0;
+    }
+    int32_t removeIsRunningListener() override {
+      state->listener = nullptr;
+      return 0;
+    }
+    int32_t start() override {
+      state->running = true;
+      if (const auto call = state->listener) call();
+      return service.status("start");
+    }
+    int32_t stopImmediately() override {
+      state->running = false;
+      return service.status("stop");
+    }
+    int32_t freeBuffer(platform::QueueBuffer*) override {
+      ++state->freed;
+      return 0;
+    }
+    int32_t dispose() override {
+      state->disposed = true;
+      return 0;
+    }
+    FakeAppAudioTap& service;
+    const platform::AudioStreamDescription description;
+    const std::shared_ptr<State> state;
+    std::vector<std::unique_ptr<std::vector<uint8_t>>> memory;
+    std::vector<std::unique_ptr<platform::QueueBuffer>> buffers;
+  };
+
+  int32_t createInputQueue(const platform::AudioStreamDescription& format, platform::AppAudioInputCallback callback,
+                           uint32_t, std::unique_ptr<platform::AppAudioTapQueue>& queue) override {
+    tap = std::make_shared<State>();
+    tap->callback = std::move(callback);
+    taps.push_back(tap);
+    queue = std::make_unique<Queue>(*this, format, tap);
+    return status("create");
+  }
+  int32_t status(const std::string& operation) const {
+    const auto it = failures.find(operation);
+    return it == failures.end() ? 0 : it->second;
+  }
+  /// Fills the tap's next buffer and hands it over. False when none is enqueued.
+  bool fill(uint32_t frames, uint64_t hostTime, uint32_t packetCount) {
+    return fill(*tap, frames, hostTime, packetCount);
+  }
+  static bool fill(State& state, uint32_t frames, uint64_t hostTime, uint32_t packetCount) {
+    if (state.enqueued.empty()) return false;
+    platform::QueueBuffer* buffer = state.enqueued.front();
+    state.enqueued.erase(state.enqueued.begin());
+    buffer->byteSize = frames * 2;
+    std::fill_n(buffer->data, buffer->byteSize, uint8_t{7});
+    platform::AudioTimeStamp start;
+    start.hostTime = hostTime;
+    state.callback(buffer, start, packetCount);
+    return true;
+  }
+
+  std::shared_ptr<State> tap;
+  std::vector<std::shared_ptr<State>> taps;
+  std::map<std::string, int32_t> failures;
+  std::optional<platform::AudioStreamDescription> reportedFormat;
+  uint32_t packetSize = 0;
+};
+
+/// Records what a movie would hold.
+class FakeAssetWriterService final : public platform::AssetWriterService {
+ public:
+  struct Input final : platform::WriterInput {
+    void setTransform(const platform::AffineTransform& to) override { transform = to; }
+    void setExpectsMediaDataInRealTime(bool to) override { realTime = to; }
+    bool isReadyForMoreMediaData() const override { return ready; }
+    bool append(const platform::SampleBufferRef& sample) override {
+      samples.push_back(sample);
+      return true;
+    }
+    [[nodiscard]] std::vector<int64_t> times() const {
+      std::vector<int64_t> values;
+      for (const auto& sample : samples) values.push_back(sample->presentationTime().value);
+      return values;
+    }
+    platform::MediaType type = platform::MediaType::Video;
+    platform::Dictionary settings;
+    platform::AffineTransform transform;
+    bool realTime = false, ready = true;
+    std::vector<platform::SampleBufferRef> samples;
+  };
+  /// What became of one writer; outlives it.
+  struct Movie {
+    platform::URL url;
+    platform::AssetWriterStatus status = platform::AssetWriterStatus::Unknown;
+    std::vector<std::shared_ptr<Input>> inputs;  // video, app audio, microphone
+    int starts = 0;
+    std::vector<platform::MediaTime> sessionStarts;
+    platform::MediaTime sessionEnd;
+    std::function<void()> completion;
+    bool startFails = false;
+  };
+  struct Writer final : platform::AssetWriter {
+    explicit Writer(std::shared_ptr<Movie> to) : movie(std::move(to)) {}
+    platform::AssetWriterStatus status() const override { return movie->status; }
+    std::optional<platform::Error> error() const override { return std::nullopt; }
+    const platform::URL& outputURL() const override { return movie->url; }
+    void addInput(std::shared_ptr<platform::WriterInput> input) override {
+      movie->inputs.push_back(std::static_pointer_cast<Input>(input));
+    }
+    bool startWriting() override {
+      ++movie->starts;
+      movie->status = movie->startFails ? platform::AssetWriterStatus::Failed : platform::AssetWriterStatus::Writing;
+      return !movie->startFails;
+    }
+    void startSessionAtSourceTime(platform::MediaTime time) override { movie->sessionStarts.push_back(time); }
+    void endSessionAtSourceTime(platform::MediaTime time) override { movie->sessionEnd = time; }
+    void finishWriting(std::function<void()> completion) override {
+      movie->completion = std::move(completion);
+      if (movie->status == platform::AssetWriterStatus::Writing) finish();
+    }
+    void finish() {
+      movie->status = platform::AssetWriterStatus::Completed;
+      const auto done = std::exchange(movie->completion, nullptr);
+      done();
+    }
+    const std::shared_ptr<Movie> movie;
+  };
+
+  platform::Result<std::unique_ptr<platform::AssetWriter>> createAssetWriter(const platform::URL& url,
+                                                                             const std::string&) override {
+    if (createFails) return platform::Error::posix(EACCES);
+    auto movie = std::make_shared<Movie>();
+    movie->url = url;
+    movie->startFails = startFails;
+    movies.push_back(movie);
+    std::unique_ptr<platform::AssetWriter> writer = std::make_unique<Writer>(movie);
+    return writer;
+  }
+  std::shared_ptr<platform::WriterInput> createWriterInput(platform::MediaType type,
+                                                           const platform::Dictionary& settings) override {
+    auto input = std::make_shared<Input>();
+    input->type = type;
+    input->settings = settings;
+    return input;
+  }
+  Movie& last() { return *movies.back(); }
+  Input& video() { return *last().inputs.at(0); }
+  Input& appAudio() { return *last().inputs.at(1); }
+  Input& microphone() { return *last().inputs.at(2); }
+
+  std::vector<std::shared_ptr<Movie>> movies;
+  bool createFails = false, startFails = false;
+};
+
+/// Exports end at once as the test says.
+class FakeExportService final : public platform::ExportService {
+ public:
+  struct Asset final : platform::MovieAsset {
+    platform::MediaTime duration() const override { return length; }
+    std::vector<int32_t> audioTrackIDs() const override { return {2, 3}; }
+    platform::MediaTime length;
+  };
+  struct Session final : platform::ExportSession {
+    void setOutputURL(const platform::URL& to) override { output = to; }
+    void setOutputFileType(const std::string&) override {}
+    void setTimeRange(const platform::MediaTimeRange& to) override { range = to; }
+    void setAudioMix(std::vector<platform::AudioMixInputParameters> to) override { mix = std::move(to); }
+    void exportAsynchronously(std::function<void()> completion) override { completion(); }
+    void cancel() override {}
+    double progress() const override { return 1; }
+    platform::ExportStatus status() const override { return result; }
+    std::optional<platform::Error> error() const override { return std::nullopt; }
+    const platform::URL& outputURL() const override { return output; }
+    platform::URL output;
+    platform::MediaTimeRange range;
+    std::vector<platform::AudioMixInputParameters> mix;
+    platform::ExportPreset preset = platform::ExportPreset::PassThrough;
+    platform::ExportStatus result = platform::ExportStatus::Completed;
+  };
+  std::shared_ptr<platform::MovieAsset> openMovie(const platform::URL&) override {
+    auto asset = std::make_shared<Asset>();
+    asset->length = duration;
+    return asset;
+  }
+  std::shared_ptr<platform::ExportSession> createExportSession(std::shared_ptr<platform::MovieAsset>,
+                                                               platform::ExportPreset preset) override {
+    auto session = std::make_shared<Session>();
+    session->preset = preset;
+    session->result = result;
+    sessions.push_back(session);
+    return session;
+  }
+  platform::MediaTime duration = platform::MediaTime::make(95, 1);
+  platform::ExportStatus result = platform::ExportStatus::Completed;
+  std::vector<std::shared_ptr<Session>> sessions;
+};
+
+}  // namespace qv::fakes

@@ -1,0 +1,133 @@
+#pragma once
+
+#include <functional>
+#include <map>
+#include <memory>
+#include <optional>
+#include <string>
+#include <vector>
+
+#include "platform/Applications.h"
+#include "platform/IPC.h"
+#include "platform/Sounds.h"
+#include "platform/SystemServices.h"
+#include "platform/UserAlert.h"
+
+namespace qv::fakes {
+
+/// Alerts stay until the test answers them.
+class FakeUserAlerts final : public platform::UserAlertService {
+ public:
+  struct Shown {
+    platform::UserAlertRequest request;
+    std::function<void(platform::UserAlertAnswer)> handler;
+    bool visible = true;
+  };
+  struct Alert final : platform::UserAlert {
+    explicit Alert(std::shared_ptr<Shown> to) : shown(std::move(to)) {}
+    ~Alert() override { shown->visible = false; }
+    const std::shared_ptr<Shown> shown;
+  };
+  std::unique_ptr<platform::UserAlert> present(const platform::UserAlertRequest& request,
+                                               std::function<void(platform::UserAlertAnswer)> handler) override {
+    if (fails) return nullptr;
+    shown.push_back(std::make_shared<Shown>(Shown{request, std::move(handler)}));
+    return std::make_unique<Alert>(shown.back());
+  }
+  void answer(platform::UserAlertAnswer answer) { shown.back()->handler(answer); }
+
+  std::vector<std::shared_ptr<Shown>> shown;
+  bool fails = false;
+};
+
+class FakeApplications final : public platform::ApplicationService, public platform::RenderServer {
+ public:
+  struct Monitor final : platform::ApplicationStateMonitor {
+    explicit Monitor(FakeApplications& to) : applications(to) {}
+    uint32_t applicationStateForBundleIdentifier(const std::string& bundleID) override {
+      const auto it = applications.states.find(bundleID);
+      return it == applications.states.end() ? 0 : it->second;
+    }
+    void applicationInfoForBundleIdentifier(const std::string& bundleID,
+                                            std::function<void(platform::Dictionary)> handler) override {
+      const auto it = applications.processes.find(bundleID);
+      platform::Dictionary information;
+      if (it != applications.processes.end()) {
+        information[platform::applicationstate::kProcessIDKey] = platform::Value(int32_t{it->second});
+      }
+      handler(std::move(information));
+    }
+    void setHandler(std::function<void(const platform::Dictionary&)> to) override {
+      applications.handler = std::move(to);
+    }
+    FakeApplications& applications;
+  };
+  std::unique_ptr<platform::ApplicationStateMonitor> createStateMonitor() override {
+    return std::make_unique<Monitor>(*this);
+  }
+  std::optional<std::string> frontmostApplication() override { return frontmost; }
+  std::optional<pid_t> ownerOfContext(uint32_t contextID) override {
+    const auto it = owners.find(contextID);
+    return it == owners.end() ? std::nullopt : std::optional(it->second);
+  }
+  void report(uint32_t state, int32_t process, bool isFrontmost) {
+    namespace keys = platform::applicationstate;
+    handler({{keys::kStateKey, platform::Value(state)},
+             {keys::kProcessIDKey, platform::Value(process)},
+             {keys::kIsFrontmostKey, platform::Value(isFrontmost)}});
+  }
+
+  std::map<std::string, uint32_t> states;
+  std::map<std::string, pid_t> processes;
+  std::map<uint32_t, pid_t> owners;
+  std::optional<std::string> frontmost;
+  std::function<void(const platform::Dictionary&)> handler;
+};
+
+class FakeSounds final : public platform::SystemSounds, public platform::ScreenReader {
+ public:
+  void play(uint32_t soundID) override { played.push_back(soundID); }
+  bool isRunning() override { return readerRuns; }
+  std::vector<uint32_t> played;
+  bool readerRuns = false;
+};
+
+class FakeKeepAlive final : public platform::KeepAliveService {
+ public:
+  void beginTransaction() override { ++begun, ++count; }
+  void endTransaction() override { --count; }
+  int openTransactionCount() const override { return count; }
+  int begun = 0, count = 0;
+};
+
+class FakePurgeableSpace final : public platform::PurgeableSpaceService {
+ public:
+  void registerCallbacks(const std::string& name, platform::PurgeableSpaceCallbacks to) override {
+    serviceName = name;
+    callbacks = std::move(to);
+  }
+  std::string serviceName;
+  platform::PurgeableSpaceCallbacks callbacks;
+};
+
+class FakePhotoLibrary final : public platform::PhotoLibrary {
+ public:
+  void createAsset(const platform::URL& file, platform::PhotoResourceType,
+                   std::function<void(const std::optional<platform::Error>&)> completion) override {
+    stored.push_back(file);
+    completion(failure);
+  }
+  std::vector<platform::URL> stored;
+  std::optional<platform::Error> failure;
+};
+
+class FakeMetrics final : public platform::MetricsReporter {
+ public:
+  std::optional<platform::Error> sendMessage(const platform::MetricsMessage& message) override {
+    messages.push_back(message);
+    return std::nullopt;
+  }
+  std::vector<platform::MetricsMessage> messages;
+};
+
+}  // namespace qv::fakes

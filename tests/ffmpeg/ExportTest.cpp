@@ -1,0 +1,214 @@
+#include <gtest/gtest.h>
+
+#include <cmath>
+#include <filesystem>
+#include <fstream>
+#include <future>
+#include <random>
+
+#include "platform/ffmpeg/FFmpegMovies.h"
+#include "platform/ffmpeg/MoviesLoader.h"
+#include "tests/ffmpeg/MovieProbe.h"
+#include "tests/ffmpeg/SyntheticMedia.h"
+
+namespace qv::platform::test {
+namespace {
+
+constexpr double kStart = 500.0;
+constexpr uint32_t kPictures = 240;  // 8 s at 30 per second
+
+/// One movie with numbered pictures, beeps on the seconds in one track and off them in the other.
+class ExportTest : public ::testing::Test {
+ protected:
+  static void SetUpTestSuite() {
+    scratch_ = new ScratchDirectory;
+    source_ = *scratch_ / "source.mp4";
+    ffmpeg::FFmpegAssetWriterService writers;
+    RecordingUnderTest recording(writers, source_, 320, 180, {0, 1, -1, 0, 0, 0});
+    for (uint32_t i = 0; i < kPictures; ++i) {
+      const double now = kStart + i / 30.0;
+      recording.appendPicture(picture(i, now, now));
+      recording.appendSound(1, beepingSound(now, 1470));
+      if (i >= 15) recording.appendSound(2, beepingSound(now, 1470, {44100, 1, true, false, 0.25}));
+    }
+    recording.finish();
+  }
+  static void TearDownTestSuite() { delete scratch_; }
+
+  std::shared_ptr<ExportSession> session(const std::string& source, const std::string& destination,
+                                         ExportPreset preset) {
+    auto made = service_.createExportSession(service_.openMovie(URL::fileURL(source)), preset);
+    made->setOutputURL(URL::fileURL(destination));
+    made->setOutputFileType(kFileTypeMPEG4);
+    return made;
+  }
+  static void runToEnd(ExportSession& session) {
+    std::promise<void> done;
+    session.exportAsynchronously([&] { done.set_value(); });
+    done.get_future().wait();
+  }
+  static size_t filesIn(const std::string& directory) {
+    return static_cast<size_t>(std::distance(std::filesystem::directory_iterator(directory), {}));
+  }
+
+  static inline ScratchDirectory* scratch_ = nullptr;
+  static inline std::string source_;
+  ffmpeg::FFmpegExportService service_;
+  ScratchDirectory results_;
+};
+
+TEST_F(ExportTest, OpensAMovieAndFindsNothingInOthers) {
+  const auto movie = service_.openMovie(URL::fileURL(source_));
+  EXPECT_DOUBLE_EQ(movie->duration().seconds(), 8.0);
+  EXPECT_EQ(movie->audioTrackIDs(), (std::vector<int32_t>{2, 3}));
+  std::ofstream(results_ / "text.mp4") << "no movie";
+  std::ofstream(results_ / "empty.mp4");
+  for (const char* name : {"text.mp4", "empty.mp4", "missing.mp4"}) {
+    const auto other = service_.openMovie(URL::fileURL(results_ / name));
+    EXPECT_EQ(other->duration().seconds(), 0) << name;
+    EXPECT_TRUE(other->audioTrackIDs().empty()) << name;
+  }
+}
+
+TEST_F(ExportTest, TrimsToTheFrameAndTheBeep) {
+  std::mt19937 random(7);
+  for (int round = 0; round < 8; ++round) {
+    const uint32_t first = random() % 200;
+    const uint32_t count = 20 + random() % (kPictures - first - 20);
+    const std::string path = results_ / ("trim" + std::to_string(round) + ".mp4");
+    auto trim = session(source_, path, ExportPreset::PassThrough);
+    trim->setTimeRange({MediaTime::make(first, 30), MediaTime::make(count, 30)});
+    runToEnd(*trim);
+    ASSERT_EQ(trim->status(), ExportStatus::Completed) << trim->error()->description();
+    EXPECT_EQ(trim->progress(), 1);
+
+    const auto movie = probe(path);
+    EXPECT_EQ(movie.errors, "");
+    ASSERT_EQ(movie.tracks.size(), 3u);
+    EXPECT_EQ(movie.tracks[0].rotation, -90);
+    for (const auto& track : movie.tracks) EXPECT_NEAR(track.duration, count / 30.0, 1e-4);
+    const auto pictures = decodePictures(path);
+    ASSERT_EQ(pictures.size(), count) << first;
+    for (uint32_t i = 0; i < count; ++i) {
+      EXPECT_EQ(pictures[i].number, first + i);
+      EXPECT_NEAR(pictures[i].time, i / 30.0, 1e-5);
+    }
+    for (int track = 0; track < 2; ++track) {
+      for (const double beep : beeps(decodeSound(path, track))) {
+        const double inSource = beep + first / 30.0;
+        // The range may begin inside a beep.
+        if (beep <= 0.01) continue;
+        EXPECT_NEAR(inSource, std::round(inSource), 0.001) << "track " << track;
+      }
+    }
+  }
+}
+
+TEST_F(ExportTest, MixesTracksAtTheirLevelsAndCopiesThePicture) {
+  const std::string path = results_ / "mix.mp4";
+  auto mix = session(source_, path, ExportPreset::HighestQuality);
+  mix->setAudioMix({{2}, {3}});
+  runToEnd(*mix);
+  ASSERT_EQ(mix->status(), ExportStatus::Completed) << mix->error()->description();
+
+  const auto movie = probe(path);
+  EXPECT_EQ(movie.errors, "");
+  ASSERT_EQ(movie.tracks.size(), 2u);
+  EXPECT_EQ(movie.tracks[0].rotation, -90);
+  for (const auto& track : movie.tracks) EXPECT_NEAR(track.duration, 8.0, 1e-4);
+  EXPECT_EQ(decodePictures(path).size(), kPictures);
+  const auto sound = decodeSound(path, 0);
+  const auto heard = beeps(sound);
+  ASSERT_EQ(heard.size(), 8u);
+  // The second track joins after half a second: the first beep is the first track's alone.
+  const auto levelAt = [&](double time) {
+    float peak = 0;
+    for (auto i = static_cast<size_t>((time + 0.01) * 44100); i < static_cast<size_t>((time + 0.04) * 44100); ++i) {
+      peak = std::max(peak, std::abs(sound[i]));
+    }
+    return peak;
+  };
+  EXPECT_NEAR(levelAt(0), 0.5, 0.03);
+  for (int second = 1; second < 8; ++second) {
+    EXPECT_NEAR(heard[static_cast<size_t>(second)], second, 0.001);
+    EXPECT_NEAR(levelAt(second), 0.75, 0.04);
+  }
+}
+
+TEST_F(ExportTest, EncodesOtherCodecsAnewAndLeavesOutMissingSound) {
+  const std::string other = results_ / "mpeg4.mp4";
+  run("ffmpeg -v error -nostdin -i '" + source_ + "' -an -c:v mpeg4 -q:v 2 '" + other + "'");
+  auto pass = session(other, results_ / "pass.mp4", ExportPreset::PassThrough);
+  runToEnd(*pass);
+  EXPECT_EQ(pass->status(), ExportStatus::Failed);
+  const std::string path = results_ / "encoded.mp4";
+  auto mix = session(other, path, ExportPreset::HighestQuality);
+  runToEnd(*mix);
+  ASSERT_EQ(mix->status(), ExportStatus::Completed) << mix->error()->description();
+  const auto movie = probe(path);
+  EXPECT_EQ(movie.errors, "");
+  ASSERT_EQ(movie.tracks.size(), 1u);
+  EXPECT_EQ(movie.tracks[0].codec, "h264");
+  EXPECT_EQ(decodePictures(path).size(), kPictures);
+}
+
+TEST_F(ExportTest, FailsWithoutLeavingAnything) {
+  std::filesystem::copy(source_, results_ / "short.mp4");
+  // A movie whose header stands in front, cut off in the middle of its media.
+  run("ffmpeg -v error -nostdin -i '" + source_ + "' -map 0 -c copy -movflags +faststart '" + (results_ / "front.mp4") +
+      "'");
+  for (const char* name : {"short.mp4", "front.mp4"}) {
+    std::filesystem::resize_file(results_ / name, std::filesystem::file_size(results_ / name) / 2);
+  }
+  std::ofstream(results_ / "empty.mp4");
+  const size_t before = filesIn(results_.path());
+  const std::string output = results_ / "output.mp4";
+  for (const auto preset : {ExportPreset::PassThrough, ExportPreset::HighestQuality}) {
+    for (const char* name : {"short.mp4", "front.mp4", "empty.mp4", "missing.mp4"}) {
+      auto bad = session(results_ / name, output, preset);
+      runToEnd(*bad);
+      EXPECT_EQ(bad->status(), ExportStatus::Failed) << name;
+      EXPECT_TRUE(bad->error().has_value()) << name;
+    }
+    const MediaTime second = MediaTime::make(1, 1);
+    const MediaTimeRange ranges[] = {{MediaTime::make(-1, 1), second},
+                                     {second, MediaTime::make(-1, 1)},
+                                     {second, MediaTime::make(8, 1)},
+                                     {MediaTime::make(9, 1), second},
+                                     {MediaTime::fromSeconds(std::nan(""), 1), second},
+                                     {second, MediaTime::zero()}};
+    for (const auto& range : ranges) {
+      auto bad = session(source_, output, preset);
+      bad->setTimeRange(range);
+      runToEnd(*bad);
+      EXPECT_EQ(bad->status(), ExportStatus::Failed);
+    }
+    auto cancelled = session(source_, output, preset);
+    cancelled->cancel();
+    runToEnd(*cancelled);
+    EXPECT_EQ(cancelled->status(), ExportStatus::Cancelled);
+    auto unwritable = session(source_, results_ / "no/such/output.mp4", preset);
+    runToEnd(*unwritable);
+    EXPECT_EQ(unwritable->status(), ExportStatus::Failed);
+  }
+  EXPECT_EQ(filesIn(results_.path()), before);
+}
+
+TEST_F(ExportTest, LoadsTheModuleOnFirstUseAndReportsAMissingOne) {
+  ffmpeg::MoviesLoader loader(QV_MOVIES_MODULE);
+  EXPECT_EQ(loader.openMovie(URL::fileURL(source_))->duration().seconds(), 8.0);
+  const std::string path = results_ / "recorded.mp4";
+  RecordingUnderTest recording(loader, path);
+  for (uint32_t i = 0; i < 30; ++i) recording.appendPicture(picture(i, kStart + i / 30.0, kStart + i / 30.0));
+  recording.finish();
+  EXPECT_EQ(probe(path).errors, "");
+
+  ffmpeg::MoviesLoader missing(results_ / "none.so");
+  EXPECT_FALSE(missing.createAssetWriter(URL::fileURL(results_ / "x.mp4"), kFileTypeMPEG4).hasValue());
+  auto failing = missing.createExportSession(missing.openMovie(URL::fileURL(source_)), ExportPreset::PassThrough);
+  runToEnd(*failing);
+  EXPECT_EQ(failing->status(), ExportStatus::Failed);
+}
+
+}  // namespace
+}  // namespace qv::platform::test

@@ -1,0 +1,104 @@
+#include "tests/ffmpeg/MovieProbe.h"
+
+#include <cmath>
+#include <cstdio>
+#include <cstdlib>
+#include <cstring>
+#include <filesystem>
+#include <nlohmann/json.hpp>
+#include <sstream>
+
+#include "tests/ffmpeg/SyntheticMedia.h"
+
+namespace qv::platform::test {
+
+std::string run(const std::string& command) {
+  FILE* pipe = ::popen(command.c_str(), "r");
+  std::string output;
+  char buffer[65536];
+  while (const size_t got = std::fread(buffer, 1, sizeof buffer, pipe)) output.append(buffer, got);
+  ::pclose(pipe);
+  return output;
+}
+
+ProbedMovie probe(const std::string& path) {
+  ProbedMovie movie;
+  movie.errors = run("ffmpeg -v error -nostdin -i '" + path + "' -map 0 -f null - 2>&1");
+  const auto json = nlohmann::json::parse(
+      run("ffprobe -v error -of json -show_format -show_streams '" + path + "' 2>/dev/null"), nullptr, false);
+  if (!json.is_object() || !json.contains("streams")) return movie;
+  movie.duration = std::atof(json["format"].value("duration", "0").c_str());
+  for (const auto& stream : json["streams"]) {
+    ProbedTrack track;
+    track.type = stream.value("codec_type", "");
+    track.codec = stream.value("codec_name", "");
+    track.profile = stream.value("profile", "");
+    track.duration = std::atof(stream.value("duration", "0").c_str());
+    track.startTime = std::atof(stream.value("start_time", "0").c_str());
+    track.width = stream.value("width", 0);
+    track.height = stream.value("height", 0);
+    for (const auto& side : stream.value("side_data_list", nlohmann::json::array())) {
+      track.rotation = side.value("rotation", 0.0);
+    }
+    movie.tracks.push_back(track);
+  }
+  return movie;
+}
+
+std::vector<DecodedPicture> decodePictures(const std::string& path) {
+  std::vector<DecodedPicture> pictures;
+  std::istringstream lines(
+      run("ffprobe -v error -select_streams v:0 -show_entries frame=pts_time,key_frame -of csv=p=0 '" + path +
+          "' 2>/dev/null"));
+  for (std::string line; std::getline(lines, line);) {
+    int key = 0;
+    double time = 0;
+    if (std::sscanf(line.c_str(), "%d,%lf", &key, &time) == 2) pictures.push_back({time, 0, key == 1});
+  }
+  // Decoded pixels of the same pictures, scaled to one height so that the size need not be known.
+  constexpr uint32_t kWidth = 320;
+  constexpr uint32_t kHeight = 16;
+  const std::string pixels = run("ffmpeg -v error -nostdin -noautorotate -i '" + path +
+                                 "' -map 0:v:0 -fps_mode passthrough -vf scale=320:16:flags=area -f rawvideo -pix_fmt "
+                                 "gray - 2>/dev/null");
+  const size_t count = pixels.size() / (kWidth * kHeight);
+  if (count != pictures.size()) return {};
+  for (size_t i = 0; i < count; ++i) {
+    const auto* luma = reinterpret_cast<const uint8_t*>(pixels.data()) + i * kWidth * kHeight;
+    pictures[i].number = numberInPicture(luma, kWidth, kHeight, kWidth);
+  }
+  return pictures;
+}
+
+std::vector<float> decodeSound(const std::string& path, int track) {
+  const std::string raw = run("ffmpeg -v error -nostdin -i '" + path + "' -map 0:a:" + std::to_string(track) +
+                              " -af 'pan=mono|c0=c0' -f f32le -ar 44100 - 2>/dev/null");
+  std::vector<float> sound(raw.size() / sizeof(float));
+  std::memcpy(sound.data(), raw.data(), sound.size() * sizeof(float));
+  return sound;
+}
+
+/// A beep begins where its first wave is: a cosine, so at full level; the encoder smears some
+/// pre-echo before it, which stays below half.
+std::vector<double> beeps(const std::vector<float>& sound) {
+  std::vector<double> found;
+  size_t quietUntil = 0;
+  for (size_t i = 0; i < sound.size(); ++i) {
+    if (i < quietUntil || std::abs(sound[i]) < 0.2f) continue;
+    found.push_back(static_cast<double>(i) / 44100);
+    quietUntil = i + 44100 / 10;
+  }
+  return found;
+}
+
+ScratchDirectory::ScratchDirectory() {
+  char name[] = "/tmp/quorveld-movies-XXXXXX";
+  path_ = ::mkdtemp(name);
+}
+
+ScratchDirectory::~ScratchDirectory() {
+  std::error_code ignored;
+  std::filesystem::remove_all(path_, ignored);
+}
+
+}  // namespace qv::platform::test

@@ -1,0 +1,52 @@
+#pragma once
+
+#include <cstdint>
+#include <string>
+#include <vector>
+
+namespace qv::platform::test {
+
+/// What an independent reader (ffprobe and ffmpeg, as programs) says of a movie.
+struct ProbedTrack {
+  std::string type;
+  std::string codec;
+  std::string profile;
+  double duration = 0;
+  double startTime = 0;
+  int width = 0;
+  int height = 0;
+  double rotation = 0;
+};
+struct ProbedMovie {
+  std::string errors;  ///< of the whole file read and decoded; empty for a good movie
+  double duration = 0;
+  std::vector<ProbedTrack> tracks;
+};
+ProbedMovie probe(const std::string& path);
+
+struct DecodedPicture {
+  double time;
+  uint32_t number;
+  bool isKey;
+};
+/// Every picture that is shown, its number read off the decoded pixels.
+std::vector<DecodedPicture> decodePictures(const std::string& path);
+/// The sound of the n-th audio track as shown, its left side at 44100 Hz.
+std::vector<float> decodeSound(const std::string& path, int track);
+/// Where each beep begins, in seconds.
+std::vector<double> beeps(const std::vector<float>& sound);
+
+std::string run(const std::string& command);
+/// A directory that goes with this object.
+class ScratchDirectory {
+ public:
+  ScratchDirectory();
+  ~ScratchDirectory();
+  [[nodiscard]] std::string operator/(const std::string& name) const { return path_ + "/" + name; }
+  [[nodiscard]] const std::string& path() const { return path_; }
+
+ private:
+  std::string path_;
+};
+
+}  // namespace qv::platform::test

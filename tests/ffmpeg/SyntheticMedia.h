@@ -1,0 +1,55 @@
+#pragma once
+
+#include <cstdint>
+#include <functional>
+#include <memory>
+#include <vector>
+
+#include "platform/AssetWriter.h"
+#include "platform/SampleBuffer.h"
+
+namespace qv::platform::test {
+
+/// A picture that carries a number in 16 bars, black or white, high enough to survive encoding.
+PixelBufferRef numberedPicture(uint32_t number, uint32_t width, uint32_t height);
+/// The number in a row of luma samples.
+uint32_t numberInPicture(const uint8_t* luma, uint32_t width, uint32_t height, uint32_t stride);
+
+/// 16-bit PCM at `rate`: silence but for a 1 kHz beep of 50 ms at every whole second of capture time.
+struct BeepFormat {
+  int rate = 44100;
+  int channels = 2;
+  bool bigEndian = false;
+  bool isFloat = false;
+  double level = 0.5;
+};
+SampleBufferRef beepingSound(double captureTime, int64_t frames, const BeepFormat& format = {});
+
+MediaTime at(double seconds);
+/// A picture captured at one time and presented at another.
+SampleBufferRef picture(uint32_t number, double captureTime, double presentationTime, uint32_t width = 320,
+                        uint32_t height = 180);
+
+Dictionary videoSettings(double width, double height, int64_t bitRate = 1'000'000, int32_t frameRate = 60);
+Dictionary audioSettings();
+
+/// A writer with one video and two audio inputs, started, that feeds itself without waiting on time.
+class RecordingUnderTest {
+ public:
+  RecordingUnderTest(AssetWriterService& service, const std::string& path, uint32_t width = 320, uint32_t height = 180,
+                     const AffineTransform& transform = {});
+  /// Waits for room, so that no picture is dropped.
+  void appendPicture(const SampleBufferRef& sample);
+  void appendSound(int track, const SampleBufferRef& sample);
+  /// Waits for the completion.
+  void finish();
+  AssetWriter& writer() { return *writer_; }
+  void drop() { writer_.reset(); }
+
+ private:
+  std::unique_ptr<AssetWriter> writer_;
+  std::shared_ptr<WriterInput> inputs_[3];
+  bool started_ = false;
+};
+
+}  // namespace qv::platform::test

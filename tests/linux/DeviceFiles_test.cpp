@@ -1,0 +1,128 @@
+#include <gtest/gtest.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <filesystem>
+
+#include "platform/linux/DeviceDescription.h"
+#include "platform/linux/EntitlementStore.h"
+#include "platform/linux/JSONPreferenceStore.h"
+#include "tests/fakes/LogRecorder.h"
+#include "tests/linux/TemporaryRoot.h"
+
+namespace qv::platform {
+namespace {
+
+class DeviceFilesTest : public testing::Test {
+ protected:
+  TemporaryRoot root_;
+  fakes::LogRecorder log_;
+};
+
+TEST_F(DeviceFilesTest, PreferencesAreReadAtEachUse) {
+  JSONPreferenceStore store(root_.path());
+  const auto value = [&] { return store.valueForKey("com.tarnwick.quorveld", "QVFullResCapture"); };
+  const std::string path = "/private/var/mobile/Library/Preferences/com.tarnwick.quorveld.json";
+  EXPECT_TRUE(value().isNone());
+  root_.write(path, R"({"QVFullResCapture": true})");
+  EXPECT_EQ(value(), Value(true));
+  EXPECT_TRUE(log_.lines().empty());
+  for (const char* broken : {"{\"QVFullResCapture\": tru", "[true]", ""}) {
+    log_.clear();
+    root_.write(path, broken);
+    EXPECT_TRUE(value().isNone());
+    EXPECT_EQ(log_.countContaining("preferences"), 1u) << broken;
+  }
+  root_.write("/private/var/mobile/Library/secret.json", R"({"QVFullResCapture": true})");
+  EXPECT_TRUE(store.valueForKey("../secret", "QVFullResCapture").isNone());
+}
+
+TEST_F(DeviceFilesTest, WithoutDescriptionItIsAPlainTelevisionBox) {
+  for (const char* content : {"", "{", "[]"}) {
+    if (*content != '\0') root_.write("/etc/quorvel/device.json", content);
+    DeviceDescription device(root_.path());
+    EXPECT_EQ(device.userInterfaceIdiom(), UserInterfaceIdiom::Television);
+    EXPECT_EQ(device.integerProperty("ChipID"), 0);
+    EXPECT_FALSE(device.booleanProperty("RegionalBehaviorShutterClick"));
+    EXPECT_FALSE(device.hasAudioCaptureDevice());
+    EXPECT_FALSE(device.allowsInternalSecurityPolicies("com.tarnwick.quorveld"));
+    EXPECT_EQ(log_.countContaining("device description"), *content != '\0' ? 1u : 0u);
+    log_.clear();
+  }
+}
+
+TEST_F(DeviceFilesTest, DescribesTheDevice) {
+  root_.write("/etc/quorvel/device.json", R"({"idiom": "tablet", "chipID": 32784, "audioCaptureDevice": true,
+      "RegionalBehaviorShutterClick": true, "internalBuild": true, "CoreCount": 4})");
+  DeviceDescription device(root_.path());
+  EXPECT_EQ(device.userInterfaceIdiom(), UserInterfaceIdiom::Tablet);
+  EXPECT_EQ(device.integerProperty("ChipID"), 32784);
+  EXPECT_EQ(device.integerProperty("CoreCount"), 4);
+  EXPECT_TRUE(device.booleanProperty("RegionalBehaviorShutterClick"));
+  EXPECT_TRUE(device.hasAudioCaptureDevice());
+  EXPECT_TRUE(device.allowsInternalSecurityPolicies("com.tarnwick.quorveld"));
+  EXPECT_TRUE(log_.lines().empty());
+}
+
+TEST_F(DeviceFilesTest, EntriesOfTheWrongTypeAreLeftOut) {
+  root_.write("/etc/quorvel/device.json", R"({"idiom": "toaster", "chipID": "7", "audioCaptureDevice": 1,
+      "internalBuild": "yes", "Name": {}, "RegionalBehaviorShutterClick": true})");
+  DeviceDescription device(root_.path());
+  EXPECT_EQ(device.userInterfaceIdiom(), UserInterfaceIdiom::Television);
+  EXPECT_EQ(device.integerProperty("ChipID"), 0);
+  EXPECT_FALSE(device.hasAudioCaptureDevice());
+  EXPECT_FALSE(device.allowsInternalSecurityPolicies(""));
+  EXPECT_TRUE(device.booleanProperty("RegionalBehaviorShutterClick"));
+  EXPECT_EQ(log_.countContaining("is ignored"), 5u);
+}
+
+class EntitlementsTest : public DeviceFilesTest {
+ protected:
+  EntitlementsTest() {
+    std::filesystem::create_directories(root_.path(kDirectory));
+    file_ = root_.write(kDirectory + "/com.example.remote.json", R"({"com.tarnwick.private.quorvel": true})");
+    setMode(0644);
+  }
+  void setMode(mode_t mode) { ASSERT_EQ(::chmod(file_.c_str(), mode), 0); }
+  Dictionary entitlements(const std::string& identifier = "com.example.remote") {
+    return EntitlementStore(root_.path()).entitlementsForBundle(identifier);
+  }
+  static inline const std::string kDirectory = "/etc/quorvel/entitlements";
+  std::string file_;
+};
+
+TEST_F(EntitlementsTest, AreReadFromTheBundlesFile) {
+  EXPECT_EQ(entitlements(), (Dictionary{{"com.tarnwick.private.quorvel", Value(true)}}));
+  EXPECT_TRUE(entitlements("com.example.other").empty());
+  EXPECT_TRUE(log_.lines().empty());
+}
+
+TEST_F(EntitlementsTest, IdentifiersCannotLeaveTheDirectory) {
+  root_.write("/etc/quorvel/outside.json", R"({"com.tarnwick.private.quorvel": true})");
+  for (const char* identifier : {"../outside", "..", "", ".", "a/../com.example.remote", "com.example.remote\n"}) {
+    EXPECT_TRUE(entitlements(identifier).empty()) << identifier;
+  }
+}
+
+TEST_F(EntitlementsTest, FilesThatOthersCouldHaveWrittenGrantNothing) {
+  for (const mode_t mode : {0664u, 0646u}) {
+    setMode(mode);
+    EXPECT_TRUE(entitlements().empty());
+  }
+  setMode(0644);
+  ASSERT_EQ(::chmod(root_.path(kDirectory).c_str(), 0777), 0);
+  EXPECT_TRUE(entitlements().empty());
+  ASSERT_EQ(::chmod(root_.path(kDirectory).c_str(), 0755), 0);
+  std::filesystem::create_symlink(file_, root_.path(kDirectory + "/com.example.link.json"));
+  EXPECT_TRUE(entitlements("com.example.link").empty());
+  std::filesystem::create_directory(root_.path(kDirectory + "/com.example.folder.json"));
+  EXPECT_TRUE(entitlements("com.example.folder").empty());
+  EXPECT_EQ(log_.countContaining("are ignored"), 5u);
+  if (::geteuid() == 0) {
+    ASSERT_EQ(::chown(file_.c_str(), 1, 1), 0);
+    EXPECT_TRUE(entitlements().empty());
+  }
+}
+
+}  // namespace
+}  // namespace qv::platform

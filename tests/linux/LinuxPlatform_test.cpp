@@ -1,0 +1,96 @@
+#include "platform/linux/LinuxPlatform.h"
+
+#include <gtest/gtest.h>
+#include <sys/syscall.h>
+#include <unistd.h>
+
+#include <filesystem>
+
+#include "support/QuorvelErrors.h"
+#include "tests/fakes/FakeTimers.h"
+#include "tests/fakes/LogRecorder.h"
+#include "tests/fakes/ManualExecutor.h"
+#include "tests/linux/TemporaryRoot.h"
+
+namespace qv::platform {
+namespace {
+
+IPCPeer thisProcess() {
+  IPCPeer peer;
+  peer.processIdentifier = ::getpid();
+  peer.processHandle = shareFileDescriptor(FileDescriptor(static_cast<int>(::syscall(SYS_pidfd_open, ::getpid(), 0))));
+  return peer;
+}
+
+TEST(LinuxPlatformTest, ErrorsSpeakTheUsersLanguageOnARealDisk) {
+  TemporaryRoot root;
+  const std::filesystem::path framework = root.path("/System/Library/Frameworks/Quorvel.framework");
+  std::filesystem::create_directories(framework.parent_path());
+  std::filesystem::copy(QV_FRAMEWORK_DIR, framework, std::filesystem::copy_options::recursive);
+  root.write("/private/var/mobile/Library/Preferences/com.tarnwick.quorveld.json", R"({"Languages": ["de-CH"]})");
+  LinuxPlatform linux_(root.path(), "");
+  Platform platform;
+  linux_.addTo(platform);
+  Platform::install(&platform);
+  EXPECT_EQ(_qvUserErrorForCode(errorcode::kFailed).localizedDescription(), "Die Aufnahme ist fehlgeschlagen.");
+  Platform::install(nullptr);
+}
+
+TEST(LinuxPlatformTest, PeersAreKnownByTheBundleAroundTheirExecutable) {
+  fakes::LogRecorder log;
+  TemporaryRoot root;
+  const std::string entitlements = "/etc/quorvel/entitlements/com.example.test.json";
+  root.write(entitlements, R"({"com.tarnwick.private.quorvel": true})");
+  std::filesystem::permissions(root.path(entitlements), std::filesystem::perms(0644));
+  std::filesystem::permissions(root.path("/etc/quorvel/entitlements"), std::filesystem::perms(0755));
+  // This test's own program becomes an application.
+  const std::filesystem::path directory = std::filesystem::read_symlink("/proc/self/exe").parent_path();
+  const std::filesystem::path info = directory / "Info.json";
+  TemporaryRoot other;
+  std::filesystem::copy_file(other.write("/Info.json", R"({"CFBundleIdentifier": "com.example.test"})"), info);
+
+  LinuxPlatform linux_(root.path(), directory.parent_path());
+  IPCPeer peer = thisProcess();
+  linux_.peerResolver()(peer);
+  EXPECT_EQ(peer.bundleIdentifier, "com.example.test");
+  EXPECT_EQ(valueForKey(peer.entitlements, "com.tarnwick.private.quorvel"), Value(true));
+
+  IPCPeer unpinned = thisProcess();
+  unpinned.processHandle = nullptr;
+  linux_.peerResolver()(unpinned);
+  EXPECT_EQ(unpinned.bundleIdentifier, std::nullopt);
+  std::filesystem::remove(info);
+
+  IPCPeer outside = thisProcess();
+  LinuxPlatform(root.path(), "").peerResolver()(outside);
+  EXPECT_EQ(outside.bundleIdentifier, std::nullopt);
+  EXPECT_TRUE(outside.entitlements.empty());
+}
+
+TEST(PeriodicPurgeableSpaceServiceTest, CallsOnceADayAndTheLatestRegistrationOnly) {
+  fakes::FakeTimers timers;
+  fakes::ManualExecutor executor;
+  PeriodicPurgeableSpaceService service(timers, executor);
+  int first = 0;
+  int second = 0;
+  const auto registerCounter = [&](int& counter) {
+    service.registerCallbacks("cache", {.purgeable = {}, .purge = {}, .cancel = {}, .periodic = [&](int64_t, int32_t) {
+                                          return static_cast<int64_t>(++counter);
+                                        }});
+  };
+  registerCounter(first);
+  timers.advance(std::chrono::hours(23));
+  EXPECT_EQ(executor.pending(), 0u);
+  timers.advance(std::chrono::hours(25));
+  executor.runUntilIdle();
+  EXPECT_EQ(first, 2);
+  registerCounter(second);
+  timers.advance(std::chrono::hours(24));
+  executor.runUntilIdle();
+  EXPECT_EQ(first, 2);
+  EXPECT_EQ(second, 1);
+  EXPECT_EQ(timers.pending(), 1u);
+}
+
+}  // namespace
+}  // namespace qv::platform

@@ -1,0 +1,121 @@
+#include <gtest/gtest.h>
+
+#include <cstdlib>
+#include <filesystem>
+#include <fstream>
+#include <random>
+
+#include "platform/mp4/AnnexB.h"
+#include "platform/mp4/BoxReader.h"
+#include "platform/mp4/MovieWriter.h"
+#include "platform/mp4/Salvage.h"
+
+namespace qv::platform::mp4 {
+namespace {
+
+class MovieWriterTest : public ::testing::Test {
+ protected:
+  MovieWriterTest() {
+    char name[] = "/tmp/quorveld-mp4-XXXXXX";
+    directory_ = ::mkdtemp(name);
+    path_ = directory_ + "/movie.mp4";
+  }
+  ~MovieWriterTest() override { std::filesystem::remove_all(directory_); }
+
+  static MovieTrack pictureTrack() {
+    MovieTrack track;
+    track.width = 64;
+    track.height = 64;
+    track.sampleEntry = makeAVCSampleEntry(64, 64, std::vector<uint8_t>(20), {});
+    return track;
+  }
+  static std::vector<std::vector<EncodedSample>> second(int64_t number) {
+    std::vector<EncodedSample> samples;
+    for (int64_t i = 0; i < 10; ++i) {
+      samples.push_back({std::vector<uint8_t>(100, 7), (number * 10 + i) * 9000, 0, 9000, i == 0});
+    }
+    return {samples};
+  }
+  /// A file as a crash leaves it after `seconds` whole fragments.
+  void writeCrashed(int64_t seconds) {
+    MovieWriter writer(std::move(DiskMovieFile::create(path_).value()), {pictureTrack()},
+                       MovieWriter::Layout::Fragmented);
+    ASSERT_FALSE(writer.writeHeader());
+    for (int64_t i = 0; i < seconds; ++i) ASSERT_FALSE(writer.writeFragment(second(i)));
+  }
+  std::vector<uint8_t> contents() const {
+    std::ifstream file(path_, std::ios::binary);
+    return {std::istreambuf_iterator<char>(file), {}};
+  }
+
+  std::string directory_;
+  std::string path_;
+};
+
+TEST_F(MovieWriterTest, IndexesMediaBeyondFourGigabytes) {
+  constexpr uint64_t kFar = uint64_t{5} << 30;
+  MovieWriter writer(std::move(DiskMovieFile::create(path_).value()), {pictureTrack()}, MovieWriter::Layout::Plain);
+  ASSERT_FALSE(writer.writeHeader());
+  const uint64_t placeholder = writer.size() - 16;
+  writer.adopt(placeholder, kFar, std::vector<TrackIndex>(1));  // a sparse file
+  ASSERT_FALSE(writer.writeFragment(second(0)));
+  const uint64_t mediaEnd = writer.size();
+  ASSERT_FALSE(writer.finish({}));
+  std::ifstream file(path_, std::ios::binary);
+  std::vector<uint8_t> head(16);
+  file.seekg(static_cast<std::streamoff>(placeholder)).read(reinterpret_cast<char*>(head.data()), 16);
+  ByteReader in(head);
+  EXPECT_EQ(in.u32(), 1u);
+  EXPECT_EQ(in.u32(), boxType("mdat"));
+  EXPECT_EQ(in.u64(), mediaEnd - placeholder);
+  std::vector<uint8_t> moov(std::filesystem::file_size(path_) - mediaEnd);
+  file.seekg(static_cast<std::streamoff>(mediaEnd)).read(reinterpret_cast<char*>(moov.data()), std::ssize(moov));
+  std::span<const uint8_t> at(moov);
+  for (const uint32_t type : {boxType("moov"), boxType("trak"), boxType("mdia"), boxType("minf"), boxType("stbl")}) {
+    at = findBox(at, type);
+  }
+  ByteReader offsets(findBox(at, boxType("co64")));
+  offsets.skip(4);
+  EXPECT_EQ(offsets.u32(), 1u);
+  EXPECT_EQ(offsets.u64(), kFar);
+}
+
+/// Whatever a crash or a bad disk leaves, a salvage ends with an answer and reads nothing out of bounds.
+TEST_F(MovieWriterTest, SalvagesOrRefusesDamagedFiles) {
+  writeCrashed(3);
+  const auto good = contents();
+  std::mt19937 random(11);
+  int salvaged = 0;
+  for (int round = 0; round < 500; ++round) {
+    auto bytes = good;
+    if (round % 2 == 0) bytes.resize(random() % bytes.size());
+    for (unsigned i = random() % 4; i > 0 && !bytes.empty(); --i) {
+      bytes[random() % bytes.size()] = static_cast<uint8_t>(random());
+    }
+    std::ofstream(path_, std::ios::binary | std::ios::trunc)
+        .write(reinterpret_cast<const char*>(bytes.data()), std::ssize(bytes));
+    if (salvageMovie(path_)) {
+      EXPECT_EQ(contents(), bytes) << "a refused file is left untouched";
+    } else {
+      ++salvaged;
+    }
+  }
+  EXPECT_GT(salvaged, 50);
+  EXPECT_TRUE(salvageMovie(directory_).has_value());
+  EXPECT_TRUE(salvageMovie(directory_ + "/none").has_value());
+}
+
+TEST_F(MovieWriterTest, SplitsByteStreams) {
+  const std::vector<uint8_t> stream = {0,    0, 0, 1, 0x67, 100, 0,    31, 9, 0, 0, 1,
+                                       0x68, 5, 0, 0, 0,    1,   0x65, 1,  0, 0, 3, 2};
+  EXPECT_EQ(splitByteStream(stream).size(), 3u);
+  EXPECT_EQ(lengthPrefixed(stream), (std::vector<uint8_t>{0, 0, 0, 6, 0x65, 1, 0, 0, 3, 2}));
+  const auto configuration = makeAVCConfiguration(stream);
+  ASSERT_GE(configuration.size(), 8u);
+  EXPECT_EQ(configuration[1], 100);
+  EXPECT_EQ(configuration[3], 31);
+  EXPECT_TRUE(makeAVCConfiguration(std::vector<uint8_t>{0, 0, 1}).empty());
+}
+
+}  // namespace
+}  // namespace qv::platform::mp4

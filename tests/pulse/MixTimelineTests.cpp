@@ -1,0 +1,48 @@
+#include <gtest/gtest.h>
+
+#include "platform/Clock.h"
+#include "platform/pulse/MixTimeline.h"
+
+namespace qv::platform {
+namespace {
+
+constexpr uint32_t kRate = 44100;
+
+TEST(MixTimeline, SumsClipsAndIsSilentElsewhere) {
+  MixTimeline timeline(kRate);
+  const auto now = systemClock().hostTime().value;
+  const int64_t frame = timeline.frameAt(now) + 100;
+  timeline.add(frame, std::vector<int16_t>{100, 300, 30000, 30000});
+  timeline.add(frame + 1, std::vector<int16_t>{20000, 20000, -8, -4});
+  std::vector<int16_t> mono(5);
+  timeline.read(static_cast<uint64_t>(now) + 100'000'000'000 / kRate - 22'675, 1, mono);
+  EXPECT_EQ(mono, (std::vector<int16_t>{0, 200, 32767, -6, 0}));
+}
+
+TEST(MixTimeline, LeavesOutWhatComesTooLateOrTooEarly) {
+  MixTimeline timeline(kRate);
+  const auto now = systemClock().hostTime().value;
+  const int64_t frame = timeline.frameAt(now);
+  std::vector<int16_t> stereo(2 * kRate);
+  timeline.read(static_cast<uint64_t>(now), 2, stereo);
+  timeline.add(frame + 10, std::vector<int16_t>(200, 77));  // read already
+  timeline.add(frame + 4 * kRate, std::vector<int16_t>(200, 77));
+  for (int second = 1; second < 6; ++second) {
+    timeline.read(static_cast<uint64_t>(now + second * 1'000'000'000LL), 2, stereo);
+    EXPECT_EQ(stereo, std::vector<int16_t>(2 * kRate)) << second;
+  }
+}
+
+TEST(MixTimeline, ForgetsWhatALongHoldUpSkipped) {
+  MixTimeline timeline(kRate);
+  const auto now = systemClock().hostTime().value;
+  timeline.add(timeline.frameAt(now), std::vector<int16_t>(2 * kRate, 55));
+  std::vector<int16_t> mono(kRate);
+  for (const int64_t second : {10, 11, 12}) {
+    timeline.read(static_cast<uint64_t>(now + second * 1'000'000'000), 1, mono);
+    EXPECT_EQ(mono, std::vector<int16_t>(kRate)) << second;
+  }
+}
+
+}  // namespace
+}  // namespace qv::platform

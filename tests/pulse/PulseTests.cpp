@@ -1,0 +1,156 @@
+#include <gtest/gtest.h>
+#include <unistd.h>
+
+#include "platform/pulse/PulsePlatform.h"
+#include "tests/pulse/PulseFixture.h"
+
+namespace qv::platform {
+namespace {
+
+constexpr double kAmplitude = 8000;  // of a player's tone
+constexpr size_t kTenth = 4410;
+
+class Microphone final : public CaptureOutputDelegate {
+ public:
+  explicit Microphone(DeviceCaptureService& service)
+      : session_(service.createSession()),
+        input_(service.createDefaultAudioInput()),
+        output_(service.createAudioDataOutput()) {
+    output_->setSampleDelegate(this, &queue_);
+    if (session_->canAddInput(input_)) session_->addInput(input_);
+    session_->addOutput(output_);
+    session_->startRunning();
+  }
+  ~Microphone() override { session_->removeOutput(output_); }
+  void captureOutputDidOutputSampleBuffer(const CaptureOutput&, const SampleBufferRef& sample) override {
+    capture.add(static_cast<uint64_t>(sample->presentationTime().value), sample->data()->bytes().data(),
+                static_cast<size_t>(sample->numSamples()));
+  }
+  [[nodiscard]] bool hasInput() const { return input_ != nullptr; }
+  Capture capture;
+
+ private:
+  SerialQueue queue_{"microphone"};
+  const std::shared_ptr<DeviceCaptureSession> session_;
+  const std::shared_ptr<CaptureDeviceInput> input_;
+  const std::shared_ptr<AudioDataOutput> output_;
+};
+
+class PulseTapTest : public PulseTest {
+ protected:
+  void SetUp() override {
+    PulseTest::SetUp();
+    if (IsSkipped() || HasFatalFailure()) return;
+    auto platform = PulsePlatform::connect(server());
+    ASSERT_TRUE(platform);
+    platform_ = std::move(platform.value());
+  }
+  Capture capture_;
+  std::unique_ptr<PulsePlatform> platform_;
+};
+
+TEST_F(PulseTapTest, HearsOneProcessAloneAndSilenceWhileItPlaysNothing) {
+  TonePlayer first(server()), second(server());
+  ASSERT_EQ(first.tell("open appout 440"), "opened");
+  ASSERT_EQ(second.tell("open appout 1000"), "opened");
+  ASSERT_GT(second.sound(), 0u);
+  const auto queue = tap(platform_->appAudioTap(), first.pid(), capture_);
+  for (const int16_t sample : capture_.next(3 * kTenth)) ASSERT_EQ(sample, 0);
+  ASSERT_GT(first.sound(), 0u);
+  ASSERT_TRUE(capture_.waitForTone(440));
+  const auto samples = capture_.next(3 * kTenth);
+  EXPECT_NEAR(amplitudeOf(440, samples), kAmplitude, 200);
+  EXPECT_LT(amplitudeOf(1000, samples), 10);
+  EXPECT_TRUE(capture_.isContinuous());
+}
+
+TEST_F(PulseTapTest, PlacesALateStreamOnTheHostClock) {
+  TonePlayer player(server());
+  const auto queue = tap(platform_->appAudioTap(), player.pid(), capture_);
+  capture_.next(kTenth);
+  ASSERT_EQ(player.tell("open appout 440"), "opened");
+  const uint64_t onset = player.sound();
+  ASSERT_TRUE(capture_.waitForTone(440));
+  EXPECT_NEAR(static_cast<double>(capture_.firstSound()) * 1e-6, static_cast<double>(onset) * 1e-6, 25)
+      << "milliseconds";
+  EXPECT_TRUE(capture_.isContinuous());
+}
+
+TEST_F(PulseTapTest, SumsTheStreamsOfAProcessAndItsChildren) {
+  TonePlayer parent(server(), true);
+  ASSERT_EQ(parent.tell("open appout 440 1500"), "opened");
+  ASSERT_GT(parent.sound(), 0u);
+  const auto queue = tap(platform_->appAudioTap(), parent.pid(), capture_);
+  ASSERT_TRUE(capture_.waitForTone(440));
+  ASSERT_TRUE(capture_.waitForTone(1500));
+  const auto samples = capture_.next(3 * kTenth);
+  EXPECT_NEAR(amplitudeOf(440, samples), kAmplitude, 200);
+  EXPECT_NEAR(amplitudeOf(1500, samples), kAmplitude, 200);
+}
+
+TEST_F(PulseTapTest, FollowsAStreamToAnotherOutput) {
+  TonePlayer player(server());
+  ASSERT_EQ(player.tell("open appout 440"), "opened");
+  ASSERT_GT(player.sound(), 0u);
+  const auto queue = tap(platform_->appAudioTap(), player.pid(), capture_);
+  ASSERT_TRUE(capture_.waitForTone(440));
+  ASSERT_EQ(player.tell("move other"), "moved");
+  capture_.next(3 * kTenth);  // sound of before the move is still on its way
+  EXPECT_TRUE(capture_.waitForTone(440));
+  EXPECT_TRUE(capture_.isContinuous());
+}
+
+TEST_F(PulseTapTest, GoesOnWithoutTheServerAndFindsItAgain) {
+  Microphone microphone(platform_->deviceCapture());
+  ASSERT_TRUE(microphone.hasInput());
+  const auto queue = tap(platform_->appAudioTap(), ::getpid(), capture_);
+  {
+    TonePlayer player(server());  // a child of this process
+    ASSERT_EQ(player.tell("open appout 440"), "opened");
+    ASSERT_GT(player.sound(), 0u);
+    ASSERT_TRUE(capture_.waitForTone(440));
+    killServer();
+    capture_.next(3 * kTenth);
+    for (const int16_t sample : capture_.next(3 * kTenth)) ASSERT_EQ(sample, 0);
+  }
+  startServer();
+  TonePlayer player(server());
+  ASSERT_EQ(player.tell("open micsrc 440"), "opened");
+  ASSERT_GT(player.sound(), 0u);
+  EXPECT_TRUE(capture_.waitForTone(440));
+  EXPECT_TRUE(microphone.capture.waitForTone(440));
+  EXPECT_TRUE(capture_.isContinuous());
+  EXPECT_TRUE(microphone.capture.isContinuous());
+}
+
+TEST_F(PulseTapTest, MicrophoneHearsTheDefaultSourceOnTheHostClock) {
+  TonePlayer player(server());
+  ASSERT_EQ(player.tell("open micsrc 440"), "opened");
+  Microphone microphone(platform_->deviceCapture());
+  ASSERT_TRUE(microphone.hasInput());
+  for (const int16_t sample : microphone.capture.next(3 * kTenth)) ASSERT_EQ(sample, 0);
+  const uint64_t onset = player.sound();
+  ASSERT_TRUE(microphone.capture.waitForTone(440));
+  const auto samples = microphone.capture.next(3 * kTenth);
+  EXPECT_NEAR(amplitudeOf(440, samples), kAmplitude, 200);
+  // A remapped source reports its own latency, not that of the output behind it.
+  EXPECT_NEAR(static_cast<double>(microphone.capture.firstSound()) * 1e-6, static_cast<double>(onset) * 1e-6, 80)
+      << "milliseconds";
+}
+
+TEST_F(PulseTapTest, PlaysTheSystemSounds) {
+  const auto queue = tap(platform_->appAudioTap(), ::getpid(), capture_);
+  platform_->sounds().play(1117);
+  double low = 0;
+  for (int tenth = 0; tenth < 100 && low < 500; ++tenth) low = amplitudeOf(880, capture_.next(kTenth));
+  EXPECT_GE(low, 500);
+}
+
+TEST(PulsePlatform, FailsWhereNoServerAnswers) {
+  const auto platform = PulsePlatform::connect("unix:/nonexistent/socket");
+  ASSERT_FALSE(platform);
+  EXPECT_EQ(platform.error().domain, kPosixErrorDomain);
+}
+
+}  // namespace
+}  // namespace qv::platform

@@ -1,0 +1,276 @@
+#include <fcntl.h>
+#include <sys/socket.h>
+
+#include "tests/sdbus/SdBusTest.h"
+
+namespace qv::platform::test {
+namespace {
+
+class ConnectionTest : public SdBusTest {};
+
+SharedFileDescriptor descriptorFor(const std::string& text) {
+  int ends[2];
+  EXPECT_EQ(::pipe2(ends, O_CLOEXEC), 0);
+  const FileDescriptor writing(ends[1]);
+  EXPECT_EQ(::write(writing.get(), text.data(), text.size()), static_cast<ssize_t>(text.size()));
+  return shareFileDescriptor(FileDescriptor(ends[0]));
+}
+
+std::string readAll(const SharedFileDescriptor& descriptor) {
+  char buffer[64];
+  const ssize_t size = ::read(descriptor->get(), buffer, sizeof buffer);
+  return size > 0 ? std::string(buffer, static_cast<size_t>(size)) : std::string();
+}
+
+TEST_F(ConnectionTest, CarriesEveryTypeThereAndBack) {
+  delegate_.object->serve = echo();
+  listen();
+  const auto client = connectClient();
+  const IPCArguments sent{Value(true),
+                          Value(int32_t{-5}),
+                          Value(uint32_t{4000000000u}),
+                          Value(int64_t{-1} << 40),
+                          Value(~uint64_t{0}),
+                          Value(2.5),
+                          Value("gr\xC3\xBC\xC3\x9F"),
+                          Value(Data{0, 1, 255}),
+                          Value(Dictionary{{"a", Value(int32_t{1})}, {"b", Value(Dictionary{{"c", Value("d")}})}}),
+                          Value(Array{Value(uint32_t{7}), Value(uint32_t{8})}),
+                          Value(Array{Value(1920.0), Value(1080.0)}),
+                          Value(Array{Value(Dictionary{{"name", Value("x")}}), Value(Dictionary{})}),
+                          Value(Array{})};
+  EXPECT_EQ(valuesOf(call(*client, "everything", sent)), sent);
+  // In a variant, dates and URLs keep their kinds too.
+  const Value nested(Dictionary{{"date", Value(Date{1e9})},
+                                {"url", Value(URL("file:///a%20b"))},
+                                {"list", Value(Array{Value(int64_t{1}), Value("two"), Value(false)})},
+                                {"data", Value(Data(70000, 9))}});
+  EXPECT_EQ(valuesOf(call(*client, "echo", {nested})), IPCArguments{nested});
+}
+
+TEST_F(ConnectionTest, SendsNoneAsTheEmptyValueOfItsType) {
+  delegate_.object->serve = echo();
+  listen();
+  const auto client = connectClient();
+  const IPCArguments back = valuesOf(call(*client, "everything", IPCArguments(13)));
+  ASSERT_EQ(back.size(), 13u);
+  EXPECT_EQ(back[0], Value(false));
+  EXPECT_EQ(back[6], Value(""));
+  EXPECT_EQ(back[8], Value(Dictionary{}));
+  EXPECT_EQ(back[10], Value(Array{Value(0.0), Value(0.0)}));
+  // An entry that is none is an absent key.
+  EXPECT_EQ(valuesOf(call(*client, "echo", {Value(Dictionary{{"gone", Value()}})})), IPCArguments{Value(Dictionary{})});
+}
+
+TEST_F(ConnectionTest, RepairsTextsThatAreNotUTF8) {
+  delegate_.object->serve = echo();
+  listen();
+  const auto client = connectClient();
+  EXPECT_EQ(valuesOf(call(*client, "echo", {Value(std::string("a\xFF\0b\xED\xA0\x80", 7))})),
+            IPCArguments{Value("a\xEF\xBF\xBD\xEF\xBF\xBD"
+                               "b\xEF\xBF\xBD\xEF\xBF\xBD\xEF\xBF\xBD")});
+}
+
+TEST_F(ConnectionTest, CarriesDescriptorsBothWays) {
+  delegate_.object->serve = echo();
+  listen();
+  const auto client = connectClient();
+  const Value payload(Dictionary{{"frame", Value(Array{Value(descriptorFor("pixels")), Value(uint32_t{16})})}});
+  const IPCArguments back = valuesOf(call(*client, "echo", {payload}));
+  ASSERT_EQ(back.size(), 1u);
+  const Array frame = valueForKey(back[0].asDictionary(), "frame").asArray();
+  ASSERT_EQ(frame.size(), 2u);
+  ASSERT_TRUE(frame[0].getIf<SharedFileDescriptor>());
+  EXPECT_EQ(readAll(*frame[0].getIf<SharedFileDescriptor>()), "pixels");
+  EXPECT_EQ(codeOf(call(*client, "everything",
+                        [] {
+                          IPCArguments arguments(13);
+                          arguments[12] = Value(Array{Value(SharedFileDescriptor())});
+                          return arguments;
+                        }())),
+            code(IPCErrorCode::InvalidArguments));
+}
+
+TEST_F(ConnectionTest, TheServerCallsItsClientWhileARequestIsOpen) {
+  listen();
+  const auto client = connectClient();
+  Events<std::string> order;
+  client->call("nothing", {}, [&](const IPCArguments&) { order.add("reply"); }, {});
+  const Call request = delegate_.object->calls.next();
+  request.connection->call("notify", {Value(uint32_t{3})}, {}, {});
+  const Call callback = clientObject_->calls.next();
+  EXPECT_EQ(callback.member, "notify");
+  EXPECT_EQ(callback.arguments, IPCArguments{Value(uint32_t{3})});
+  EXPECT_TRUE(order.isEmpty());
+  request.reply({});
+  EXPECT_EQ(order.next(), "reply");
+}
+
+TEST_F(ConnectionTest, ACallIsAnsweredOnceAndAnUnansweredOneFails) {
+  delegate_.object->serve = [](const Call& served) {
+    if (served.arguments[0].asBool()) {
+      served.reply({Value("first")});
+      served.reply({Value("second")});
+      served.reply.fail("com.example.Late", "late");
+    }
+  };
+  listen();
+  const auto client = connectClient();
+  EXPECT_EQ(valuesOf(call(*client, "echo", {Value(true)})), IPCArguments{Value("first")});
+  const Outcome unanswered = call(*client, "echo", {Value(false)});
+  ASSERT_EQ(codeOf(unanswered), code(IPCErrorCode::NoReply));
+  EXPECT_EQ(valueForKey(std::get<Error>(unanswered).userInfo, kIPCRemoteErrorNameKey).asString(),
+            "com.tarnwick.quorveld.Error.NoReply");
+}
+
+TEST_F(ConnectionTest, AnAnswerThatDoesNotFitFailsTheCallOnly) {
+  delegate_.object->serve = [](const Call& served) {
+    if (served.member == "everything") return served.reply({Value("one value instead of many")});
+    served.reply(served.arguments);
+  };
+  listen();
+  const auto client = connectClient();
+  EXPECT_EQ(codeOf(call(*client, "everything", IPCArguments(13))), code(IPCErrorCode::RemoteError));
+  EXPECT_EQ(valuesOf(call(*client, "echo", {Value(1.0)})), IPCArguments{Value(1.0)});
+}
+
+TEST_F(ConnectionTest, WrongCallsFailAtTheCaller) {
+  delegate_.object->serve = echo();
+  listen();
+  const auto client = connectClient();
+  EXPECT_EQ(codeOf(call(*client, "noSuchThing", {})), code(IPCErrorCode::UnknownOperation));
+  EXPECT_EQ(codeOf(call(*client, "echo", {})), code(IPCErrorCode::InvalidArguments));
+  EXPECT_EQ(codeOf(call(*client, "notify", {Value("text")})), code(IPCErrorCode::InvalidArguments));
+  EXPECT_EQ(codeOf(call(*client, "notify", {Value(int64_t{-1})})), code(IPCErrorCode::InvalidArguments));
+  Value deep;
+  for (int i = 0; i < 40; ++i) deep = Value(Array{deep});
+  EXPECT_EQ(codeOf(call(*client, "echo", {deep})), code(IPCErrorCode::InvalidArguments));
+  EXPECT_EQ(valuesOf(call(*client, "nothing", {})), IPCArguments{});
+}
+
+TEST_F(ConnectionTest, AnOperationThatThePeerLacksFailsAndTheConnectionStays) {
+  delegate_.object->serve = echo();
+  listen();
+  const auto client = makeClient();
+  IPCInterface newer = testInterface();
+  newer.operations.push_back({"future", {"s"}, {"text"}, std::nullopt, {}});
+  newer.operations[0].arguments = {"u"};  // echo, in another version
+  client->setRemoteInterface(newer);
+  client->resume();
+  EXPECT_EQ(codeOf(call(*client, "future", {Value("x")})), code(IPCErrorCode::UnknownOperation));
+  EXPECT_EQ(codeOf(call(*client, "echo", {Value(uint32_t{1})})), code(IPCErrorCode::InvalidArguments));
+  EXPECT_EQ(valuesOf(call(*client, "nothing", {})), IPCArguments{});
+}
+
+TEST_F(ConnectionTest, AnObjectThatExportsNothingAnswersUnknown) {
+  listen();
+  auto connected = client_->connect("test.service");
+  ASSERT_TRUE(connected);
+  (*connected)->resume();
+  const auto server = delegate_.connections.next();
+  EXPECT_EQ(codeOf(call(*server, "notify", {Value(uint32_t{1})})), code(IPCErrorCode::UnknownOperation));
+}
+
+TEST_F(ConnectionTest, InvalidationIsToldOnceAndFailsOpenCalls) {
+  listen();
+  const auto client = connectClient();
+  Events<int64_t> failures;
+  client->call("nothing", {}, {}, [&](const Error& error) { failures.add(error.code); });
+  const Call open = delegate_.object->calls.next();
+  client->invalidate();
+  client->invalidate();
+  EXPECT_EQ(failures.next(), code(IPCErrorCode::ConnectionInvalid));
+  EXPECT_EQ(clientEnded_.next(), "invalidated");
+  EXPECT_EQ(delegate_.ended.next(), "invalidated");
+  EXPECT_EQ(codeOf(call(*client, "nothing", {})), code(IPCErrorCode::ConnectionInvalid));
+  open.reply({});
+  EXPECT_EQ(codeOf(call(*open.connection, "notify", {Value(uint32_t{1})})), code(IPCErrorCode::ConnectionInvalid));
+  EXPECT_TRUE(clientEnded_.isEmpty());
+  EXPECT_TRUE(delegate_.ended.isEmpty());
+  EXPECT_TRUE(failures.isEmpty());
+}
+
+TEST_F(ConnectionTest, ClearedHandlersAreNotCalled) {
+  listen();
+  const auto client = connectClient();
+  const auto server = delegate_.connections.next();
+  queue_->sync([&] {
+    client->setInvalidationHandler(nullptr);
+    client->setInterruptionHandler(nullptr);
+    client->invalidate();
+  });
+  EXPECT_EQ(delegate_.ended.next(), "invalidated");
+  queue_->sync([] {});
+  EXPECT_TRUE(clientEnded_.isEmpty());
+}
+
+TEST_F(ConnectionTest, ALostNamedServiceIsAnInterruptionAndCanBeConnectedAnew) {
+  delegate_.object->serve = echo();
+  listen();
+  const auto client = connectClient();
+  EXPECT_EQ(valuesOf(call(*client, "nothing", {})), IPCArguments{});
+  delegate_.connections.next()->invalidate();
+  EXPECT_EQ(clientEnded_.next(), "interrupted");
+  EXPECT_EQ(codeOf(call(*client, "nothing", {})), code(IPCErrorCode::ConnectionInvalid));
+  client->invalidate();
+  const auto again = connectClient();
+  EXPECT_EQ(valuesOf(call(*again, "nothing", {})), IPCArguments{});
+  EXPECT_TRUE(clientEnded_.isEmpty());
+}
+
+TEST_F(ConnectionTest, TheLastMessagesBeforeAnInvalidationArrive) {
+  listen();
+  constexpr uint32_t kMessages = 200;
+  for (int round = 0; round < 20; ++round) {
+    const auto client = connectClient();
+    const auto server = delegate_.connections.next();
+    for (uint32_t i = 0; i < kMessages; ++i) {
+      client->call("notify", {Value(i)}, {}, {});
+      // The peer sends too: its failing writes must not cost what it has not read yet.
+      server->call("sample", {Value(i), Value(Data(100))}, {}, {});
+    }
+    client->invalidate();
+    for (uint32_t i = 0; i < kMessages; ++i) EXPECT_EQ(delegate_.object->calls.next().arguments[0], Value(i));
+    EXPECT_EQ(delegate_.ended.next(), "invalidated");
+  }
+}
+
+TEST_F(ConnectionTest, DroppingTheLastReferenceEndsTheConnectionSilently) {
+  listen();
+  auto client = connectClient();
+  Events<int64_t> failures;
+  client->call("nothing", {}, {}, [&](const Error& error) { failures.add(error.code); });
+  delegate_.object->calls.next();
+  client.reset();
+  EXPECT_EQ(failures.next(), code(IPCErrorCode::ConnectionInvalid));
+  EXPECT_EQ(delegate_.ended.next(), "invalidated");
+  EXPECT_TRUE(clientEnded_.isEmpty());
+}
+
+TEST_F(ConnectionTest, HandlersRunOnTheTargetQueueOneAtATime) {
+  std::atomic<int> running{0};
+  std::atomic<int> handled{0};
+  Events<bool> done;
+  SerialQueue serverQueue("server");
+  delegate_.object->serve = echo();
+  clientObject_->serve = [&](const Call&) {
+    EXPECT_TRUE(queue_->isOnQueue());
+    EXPECT_EQ(++running, 1);
+    --running;
+    if (++handled == 500) done.add(true);
+  };
+  listen();
+  const auto client = connectClient();
+  const auto server = delegate_.connections.next();
+  std::vector<std::thread> threads;
+  for (int t = 0; t < 5; ++t) {
+    threads.emplace_back([&] {
+      for (uint32_t i = 0; i < 100; ++i) server->call("notify", {Value(i)}, {}, {});
+    });
+  }
+  for (auto& thread : threads) thread.join();
+  done.next();
+}
+
+}  // namespace
+}  // namespace qv::platform::test

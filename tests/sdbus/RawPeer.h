@@ -1,0 +1,90 @@
+#pragma once
+
+#include <gtest/gtest.h>
+#include <sys/socket.h>
+#include <sys/un.h>
+#include <unistd.h>
+
+#include <cstdint>
+#include <cstring>
+#include <string>
+
+#include "platform/FileDescriptor.h"
+
+namespace qv::platform::test {
+
+/// A D-Bus method call in bytes, for peers that no library would make.
+inline std::string rawCall(const std::string& interface, const std::string& member, const std::string& signature,
+                           const std::string& body, uint8_t flags = 0,
+                           const std::string& path = "/com/tarnwick/quorveld", uint32_t unixFDs = 0) {
+  const auto number = [](uint32_t value) { return std::string(reinterpret_cast<const char*>(&value), 4); };
+  std::string fields;
+  const auto field = [&](char code, char type, const std::string& value) {
+    while (fields.size() % 8 != 0) fields += '\0';
+    fields += code;
+    fields += std::string{'\1', type, '\0'};
+    if (type == 'u') {
+      fields += value;
+    } else {
+      fields += type == 'g' ? std::string(1, static_cast<char>(value.size())) : number(uint32_t(value.size()));
+      fields += value + '\0';
+    }
+  };
+  field(1, 'o', path);
+  field(2, 's', interface);
+  field(3, 's', member);
+  if (!signature.empty()) field(8, 'g', signature);
+  if (unixFDs > 0) field(9, 'u', number(unixFDs));
+  std::string message = std::string{'l', '\1', static_cast<char>(flags), '\1'} + number(uint32_t(body.size())) +
+                        number(1) + number(uint32_t(fields.size())) + fields;
+  while (message.size() % 8 != 0) message += '\0';
+  return message + body;
+}
+
+/// A client that speaks by hand, and reads only when told to.
+class RawPeer {
+ public:
+  explicit RawPeer(const std::string& path) : socket_(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0)) {
+    sockaddr_un address{};
+    address.sun_family = AF_UNIX;
+    path.copy(address.sun_path, sizeof address.sun_path - 1);
+    EXPECT_EQ(::connect(socket_.get(), reinterpret_cast<sockaddr*>(&address), sizeof address), 0);
+  }
+  void authenticate() {
+    std::string uid;
+    for (const char digit : std::to_string(::getuid())) {
+      uid += '3';
+      uid += digit;
+    }
+    using namespace std::string_literals;
+    send("\0AUTH EXTERNAL "s + uid + "\r\nNEGOTIATE_UNIX_FD\r\nBEGIN\r\n");
+  }
+  bool send(const std::string& bytes) {
+    return ::send(socket_.get(), bytes.data(), bytes.size(), MSG_NOSIGNAL) == static_cast<ssize_t>(bytes.size());
+  }
+  /// Sends `bytes` again and again until the other side takes no more for now, or has taken
+  /// `most`; answers how much it took.
+  size_t flood(const std::string& bytes, size_t most) {
+    const timeval patience{1, 0};
+    ::setsockopt(socket_.get(), SOL_SOCKET, SO_SNDTIMEO, &patience, sizeof patience);
+    size_t sent = 0;
+    while (sent < most && send(bytes)) sent += bytes.size();
+    return sent;
+  }
+  /// Reads until `text` has come; false when the connection ends first.
+  bool readUntil(const std::string& text) {
+    char buffer[4096];
+    while (received_.find(text) == std::string::npos) {
+      const ssize_t size = ::read(socket_.get(), buffer, sizeof buffer);
+      if (size <= 0) return false;
+      received_.append(buffer, static_cast<size_t>(size));
+    }
+    return true;
+  }
+
+ private:
+  FileDescriptor socket_;
+  std::string received_;
+};
+
+}  // namespace qv::platform::test

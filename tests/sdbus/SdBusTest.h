@@ -1,0 +1,198 @@
+#pragma once
+
+#include <gtest/gtest.h>
+
+#include <chrono>
+#include <condition_variable>
+#include <cstdlib>
+#include <deque>
+#include <filesystem>
+#include <functional>
+#include <memory>
+#include <mutex>
+#include <string>
+#include <thread>
+#include <variant>
+#include <vector>
+
+#include "platform/sdbus/SdBusIPC.h"
+#include "tests/sdbus/TestInterface.h"
+
+namespace qv::platform::test {
+
+/// How long a test waits before it says that something never came; far beyond any slow machine.
+inline constexpr std::chrono::seconds kNever{60};
+
+/// Events in the order in which they came, from any thread.
+///
+/// Threading: thread-safe.
+template <typename Event>
+class Events {
+ public:
+  void add(Event event) {
+    std::lock_guard lock(mutex_);
+    events_.push_back(std::move(event));
+    changed_.notify_all();
+  }
+  /// Takes the next one; a failure and an empty one when none comes.
+  Event next() {
+    std::unique_lock lock(mutex_);
+    if (!changed_.wait_for(lock, kNever, [this] { return !events_.empty(); })) {
+      ADD_FAILURE() << "no event came";
+      return Event();
+    }
+    Event event = std::move(events_.front());
+    events_.pop_front();
+    return event;
+  }
+  bool isEmpty() const {
+    std::lock_guard lock(mutex_);
+    return events_.empty();
+  }
+  size_t count() const {
+    std::lock_guard lock(mutex_);
+    return events_.size();
+  }
+
+ private:
+  mutable std::mutex mutex_;
+  std::condition_variable changed_;
+  std::deque<Event> events_;
+};
+
+struct Call {
+  std::string member;
+  IPCArguments arguments;
+  IPCReply reply;
+  std::shared_ptr<IPCConnection> connection;
+};
+
+/// An exported object that records calls, or serves them by `serve`.
+class FakeObject final : public IPCExportedObject {
+ public:
+  void handleCall(const std::shared_ptr<IPCConnection>& connection, const IPCOperation& operation,
+                  IPCArguments arguments, IPCReply reply) override {
+    if (serve) {
+      serve({operation.member, std::move(arguments), std::move(reply), connection});
+    } else {
+      calls.add({operation.member, std::move(arguments), std::move(reply), connection});
+    }
+  }
+  std::function<void(Call)> serve;  ///< set before the connection is resumed
+  Events<Call> calls;
+};
+
+/// Accepts every connection, with `object` exported, and keeps it.
+class FakeDelegate final : public IPCListenerDelegate {
+ public:
+  bool listenerShouldAcceptNewConnection(IPCListener&, const std::shared_ptr<IPCConnection>& connection) override {
+    if (!accepts) {
+      refused.add(true);
+      return false;
+    }
+    connection->setExportedInterface(testInterface(), object);
+    connection->setRemoteInterface(testInterface());
+    connection->setInvalidationHandler([this] { ended.add("invalidated"); });
+    connection->setInterruptionHandler([this] { ended.add("interrupted"); });
+    connection->resume();
+    connections.add(connection);
+    return true;
+  }
+  bool accepts = true;
+  std::shared_ptr<FakeObject> object = std::make_shared<FakeObject>();
+  Events<std::shared_ptr<IPCConnection>> connections;
+  Events<std::string> ended;
+  Events<bool> refused;
+};
+
+/// A daemon's service object and a client's, talking over a socket in a directory of the test's own.
+class SdBusTest : public ::testing::Test {
+ protected:
+  explicit SdBusTest(SdBusIPCOptions options = {}) {
+    char name[] = "/tmp/qv-sdbus-XXXXXX";
+    directory_ = ::mkdtemp(name);
+    options.runtimeDirectory = directory_;
+    server_ = std::make_unique<SdBusIPCService>(resolver(), options);
+    client_ = std::make_unique<SdBusIPCService>(IPCPeerResolver(), options);
+    queue_ = std::make_unique<SerialQueue>("test");
+  }
+  ~SdBusTest() override {
+    listener_.reset();
+    client_.reset();
+    server_.reset();
+    // Whatever is still queued for the fakes runs while they live.
+    queue_->sync([] {});
+    std::filesystem::remove_all(directory_);
+  }
+
+  static IPCPeerResolver resolver() {
+    return [](IPCPeer& peer) {
+      peer.bundleIdentifier = "com.example.pid" + std::to_string(peer.processIdentifier);
+      peer.entitlements["com.example.allowed"] = Value(true);
+    };
+  }
+
+  void listen() {
+    listener_ = server_->createListener("test.service");
+    listener_->setDelegate(&delegate_, *queue_);
+    const auto error = listener_->resume();
+    ASSERT_FALSE(error) << error->description();
+  }
+
+  /// A client's connection, configured but not resumed.
+  std::shared_ptr<IPCConnection> makeClient() {
+    auto connection = client_->connect("test.service");
+    EXPECT_TRUE(connection.hasValue()) << connection.error().description();
+    configure(*connection.value());
+    return connection.value();
+  }
+  void configure(IPCConnection& connection) {
+    connection.setExportedInterface(testInterface(), clientObject_);
+    connection.setRemoteInterface(testInterface());
+    connection.setInvalidationHandler([this] { clientEnded_.add("invalidated"); });
+    connection.setInterruptionHandler([this] { clientEnded_.add("interrupted"); });
+    connection.setTargetQueue(*queue_);
+  }
+  std::shared_ptr<IPCConnection> connectClient() {
+    auto connection = makeClient();
+    connection->resume();
+    return connection;
+  }
+
+  /// Calls and waits for the end; a failure as an Error.
+  using Outcome = std::variant<std::monostate, IPCArguments, Error>;
+  Outcome call(IPCConnection& connection, std::string_view member, IPCArguments arguments) {
+    auto outcomes = std::make_shared<Events<Outcome>>();
+    connection.call(
+        member, std::move(arguments), [outcomes](const IPCArguments& values) { outcomes->add(values); },
+        [outcomes](const Error& error) { outcomes->add(error); });
+    Outcome outcome = outcomes->next();
+    EXPECT_TRUE(outcomes->isEmpty()) << "a call ended twice";
+    return outcome;
+  }
+  static IPCArguments valuesOf(const Outcome& outcome) {
+    if (const auto* error = std::get_if<Error>(&outcome)) ADD_FAILURE() << error->description();
+    const auto* values = std::get_if<IPCArguments>(&outcome);
+    return values ? *values : IPCArguments();
+  }
+  static int64_t codeOf(const Outcome& outcome) {
+    const auto* error = std::get_if<Error>(&outcome);
+    return error ? error->code : 0;
+  }
+  static std::function<void(Call)> echo() {
+    return [](const Call& served) { served.reply(served.arguments); };
+  }
+
+  std::string directory_;
+  std::unique_ptr<SerialQueue> queue_;
+  FakeDelegate delegate_;
+  std::shared_ptr<FakeObject> clientObject_ = std::make_shared<FakeObject>();
+  Events<std::string> clientEnded_;
+  std::unique_ptr<SdBusIPCService> server_;
+  std::unique_ptr<SdBusIPCService> client_;
+  std::unique_ptr<IPCListener> listener_;
+};
+
+constexpr int64_t code(IPCErrorCode value) { return static_cast<int64_t>(value); }
+
+}  // namespace qv::platform::test

@@ -1,0 +1,146 @@
+#include <cstring>
+#include <future>
+
+#include "extensions/QVSharedFrameObject.h"
+#include "platform/SampleBuffer.h"
+#include "tests/sdk/RecorderFixture.h"
+
+namespace qv::client {
+namespace {
+
+using platform::AudioStreamDescription;
+using platform::Data;
+using platform::IPCArguments;
+using platform::MediaTime;
+using platform::SampleTimingInfo;
+using platform::SharedFrame;
+using platform::Value;
+using namespace std::chrono_literals;
+
+template <typename T>
+Data bytesOf(const T& record) {
+  Data bytes(sizeof(T));
+  std::memcpy(bytes.data(), &record, sizeof(T));
+  return bytes;
+}
+
+const SampleTimingInfo kTiming{MediaTime::make(1, 60), MediaTime::make(5'000'000'000, platform::kHostTimescale),
+                               MediaTime::invalid()};
+const AudioStreamDescription kFormat{.sampleRate = 44100,
+                                     .formatID = platform::kAudioFormatLinearPCM,
+                                     .formatFlags = platform::kAudioFormatFlagIsSignedInteger |
+                                                    platform::kAudioFormatFlagIsBigEndian |
+                                                    platform::kAudioFormatFlagIsPacked,
+                                     .bytesPerPacket = 2,
+                                     .framesPerPacket = 1,
+                                     .bytesPerFrame = 2,
+                                     .channelsPerFrame = 1,
+                                     .bitsPerChannel = 16,
+                                     .reserved = 0};
+
+class RecorderCapture : public RecorderFixture {
+ protected:
+  RecorderCapture() { startRecording(); }
+
+  /// Sends a 2 x 2 picture of `fill`; the future is ready when the daemon may use its memory again.
+  std::future<void> sendFrame(uint8_t fill) {
+    auto frame = *SharedFrame::create({2, 2, 8, platform::PixelFormat::BGRX});
+    for (uint8_t& byte : frame->mutableBytes()) byte = fill;
+    auto returned = std::make_shared<std::promise<void>>();
+    auto future = returned->get_future();
+    std::shared_ptr<void> hold(nullptr, [returned](void*) { returned->set_value(); });
+    const QVSharedFrameObject object(SharedFrame::withAttachment(std::move(frame), std::move(hold)));
+    tellClient("captureHandlerWithSample", {object.encodeForIPC(), bytesOf(kTiming)});
+    return future;
+  }
+};
+
+TEST_F(RecorderCapture, AFrameIsTheDaemonsMemoryUntilItIsDropped) {
+  auto returned = sendFrame(0x5a);
+  run();
+  ASSERT_EQ(frames_.size(), 1u);
+  const quorvel::VideoFrame& frame = frames_[0];
+  EXPECT_EQ(frame.width, 2u);
+  EXPECT_EQ(frame.stride, 8u);
+  ASSERT_EQ(frame.pixels.size(), 16u);
+  EXPECT_EQ(frame.pixels[15], 0x5a);
+  EXPECT_EQ(frame.presentationTime, 5s);
+  EXPECT_EQ(frame.duration, 16'666'667ns);
+  auto copy = frame;
+  frames_.clear();
+  EXPECT_EQ(returned.wait_for(0s), std::future_status::timeout);
+  copy = {};
+  EXPECT_EQ(returned.wait_for(20s), std::future_status::ready);
+}
+
+TEST_F(RecorderCapture, AnApplicationThatDoesNotKeepUpLosesTheNewest) {
+  std::vector<std::function<void()>> waiting;
+  quorvel::RecorderOptions options;
+  options.events = events();
+  options.executor = [&](std::function<void()> work) { waiting.push_back(std::move(work)); };
+  recorder_ = std::make_unique<RecorderClient>(ipc_, timers_, executor_, std::move(options));
+  recorder_->pause();
+  takeLog();
+  std::vector<std::future<void>> returned;
+  for (uint8_t i = 0; i < 5; ++i) returned.push_back(sendFrame(i));
+  run();
+  EXPECT_EQ(recorder_->droppedSamples(), 2u);
+  EXPECT_EQ(returned[3].wait_for(20s), std::future_status::ready);
+  for (auto& work : waiting) std::exchange(work, {})();
+  ASSERT_EQ(frames_.size(), 3u);
+  EXPECT_EQ(frames_[2].pixels[0], 2);
+  sendFrame(9);
+  run();
+  waiting.back()();
+  EXPECT_EQ(frames_.back().pixels[0], 9);
+  waiting.clear();
+}
+
+TEST_F(RecorderCapture, AudioCarriesItsFormatAndSource) {
+  for (const int64_t type : {2, 3})
+    tellClient("captureHandlerWithAudioSample",
+               {Data{1, 2, 3, 4}, bytesOf(kFormat), int64_t{2}, type, bytesOf(kTiming)});
+  run();
+  ASSERT_EQ(samples_.size(), 2u);
+  EXPECT_EQ(samples_[0].source, quorvel::AudioSample::Source::Application);
+  EXPECT_EQ(samples_[1].source, quorvel::AudioSample::Source::Microphone);
+  EXPECT_EQ(samples_[0].bytes, (Data{1, 2, 3, 4}));
+  EXPECT_EQ(samples_[0].frameCount, 2);
+  EXPECT_EQ(samples_[0].format.sampleRate, 44100);
+  EXPECT_EQ(samples_[0].format.channels, 1u);
+  EXPECT_TRUE(samples_[0].format.isBigEndian && samples_[0].format.isSigned && !samples_[0].format.isFloat);
+  EXPECT_EQ(samples_[0].presentationTime, 5s);
+}
+
+TEST_F(RecorderCapture, MalformedSamplesAreDropped) {
+  const Data timing = bytesOf(kTiming), format = bytesOf(kFormat);
+  SampleTimingInfo timeless = kTiming;
+  timeless.presentationTimeStamp = MediaTime::invalid();
+  AudioStreamDescription encoded = kFormat;
+  encoded.formatID = platform::kAudioFormatMPEG4AAC;
+  AudioStreamDescription empty = kFormat;
+  empty.bytesPerFrame = 0;
+  const std::vector<IPCArguments> sounds = {
+      {Data{1, 2}, format, int64_t{1}, int64_t{1}, timing},
+      {Data{1, 2}, format, int64_t{2}, int64_t{2}, timing},  // more frames than bytes
+      {Data{1, 2}, format, int64_t{-1}, int64_t{2}, timing},
+      {Data{1, 2}, format, INT64_MAX, int64_t{2}, timing},
+      {Data{1, 2}, Data(39), int64_t{1}, int64_t{2}, timing},
+      {Data{1, 2}, format, int64_t{1}, int64_t{2}, Data(71)},
+      {Data{1, 2}, format, int64_t{1}, int64_t{2}, bytesOf(timeless)},
+      {Data{1, 2}, bytesOf(encoded), int64_t{1}, int64_t{2}, timing},
+      {Data{1, 2}, bytesOf(empty), int64_t{1}, int64_t{2}, timing},
+  };
+  for (const auto& sound : sounds) tellClient("captureHandlerWithAudioSample", sound);
+  const auto notAFrame = platform::shareFileDescriptor(platform::FileDescriptor(::dup(0)));
+  tellClient("captureHandlerWithSample", {platform::Array{notAFrame, notAFrame, 2u, 2u, 8u, 1u}, timing});
+  run();
+  EXPECT_TRUE(samples_.empty());
+  EXPECT_TRUE(frames_.empty());
+  tellClient("captureHandlerWithAudioSample", {Data{1, 2}, format, int64_t{1}, int64_t{2}, timing});
+  run();
+  EXPECT_EQ(samples_.size(), 1u);
+}
+
+}  // namespace
+}  // namespace qv::client

@@ -1,0 +1,180 @@
+#include <gtest/gtest.h>
+#include <stdlib.h>
+
+#include <cstring>
+#include <filesystem>
+#include <future>
+
+#include "daemon/client/QVClientProtocol.h"
+#include "daemon/client/QVDaemonProtocol.h"
+#include "extensions/QVSharedFrameObject.h"
+#include "platform/SampleBuffer.h"
+#include "platform/sdbus/SdBusIPC.h"
+#include "sdk/client/quorvel/Recorder.h"
+#include "tests/fakes/FakeIPC.h"
+
+/// Both ends are in this process, so two threads make their first bus objects at once. libsystemd then
+/// fills one static buffer of random bytes from both, and copies it: any mixture will do.
+extern "C" const char* __tsan_default_suppressions() { return "race:libsystemd.so\n"; }
+
+namespace qv::client {
+namespace {
+
+using platform::Dictionary;
+using platform::IPCConnection;
+using platform::Value;
+using namespace std::chrono_literals;
+
+/// A value that another thread brings.
+template <typename T>
+class Awaited {
+ public:
+  void set(T value) { promise_.set_value(std::move(value)); }
+  /// Fails the test after a time that only a hang reaches.
+  std::optional<T> take() {
+    auto future = promise_.get_future();
+    if (future.wait_for(30s) != std::future_status::ready) {
+      ADD_FAILURE() << "nothing came";
+      return std::nullopt;
+    }
+    return future.get();
+  }
+
+ private:
+  std::promise<T> promise_;
+};
+
+/// The library as applications get it, over a real socket, with a daemon of the test's in this process.
+class RecorderSocket : public ::testing::Test, protected platform::IPCListenerDelegate {
+ protected:
+  RecorderSocket() {
+    char directory[] = "/tmp/quorvel-test-XXXXXX";
+    directory_ = ::mkdtemp(directory);
+    ::setenv("XDG_RUNTIME_DIR", directory_.c_str(), 1);
+  }
+  ~RecorderSocket() override {
+    recorder_.reset();
+    stopDaemon();
+    std::filesystem::remove_all(directory_);
+  }
+  void startDaemon() {
+    service_ = std::make_unique<platform::SdBusIPCService>();
+    listener_ = service_->createListener(kServiceName);
+    listener_->setDelegate(this, queue_);
+    const auto error = listener_->resume();
+    ASSERT_FALSE(error) << error->description();
+  }
+  void stopDaemon() {
+    if (listener_) listener_->invalidate();
+    queue_.sync([this] {
+      if (daemonEnd_) daemonEnd_->invalidate();
+      daemonEnd_.reset();
+    });
+    listener_.reset();
+    service_.reset();
+  }
+  bool listenerShouldAcceptNewConnection(platform::IPCListener&,
+                                         const std::shared_ptr<IPCConnection>& connection) override {
+    connection->setExportedInterface(daemonProtocol(), daemon_);
+    connection->setRemoteInterface(clientProtocol());
+    connection->resume();
+    daemonEnd_ = connection;
+    return true;
+  }
+  std::shared_ptr<IPCConnection> daemonEnd() {
+    return queue_.syncResult<std::shared_ptr<IPCConnection>>([this] { return daemonEnd_; });
+  }
+  void startRecording() {
+    Awaited<quorvel::StartResult> started;
+    recorder_->start({.windows = {42}, .width = 4, .height = 4, .capture = true},
+                     [&](quorvel::StartResult result) { started.set(std::move(result)); });
+    const auto call = daemon_->takeCall();
+    ASSERT_EQ(call.arguments.size(), 8u);
+    EXPECT_EQ(call.arguments[0], Value(platform::Array{42u}));
+    call.reply({Dictionary(), false, false});
+    const auto result = started.take();
+    ASSERT_TRUE(result);
+    EXPECT_FALSE(result->error);
+  }
+
+  std::string directory_;
+  platform::SerialQueue queue_{"test daemon"};
+  const std::shared_ptr<fakes::RecordingExportedObject> daemon_ = std::make_shared<fakes::RecordingExportedObject>();
+  std::unique_ptr<platform::SdBusIPCService> service_;
+  std::unique_ptr<platform::IPCListener> listener_;
+  std::shared_ptr<IPCConnection> daemonEnd_;
+  std::unique_ptr<quorvel::Recorder> recorder_;
+};
+
+TEST_F(RecorderSocket, RecordsCapturesAndStops) {
+  startDaemon();
+  Awaited<quorvel::VideoFrame> arrived;
+  quorvel::RecorderOptions options;
+  options.events.videoFrame = [&](quorvel::VideoFrame frame) { arrived.set(std::move(frame)); };
+  recorder_ = quorvel::Recorder::create(std::move(options));
+  startRecording();
+
+  auto pixels = *platform::SharedFrame::create({4, 4, 16, platform::PixelFormat::BGRX});
+  std::memset(pixels->mutableBytes().data(), 0x77, 64);
+  Awaited<bool> returned;
+  std::shared_ptr<void> hold(nullptr, [&](void*) { returned.set(true); });
+  platform::SampleTimingInfo timing;
+  timing.presentationTimeStamp = platform::MediaTime::make(3, 2);
+  platform::Data timingData(sizeof timing);
+  std::memcpy(timingData.data(), &timing, sizeof timing);
+  daemonEnd()->call(
+      "captureHandlerWithSample",
+      {QVSharedFrameObject(platform::SharedFrame::withAttachment(std::move(pixels), std::move(hold))).encodeForIPC(),
+       timingData},
+      {}, {});
+  hold.reset();
+  auto frame = arrived.take();
+  ASSERT_TRUE(frame);
+  EXPECT_EQ(frame->pixels[63], 0x77);
+  EXPECT_EQ(frame->presentationTime, 1500ms);
+  EXPECT_EQ(frame->duration, std::nullopt);
+  frame.reset();
+  EXPECT_TRUE(returned.take()) << "the frame came back to the daemon";
+
+  Awaited<quorvel::StopResult> stopped;
+  recorder_->stop([&](quorvel::StopResult result) { stopped.set(std::move(result)); });
+  EXPECT_EQ(daemon_->takeCall().member, "stopRecordingWithHandler");
+  const auto result = stopped.take();
+  ASSERT_TRUE(result);
+  ASSERT_TRUE(result->error) << "the daemon let the call go unanswered";
+  EXPECT_EQ(result->error->code, quorvel::kErrorUnknown);
+  EXPECT_NE(result->error->text.find("NoReply"), std::string::npos) << result->error->text;
+}
+
+TEST_F(RecorderSocket, ADeadDaemonIsToldOnceAndFoundAgain) {
+  startDaemon();
+  Awaited<quorvel::StopResult> ended;
+  Awaited<bool> interrupted, backAgain;
+  int connections = 0;
+  quorvel::RecorderOptions options;
+  options.events.stopped = [&](quorvel::StopResult result) { ended.set(std::move(result)); };
+  options.events.interrupted = [&] { interrupted.set(true); };
+  options.events.connected = [&] {
+    if (++connections == 2) backAgain.set(true);
+  };
+  recorder_ = quorvel::Recorder::create(std::move(options));
+  startRecording();
+  Awaited<quorvel::StateResult> state;
+  recorder_->currentState([&](quorvel::StateResult result) { state.set(std::move(result)); });
+  const auto unanswered = daemon_->takeCall();
+  stopDaemon();
+  EXPECT_EQ(state.take()->error->code, quorvel::kErrorConnectionInterrupted);
+  EXPECT_EQ(ended.take()->error->code, quorvel::kErrorConnectionInterrupted);
+  EXPECT_TRUE(interrupted.take());
+  Awaited<quorvel::Error> refused;
+  recorder_->pause([&](quorvel::Error error) { refused.set(std::move(error)); });
+  EXPECT_EQ(refused.take()->code, quorvel::kErrorConnectionInvalid);
+
+  recorder_->keepConnected(true);
+  startDaemon();
+  EXPECT_TRUE(backAgain.take());
+  startRecording();
+}
+
+}  // namespace
+}  // namespace qv::client

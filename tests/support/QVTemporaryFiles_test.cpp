@@ -1,0 +1,168 @@
+#include "support/QVTemporaryFiles.h"
+
+#include <cerrno>
+#include <vector>
+
+#include "tests/support/SupportTest.h"
+
+namespace qv {
+namespace {
+
+using fakes::FakeClock;
+using fakes::FakeFileSystem;
+using platform::Error;
+using platform::URL;
+using Operation = FakeFileSystem::Operation;
+
+constexpr const char kStore[] = "/root/private/var/mobile/Library/Quorvel";
+constexpr const char kAgeingError[] = "error in _qvRemoveFile_srDeleteFilesOlderThanTimeToLiveInSeconds, error code: ";
+
+class TemporaryFilesTest : public SupportTest {
+ protected:
+  void addFile(const std::string& name, uint64_t size, double age = 0) {
+    disk_.addFileOfSize(path(name), size, {FakeClock::kStart - age});
+  }
+  static std::string path(const std::string& name) { return std::string(kStore) + "/" + name; }
+  bool exists(const std::string& name) { return disk_.itemExists(path(name)); }
+};
+
+TEST_F(TemporaryFilesTest, SetupMakesTheDirectoryOnceAndSurvivesFailure) {
+  disk_.addDirectory("/root/private/var/mobile/Library");
+  _srSetupTempDirectory();
+  EXPECT_TRUE(disk_.itemExists(kStore));
+  _srSetupTempDirectory();
+  EXPECT_EQ(disk_.events().size(), 1u);
+
+  disk_.addFile("/other/private/var/mobile/Library/Quorvel", "a plain file in the way");
+  platform_.deviceRoot = "/other";
+  _srSetupTempDirectory();
+  EXPECT_EQ(disk_.events().size(), 1u);
+  EXPECT_EQ(log_.texts(), std::vector<std::string>(3, "_srSetupTempDirectory"));
+
+  platform_.deviceRoot = "/without/parents";
+  log_.clear();
+  _srSetupTempDirectory();
+  ASSERT_EQ(log_.lines().size(), 3u);
+  EXPECT_EQ(log_.lines()[1].channel, platform::LogChannel::Console);
+  EXPECT_TRUE(log_.lines()[1].text.starts_with("error: posix 2"));
+  EXPECT_EQ(log_.lines()[2].text, "error creating temp directory");
+}
+
+TEST_F(TemporaryFilesTest, OnlyStrictlyOlderEntriesAgeOut) {
+  addFile("old.mp4", 100, 86400.5);
+  addFile("limit.mp4", 10, 86400.0);
+  addFile("new.mp4", 1, 5);
+  EXPECT_EQ(_srDeleteFilesOlderThanTimeToLiveInSeconds(86400.0), 100);
+  EXPECT_FALSE(exists("old.mp4"));
+  EXPECT_TRUE(exists("limit.mp4"));
+  EXPECT_TRUE(exists("new.mp4"));
+  EXPECT_EQ(log_.texts(),
+            (std::vector<std::string>{"_srDeleteFilesOlderThanTimeToLiveInSeconds: 86400", "deleting old file"}));
+}
+
+TEST_F(TemporaryFilesTest, DeletingAllCountsOnlyWhatWasRemoved) {
+  addFile("future.mp4", 7, -50);  // the clock was set back since
+  addFile("stuck.mp4", 1000, 50);
+  disk_.addDirectory(path("folder"), 4096);
+  disk_.addFileOfSize(path("folder/inner.mp4"), 5);
+  addFile("nameless.mp4", 300);
+  disk_.failOn(Operation::Remove, path("stuck.mp4"), EBUSY);
+  disk_.failOn(Operation::Attributes, path("nameless.mp4"), EIO);
+  EXPECT_EQ(_srDeleteAllTempFiles(), 7 + 4096);
+  EXPECT_TRUE(exists("stuck.mp4"));
+  EXPECT_FALSE(exists("folder/inner.mp4"));
+  EXPECT_FALSE(exists("nameless.mp4"));
+  EXPECT_EQ(log_.count(kAgeingError + std::to_string(EBUSY)), 1u);
+  EXPECT_EQ(log_.count(kAgeingError + std::to_string(EIO)), 1u);
+  EXPECT_EQ(log_.countContaining("error = posix"), 2u);
+}
+
+TEST_F(TemporaryFilesTest, AnEntryOfUnknownAgeStaysWhileOthersAgeOut) {
+  addFile("unknown.mp4", 300, 1e6);
+  addFile("old.mp4", 20, 1e6);
+  disk_.failOn(Operation::Attributes, path("unknown.mp4"), EIO);
+  EXPECT_EQ(_srDeleteFilesOlderThanTimeToLiveInSeconds(1.9), 20);
+  EXPECT_TRUE(exists("unknown.mp4"));
+  EXPECT_TRUE(log_.contains("_srDeleteFilesOlderThanTimeToLiveInSeconds: 1"));
+}
+
+TEST_F(TemporaryFilesTest, AMissingDirectoryIsReportedOnceAndHoldsNothing) {
+  EXPECT_EQ(_srDeleteAllTempFiles(), 0);
+  EXPECT_EQ(log_.count(kAgeingError + std::to_string(ENOENT)), 1u);
+  std::optional<Error> error;
+  EXPECT_EQ(_srSizeOfTempDir(&error), 0);
+  ASSERT_TRUE(error);
+  EXPECT_EQ(error->code, ENOENT);
+  EXPECT_EQ(_srDeviceFreeDiskSpace(), 0u);
+  EXPECT_FALSE(_srDeviceHasSufficientFreeSpaceForRecording());
+}
+
+TEST_F(TemporaryFilesTest, TheSizeIsThatOfTheDirectoryEntryAlone) {
+  disk_.addDirectory(kStore, 4096);
+  addFile("big.mp4", 1'000'000);
+  EXPECT_EQ(_srSizeOfTempDir(nullptr), 4096);
+}
+
+TEST_F(TemporaryFilesTest, FreeSpaceMustExceedTheThreshold) {
+  disk_.addDirectory(kStore);
+  disk_.setFreeSize(100'000'000);
+  EXPECT_FALSE(_srDeviceHasSufficientFreeSpaceForRecording());
+  disk_.setFreeSize(100'000'001);
+  EXPECT_TRUE(_srDeviceHasSufficientFreeSpaceForRecording());
+}
+
+TEST_F(TemporaryFilesTest, RemovingAFileWorksInTheBackgroundAndToleratesAMissingOne) {
+  addFile("clip 1.mp4", 1);
+  addFile("stuck.mp4", 1);
+  disk_.failOn(Operation::Remove, path("stuck.mp4"), EBUSY);
+  std::vector<int64_t> codes;
+  const auto record = [&](const std::optional<Error>& error) { codes.push_back(error ? error->code : 0); };
+  _srRemoveFile(URL::fileURL(path("clip 1.mp4")), record);
+  _srRemoveFile(URL::fileURL(path("missing.mp4")), record);
+  _srRemoveFile(URL::fileURL(path("stuck.mp4")), record);
+  _srRemoveFile(URL::fileURL(path("missing.mp4")), nullptr);
+  EXPECT_TRUE(exists("clip 1.mp4"));
+  background_.runUntilIdle();
+  EXPECT_FALSE(exists("clip 1.mp4"));
+  EXPECT_EQ(codes, (std::vector<int64_t>{0, 0, EBUSY}));
+  EXPECT_EQ(log_.texts(), std::vector<std::string>{"_qvRemoveFile error: " + std::to_string(EBUSY)});
+}
+
+TEST_F(TemporaryFilesTest, MovingReplacesTheDestination) {
+  addFile("from.mp4", 1);
+  addFile("to.mp4", 2);
+  std::vector<int64_t> codes;
+  const auto move = [&] {
+    _srMoveFileFromURL(URL::fileURL(path("from.mp4")), URL::fileURL(path("to.mp4")),
+                       [&](const std::optional<Error>& error) { codes.push_back(error ? error->code : 0); });
+    global_.runUntilIdle();
+  };
+  move();
+  EXPECT_FALSE(exists("from.mp4"));
+  EXPECT_EQ(disk_.attributesOfItem(path("to.mp4")).value().size, 1u);
+  move();
+  EXPECT_EQ(codes, (std::vector<int64_t>{0, ENOENT}));
+  EXPECT_EQ(log_.texts(), std::vector<std::string>{"_qvMoveFileFromURL error: " + std::to_string(ENOENT)});
+}
+
+TEST_F(TemporaryFilesTest, DeletingByPrefixGoesOnAfterAFailure) {
+  for (const char* name : {"Clip_1.mp4", "clip2.mp4", "myclip.mp4", "clip3.mp4", "cli"}) addFile(name, 1);
+  disk_.failOn(Operation::Remove, path("clip2.mp4"), EBUSY);
+  _srDeleteFilesWithPrefix("clip");
+  global_.runUntilIdle();
+  EXPECT_EQ(disk_.contentsOfDirectory(kStore).value(), (std::vector<std::string>{"clip2.mp4", "myclip.mp4", "cli"}));
+  platform_.deviceRoot = "/nowhere";
+  _srDeleteFilesWithPrefix("clip");
+  global_.runUntilIdle();
+  EXPECT_EQ(log_.texts(), (std::vector<std::string>{"_qvDeleteFilesWithPrefix error: " + std::to_string(EBUSY),
+                                                    "_qvDeleteFilesWithPrefix error: " + std::to_string(ENOENT)}));
+}
+
+TEST_F(TemporaryFilesTest, CreationDateComesFromTheAttributes) {
+  disk_.addFile(path("a.mp4"), "x", {200}, platform::Date{100});
+  EXPECT_EQ(_srGetCreationDateForFile(URL::fileURL(path("a.mp4"))), platform::Date{100});
+  EXPECT_EQ(_srGetCreationDateForFile(URL::fileURL(path("b.mp4"))), std::nullopt);
+}
+
+}  // namespace
+}  // namespace qv

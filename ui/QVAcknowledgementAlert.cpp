@@ -1,0 +1,77 @@
+#include "ui/QVAcknowledgementAlert.h"
+
+#include "platform/Log.h"
+#include "platform/Platform.h"
+#include "support/QVExtensions.h"
+
+namespace qv {
+
+using platform::UserAlertAnswer;
+using platform::UserAlertRequest;
+namespace logs = platform::logs;
+
+namespace {
+
+std::string text(const char* key) { return _qvLocalizedStringFromFrameworkBundleWithKey(key).value_or(key); }
+
+/// Puts `argument` in place of the format's one "%@".
+std::string formatted(std::string format, const std::string& argument) {
+  const size_t position = format.find("%@");
+  if (position != std::string::npos) format.replace(position, 2, argument);
+  return format;
+}
+
+UserAlertRequest buildAlert(const AcknowledgementRequest& request) {
+  const std::string name = _qvLocalizedAppNameFromBundleID(request.bundleID).value_or(request.bundleID);
+  UserAlertRequest alert;
+  alert.header =
+      formatted(text(request.capture ? "ACKNOWLEDGEMENT_CAPTURE_ALERT_TITLE" : "ACKNOWLEDGEMENT_ALERT_TITLE"), name);
+  alert.message = text(request.capture ? "ACKNOWLEDGEMENT_CAPTURE_ALERT_BODY_TV" : "ACKNOWLEDGEMENT_ALERT_BODY_TV");
+  if (request.camera || request.microphone) {
+    alert.message +=
+        " " + text(request.camera ? "ACKNOWLEDGEMENT_ALERT_BODY_CAMERA" : "ACKNOWLEDGEMENT_ALERT_BODY_MIC");
+    alert.alternateButton =
+        text(request.camera ? "ACKNOWLEDGEMENT_ALERT_ACCEPT_BUTTON_1_CAMERA" : "ACKNOWLEDGEMENT_ALERT_ACCEPT_BUTTON_1");
+    alert.otherButton = text("ACKNOWLEDGEMENT_ALERT_ACCEPT_BUTTON_2");
+    alert.defaultButton = text("ACKNOWLEDGEMENT_ALERT_DECLINE_BUTTON");
+  } else {
+    alert.defaultButton = text("ACKNOWLEDGEMENT_ALERT_ACCEPT_BUTTON_1_MICROPHONE_DISABLED");
+    alert.otherButton = text("ACKNOWLEDGEMENT_ALERT_DECLINE_BUTTON");
+  }
+  if (const auto framework = _qvFrameworkBundle()) alert.localizationPath = framework->path();
+  return alert;
+}
+
+AcknowledgementAnswer acceptedWithout(const AcknowledgementRequest& request) {
+  QV_LOG(logs::kUI, "%s",
+         request.camera ? "user acknowledged recording, but camera recording is disabled"
+                        : "user acknowledged recording, but microphone recording is disabled");
+  return {true, false, false};
+}
+
+AcknowledgementAnswer interpret(const AcknowledgementRequest& request, UserAlertAnswer answer) {
+  const bool threeButtons = request.camera || request.microphone;
+  const UserAlertAnswer without = threeButtons ? UserAlertAnswer::Other : UserAlertAnswer::Default;
+  if (answer == without) return acceptedWithout(request);
+  if (threeButtons && answer == UserAlertAnswer::Alternate) {
+    QV_LOG(logs::kUI, "user acknowledged recording");
+    return {true, request.microphone, request.camera};
+  }
+  QV_LOG(logs::kUI, "user refused recording");
+  return {};
+}
+
+}  // namespace
+
+std::unique_ptr<platform::UserAlert> presentAcknowledgementAlert(const AcknowledgementRequest& request,
+                                                                 std::function<void(AcknowledgementAnswer)> handler) {
+  auto alert = platform::Platform::current().userAlerts->present(
+      buildAlert(request), [request, handler](UserAlertAnswer answer) { handler(interpret(request, answer)); });
+  if (!alert) {
+    QV_LOG_ERROR(logs::kUI, "error showing acknowledgement alert");
+    handler({});
+  }
+  return alert;
+}
+
+}  // namespace qv

@@ -1,0 +1,111 @@
+#include "writer/QVMovieWriter.h"
+
+#include "platform/Log.h"
+#include "support/QVTemporaryFiles.h"
+
+namespace qv {
+
+using platform::AssetWriterStatus;
+using platform::MediaTime;
+using platform::SampleBufferRef;
+using platform::URL;
+namespace logs = platform::logs;
+
+QVMovieWriter::QVMovieWriter(platform::Size windowSize, std::string outputPath)
+    : windowSize_(windowSize),
+      outputPath_(std::move(outputPath)),
+      movieWriterQueue_("com.tarnwick.Quorvel.QVMovieWriterQueue", *platform::Platform::current().globalQueue) {}
+
+void QVMovieWriter::setBroadcastConfig(std::optional<QVBroadcastConfiguration> configuration) {
+  broadcastConfig_ = std::move(configuration);
+}
+
+void QVMovieWriter::startWritingHandler(std::function<void()> handler) {
+  movieWriterQueue_.async(
+      [self = shared_from_this(), handler = std::move(handler)] { self->dispatchedStartWritingHandler(handler); });
+}
+
+void QVMovieWriter::dispatchedStartWritingHandler(const std::function<void()>& handler) {
+  QV_LOG(logs::kWriter, "QVMovieWriter: startWritingHandler");
+  _srRemoveFile(outputURL(), [self = shared_from_this(), handler](const auto&) {
+    // On the writer's queue, so that a finish which came meanwhile cannot overlap.
+    self->movieWriterQueue_.sync([&] { self->dispatchedSetupAssetWriter(); });
+    if (handler) handler();
+  });
+}
+
+void QVMovieWriter::setupAssetWriter() {
+  movieWriterQueue_.sync([this] { dispatchedSetupAssetWriter(); });
+}
+
+bool QVMovieWriter::appendVideoSampleBuffer(const SampleBufferRef& sample, const platform::AffineTransform& transform) {
+  return movieWriterQueue_.syncResult<bool>([&] { return dispatchedAppendVideoSampleBuffer(sample, transform); });
+}
+
+void QVMovieWriter::appendAudio1SampleBuffer(const SampleBufferRef& sample) {
+  movieWriterQueue_.sync([&] { dispatchedAppendAudio1SampleBuffer(sample); });
+}
+
+void QVMovieWriter::appendAudio2SampleBuffer(const SampleBufferRef& sample) {
+  movieWriterQueue_.sync([&] { dispatchedAppendAudio2SampleBuffer(sample); });
+}
+
+void QVMovieWriter::finishWritingWithHandler(FinishHandler handler) {
+  movieWriterQueue_.async([self = shared_from_this(), handler = std::move(handler)]() mutable {
+    self->dispatchedFinishWritingWithHandler(std::move(handler));
+  });
+}
+
+void QVMovieWriter::notifyRecordingMayBeStopped() {
+  trimVideoPresentationTime_.store(video_.lastPresentationTime.load());
+}
+
+void QVMovieWriter::notifyRecordingResumed() { trimVideoPresentationTime_.store(MediaTime::invalid()); }
+
+AssetWriterStatus QVMovieWriter::status() const {
+  return assetWriter_ ? assetWriter_->status() : AssetWriterStatus::Unknown;
+}
+
+void QVMovieWriter::dispatchedFinishWritingWithHandler(FinishHandler handler) {
+  if (isFinishingWriting_) return;
+  isFinishingWriting_ = true;
+  video_.queue.reset();
+  audio1_.queue.reset();
+  audio2_.queue.reset();
+  QV_LOG(logs::kWriter, "QVMovieWriter: finishWritingWithHandler: status = %i", static_cast<int>(status()));
+  if (!didProcessFirstSample_) {
+    QV_LOG(logs::kWriter, "QVMovieWriter: finishWritingWithHandler: first sample buffer was not processed or appended");
+    if (handler) handler(std::nullopt);
+  } else if (status() != AssetWriterStatus::Writing) {
+    finishNotWriting(handler);
+  } else {
+    finishFile(std::move(handler));
+  }
+}
+
+void QVMovieWriter::finishNotWriting(const FinishHandler& handler) {
+  std::optional<URL> url;
+  if (assetWriter_) {
+    QV_LOG(logs::kWriter, "not writing, returning video url set on assetwriter (most likely nil)");
+    const auto error = assetWriter_->error();
+    QV_LOG_ERROR(logs::kWriter, "asset writer error = %i", error ? static_cast<int>(error->code) : 0);
+    url = assetWriter_->outputURL();
+  }
+  if (handler) handler(url);
+  didProcessFirstSample_ = false;
+}
+
+void QVMovieWriter::finishFile(FinishHandler handler) {
+  const MediaTime end = trimVideoPresentationTime_.exchange(MediaTime::invalid());
+  if (end.isValid()) assetWriter_->endSessionAtSourceTime(end);
+  assetWriter_->finishWriting([self = shared_from_this(), handler = std::move(handler)]() mutable {
+    // Goes on on the writer's queue, so that the last reference never ends on the file's own thread.
+    auto& queue = self->movieWriterQueue_;
+    queue.async([self = std::move(self), handler = std::move(handler)] {
+      if (handler) handler(self->assetWriter_->outputURL());
+      self->didProcessFirstSample_ = false;
+    });
+  });
+}
+
+}  // namespace qv

@@ -1,0 +1,110 @@
+#pragma once
+
+#include <functional>
+#include <memory>
+#include <optional>
+#include <string>
+
+#include "extensions/QVBroadcastConfiguration.h"
+#include "platform/BufferQueue.h"
+#include "platform/Guarded.h"
+#include "platform/Platform.h"
+
+namespace qv {
+
+/// Turns the timed samples of one recording into one MPEG-4 movie: the captured screen as H.264, the
+/// app's audio (track 1) and the microphone (track 2) as AAC.
+///
+/// Decides when the file's timeline starts (at the first video sample; audio before it is dropped),
+/// keeps each track's times strictly increasing, and can end the movie at the last frame before a
+/// stop was announced. It does not rebase times across a pause: samples come with their final times.
+///
+/// A writer lives for one file: start; append, only after the start handler has run; finish, once.
+///
+/// Threading: thread-safe; every step runs on the writer's serial queue. Appends wait for it, the
+/// others return at once. Handlers are called on the writer's queue or a background queue.
+class QVMovieWriter : public std::enable_shared_from_this<QVMovieWriter> {
+ public:
+  using FinishHandler = std::function<void(const std::optional<platform::URL>&)>;
+
+  QVMovieWriter(platform::Size windowSize, std::string outputPath);
+
+  void setBroadcastConfig(std::optional<QVBroadcastConfiguration> configuration);
+  void setSystemRecording(bool systemRecording) { systemRecording_ = systemRecording; }
+  [[nodiscard]] bool isSystemRecording() const { return systemRecording_; }
+  [[nodiscard]] platform::URL outputURL() const { return platform::URL::fileURL(outputPath_); }
+  [[nodiscard]] const std::string& outputPath() const { return outputPath_; }
+  [[nodiscard]] platform::Size windowSize() const { return windowSize_; }
+  [[nodiscard]] platform::MediaTime trimVideoPresentationTime() const { return trimVideoPresentationTime_.load(); }
+
+  /// Removes any file at the output path, sets the file writer up, then calls the handler, whether
+  /// or not that succeeded: a failure shows at the first append or at the finish.
+  void startWritingHandler(std::function<void()> handler);
+  /// The same without removing a file, and waited for.
+  void setupAssetWriter();
+  /// False when the sample had to start the file and that failed, or the file has failed since:
+  /// the recording is then over. True in every other case, also for a dropped sample.
+  bool appendVideoSampleBuffer(const platform::SampleBufferRef& sample, const platform::AffineTransform& transform);
+  void appendAudio1SampleBuffer(const platform::SampleBufferRef& sample);
+  void appendAudio2SampleBuffer(const platform::SampleBufferRef& sample);
+  /// The handler gets the movie's URL, or nothing when no video sample was ever written. A second
+  /// finish is ignored, its handler not called.
+  void finishWritingWithHandler(FinishHandler handler);
+  /// The movie is to end at the last frame written so far, unless the recording resumes.
+  void notifyRecordingMayBeStopped();
+  void notifyRecordingResumed();
+  /// Makes a copy of a finished movie without its first and last seconds (rounded to whole seconds).
+  /// The handler gets the copy's URL, or nothing when the export failed or was cancelled.
+  void trimMovieWithURL(platform::URL movie, double startClipDuration, double endClipDuration,
+                        platform::URL outputFileURL, FinishHandler handler);
+
+ private:
+  /// One track's input with what waits for it.
+  struct Track {
+    std::shared_ptr<platform::WriterInput> input;
+    platform::BufferQueue queue;
+    /// Of the last sample that went through the queue. The first video sample does not set it.
+    platform::Guarded<platform::MediaTime> lastPresentationTime;
+  };
+
+  void dispatchedStartWritingHandler(const std::function<void()>& handler);
+  void dispatchedSetupAssetWriter();
+  bool dispatchedAppendVideoSampleBuffer(const platform::SampleBufferRef& sample,
+                                         const platform::AffineTransform& transform);
+  void dispatchedAppendAudio1SampleBuffer(const platform::SampleBufferRef& sample);
+  void dispatchedAppendAudio2SampleBuffer(const platform::SampleBufferRef& sample);
+  void dispatchedFinishWritingWithHandler(FinishHandler handler);
+  void dispatchedTrimMovieWithURL(const platform::URL& movie, double startClipDuration, double endClipDuration,
+                                  const platform::URL& outputFileURL, FinishHandler handler);
+
+  [[nodiscard]] platform::AssetWriterStatus status() const;
+  void createInputs();
+  [[nodiscard]] platform::Dictionary compressionProperties() const;
+  [[nodiscard]] int64_t bitRate() const;
+  bool appendFirstVideoSample(const platform::SampleBufferRef& sample, const platform::AffineTransform& transform);
+  bool ensureWriting(const platform::AffineTransform& transform);
+  void drainVideo();
+  void appendAudio(Track& track, int number, const platform::SampleBufferRef& sample);
+  void drainAudio(Track& track, int number);
+  void finishNotWriting(const FinishHandler& handler);
+  void finishFile(FinishHandler handler);
+
+  const platform::Size windowSize_;
+  const std::string outputPath_;
+  platform::SerialQueue movieWriterQueue_;
+  std::optional<QVBroadcastConfiguration> broadcastConfig_;
+  bool systemRecording_ = false;
+  platform::Guarded<platform::MediaTime> trimVideoPresentationTime_;
+
+  // Writer queue only.
+  std::unique_ptr<platform::AssetWriter> assetWriter_;
+  Track video_;
+  Track audio1_;
+  Track audio2_;
+  bool didStartWriting_ = false;
+  bool didStartSession_ = false;
+  bool didProcessFirstSample_ = false;
+  bool isFinishingWriting_ = false;
+};
+
+}  // namespace qv

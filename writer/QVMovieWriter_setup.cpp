@@ -1,0 +1,107 @@
+#include <cmath>
+
+#include "platform/Log.h"
+#include "writer/QVMovieWriter.h"
+
+namespace qv {
+
+using platform::Dictionary;
+using platform::MediaTime;
+using platform::Platform;
+using platform::Value;
+namespace logs = platform::logs;
+namespace settings = platform::settings;
+
+namespace {
+
+constexpr const char kPreferenceDomain[] = "com.tarnwick.quorveld";
+constexpr double kLargeSide = 1920.0;
+constexpr int64_t kTabletBitRate = 7'000'000;
+constexpr int64_t kLargeBitRate = 5'000'000;
+constexpr int64_t kDefaultBitRate = 3'000'000;
+constexpr double kMaximumSide = 16384.0;
+
+/// Truncated to an integer and, when odd, one more: H.264 with 4:2:0 chroma wants even sides.
+double evenSide(double side) {
+  if (!(side >= 1.0)) return 2.0;
+  const auto whole = static_cast<int64_t>(std::min(side, kMaximumSide));
+  return static_cast<double>(whole + (whole & 1));
+}
+
+/// Layout tag stereo (101 << 16 | 2), no bitmap, no channel descriptions.
+platform::Data stereoChannelLayout() {
+  platform::Data layout(32, 0);
+  layout[0] = 0x02;
+  layout[2] = 0x65;
+  return layout;
+}
+
+Dictionary audioSettings() {
+  return {{settings::kFormatID, Value(platform::kAudioFormatMPEG4AAC)},
+          {settings::kNumberOfChannels, Value(int32_t{2})},
+          {settings::kSampleRate, Value(44100.0)},
+          {settings::kChannelLayout, Value(stereoChannelLayout())},
+          {settings::kEncoderBitRate, Value(int32_t{128000})}};
+}
+
+}  // namespace
+
+int64_t QVMovieWriter::bitRate() const {
+  const Value override = Platform::current().preferences->valueForKey(kPreferenceDomain, "QVBitRateOverride");
+  if (override.isNumber() && override.asInteger() > 0) return override.asInteger();
+  if (!override.isNone()) QV_LOG_ERROR(logs::kWriter, "QVBitRateOverride is no positive number, ignored");
+  if (Platform::current().deviceInfo->userInterfaceIdiom() == platform::UserInterfaceIdiom::Tablet) {
+    return kTabletBitRate;
+  }
+  return windowSize_.width >= kLargeSide || windowSize_.height >= kLargeSide ? kLargeBitRate : kDefaultBitRate;
+}
+
+Dictionary QVMovieWriter::compressionProperties() const {
+  const int64_t rate = bitRate();
+  QV_LOG(logs::kWriter, "bit rate set to %ld", static_cast<long>(rate));
+  Dictionary properties{{settings::kExpectedSourceFrameRate, Value(int32_t{60})},
+                        {settings::kProfileLevel, Value(settings::kProfileHighAutoLevel)},
+                        {settings::kAverageBitRate, Value(rate)},
+                        {settings::kMaxKeyFrameInterval, Value(int32_t{60})}};
+  if (broadcastConfig_ && !broadcastConfig_->videoCompressionProperties.empty()) {
+    QV_LOG(logs::kWriter, "using custom video compression properties");
+    for (const auto& [key, value] : broadcastConfig_->videoCompressionProperties) {
+      properties.insert_or_assign(key, value);
+    }
+  }
+  return properties;
+}
+
+void QVMovieWriter::createInputs() {
+  platform::AssetWriterService& service = *Platform::current().assetWriter;
+  const Dictionary videoSettings{{settings::kVideoCodec, Value(settings::kCodecH264)},
+                                 {settings::kVideoWidth, Value(evenSide(windowSize_.width))},
+                                 {settings::kVideoHeight, Value(evenSide(windowSize_.height))},
+                                 {settings::kCompressionProperties, Value(compressionProperties())}};
+  video_.input = service.createWriterInput(platform::MediaType::Video, videoSettings);
+  audio1_.input = service.createWriterInput(platform::MediaType::Audio, audioSettings());
+  audio2_.input = service.createWriterInput(platform::MediaType::Audio, audioSettings());
+  for (Track* track : {&video_, &audio1_, &audio2_}) {
+    track->input->setExpectsMediaDataInRealTime(true);
+    assetWriter_->addInput(track->input);
+  }
+}
+
+void QVMovieWriter::dispatchedSetupAssetWriter() {
+  QV_LOG(logs::kWriter, "QVMovieWriter: setupAssetWriter");
+  // A recording that ended while its file was being prepared needs none any more.
+  if (isFinishingWriting_) return;
+  for (Track* track : {&video_, &audio1_, &audio2_}) {
+    track->queue.reset();
+    track->lastPresentationTime.store(MediaTime::invalid());
+  }
+  auto created = Platform::current().assetWriter->createAssetWriter(outputURL(), platform::kFileTypeMPEG4);
+  if (!created) {
+    QV_LOG_ERROR(logs::kWriter, "QVMovieWriter: setupAssetWriter error: %i", static_cast<int>(created.error().code));
+    return;
+  }
+  assetWriter_ = std::move(*created);
+  createInputs();
+}
+
+}  // namespace qv
