@@ -2,6 +2,7 @@
 
 #include <poll.h>
 #include <sys/epoll.h>
+#include <sys/socket.h>
 
 #include <cerrno>
 #include <cstring>
@@ -18,6 +19,10 @@ constexpr int kMessagesPerTurn = 64;  // then others have theirs
 /// Answers that sd-bus gives by itself (errors, introspection) wait in its own queue: a peer that
 /// asks without reading is not read either beyond this many.
 constexpr uint64_t kMaximumBusQueue = 64;
+
+/// How much the kernel may hold for a peer that does not read; it counts twice this, with its own
+/// overhead. sd-bus asks for 8 MiB and gets them as root: seconds of sound on top of our own bound.
+constexpr int kSocketBufferBytes = 256 << 10;
 
 uint64_t queuedInBus(sd_bus* bus) {
   uint64_t count = 0;
@@ -72,6 +77,7 @@ int BusLink::prepareBus() {
     if (r < 0) return r;
   }
   if ((r = sd_bus_start(bus)) < 0) return r;
+  ::setsockopt(fd_, SOL_SOCKET, SO_SNDBUF, &kSocketBufferBytes, sizeof kSocketBufferBytes);
   watchedEvents_ = EPOLLIN;
   watch_ = context_->io.watch(fd_, watchedEvents_, [this](uint32_t events) { onEvents(events); });
   return 0;

@@ -108,10 +108,9 @@ TEST_F(PeersTest, APeerThatNeverReadsLosesMediaFirstAndIsThenCutOff) {
   const auto server = admit(peer);
   Events<int64_t> failures;
   for (uint32_t i = 0; i < 100; ++i) sendNumbered(*server, "sample", i, failures);
-  EXPECT_EQ(failures.next(), code(IPCErrorCode::MessageDropped));
+  // All but what the socket's buffer and the media bound take, about a dozen, however fast it is sent.
+  for (int i = 0; i < 80; ++i) EXPECT_EQ(failures.next(), code(IPCErrorCode::MessageDropped));
   EXPECT_TRUE(delegate_.ended.isEmpty());
-  // At most the socket's buffer and the media bound were taken.
-  EXPECT_GT(failures.count(), 80u);
   Events<int64_t> controlFailures;
   constexpr uint32_t kFarBeyondTheBound = 20000;
   for (uint32_t i = 0; i < kFarBeyondTheBound; ++i) sendNumbered(*server, "notify", i, controlFailures);
@@ -165,19 +164,20 @@ TEST_F(PeersTest, APeerThatAsksWithoutEndIsNotReadFurtherThanItIsServed) {
   };
   listen();
   constexpr size_t kMost = 64 << 20;
+  constexpr std::chrono::seconds kPatience{1};
   constexpr uint8_t kNoReplyExpected = 1;
   const std::string notify = rawCall(testInterface().name, "notify", "u", std::string("\1\0\0\0", 4), kNoReplyExpected);
   RawPeer asking(socketPath());
   const auto server = admit(asking);
-  EXPECT_LT(asking.flood(notify, kMost), 4u << 20);
+  EXPECT_LT(asking.flood(notify, kMost, kPatience), 4u << 20);
   // Answers that nobody reads: sd-bus gives these by itself.
   RawPeer deaf(socketPath());
   const auto second = admit(deaf);
   const std::string ping = rawCall("org.freedesktop.DBus.Peer", "Ping", "", "");
-  EXPECT_LT(deaf.flood(ping, kMost), 4u << 20);
+  EXPECT_LT(deaf.flood(ping, kMost, kPatience), 4u << 20);
   opened.set_value();
   // Reading goes on where it stopped.
-  EXPECT_TRUE(asking.flood(notify, 1 << 20) > 0);
+  EXPECT_GE(asking.flood(notify, 1 << 20, kNever), 1u << 20);
   EXPECT_GT(handled, 0u);
   EXPECT_TRUE(delegate_.ended.isEmpty());
 }

@@ -5,6 +5,7 @@
 #include <sys/un.h>
 #include <unistd.h>
 
+#include <chrono>
 #include <cstdint>
 #include <cstring>
 #include <string>
@@ -62,11 +63,11 @@ class RawPeer {
   bool send(const std::string& bytes) {
     return ::send(socket_.get(), bytes.data(), bytes.size(), MSG_NOSIGNAL) == static_cast<ssize_t>(bytes.size());
   }
-  /// Sends `bytes` again and again until the other side takes no more for now, or has taken
-  /// `most`; answers how much it took.
-  size_t flood(const std::string& bytes, size_t most) {
-    const timeval patience{1, 0};
-    ::setsockopt(socket_.get(), SOL_SOCKET, SO_SNDTIMEO, &patience, sizeof patience);
+  /// Sends `bytes` again and again until the other side takes nothing for as long as `patience`, or
+  /// has taken `most`; answers how much it took.
+  size_t flood(const std::string& bytes, size_t most, std::chrono::seconds patience) {
+    const timeval bound{patience.count(), 0};
+    ::setsockopt(socket_.get(), SOL_SOCKET, SO_SNDTIMEO, &bound, sizeof bound);
     size_t sent = 0;
     while (sent < most && send(bytes)) sent += bytes.size();
     return sent;

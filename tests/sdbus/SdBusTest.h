@@ -92,8 +92,8 @@ class FakeDelegate final : public IPCListenerDelegate {
     }
     connection->setExportedInterface(testInterface(), object);
     connection->setRemoteInterface(testInterface());
-    connection->setInvalidationHandler([this] { ended.add("invalidated"); });
-    connection->setInterruptionHandler([this] { ended.add("interrupted"); });
+    connection->setInvalidationHandler([events = events_] { events->add("invalidated"); });
+    connection->setInterruptionHandler([events = events_] { events->add("interrupted"); });
     connection->resume();
     connections.add(connection);
     return true;
@@ -101,8 +101,14 @@ class FakeDelegate final : public IPCListenerDelegate {
   bool accepts = true;
   std::shared_ptr<FakeObject> object = std::make_shared<FakeObject>();
   Events<std::shared_ptr<IPCConnection>> connections;
-  Events<std::string> ended;
   Events<bool> refused;
+
+ private:
+  /// The connections' queues may be behind, and outlive this.
+  const std::shared_ptr<Events<std::string>> events_ = std::make_shared<Events<std::string>>();
+
+ public:
+  Events<std::string>& ended = *events_;
 };
 
 /// A daemon's service object and a client's, talking over a socket in a directory of the test's own.

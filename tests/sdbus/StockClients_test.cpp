@@ -75,10 +75,12 @@ class Client(dbus.service.Object):
         loop.quit()
 connection = dbus.connection.Connection(sys.argv[1])
 client = Client(connection, path)
-daemon = dbus.Interface(connection.get_object(None, path, introspect=False), name)
+def echo(value):
+    return connection.call_blocking(None, path, name, 'echo', 'v', (value,))
+echo('first')  # the library knows after one answer that descriptors may be sent
 read, write = os.pipe()
 os.write(write, b'through')
-back = daemon.echo(dbus.types.UnixFd(read, variant_level=1))
+back = echo(dbus.types.UnixFd(read))
 print(os.read(back.take(), 7).decode())
 loop.run()
 )";
