@@ -1,6 +1,7 @@
 """Reads movies with independent programs, ffprobe and ffmpeg, which must find nothing to complain of."""
 import array
 import json
+import os
 import subprocess
 
 from harness import check
@@ -21,6 +22,19 @@ def streams(path):
     """The streams' descriptions by ffprobe, video first."""
     output = run_silently(['ffprobe', '-v', 'error', '-show_streams', '-of', 'json', path])
     return json.loads(output)['streams']
+
+
+def fragment_count(path):
+    """How many fragments a movie that is being recorded has so far, the one in writing included."""
+    count = 0
+    with open(path, 'rb') as file:
+        while len(head := file.read(8)) == 8:
+            size = int.from_bytes(head[:4], 'big')
+            if size < 8:
+                break
+            count += head[4:] == b'moof'
+            file.seek(size - 8, os.SEEK_CUR)
+    return count
 
 
 def check_decodes(path):

@@ -16,8 +16,9 @@ FAILED_TO_START, ENTITLEMENTS, NO_CONTEXT_MATCH = -5803, -5810, -5816
 APP_AUDIO, MICROPHONE = 2, 3  # buffer types
 
 
-def as_client(case, **options):
-    with Device(**options) as device:
+def as_client(case):
+    with Device() as device:
+        device.write('etc/quorvel/device.json', '{"audioCaptureDevice": true}')
         device.start_daemon()
         print(device.run_client(os.path.basename(__file__), 'client', case, device.movies), end='')
 
