@@ -1,0 +1,68 @@
+"""A recording survives the daemon's death at any moment, but for its last second."""
+import concurrent.futures
+import os
+import random
+import time
+
+import movie
+from harness import Device, check, is_sanitized, main, wait_for_line, wait_until
+from testsignal import FRAME_INTERVAL
+
+SEED = 20240229
+SHORTEST, LONGEST = 1.5, 4.0  # seconds of media until the kill
+# The pictures of a sanitized build may wait for long at the encoder; that is no loss of the file's.
+LARGEST_LOSS = 4.0 if is_sanitized() else 1.0 + FRAME_INTERVAL
+
+
+def record_and_kill(device, length, killed_path):
+    """The moments of the start and the kill. Pictures follow CLOCK_MONOTONIC, as time.monotonic() does."""
+    daemon = device.start_daemon()
+    game = device.start_game('record 600; stop')
+    wait_for_line(game, 'started')
+    started = time.monotonic()
+    wait_until(device.movie_files, 'the movie file')
+    path, = device.movie_files()
+    wait_until(lambda: movie.fragment_count(path) >= 1 and time.monotonic() >= started + length, 'the moment to kill',
+               step=0.001)
+    killed = time.monotonic()
+    daemon.kill()
+    daemon.check_sanitizers()
+    wait_for_line(game, 'stopped')  # the client is told
+    game.kill()
+    game.wait()
+    os.rename(path, killed_path)
+    return started, killed
+
+
+def judge(path, started, killed):
+    """How much is missing, in seconds."""
+    video, audio = movie.streams(path)[:2]
+    movie.check_decodes(path)
+    frames = movie.video_frames(path)
+    movie.check_numbers(frames)
+    check(frames[0].number == 0, f'the movie begins with picture {frames[0].number}')
+    captured = killed - movie.host_time_of_start(frames, started)
+    loss = captured - float(video['duration'])
+    missing = frames[-1].number + 1 - len(frames)
+    print(f'{captured:.3f} s captured, picture {video["duration"]} s, sound {audio["duration"]} s: {loss:.3f} s lost, '
+          f'{missing} pictures left out', flush=True)
+    return loss
+
+
+def kill_at_random_moments(rounds):
+    moments = random.Random(SEED)
+    with Device() as device, concurrent.futures.ThreadPoolExecutor(1) as judges:
+        losses = []
+        for index in range(int(rounds)):
+            path = os.path.join(device.path, f'killed{index}.mp4')
+            times = record_and_kill(device, moments.uniform(SHORTEST, LONGEST), path)
+            losses.append(judges.submit(judge, path, *times))
+        worst = max(loss.result() for loss in losses)
+        check(worst <= LARGEST_LOSS, f'{worst:.3f} s of a movie are lost')
+        # The daemon after all these goes on where they left off.
+        device.start_daemon()
+        check('error=0' in device.run_game('record 1; stop; quit'), 'no recording after the crashes')
+
+
+if __name__ == '__main__':
+    main({'kill': kill_at_random_moments})

@@ -1,0 +1,202 @@
+"""Clients on a stock D-Bus library of another language.
+
+A case starts the daemon and runs itself once more, with the interpreter of a bundle, as the client.
+"""
+import math
+import os
+import struct
+import sys
+import urllib.parse
+
+from harness import Device, check, main, wait_until
+
+INVALID_ARGUMENTS = 'org.freedesktop.DBus.Error.InvalidArgs'
+NOT_RECORDING = 'com.tarnwick.quorveld.Error.NotRecording'
+FAILED_TO_START, ENTITLEMENTS, NO_CONTEXT_MATCH = -5803, -5810, -5816
+APP_AUDIO, MICROPHONE = 2, 3  # buffer types
+
+
+def as_client(case):
+    with Device() as device:
+        device.write('etc/quorvel/device.json', '{"audioCaptureDevice": true}')
+        device.start_daemon()
+        print(device.run_client(os.path.basename(__file__), 'client', case, device.movies), end='')
+
+
+# In the client -------------------------------------------------------------------------------------
+
+STATE_KEYS = {'isRecording', 'isBroadcasting', 'microphoneEnabled', 'isSystemRecording', 'hasUserConsentForMicrophone',
+              'hasUserConsentForCamera', 'microphoneEnabledPersistent'}
+
+
+def check_state(client, **expected):
+    state = client.state()
+    check(set(state) == STATE_KEYS, f'the state has {sorted(state)}')
+    for key, value in expected.items():
+        check(bool(state[key]) == value, f'{key} is {state[key]}')
+
+
+def longest_run(numbers):
+    """Of numbers that rise by one."""
+    longest = length = 1
+    for former, number in zip(numbers, numbers[1:]):
+        length = length + 1 if number == former + 1 else 1
+        longest = max(longest, length)
+    return longest
+
+
+def check_frames(frames):
+    for frame in frames:
+        check((frame.width, frame.height, frame.pixel_format) == (640, 360, 1), vars(frame))
+        check(frame.timing_size == 72, f'{frame.timing_size} timing bytes')
+        check(frame.number is not None, 'a captured picture cannot be read')
+    for former, frame in zip(frames, frames[1:]):
+        check(frame.number > former.number, f'picture {frame.number} follows {former.number}')
+        check(frame.presentation_time > former.presentation_time, f'picture {frame.number} goes back in time')
+    # The flash tells the host time, so it proves that the presentation time is that of the picture.
+    for frame in frames:
+        phase = frame.presentation_time % 1
+        check(frame.shows_flash == (phase < 0.1), f'picture {frame.number} at {phase} s: {frame.shows_flash}')
+
+
+def check_audio(samples, buffer_type):
+    samples = [sample for sample in samples if sample.buffer_type == buffer_type]
+    check(samples, f'no audio of type {buffer_type}')
+    for sample in samples:
+        check(len(sample.description) == 40 and len(sample.timing) == 72,
+              f'{len(sample.description)} and {len(sample.timing)} bytes describe audio')
+        rate, _, _, _, _, bytes_per_frame, channels, bits, _ = struct.unpack('=d8I', sample.description)
+        check(rate > 0 and bits == 16 and bytes_per_frame == 2 * channels, f'{rate} Hz, {bits} bits, {bytes_per_frame}')
+        check(len(sample.sample) == sample.item_count * bytes_per_frame,
+              f'{len(sample.sample)} bytes are {sample.item_count} items')
+
+
+def capture(client, _movies):
+    """State, refusal of a system recording, capture of picture, sound and microphone, stop."""
+    check_state(client, isRecording=False)
+    check(client.start(system=True, contexts=[]) == ENTITLEMENTS, 'a system recording is not refused')
+    check_state(client, isRecording=False)
+
+    check(client.start(capture=True) == 0, 'the capture is refused')
+    check_state(client, isRecording=True, isSystemRecording=False)
+    received = client.received
+
+    def captured_enough():
+        numbers = [frame.number for frame in received.frames]
+        return len(numbers) >= 60 and longest_run(numbers) >= 60 and len(received.audio) >= 10
+    client.run_until(captured_enough, 'sixty frames that rise by one, and sound')
+    check(client.stop() == ('', 0), 'a capture gives a movie or an error')
+    check_state(client, isRecording=False)
+    check_frames(received.frames)
+    check_audio(received.audio, APP_AUDIO)
+    check(received.frames[0].number < 16, f'the first picture is {received.frames[0].number}')
+
+    count = len(received.frames)
+    client.call('Ping', interface='org.freedesktop.DBus.Peer')
+    check(len(received.frames) == count and not received.stops, 'samples or stops come after the stop')
+    print(f'captured {count} frames, {len(received.audio)} audio samples')
+
+
+def microphone(client, _movies):
+    """On a device with a microphone, the consent given, both sounds are handed over."""
+    check(client.start(capture=True, microphone=True) == 0, 'the capture is refused')
+    check(bool(client.microphone), 'the microphone is off')
+    received = client.received
+    client.run_until(lambda: {APP_AUDIO, MICROPHONE} <= {sample.buffer_type for sample in received.audio},
+                     'sound of both kinds')
+    check(client.stop() == ('', 0), 'the stop fails')
+    check_audio(received.audio, MICROPHONE)
+
+
+def movie(client, movies):
+    from movie import check_decodes, streams  # pylint: disable=import-outside-toplevel
+    check(client.refusal('stopRecordingWithHandler') == NOT_RECORDING, 'a stop without recording')
+    check(client.start() == 0, 'the recording is refused')
+    check(client.refusal('discardRecordingWithHandler') is not None, 'a running recording can be discarded')
+
+    def recorded_a_second():
+        return any(os.stat(os.path.join(movies, name)).st_size > 8000 for name in os.listdir(movies))
+    wait_until(recorded_a_second, 'the movie to grow')
+    url, code = client.stop()
+    check(code == 0 and url.startswith('file:///'), f'the stop gives "{url}", {code}')
+    path = urllib.parse.unquote(urllib.parse.urlparse(url).path)
+    check(os.path.realpath(path).startswith(os.path.realpath(movies)), f'the movie is {path}')
+    video, audio = streams(path)[:2]
+    check((video['codec_name'], video['profile'], video['width'], video['height']) == ('h264', 'High', 640, 360),
+          f'the picture is {video["codec_name"]} {video["profile"]}')
+    check((audio['codec_name'], audio['profile']) == ('aac', 'LC'), f'the sound is {audio["codec_name"]}')
+    check(float(video['duration']) > 0.5 and abs(float(video['duration']) - float(audio['duration'])) < 0.05,
+          f'{video["duration"]} s of picture, {audio["duration"]} s of sound')
+    check_decodes(path)
+    check(not client.received.frames and not client.received.audio, 'samples are handed over without capture')
+
+    check(client.refusal('discardRecordingWithHandler') is None, 'the movie cannot be discarded')
+    check(not os.path.exists(path), 'the discarded movie is still there')
+
+
+def bad_input(client, _movies):
+    """Each nonsense is refused, and the connection goes on."""
+    def still_serves():
+        check_state(client, isRecording=False)
+
+    start, arguments = 'startRecordingWindowLayerContextIDs', [os.getpid()]
+    for signature, values in (('', ()), ('s', ('x',)), ('au', (arguments,)),
+                              ('ai(dd)bbbbbah', (arguments, (640.0, 360.0), *[False] * 5, [])),
+                              ('au(ii)bbbbbah', (arguments, (640, 360), *[False] * 5, [])),
+                              ('au(dd)bbbbbahs', (arguments, (640.0, 360.0), *[False] * 5, [], 'more'))):
+        refusal = client.refusal(start, signature, *values)
+        check(refusal == INVALID_ARGUMENTS, f'{signature}: {refusal}')
+    for member, signature, *values in (('setMicrophoneEnabled', 's', 'yes'), ('pauseRecording', 'b', True),
+                                       ('stopRecordingWithStartClipDuration', 'ii', 1, 1),
+                                       ('setupBroadcastWithHostBundleID', 'ssays', 'a', 'a', b'a', 'a')):
+        refusal = client.refusal(member, signature, *values)
+        check(refusal == INVALID_ARGUMENTS, f'{member}: {refusal}')
+    still_serves()
+
+    unknown = 'org.freedesktop.DBus.Error.Unknown'
+    check(client.refusal('eraseTheDisk') == unknown + 'Method', 'an unknown member')
+    check((client.refusal('pauseRecording', interface='com.example.Other') or '').startswith(unknown), 'an interface')
+    still_serves()
+
+    for size in ((0.0, 0.0), (-640.0, 360.0), (math.nan, 360.0), (640.0, math.inf), (1e9, 1e9), (1e308, 1.0)):
+        code = client.start(size=size)
+        check(code == FAILED_TO_START, f'size {size}: {code}')
+    foreign = os.getppid()  # it runs, but in no bundle
+    for contexts in ([0], [foreign], [os.getpid(), foreign], [0xFFFFFFFF], [1] * 10000):
+        code = client.start(contexts=contexts)
+        check(code == FAILED_TO_START, f'contexts {contexts[:3]}: {code}')
+    still_serves()
+
+    # What acts on a running recording has nothing to act on; what sets a value takes any.
+    for member, signature, *values in (('pauseRecording', ''), ('resumeRecordingWithWindowLayerContextID', 'u', 0),
+                                       ('updateProcessIDForAudioCaptureWithPID', 'i', -1),
+                                       ('reportCameraUsage', 'i', -2 ** 31), ('setMicrophoneEnabled', 'b', True)):
+        check(client.refusal(member, signature, *values) is None, f'{member} is refused')
+    check(client.refusal('stopRecordingWithStartClipDuration', 'dd', math.nan, 1e300) == NOT_RECORDING, 'a stop')
+    for url in ('', 'file:///etc/passwd', 'http://example.com/', '%%%', 'file:///' + 'a' * 100000):
+        error = client.call('saveVideoToCameraRoll', 's', url)
+        check(error and error['code'] == -5812, f'saving {url[:30]} gives {error}')
+    still_serves()
+
+    # A resume with a window of somebody else ends the recording with an error and its movie.
+    check(client.start() == 0, 'a sound request is refused after the nonsense')
+    client.call('pauseRecording')
+    client.call('resumeRecordingWithWindowLayerContextID', 'u', foreign)
+    client.run_until(lambda: client.received.stops, 'the recording to be stopped')
+    check(int(client.received.stops[0][0]['code']) == NO_CONTEXT_MATCH, client.received.stops)
+    wait_until(lambda: not client.state()['isRecording'], 'the recording to be over')
+    check(client.start(capture=True) == 0, 'a sound request is refused after the nonsense')
+    client.run_until(lambda: len(client.received.frames) > 5, 'frames')
+    check(client.stop() == ('', 0), 'the stop fails')
+
+
+def run_client(case, movies):
+    from client import Client  # pylint: disable=import-outside-toplevel
+    CLIENT_CASES[case](Client(), movies)
+
+
+CLIENT_CASES = {'capture': capture, 'microphone': microphone, 'movie': movie, 'bad_input': bad_input}
+
+if __name__ == '__main__':
+    sys.dont_write_bytecode = True
+    main({'client': run_client, **{case: lambda case=case: as_client(case) for case in CLIENT_CASES}})

@@ -1,0 +1,167 @@
+"""The daemon lives on, and says what is wrong, where the world around it is not as it should be."""
+import json
+import os
+import subprocess
+import sys
+
+import movie
+from harness import PATIENCE, Device, check, main, wait_for_line, wait_until
+
+INSUFFICIENT_STORAGE, FAILED_TO_SAVE = -5805, -5812
+STARTED = 'started microphone=0 camera=0'
+
+
+def records(device):
+    return 'error=0' in device.run_game('record 1; stop; discard; quit')
+
+
+def run_refused_game(device, script):
+    """The lines of a game whose recording is not what it asked for."""
+    game = device.start_game(script)
+    output, _ = game.communicate(timeout=PATIENCE)
+    check(game.returncode == 1, f'the game ended with {game.returncode}:\n{output}')
+    return output
+
+
+def second_daemon():
+    """It must not take the place of the one that serves."""
+    with Device() as device:
+        first = device.start_daemon()
+        game = device.start_game('record 2; stop; quit')
+        wait_for_line(game, 'started')
+        second = device.start_daemon(expect_service=False)
+        second.process.wait(PATIENCE)
+        check(second.process.returncode > 0, f'the second daemon ended with {second.process.returncode}')
+        check('the service cannot be opened' in second.log(), f'it says nothing of the reason: {second.log()}')
+        wait_for_line(game, 'stopped url=file:')
+        game.wait(PATIENCE)
+        check(first.is_running() and records(device), 'the first daemon serves no longer')
+
+
+def client_dies_in_alert():
+    """The start of a client that died during its alert is over; its successor's is its own."""
+    with Device(alert='never', log='notice') as device:
+        device.write('etc/quorvel/device.json', '{"internalBuild": true}')
+        daemon = device.start_daemon()
+        for count in (1, 2):
+            game = device.start_game('record 1; stop; quit')
+            daemon.wait_for_log('QVRecordingManager:showAcknowledgementAlert', count)
+            game.kill()
+            game.wait()
+            daemon.wait_for_log('QVRecordingManager: applicationDisconnected', count)
+        # From now on nobody is asked, so that the next start can succeed.
+        device.write('com.tarnwick.quorveld.json', '{"QVSuppressAlert": true}', device.preferences)
+        check(records(device), 'the next client is not served')
+
+
+def client_dies_in_recording():
+    """Its recording ends, its file goes away, and the next client is served."""
+    with Device() as device:
+        device.start_daemon()
+        game = device.start_game('record 600; stop')
+        wait_for_line(game, 'started')
+        wait_until(device.movie_files, 'the movie file')
+        path, = device.movie_files()
+        wait_until(lambda: movie.fragment_count(path) >= 1, 'the movie to grow')
+        game.kill()
+        game.wait()
+        wait_until(lambda: not device.movie_files(), 'the movie of nobody to go away')
+        check(records(device), 'the next client is not served')
+
+
+def disk_without_room():
+    """No recording begins with 100 MB free or less; when there is room again, one does."""
+    with Device() as device:
+        device.mount_disk(device.media, '120m')
+        device.start_daemon()
+        check(records(device), 'no recording with room enough')
+        device.write('ballast', bytes(30_000_000), device.media)
+        output = run_refused_game(device, 'record 1; stop; quit')
+        check(f'error code={INSUFFICIENT_STORAGE} ' in output, output)
+        check(not device.movie_files(), 'the refused recording has a file')
+        os.remove(os.path.join(device.media, 'ballast'))
+        check(records(device), 'no recording with room again')
+
+
+def disk_that_fills():
+    """What was recorded before the disk was full can be played; the daemon goes on."""
+    with Device() as device:
+        device.mount_disk(device.media, '120m')
+        device.start_daemon()
+        game = device.start_game('record 4; stop; quit')
+        wait_for_line(game, 'started')
+        wait_until(device.movie_files, 'the movie file')
+        path, = device.movie_files()
+        wait_until(lambda: movie.fragment_count(path) >= 1, 'the movie to grow')
+        ballast = os.path.join(device.media, 'ballast')
+        with open(ballast, 'wb', buffering=0) as file:
+            try:
+                while True:
+                    file.write(bytes(1 << 20))
+            except OSError:
+                pass
+        output, _ = game.communicate(timeout=PATIENCE)
+        print(output)
+        check('stopped url=' in output, 'the game is told nothing')
+        for path in device.movie_files():
+            movie.check_decodes(path)
+            print(path, movie.streams(path)[0]['duration'])
+        os.remove(ballast)
+        check(records(device), 'no recording with room again')
+
+
+def no_place_for_movies():
+    """Without the directory that holds the movies' a recording runs, and ends with an error."""
+    with Device(hasMediaParent=False) as device:
+        device.start_daemon()
+        output = run_refused_game(device, 'record 1; stop; quit')
+        check(STARTED in output, f'the recording is refused:\n{output}')
+        check(f'error={FAILED_TO_SAVE}\n' in output and 'stopped url= ' in output, output)
+        os.makedirs(device.movies)
+        check(records(device), 'no recording with the directory in place')
+
+
+BROKEN = ['', '{', '[]', 'null', '{"idiom": 7, "chipID": "x", "Languages": 3, "QVBitRateOverride": "lots"}',
+          '{"Languages": [1, {}, "xx-nonsense", ""], "QVBitRateOverride": -5, "QVFullResCapture": "maybe"}',
+          '\ufffd\x00\x01' * 50, '[' * 100_000, 'x' * 3_000_000]
+
+
+def broken_files():
+    """Whatever stands in the files that the device's maker and user write, recordings work."""
+    for content in BROKEN:
+        with Device() as device:
+            device.write('etc/quorvel/device.json', content)
+            device.write('com.tarnwick.quorveld.json', content, device.preferences)
+            for bundle in ('com.tarnwick.quorveld', 'com.example.quorvel.game'):
+                device.write(f'etc/quorvel/entitlements/{bundle}.json', content)
+            device.write('Info.json', content, device.framework)
+            for directory, _, names in os.walk(os.path.join(device.framework, 'Resources')):
+                for name in names:
+                    device.write(name, content, directory)
+            daemon = device.start_daemon()
+            check(records(device), f'no recording with files of {content[:30]!r}')
+            check(daemon.is_running(), 'the daemon ended')
+    with Device() as device:  # no files at all, and links and directories where files should be
+        subprocess.run(['rm', '-r', device.framework], check=True)
+        os.makedirs(os.path.join(device.root, 'etc/quorvel/device.json'))
+        os.makedirs(device.preferences)
+        os.symlink('com.tarnwick.quorveld.json', os.path.join(device.preferences, 'com.tarnwick.quorveld.json'))
+        device.start_daemon()
+        check(records(device), 'no recording without files')
+
+
+def movies_directory_is_a_file():
+    with Device() as device:
+        device.write('Quorvel', 'not a directory', device.media)
+        device.start_daemon()
+        output = run_refused_game(device, 'record 1; stop; quit')
+        check('error' in output, output)
+        os.remove(device.movies)
+        os.makedirs(device.movies)
+        check(records(device), 'no recording with the directory in place')
+
+
+if __name__ == '__main__':
+    main({case.__name__: case for case in (second_daemon, client_dies_in_alert, client_dies_in_recording,
+                                           disk_without_room, disk_that_fills, no_place_for_movies, broken_files,
+                                           movies_directory_is_a_file)})
