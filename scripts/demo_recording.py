@@ -18,6 +18,9 @@ import urllib.parse
 
 RATE = 44100
 BEEP_HZ = 1000
+# Sound reaches the daemon about an eighth of a second after it was played, so a cut (the pause, the stop) may
+# take the beep of a flash that it leaves; and a resume may come amid a flash.
+CUT_MARGIN = 0.3
 started = []
 
 
@@ -184,6 +187,9 @@ def report(movie):
     beep_times = beeps(movie)
     worst = {"before": None, "after": None}
     for flash in flashes(movie):
+        if abs(flash - 4) < CUT_MARGIN or flash > duration - CUT_MARGIN:
+            print(f"flash at {flash:.3f} s, at a cut: not measured")
+            continue
         distance = min((beep - flash for beep in beep_times), key=abs, default=math.inf)
         side = "before" if flash < 4 else "after"
         print(f"flash at {flash:.3f} s, beep {distance * 1000:+.1f} ms ({side} the pause)")
