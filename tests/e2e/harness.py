@@ -126,7 +126,7 @@ class Device:
     At its end the daemons that still run are stopped and must end well, and the directory goes away.
     """
 
-    def __init__(self, alert='accept', log='error', hasMediaParent=True):
+    def __init__(self, alert='accept', log='error', has_media_parent=True):
         self.path = tempfile.mkdtemp(prefix='quorveld-e2e-')
         self.root = os.path.join(self.path, 'root')
         self.media = os.path.join(self.root, 'private/var/mobile/Library')
@@ -139,7 +139,7 @@ class Device:
         self.daemons = []
         self.clients = []
         self.mounts = []
-        if hasMediaParent:
+        if has_media_parent:
             os.makedirs(self.media)
         shutil.copytree(setting('QV_E2E_FRAMEWORK'), self.framework)
         self._make_test_bundle()
@@ -168,6 +168,10 @@ class Device:
         if mounted.returncode != 0:
             raise Skipped(f'no file system can be mounted here: {mounted.stderr.strip()}')
         self.mounts.append(directory)
+
+    @staticmethod
+    def remount(directory, option):
+        subprocess.run(['mount', '-o', f'remount,{option}', directory], check=True)
 
     def environment(self):
         environment = {'PATH': os.environ['PATH'], 'HOME': self.path, 'LANG': 'C.UTF-8', 'TMPDIR': self.path,
