@@ -25,7 +25,8 @@ std::shared_ptr<QVRecordingManager> QVRecordingManager::create(QVCaptureManager&
 
 QVRecordingManager::QVRecordingManager(QVCaptureManager& captureManager)
     : platform_(platform::Platform::current()),
-      captureManager_(captureManager), sequence_("com.tarnwick.quorveld.manager", *platform_.globalQueue) {
+      captureManager_(captureManager),
+      sequence_("com.tarnwick.quorveld.manager", *platform_.globalQueue) {
   _srSetupTempDirectory();
   publicListener_ = platform_.ipc->createListener(kServiceName);
   publicListener_->setDelegate(this, sequence_);

@@ -122,7 +122,7 @@ class QVRecordingManager final : public platform::IPCListenerDelegate,
   [[nodiscard]] bool checkContextIDsMatch(const std::vector<uint32_t>& contextIDs);
   [[nodiscard]] std::optional<platform::Error> checkStartIsAllowed(const StartRequest& start);
   void continueStartAfterStops(const Start& start);
-  void askForAcknowledgement(const Start& start);
+  void showAcknowledgementAlertForSession(const Start& start);
   void continueStartAfterAcknowledgement(const Start& start, const AcknowledgementAnswer& answer);
   void beginRecording(const Start& start);
   void configureSession(const Start& start);
@@ -135,7 +135,7 @@ class QVRecordingManager final : public platform::IPCListenerDelegate,
   [[nodiscard]] bool isApplicationInForegroundWithBundleIdentifier(const std::string& bundleID);
 
   // --- Stop.
-  void stopCurrentRecordingSession();
+  void stopCurrentRecordingSessionWithHandler();
   void stopRecordingSession(const Session& session, double startClipDuration, double endClipDuration,
                             FinishHandler handler);
   void reportStoppedByOtherStart(const Session& session);

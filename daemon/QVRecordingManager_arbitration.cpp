@@ -90,15 +90,15 @@ void QVRecordingManager::recordingSessionStoppedWithError(const Session& session
                                                           const std::optional<Error>& error) {
   sequence_.async([self = shared_from_this(), session, generation, error] {
     self->recordingSessionStoppedWithErrorMovieURL(session, error, std::nullopt);
-    session->completeMovieAfterFailure(generation,
-        [weakSelf = std::weak_ptr(self), session, generation, hold = self->holdEnding(session->bundleID())] {
-          const auto manager = weakSelf.lock();
-          if (!manager) return;
-          manager->sequence_.async([manager, session, generation, hold] {
-            manager->resetStatesForSession(session, generation);
-            manager->replaceSessionAfterMediaServicesReset(session);
-          });
-        });
+    session->completeMovieAfterFailure(generation, [weakSelf = std::weak_ptr(self), session, generation,
+                                                    hold = self->holdEnding(session->bundleID())] {
+      const auto manager = weakSelf.lock();
+      if (!manager) return;
+      manager->sequence_.async([manager, session, generation, hold] {
+        manager->resetStatesForSession(session, generation);
+        manager->replaceSessionAfterMediaServicesReset(session);
+      });
+    });
   });
 }
 

@@ -13,7 +13,7 @@ constexpr const char kDaemonDomain[] = "com.tarnwick.quorveld";
 
 /// Shows the alert unless the application is exempt. The start waits for the answer; the manager does
 /// not.
-void QVRecordingManager::askForAcknowledgement(const Start& start) {
+void QVRecordingManager::showAcknowledgementAlertForSession(const Start& start) {
   if (platform_.deviceInfo->allowsInternalSecurityPolicies(kDaemonDomain)) {
     const bool suppressed = !platform_.preferences->valueForKey(kDaemonDomain, "QVSuppressAlert").isNone();
     QV_LOG(logs::kDaemon, "QVRecordingManager: suppressAlert=%d", suppressed ? 1 : 0);
@@ -24,7 +24,7 @@ void QVRecordingManager::askForAcknowledgement(const Start& start) {
   }
   QV_LOG(logs::kDaemon, "QVRecordingManager:showAcknowledgementAlert");
   const std::string& bundleID = start->session->bundleID();
-  if (exemptions_.isExempt(bundleID, start->microphoneRecording)) {
+  if (exemptions_.isExemptFromAcknowledgementAlertSession(bundleID, start->microphoneRecording)) {
     beginRecording(start);
     return;
   }
@@ -47,7 +47,7 @@ void QVRecordingManager::continueStartAfterAcknowledgement(const Start& start, c
   }
   start->microphoneRecording = answer.microphone;
   start->cameraRecording = answer.camera;
-  exemptions_.exempt(start->session->bundleID(), answer.microphone);
+  exemptions_.updateExemptionListWithSession(start->session->bundleID(), answer.microphone);
   beginRecording(start);
 }
 

@@ -63,7 +63,7 @@ void QVRecordingManager::startRecordingWindowLayerContextIDs(const IPCArguments&
   QV_LOG(logs::kDaemon,
          "QVRecordingManager:startRecordingWindowLayerContextID:windowSize:microphoneEnabled:streaming:withHandler:");
   pendingStarts_[start->session->bundleID()] = start;
-  stopCurrentRecordingSession();
+  stopCurrentRecordingSessionWithHandler();
   // A former recording of this application ends before anything of the new one begins.
   whenEnded(start->session->bundleID(), [this, start] { continueStartAfterStops(start); });
 }
@@ -129,12 +129,13 @@ void QVRecordingManager::continueStartAfterStops(const Start& start) {
     refuseStart(start, _qvUserErrorForCode(errorcode::kFailedToStart));
     return;
   }
+  platform_.assetWriter->prepareForWriting();
   start->microphoneRecording = start->microphoneEnabled;
   start->cameraRecording = start->cameraEnabled;
   if (start->systemRecording || start->broadcast) {
     beginRecording(start);
   } else {
-    askForAcknowledgement(start);
+    showAcknowledgementAlertForSession(start);
   }
 }
 

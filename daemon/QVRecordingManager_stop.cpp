@@ -24,7 +24,7 @@ Value encodeURL(const std::optional<URL>& url) { return Value(url ? url->absolut
 
 }  // namespace
 
-void QVRecordingManager::stopCurrentRecordingSession() {
+void QVRecordingManager::stopCurrentRecordingSessionWithHandler() {
   QV_LOG(logs::kDaemon, "QVRecordingManager:stopCurrentRecordingSession:");
   // A copy: the stops change the registry's sessions, and may change the registry.
   const auto sessions = bundleIDToRecordingSessionLookup_;

@@ -85,6 +85,9 @@ class AssetWriter {
 class AssetWriterService {
  public:
   virtual ~AssetWriterService() = default;
+  /// A movie is likely to be wanted soon (the user is being asked): make ready what takes long.
+  /// Returns at once.
+  virtual void prepareForWriting() = 0;
   /// An error where the URL is no file URL, its directory is missing or not writable, or the file
   /// exists already.
   virtual Result<std::unique_ptr<AssetWriter>> createAssetWriter(const URL& outputURL, const std::string& fileType) = 0;

@@ -8,12 +8,12 @@ namespace {
 constexpr double kExemptionSeconds = 480.0;
 }
 
-bool QVExemptionBook::isExempt(const std::string& bundleID, bool withMicrophone) const {
+bool QVExemptionBook::isExemptFromAcknowledgementAlertSession(const std::string& bundleID, bool withMicrophone) const {
   return withMicrophone ? exemptWithMicRecordingEnabledBundleIdentifiers_.contains(bundleID)
                         : exemptBundleIdentifiers_.contains(bundleID);
 }
 
-void QVExemptionBook::exempt(const std::string& bundleID, bool withMicrophone) {
+void QVExemptionBook::updateExemptionListWithSession(const std::string& bundleID, bool withMicrophone) {
   if (withMicrophone) exemptWithMicRecordingEnabledBundleIdentifiers_.insert(bundleID);
   exemptBundleIdentifiers_.insert(bundleID);
 }

@@ -17,8 +17,8 @@ namespace qv {
 /// Threading: manager sequence only.
 class QVExemptionBook {
  public:
-  [[nodiscard]] bool isExempt(const std::string& bundleID, bool withMicrophone) const;
-  void exempt(const std::string& bundleID, bool withMicrophone);
+  [[nodiscard]] bool isExemptFromAcknowledgementAlertSession(const std::string& bundleID, bool withMicrophone) const;
+  void updateExemptionListWithSession(const std::string& bundleID, bool withMicrophone);
   /// Only the first move to the background since the last expiry counts.
   void noteBackground(const std::string& bundleID, platform::Date now);
   void expireAcknowledgementExemptionsForBundleID(const std::string& bundleID, platform::Date now);

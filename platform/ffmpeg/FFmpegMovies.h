@@ -19,6 +19,8 @@ using MovieFileFactory = std::function<Result<std::unique_ptr<mp4::MovieFile>>(c
 class FFmpegAssetWriterService final : public AssetWriterService {
  public:
   explicit FFmpegAssetWriterService(MovieFileFactory createFile = mp4::DiskMovieFile::create);
+  /// Nothing: the codecs are in memory when this object exists.
+  void prepareForWriting() override {}
   Result<std::unique_ptr<AssetWriter>> createAssetWriter(const URL& outputURL, const std::string& fileType) override;
   std::shared_ptr<WriterInput> createWriterInput(MediaType type, const Dictionary& outputSettings) override;
 

@@ -85,9 +85,9 @@ ExportService* MoviesLoader::exports() {
   return exports_;
 }
 
-std::optional<Error> MoviesLoader::preload() {
-  loadOnce();
-  return error_;
+void MoviesLoader::prepareForWriting() {
+  // The loader lives as long as the process; a load that is under way makes later ones wait for it.
+  globalQueue().post([this] { loadOnce(); });
 }
 
 Result<std::unique_ptr<AssetWriter>> MoviesLoader::createAssetWriter(const URL& outputURL,

@@ -21,13 +21,13 @@ class MoviesLoader final : public AssetWriterService, public ExportService {
   /// `modulePath`: empty for the places above.
   explicit MoviesLoader(std::string modulePath = {});
 
+  /// Loads the module on the global queue: it takes tens of milliseconds.
+  void prepareForWriting() override;
   Result<std::unique_ptr<AssetWriter>> createAssetWriter(const URL& outputURL, const std::string& fileType) override;
   /// Null where the module cannot be loaded; then no writer was created either.
   std::shared_ptr<WriterInput> createWriterInput(MediaType type, const Dictionary& outputSettings) override;
   std::shared_ptr<MovieAsset> openMovie(const URL& url) override;
   std::shared_ptr<ExportSession> createExportSession(std::shared_ptr<MovieAsset> asset, ExportPreset preset) override;
-  /// Loads the module now, e.g. from a background queue when a recording is about to start.
-  std::optional<Error> preload();
 
  private:
   AssetWriterService* assetWriters();

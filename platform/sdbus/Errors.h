@@ -6,7 +6,7 @@
 
 namespace qv::platform::sdbus {
 
-// D-Bus errors of this system; the others are those of the D-Bus specification.
+// D-Bus errors of this system; the others are those of D-Bus itself.
 inline constexpr const char kNoReplyError[] = "com.tarnwick.quorveld.Error.NoReply";
 inline constexpr const char kInvalidReplyError[] = "com.tarnwick.quorveld.Error.InvalidReply";
 

@@ -19,11 +19,35 @@ AlertFocus::~AlertFocus() {
 
 void AlertFocus::handleEvents(pid_t alertProcess) {
   while (auto event = connection_->pollEvent()) {
-    if ((event->response_type & 0x7F) != XCB_MAP_NOTIFY) continue;
-    const xcb_window_t window = reinterpret_cast<const xcb_map_notify_event_t&>(*event).window;
-    if (processOfWindow(*connection_, window) != alertProcess) continue;
-    if (windowManagerCheck(*connection_) == XCB_NONE) windowAppeared(window, alertProcess);
+    // A window manager puts the window into a frame of its own before it shows both.
+    const uint8_t type = event->response_type & 0x7F;
+    xcb_window_t window = XCB_NONE;
+    if (type == XCB_MAP_NOTIFY)
+      window = reinterpret_cast<const xcb_map_notify_event_t&>(*event).window;
+    else if (type == XCB_REPARENT_NOTIFY)
+      window = reinterpret_cast<const xcb_reparent_notify_event_t&>(*event).window;
+    if (window == XCB_NONE || processOfWindow(*connection_, window) != alertProcess) continue;
+    if (windowManagerCheck(*connection_) != XCB_NONE)
+      askForActivation(window);
+    else if (type == XCB_MAP_NOTIFY)
+      windowAppeared(window, alertProcess);
   }
+}
+
+void AlertFocus::askForActivation(xcb_window_t window) {
+  // Like a taskbar: a request in the application's own name may be refused, lest it steal the focus.
+  constexpr uint32_t kSourceIsPager = 2;
+  xcb_client_message_event_t message{};
+  message.response_type = XCB_CLIENT_MESSAGE;
+  message.format = 32;
+  message.window = window;
+  message.type = connection_->atom("_NET_ACTIVE_WINDOW");
+  message.data.data32[0] = kSourceIsPager;
+  message.data.data32[1] = XCB_CURRENT_TIME;
+  xcb_send_event(connection_->get(), 0, connection_->root(),
+                 XCB_EVENT_MASK_SUBSTRUCTURE_REDIRECT | XCB_EVENT_MASK_SUBSTRUCTURE_NOTIFY,
+                 reinterpret_cast<const char*>(&message));
+  xcb_flush(connection_->get());
 }
 
 void AlertFocus::windowAppeared(xcb_window_t window, pid_t alertProcess) {

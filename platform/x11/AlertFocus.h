@@ -8,8 +8,9 @@
 
 namespace qv::platform {
 
-/// Puts an alert's window in the middle and gives it the keyboard, where no window manager does
-/// that; gives the keyboard back when destroyed.
+/// Gives an alert's window the keyboard. A window manager is asked to activate it, and gives the
+/// keyboard back by itself. Without one the window is put in the middle and given the keyboard,
+/// which goes back when this is destroyed.
 ///
 /// Threading: used by one thread at a time.
 class AlertFocus {
@@ -24,6 +25,7 @@ class AlertFocus {
   void handleEvents(pid_t alertProcess);
 
  private:
+  void askForActivation(xcb_window_t window);
   void windowAppeared(xcb_window_t window, pid_t alertProcess);
   void restore();
 

@@ -238,6 +238,7 @@ class FakeAppAudioTap final : public platform::AppAudioTapService {
 /// Records what a movie would hold.
 class FakeAssetWriterService final : public platform::AssetWriterService {
  public:
+  void prepareForWriting() override {}
   struct Input final : platform::WriterInput {
     void setTransform(const platform::AffineTransform& to) override { transform = to; }
     void setExpectsMediaDataInRealTime(bool to) override { realTime = to; }

@@ -240,7 +240,7 @@ TEST_F(ConnectionTest, DroppingTheLastReferenceEndsTheConnectionSilently) {
   auto client = connectClient();
   Events<int64_t> failures;
   client->call("nothing", {}, {}, [&](const Error& error) { failures.add(error.code); });
-  delegate_.object->calls.next();
+  const Call open = delegate_.object->calls.next();  // dropped, it would be answered
   client.reset();
   EXPECT_EQ(failures.next(), code(IPCErrorCode::ConnectionInvalid));
   EXPECT_EQ(delegate_.ended.next(), "invalidated");

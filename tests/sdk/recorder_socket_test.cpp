@@ -13,10 +13,6 @@
 #include "sdk/client/quorvel/Recorder.h"
 #include "tests/fakes/FakeIPC.h"
 
-/// Both ends are in this process, so two threads make their first bus objects at once. libsystemd then
-/// fills one static buffer of random bytes from both, and copies it: any mixture will do.
-extern "C" const char* __tsan_default_suppressions() { return "race:libsystemd.so\n"; }
-
 namespace qv::client {
 namespace {
 

@@ -152,7 +152,7 @@ TEST_F(ApplicationsTest, FollowsTheWindowManager) {
   XServer own;
   open(own.display());
   ChildProcess manager({"openbox", "--sm-disable"}, {"DISPLAY=" + display_});
-  client_->waitForWindowManager();
+  const auto managerWindow = client_->waitForWindowManager();
   watch();
   const auto activate = [&](const WindowProcess& process) {
     ASSERT_EQ(
@@ -165,13 +165,21 @@ TEST_F(ApplicationsTest, FollowsTheWindowManager) {
   auto game = launch(kGame);
   activate(*game);
   ASSERT_TRUE(recorder_.waitForFront(kGame));
+  EXPECT_EQ(stateOf(kGame), kApplicationForeground);
+  EXPECT_EQ(decode(infoOf(kGame)), (Report{kGame, game->pid(), kApplicationForeground, true}));
   auto film = launch(kFilm);
   activate(*film);
   ASSERT_TRUE(recorder_.waitForFront(kFilm));
   EXPECT_EQ(stateOf(kGame), kApplicationBackground);
   EXPECT_EQ(stateOf(kFilm), kApplicationForeground);
+  activate(*game);
+  ASSERT_TRUE(recorder_.waitForFront(kGame));
+  EXPECT_EQ(frontmost(), kGame);
+  activate(*film);
+  ASSERT_TRUE(recorder_.waitForFront(kFilm));
   monitor_->setHandler({});
-  manager.kill();  // its properties stay behind, and say that the film is active
+  manager.kill();
+  client_->waitForEnd(managerWindow);  // its properties stay behind, and say that the film is active
   client_->raise(game->window());
   client_->focus(game->window());
   EXPECT_EQ(frontmost(), kGame);

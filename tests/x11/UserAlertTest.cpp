@@ -16,8 +16,12 @@ class UserAlertTest : public XServerTest {
     XServerTest::SetUp();
     if (IsSkipped()) return;
     if (!hasProgram("zenity") || !hasProgram("xdotool")) GTEST_SKIP() << "zenity or xdotool is not installed";
-    platform_ = std::move(X11Platform::connect(display(), {}).value());
-    user_ = std::make_unique<XClient>(display());
+    open(display());
+  }
+  void open(const std::string& name) {
+    display_ = name;
+    platform_ = std::move(X11Platform::connect(name, {}).value());
+    user_ = std::make_unique<XClient>(name);
   }
   std::unique_ptr<UserAlert> present(const UserAlertRequest& request) {
     answer_ = {};
@@ -26,7 +30,7 @@ class UserAlertTest : public XServerTest {
   void press(const std::vector<std::string>& keys) {
     std::vector<std::string> arguments{"xdotool", "key", "--delay", "100"};
     arguments.insert(arguments.end(), keys.begin(), keys.end());
-    ASSERT_EQ(ChildProcess(arguments, {"DISPLAY=" + display()}).wait(), 0);
+    ASSERT_EQ(ChildProcess(arguments, {"DISPLAY=" + display_}).wait(), 0);
   }
   /// Presents the alert, presses keys once it has the keyboard, and tells the answer.
   UserAlertAnswer answerByKeys(const UserAlertRequest& request, const std::vector<std::string>& keys) {
@@ -45,6 +49,7 @@ class UserAlertTest : public XServerTest {
   const UserAlertRequest twoButtons_{
       "Record <b>Tom & Jerry</b>?", "A \\n text_with --everything", "_Allow & go", "", "Don't allow", ""};
   const UserAlertRequest threeButtons_{"-Record?", "text", "Refuse", "With camera", "Without", ""};
+  std::string display_;
   std::promise<UserAlertAnswer> answer_;
   std::unique_ptr<X11Platform> platform_;
   std::unique_ptr<XClient> user_;
@@ -74,6 +79,23 @@ TEST_F(UserAlertTest, GivesTheKeyboardBack) {
   user_->focus(game);
   EXPECT_EQ(answerByKeys(twoButtons_, {"Return"}), UserAlertAnswer::Other);
   EXPECT_EQ(user_->focused(), game) << "at the latest when the handler is called";
+}
+
+TEST_F(UserAlertTest, TakesAndReturnsTheKeyboardUnderAWindowManager) {
+  if (!hasProgram("openbox")) GTEST_SKIP() << "openbox is not installed";
+  XServer own;
+  open(own.display());
+  ChildProcess manager({"openbox", "--sm-disable"}, {"DISPLAY=" + display_});
+  user_->waitForWindowManager();
+  const WindowProcess game(display_);
+  ASSERT_EQ(
+      ChildProcess({"xdotool", "windowactivate", "--sync", std::to_string(game.window())}, {"DISPLAY=" + display_})
+          .wait(),
+      0);
+  user_->waitForFocus(game.window());
+  press({"a"});  // the user is busy with it
+  EXPECT_EQ(answerByKeys(twoButtons_, {"Right", "Return"}), UserAlertAnswer::Default);
+  user_->waitForFocus(game.window());
 }
 
 TEST_F(UserAlertTest, DestroyingTakesTheAlertAwayWithoutAnAnswer) {

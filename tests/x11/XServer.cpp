@@ -193,6 +193,17 @@ xcb_window_t XClient::focused() {
   return window;
 }
 
+bool XClient::hasProperty(xcb_window_t window, const char* name) {
+  auto* atom = xcb_intern_atom_reply(
+      connection_, xcb_intern_atom(connection_, 0, static_cast<uint16_t>(std::strlen(name)), name), nullptr);
+  auto* reply = xcb_get_property_reply(
+      connection_, xcb_get_property(connection_, 0, window, atom->atom, XCB_ATOM_ANY, 0, 0), nullptr);
+  const bool isSet = reply != nullptr && reply->type != XCB_ATOM_NONE;
+  std::free(reply);
+  std::free(atom);
+  return isSet;
+}
+
 std::string XClient::property(xcb_window_t window, const char* name) {
   auto* atom = xcb_intern_atom_reply(
       connection_, xcb_intern_atom(connection_, 0, static_cast<uint16_t>(std::strlen(name)), name), nullptr);
@@ -207,18 +218,65 @@ std::string XClient::property(xcb_window_t window, const char* name) {
   return value;
 }
 
-void XClient::waitForWindowManager() {
-  const uint32_t mask = XCB_EVENT_MASK_PROPERTY_CHANGE;
-  xcb_change_window_attributes(connection_, screen_->root, XCB_CW_EVENT_MASK, &mask);
-  while (property(screen_->root, "_NET_SUPPORTING_WM_CHECK").empty()) std::free(xcb_wait_for_event(connection_));
+void XClient::waitForEvent() {
+  xcb_generic_event_t* event = xcb_wait_for_event(connection_);
+  if (event == nullptr) throw std::runtime_error("the X server has gone");
+  std::free(event);
+}
+
+void XClient::select(xcb_window_t window, uint32_t mask) {
+  xcb_change_window_attributes(connection_, window, XCB_CW_EVENT_MASK, &mask);
+}
+
+xcb_window_t XClient::waitForWindowManager() {
+  // The list of its clients is the last that it publishes before it manages windows. A window that
+  // asks to be shown between the announcement and that may be overlooked.
+  select(screen_->root, XCB_EVENT_MASK_PROPERTY_CHANGE);
+  while (!hasProperty(screen_->root, "_NET_CLIENT_LIST_STACKING")) waitForEvent();
+  const std::string check = property(screen_->root, "_NET_SUPPORTING_WM_CHECK");
+  xcb_window_t window = XCB_NONE;
+  if (check.size() == sizeof window) std::memcpy(&window, check.data(), sizeof window);
+  return window;
+}
+
+void XClient::waitForEnd(xcb_window_t window) {
+  select(window, XCB_EVENT_MASK_STRUCTURE_NOTIFY);
+  while (parentOf(window) != XCB_NONE) waitForEvent();
+}
+
+xcb_window_t XClient::parentOf(xcb_window_t window) {
+  auto* tree = xcb_query_tree_reply(connection_, xcb_query_tree(connection_, window), nullptr);
+  const xcb_window_t parent = tree == nullptr ? XCB_NONE : tree->parent;
+  std::free(tree);
+  return parent;
+}
+
+void XClient::selectFocusEvents() {
+  // A window tells also of a focus that moves into or out of a window within it.
+  auto* tree = xcb_query_tree_reply(connection_, xcb_query_tree(connection_, screen_->root), nullptr);
+  if (tree == nullptr) return;
+  const xcb_window_t* children = xcb_query_tree_children(tree);
+  for (int i = 0; i < xcb_query_tree_children_length(tree); ++i) select(children[i], XCB_EVENT_MASK_FOCUS_CHANGE);
+  std::free(tree);
+}
+
+xcb_window_t XClient::waitForFocus(const std::function<bool(xcb_window_t)>& isWanted) {
+  select(screen_->root, XCB_EVENT_MASK_SUBSTRUCTURE_NOTIFY | XCB_EVENT_MASK_FOCUS_CHANGE);
+  while (true) {
+    selectFocusEvents();
+    for (xcb_window_t window = focused(); window > XCB_INPUT_FOCUS_POINTER_ROOT; window = parentOf(window))
+      if (isWanted(window)) return window;
+    waitForEvent();
+  }
 }
 
 xcb_window_t XClient::waitForFocusedWindow(const std::string& title) {
-  while (true) {
-    const xcb_window_t window = focused();
-    if (window > XCB_INPUT_FOCUS_POINTER_ROOT && property(window, "_NET_WM_NAME") == title) return window;
-    ::usleep(10'000);  // the server tells nobody of a focus that moves between other clients' windows
-  }
+  // Some toolkits focus a window of no size within their window.
+  return waitForFocus([&](xcb_window_t window) { return property(window, "_NET_WM_NAME") == title; });
+}
+
+void XClient::waitForFocus(xcb_window_t wanted) {
+  waitForFocus([&](xcb_window_t window) { return window == wanted; });
 }
 
 WindowProcess::WindowProcess(const std::string& display) {

@@ -6,6 +6,7 @@
 
 #include <condition_variable>
 #include <cstdint>
+#include <functional>
 #include <initializer_list>
 #include <memory>
 #include <mutex>
@@ -78,16 +79,26 @@ class XClient {
   void focus(xcb_window_t window);
   /// The window that has the keyboard focus.
   [[nodiscard]] xcb_window_t focused();
-  /// Returns when a window manager has announced itself.
-  void waitForWindowManager();
-  /// Returns when another client has mapped a top-level window of this title that has the focus.
+  /// Returns when a window manager manages windows; the window that stands for it.
+  xcb_window_t waitForWindowManager();
+  /// Returns when the window exists no more.
+  void waitForEnd(xcb_window_t window);
+  /// Returns when a window of this title, or one within it, has the focus.
   xcb_window_t waitForFocusedWindow(const std::string& title);
+  /// Returns when this window, or one within it, has the focus.
+  void waitForFocus(xcb_window_t wanted);
   void setCursor(xcb_window_t window, uint16_t side, uint32_t rgb);
   [[nodiscard]] xcb_connection_t* connection() const { return connection_; }
   [[nodiscard]] xcb_window_t root() const { return screen_->root; }
   void sync();
 
  private:
+  void waitForEvent();
+  void select(xcb_window_t window, uint32_t mask);
+  void selectFocusEvents();
+  xcb_window_t waitForFocus(const std::function<bool(xcb_window_t)>& isWanted);
+  xcb_window_t parentOf(xcb_window_t window);
+  bool hasProperty(xcb_window_t window, const char* name);
   std::string property(xcb_window_t window, const char* name);
 
   xcb_connection_t* connection_;
