@@ -79,8 +79,8 @@ void MovieRecorder::take(std::vector<Item> items) {
 
 void MovieRecorder::add(Item item) {
   const auto& mine = pending_[item.track];
-  if (!mine.empty() && item.sample.decodeTime - mine.front().decodeTime >=
-                           kFragmentLength.count() * int64_t{tracks_[item.track].timescale}) {
+  const int64_t fragmentTicks = kFragmentLength.count() * int64_t{tracks_[item.track].timescale} / 1000;
+  if (!mine.empty() && item.sample.decodeTime - mine.front().decodeTime >= fragmentTicks) {
     // Here, with the next sample in hand, the duration of the last one is known.
     pending_[item.track].back().duration = static_cast<uint32_t>(item.sample.decodeTime - mine.back().decodeTime);
     flush();

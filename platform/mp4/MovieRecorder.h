@@ -13,8 +13,8 @@
 
 namespace qv::platform::mp4 {
 
-/// Writes a movie from a thread of its own, in fragments of a second: by the samples' times, and by
-/// the clock when few come. No track waits for another. The disk never holds up the encoder until
+/// Writes a movie from a thread of its own, in fragments of `kFragmentLength`: by the samples' times,
+/// and by the clock when few come. No track waits for another. The disk never holds up the encoder until
 /// `kMaximumQueuedBytes` wait for it.
 ///
 /// When the disk fails, what was written before is finished at once and `onFailure` is told; later
@@ -24,7 +24,9 @@ namespace qv::platform::mp4 {
 class MovieRecorder {
  public:
   static constexpr size_t kMaximumQueuedBytes = 32u << 20;
-  static constexpr std::chrono::seconds kFragmentLength{1};
+  /// A crash may cost a second. What stands in the encoder is lost beside the fragment, so that leaves
+  /// it 200 ms (measured: 63 ms at most in 40 recordings at 60 frames/s on two busy cores).
+  static constexpr std::chrono::milliseconds kFragmentLength{800};
 
   MovieRecorder(std::unique_ptr<MovieFile> file, std::vector<MovieTrack> tracks,
                 std::function<void(const Error&)> onFailure);

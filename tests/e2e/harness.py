@@ -75,6 +75,7 @@ class Daemon:
     """One quorveld process; its log is a file, for a killed daemon tells nothing more."""
 
     def __init__(self, device, environment):
+        self.has_ended = False  # as the test wanted it
         self.log_path = os.path.join(device.path, f'log{len(device.daemons)}')
         self.socket_path = os.path.join(environment['XDG_RUNTIME_DIR'], SOCKET)
         with open(self.log_path, 'wb') as log:
@@ -106,12 +107,19 @@ class Daemon:
         """As a crash does it: nothing is completed."""
         self.process.kill()
         self.process.wait()
+        self.has_ended = True
+
+    def wait_for_end(self):
+        """The exit code of a daemon that gives up."""
+        code = self.process.wait(PATIENCE)
+        self.has_ended = True
+        return code
 
     def stop(self):
         """As the service manager does it; the daemon must still have been there."""
         check(self.is_running(), f'the daemon ended by itself with {self.process.returncode}')
         self.process.send_signal(signal.SIGTERM)
-        self.process.wait(PATIENCE)
+        self.wait_for_end()
         check(self.process.returncode == 0, f'the daemon ended with {self.process.returncode}')
         self.check_sanitizers()
 
@@ -126,7 +134,7 @@ class Device:
     At its end the daemons that still run are stopped and must end well, and the directory goes away.
     """
 
-    def __init__(self, alert='accept', log='error', hasMediaParent=True):
+    def __init__(self, alert='accept', log='error', has_media_parent=True):
         self.path = tempfile.mkdtemp(prefix='quorveld-e2e-')
         self.root = os.path.join(self.path, 'root')
         self.media = os.path.join(self.root, 'private/var/mobile/Library')
@@ -139,7 +147,7 @@ class Device:
         self.daemons = []
         self.clients = []
         self.mounts = []
-        if hasMediaParent:
+        if has_media_parent:
             os.makedirs(self.media)
         shutil.copytree(setting('QV_E2E_FRAMEWORK'), self.framework)
         self._make_test_bundle()
@@ -168,6 +176,10 @@ class Device:
         if mounted.returncode != 0:
             raise Skipped(f'no file system can be mounted here: {mounted.stderr.strip()}')
         self.mounts.append(directory)
+
+    @staticmethod
+    def remount(directory, option):
+        subprocess.run(['mount', '-o', f'remount,{option}', directory], check=True)
 
     def environment(self):
         environment = {'PATH': os.environ['PATH'], 'HOME': self.path, 'LANG': 'C.UTF-8', 'TMPDIR': self.path,
@@ -226,7 +238,7 @@ class Device:
         try:
             if kind is None:
                 for daemon in self.daemons:
-                    if daemon.is_running():
+                    if not daemon.has_ended:
                         daemon.stop()
             elif not issubclass(kind, Skipped):
                 self._show_logs()

@@ -1,8 +1,6 @@
 """The daemon lives on, and says what is wrong, where the world around it is not as it should be."""
-import json
 import os
-import subprocess
-import sys
+import shutil
 
 import movie
 from harness import PATIENCE, Device, check, main, wait_for_line, wait_until
@@ -30,8 +28,8 @@ def second_daemon():
         game = device.start_game('record 2; stop; quit')
         wait_for_line(game, 'started')
         second = device.start_daemon(expect_service=False)
-        second.process.wait(PATIENCE)
-        check(second.process.returncode > 0, f'the second daemon ended with {second.process.returncode}')
+        code = second.wait_for_end()
+        check(code > 0, f'the second daemon ended with {code}')
         check('the service cannot be opened' in second.log(), f'it says nothing of the reason: {second.log()}')
         wait_for_line(game, 'stopped url=file:')
         game.wait(PATIENCE)
@@ -101,24 +99,48 @@ def disk_that_fills():
             except OSError:
                 pass
         output, _ = game.communicate(timeout=PATIENCE)
-        print(output)
-        check('stopped url=' in output, 'the game is told nothing')
-        for path in device.movie_files():
-            movie.check_decodes(path)
-            print(path, movie.streams(path)[0]['duration'])
+        check(f'stopped url= error={FAILED_TO_SAVE}\n' in output, output)
+        path, = device.movie_files()
+        check(float(movie.streams(path)[0]['duration']) > 0.5, 'nothing is left of the recording')
+        movie.check_decodes(path)
         os.remove(ballast)
         check(records(device), 'no recording with room again')
 
 
-def no_place_for_movies():
-    """Without the directory that holds the movies' a recording runs, and ends with an error."""
-    with Device(hasMediaParent=False) as device:
+def read_only_disk():
+    """A recording whose file cannot be made begins, and its stop says that there is no movie."""
+    with Device() as device:
+        device.mount_disk(device.movies, '200m')
         device.start_daemon()
+        device.remount(device.movies, 'ro')
         output = run_refused_game(device, 'record 1; stop; quit')
         check(STARTED in output, f'the recording is refused:\n{output}')
-        check(f'error={FAILED_TO_SAVE}\n' in output and 'stopped url= ' in output, output)
-        os.makedirs(device.movies)
-        check(records(device), 'no recording with the directory in place')
+        check(f'stopped url= error={FAILED_TO_SAVE}\n' in output, output)
+        device.remount(device.movies, 'rw')
+        check(records(device), 'no recording on a disk that can be written again')
+
+
+def check_refused_for_storage(device):
+    output = run_refused_game(device, 'record 1; stop; quit')
+    check(f'error code={INSUFFICIENT_STORAGE} ' in output, output)
+    if os.path.isfile(device.movies):
+        os.remove(device.movies)
+    os.makedirs(device.movies)
+    check(records(device), 'no recording with the directory in place')
+
+
+def no_place_for_movies():
+    """A directory that does not exist has no free space."""
+    with Device(has_media_parent=False) as device:
+        device.start_daemon()
+        check_refused_for_storage(device)
+
+
+def movies_directory_is_a_file():
+    with Device() as device:
+        device.write('Quorvel', 'not a directory', device.media)
+        device.start_daemon()
+        check_refused_for_storage(device)
 
 
 BROKEN = ['', '{', '[]', 'null', '{"idiom": 7, "chipID": "x", "Languages": 3, "QVBitRateOverride": "lots"}',
@@ -142,7 +164,7 @@ def broken_files():
             check(records(device), f'no recording with files of {content[:30]!r}')
             check(daemon.is_running(), 'the daemon ended')
     with Device() as device:  # no files at all, and links and directories where files should be
-        subprocess.run(['rm', '-r', device.framework], check=True)
+        shutil.rmtree(device.framework)
         os.makedirs(os.path.join(device.root, 'etc/quorvel/device.json'))
         os.makedirs(device.preferences)
         os.symlink('com.tarnwick.quorveld.json', os.path.join(device.preferences, 'com.tarnwick.quorveld.json'))
@@ -150,18 +172,7 @@ def broken_files():
         check(records(device), 'no recording without files')
 
 
-def movies_directory_is_a_file():
-    with Device() as device:
-        device.write('Quorvel', 'not a directory', device.media)
-        device.start_daemon()
-        output = run_refused_game(device, 'record 1; stop; quit')
-        check('error' in output, output)
-        os.remove(device.movies)
-        os.makedirs(device.movies)
-        check(records(device), 'no recording with the directory in place')
-
-
 if __name__ == '__main__':
-    main({case.__name__: case for case in (second_daemon, client_dies_in_alert, client_dies_in_recording,
-                                           disk_without_room, disk_that_fills, no_place_for_movies, broken_files,
-                                           movies_directory_is_a_file)})
+    main({case.__name__: case for case in (
+        second_daemon, client_dies_in_alert, client_dies_in_recording, disk_without_room, disk_that_fills,
+        read_only_disk, no_place_for_movies, movies_directory_is_a_file, broken_files)})
