@@ -9,7 +9,6 @@ finishes are in none of the figures.
 import argparse
 import json
 import os
-import statistics
 import subprocess
 import sys
 import time
@@ -17,6 +16,7 @@ import urllib.parse
 from dataclasses import dataclass, field
 
 import processes
+import table
 from stage import Game, Stage
 
 SETTLING = 1.0  # seconds at both ends of a recording that are not measured
@@ -50,14 +50,12 @@ class Round:
     threads: dict = field(default_factory=dict)
 
 
-def median(rounds, value):
-    return statistics.median(value(r) for r in rounds)
-
-
 def probe_frames(path):
-    arguments = ["ffprobe", "-v", "error", "-count_packets", "-show_entries", "stream=codec_type,nb_read_packets,duration",
-                 "-of", "json", path]
-    streams = json.loads(subprocess.run(arguments, capture_output=True, text=True, check=True, timeout=60).stdout)["streams"]
+    """(pictures, seconds, kinds of the tracks)"""
+    arguments = ["ffprobe", "-v", "error", "-count_packets", "-of", "json", "-show_entries",
+                 "stream=codec_type,nb_read_packets,duration", path]
+    probe = subprocess.run(arguments, capture_output=True, text=True, check=True, timeout=60)
+    streams = json.loads(probe.stdout)["streams"]
     video = next(stream for stream in streams if stream["codec_type"] == "video")
     return int(video["nb_read_packets"]), float(video["duration"]), [stream["codec_type"] for stream in streams]
 
@@ -71,10 +69,11 @@ class Bench:
     def measured(self, pid, begin, end):
         """(processor seconds per second of the process, of the X server, of each thread by name)"""
         sleep_until(begin)
-        before = time.monotonic(), processes.processor_seconds(pid), processes.processor_seconds(self.stage.display_server)
+        server = self.stage.display_server
+        before = time.monotonic(), processes.processor_seconds(pid), processes.processor_seconds(server)
         threads_before = processes.thread_seconds(pid)
         sleep_until(end)
-        after = time.monotonic(), processes.processor_seconds(pid), processes.processor_seconds(self.stage.display_server)
+        after = time.monotonic(), processes.processor_seconds(pid), processes.processor_seconds(server)
         elapsed = after[0] - before[0]
         threads = {}
         for task, (name, seconds) in processes.thread_seconds(pid).items():
@@ -97,7 +96,8 @@ class Bench:
         pictures, duration, kinds = probe_frames(path)
         if sorted(kinds) != ["audio", "audio", "video"]:
             raise RuntimeError(f"the movie has {kinds}")
-        return Round(daemon, 0, 0, pictures / (duration * mode.fps), dropped, 0, server, 0, threads), stopped - requested
+        frames = pictures / (duration * mode.fps)
+        return Round(daemon, 0, 0, frames, dropped, 0, server, 0, threads), stopped - requested
 
     # The same by other means ------------------------------------------------------------------------
 
@@ -151,7 +151,10 @@ class Bench:
     # Times ------------------------------------------------------------------------------------------
 
     def first_start(self, game):
-        """The alert is answered by the keyboard. Seconds from the key, and from the answer's arrival, to the start's reply."""
+        """The alert is answered by the keyboard.
+
+        (seconds from the key, and from the answer's arrival, to the start's reply)
+        """
         asked, said = self.stage.daemon.mark(), game.child.mark()
         self.stage.press("r")
         self.stage.daemon.expect("showAcknowledgementAlert", asked)
@@ -224,63 +227,6 @@ def progress(text):
     print(text, file=sys.stderr, flush=True)
 
 
-# The table ------------------------------------------------------------------------------------------
-
-
-def row(what, figure, note=""):
-    print(f"  {what:<52}{figure:>18}  {note}".rstrip())
-
-
-def print_costs(mode, rounds):
-    print(f"\n{mode.name}, {mode.bit_rate} kbit/s, application sound and microphone; medians of {len(rounds)} rounds")
-    row("processor: daemon / x11grab", f"{median(rounds, lambda r: r.daemon / r.x11grab):.2f}",
-        f"{median(rounds, lambda r: r.daemon):.3f} s/s against {median(rounds, lambda r: r.x11grab):.3f}")
-    row("processor: daemon / bare encoder", f"{median(rounds, lambda r: r.daemon / r.bare):.2f}",
-        f"{median(rounds, lambda r: r.bare):.3f} s/s")
-    row("X server's processor: daemon / x11grab",
-        f"{median(rounds, lambda r: r.server / max(r.server_x11grab, 0.001)):.2f}",
-        f"{median(rounds, lambda r: r.server):.3f} s/s against {median(rounds, lambda r: r.server_x11grab):.3f}; "
-        "with the game's own drawing")
-    row("pictures dropped by the daemon", " ".join(str(r.dropped) for r in rounds), "of each round, as it logs them")
-    row("pictures in the movie / pictures due", f"{median(rounds, lambda r: r.frames):.3f}",
-        f"x11grab {median(rounds, lambda r: r.x11grab_frames):.3f}")
-    names = sorted({name for r in rounds for name in r.threads})
-    costs = sorted(((median(rounds, lambda r: r.threads.get(name, 0.0)), name) for name in names), reverse=True)
-    print("  the daemon's threads, s/s: " + ", ".join(f"{name} {cost:.3f}" for cost, name in costs if cost >= 0.001))
-
-
-def print_times(first, first_stop, starts, stops, finishes):
-    print("\nTimes")
-    row("first start: answer of the alert to reply", f"{first[1] * 1e3:.0f} ms", f"{first[0] * 1e3:.0f} ms from the key")
-    row("later starts: request to reply, median and worst",
-        f"{statistics.median(starts) * 1e3:.0f}, {max(starts) * 1e3:.0f} ms", f"{len(starts)} starts, consent remembered")
-    row("stop to playable movie: first, of 10 s", f"{first_stop * 1e3:.0f} ms")
-    row("stop to playable movie: all others, median and worst",
-        f"{statistics.median(stops) * 1e3:.0f}, {max(stops) * 1e3:.0f} ms", f"{len(stops)} recordings of the rounds above")
-    for line in finishes.splitlines():
-        seconds, milliseconds = line.split()
-        row(f"finish of a made-up movie of {int(seconds)} s", f"{milliseconds} ms",
-            "index and syncs alone: bench_movie_finish")
-
-
-def print_capture(results):
-    print("\nCapture (samples to the application)")
-    for mode, (latency, cost, line, frames, rights, drawing) in results:
-        row(f"{mode.name}: capture to the client's handler, median", f"{latency:.1f} ms",
-            f"the handler runs in the game's main loop, which draws for about {drawing * 1e3:.1f} ms of each picture")
-        row(f"{mode.name}: what the client got", line.split("video=")[1].split()[0], line)
-        row(f"{mode.name}: daemon's processor", f"{cost:.3f} s/s")
-        row(f"{mode.name}: frames that server, daemon and game share", str(frames),
-            f"inodes seen in /proc/PID/maps of all three at once, game's rights: {rights}; a copy would show none")
-
-
-def print_idle(before, after, beside_game, seconds):
-    print("\nIdle daemon")
-    for when, (resident, anonymous, woken) in (("before the first recording", before), ("after the last recording", after)):
-        row(f"resident, {when}", f"{resident / 1024:.1f} MB", f"of it anonymous {anonymous / 1024:.1f} MB")
-        row(f"wake-ups in {seconds:g} s, {when}", str(woken))
-    row("wake-ups in one x11grab round", str(beside_game), "a client is connected and draws, nothing is recorded")
-
 
 def idle(pid, seconds):
     before = processes.wake_ups(pid)
@@ -321,13 +267,14 @@ def main():
         print(f"One run on {os.cpu_count()} processors that others share: load {load_before:.1f} before it, "
               f"{os.getloadavg()[0]:.1f} after. Compare ratios, not seconds.")
         for mode, rounds in costs:
-            print_costs(mode, rounds)
-        print_times(first, first_stop, starts, stops, finishes)
-        print_capture(captures)
-        print_idle(before, after, bench.woken_beside_game, idle_seconds)
+            table.print_costs(mode, rounds)
+        table.print_times(first, first_stop, starts, stops, finishes)
+        table.print_capture(captures)
+        table.print_idle(before, after, bench.woken_beside_game, idle_seconds)
         print("\nCompared with, here for the first mode:")
         print("  " + bench.x11grab_command(modes[0], "x11grab.mp4"))
-        print("  " + " ".join(os.path.relpath(part) if os.path.isabs(part) else part for part in bench.bare_command(modes[0])))
+        bare = bench.bare_command(modes[0])
+        print("  " + " ".join([os.path.relpath(bare[0]), *bare[1:]]))
 
 
 if __name__ == "__main__":

@@ -63,8 +63,8 @@ class Stage:
 
     def _start_display(self):
         # Without a window manager the game's window lies in the corner, where x11grab finds it.
-        server = self.start(["Xvfb", "-displayfd", "1", "-screen", "0", f"{SCREEN[0]}x{SCREEN[1]}x24", "-nolisten", "tcp",
-                             "-noreset"])
+        server = self.start(["Xvfb", "-displayfd", "1", "-screen", "0", f"{SCREEN[0]}x{SCREEN[1]}x24", "-nolisten",
+                             "tcp", "-noreset"])
         self.display_server = server.pid
         self.environment["DISPLAY"] = ":" + server.expect("")[1]
 
@@ -105,7 +105,7 @@ class Stage:
                               check=check, timeout=seconds)
 
     def press(self, *keys):
-        """Presses keys one after the other; when the last one was pressed, not sooner than it reached the server."""
+        """Presses keys one after the other; returns when the last one has been sent."""
         self.run(["xdotool", "key", "--delay", "60", *keys])
 
 
