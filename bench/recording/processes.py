@@ -111,7 +111,7 @@ def shared_memory_files(pid):
     found = {}
     with open(f"/proc/{pid}/maps") as file:
         for line in file:
-            fields = line.split(None, 5)
-            if len(fields) == 6 and fields[5].startswith("/memfd:"):
+            if "/memfd:" in line:
+                fields = line.split(None, 5)
                 found[int(fields[4])] = fields[1]
     return found

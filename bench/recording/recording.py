@@ -202,21 +202,21 @@ class Bench:
         return float(line.split("latency_ms=")[1].split()[0]), daemon, line, frames, rights, drawing
 
     def shared_frames(self, game):
-        """Memory files that the X server, the daemon and the game map at the same time, and the game's rights.
+        """How many frames the X server, the daemon and the game map at the same time, and the game's rights.
 
-        The game maps a frame only while it has it, so it is looked for again and again.
+        Server and daemon keep their frames mapped; the game maps one only while it has it, a fraction of a
+        picture's time, so it is looked at again and again.
         """
+        kept = set.intersection(*(set(processes.shared_memory_files(pid)) for pid in
+                                  (self.stage.display_server, self.stage.daemon.pid)))
         frames, rights = set(), set()
-        until = time.monotonic() + 1.5
+        until = time.monotonic() + 2
         while time.monotonic() < until:
             seen = processes.shared_memory_files(game)
-            if not seen:
-                continue
-            others = (processes.shared_memory_files(pid) for pid in (self.stage.display_server, self.stage.daemon.pid))
-            for inode in set(seen).intersection(*others):
+            for inode in kept.intersection(seen):
                 frames.add(inode)
                 rights.add(seen[inode])
-        return len(frames), "".join(sorted(rights)) or "none"
+        return len(frames), "".join(sorted(rights))
 
 
 def sleep_until(when):

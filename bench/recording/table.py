@@ -54,7 +54,8 @@ def print_capture(results):
         row(f"{mode.name}: what the client got", line.split("video=")[1].split()[0], line)
         row(f"{mode.name}: daemon's processor", f"{cost:.3f} s/s")
         row(f"{mode.name}: frames that server, daemon and game share", str(frames),
-            f"inodes seen in /proc/PID/maps of all three at once, game's rights: {rights}; a copy would show none")
+            f"the same inodes in /proc/PID/maps of all three, game's rights {rights}: nothing is copied between them"
+            if frames else "none was met; the game has each for a moment only, so this tells nothing")
 
 
 def print_idle(before, after, beside_game, seconds):
