@@ -1,5 +1,6 @@
 #include "platform/ffmpeg/FFmpegAssetWriter.h"
 
+#include <malloc.h>
 #include <pthread.h>
 
 #include "platform/Executor.h"
@@ -39,6 +40,8 @@ bool FFmpegAssetWriter::startWriting() {
   state_->start();
   encoderThread_ = std::thread([state = state_, movieFile = std::move(*file), plans = std::move(plans)]() mutable {
     MovieEncoder(state, std::move(movieFile), plans).run();
+    // Encoders leave tens of megabytes of free heap behind, which the next recording may never need.
+    ::malloc_trim(0);
   });
   pthread_setname_np(encoderThread_.native_handle(), "qv-encoder");
   return true;

@@ -4,31 +4,14 @@
 #include <unistd.h>
 
 #include <cerrno>
-#include <cstdarg>
-#include <cstdio>
 #include <filesystem>
-#include <mutex>
 
-#include "platform/Log.h"
 #include "platform/ffmpeg/FFmpegAssetWriter.h"
-#include "platform/ffmpeg/FFmpegExportSession.h"
-#include "platform/ffmpeg/FFmpegHandles.h"
 #include "platform/ffmpeg/FFmpegWriterInput.h"
+#include "platform/ffmpeg/LibraryLog.h"
 
 namespace qv::platform::ffmpeg {
 namespace {
-
-void logLibraryLine(void*, int level, const char* format, va_list arguments) {
-  if (level > AV_LOG_WARNING || !logIsOn(LogLevel::Info)) return;
-  char text[512];
-  std::vsnprintf(text, sizeof text, format, arguments);
-  QV_LOG_INFO(logs::kMovie, "%s", text);
-}
-
-void routeLibraryLog() {
-  static std::once_flag once;
-  std::call_once(once, [] { av_log_set_callback(logLibraryLine); });
-}
 
 std::optional<Error> checkDestination(const URL& url) {
   const std::string path = url.path();
@@ -58,17 +41,6 @@ Result<std::unique_ptr<AssetWriter>> FFmpegAssetWriterService::createAssetWriter
 std::shared_ptr<WriterInput> FFmpegAssetWriterService::createWriterInput(MediaType type,
                                                                          const Dictionary& outputSettings) {
   return std::make_shared<FFmpegWriterInput>(type, outputSettings);
-}
-
-FFmpegExportService::FFmpegExportService() { routeLibraryLog(); }
-
-std::shared_ptr<MovieAsset> FFmpegExportService::openMovie(const URL& url) {
-  return std::make_shared<FFmpegMovieAsset>(url);
-}
-
-std::shared_ptr<ExportSession> FFmpegExportService::createExportSession(std::shared_ptr<MovieAsset> asset,
-                                                                        ExportPreset preset) {
-  return std::make_shared<FFmpegExportSession>(std::move(asset), preset);
 }
 
 }  // namespace qv::platform::ffmpeg

@@ -2,7 +2,7 @@
 
 #include <dlfcn.h>
 
-#include <filesystem>
+#include <utility>
 
 #include "platform/Executor.h"
 #include "platform/Log.h"
@@ -11,19 +11,27 @@
 namespace qv::platform::ffmpeg {
 namespace {
 
-constexpr const char kModuleName[] = "quorveld-movies.so";
-
 void forwardLine(LogLevel level, const char* category, const char* text) { QV_LOG_AT(level, category, "%s", text); }
 
-std::string findModule() {
+std::filesystem::path findModules() {
   namespace fs = std::filesystem;
   std::error_code error;
   const fs::path directory = fs::read_symlink("/proc/self/exe", error).parent_path();
-  const fs::path installed = directory / "../lib/quorveld" / kModuleName;
-  return fs::exists(directory / kModuleName, error) ? directory / kModuleName : installed;
+  return fs::exists(directory / kMoviesModule, error) ? directory : directory / "../lib/quorveld";
 }
 
-Error loadError(const std::string& text) { return Error{"movie", ENOENT, {{kLocalizedDescriptionKey, Value(text)}}}; }
+/// The service that the module's entry opens. Never unloaded.
+template <typename Open>
+auto openModule(const std::filesystem::path& path, const char* entry)
+    -> Result<decltype(std::declval<Open>()(std::declval<const MoviesHost&>()))> {
+  void* module = ::dlopen(path.c_str(), RTLD_NOW | RTLD_LOCAL);
+  auto* open = module ? reinterpret_cast<Open>(::dlsym(module, entry)) : nullptr;
+  if (open != nullptr) return open({forwardLine, detail::logThreshold.load(std::memory_order_relaxed)});
+  const char* why = ::dlerror();
+  Error error{"movie", ENOENT, {{kLocalizedDescriptionKey, Value(why ? why : path.c_str())}}};
+  QV_LOG_ERROR(logs::kMovie, "movie module: %s", error.description().c_str());
+  return error;
+}
 
 /// What there is of a movie, and of an export, when nothing can be read.
 ///
@@ -56,63 +64,52 @@ class FailedExportSession final : public ExportSession {
 
 }  // namespace
 
-MoviesLoader::MoviesLoader(std::string modulePath) : modulePath_(std::move(modulePath)) {}
+MoviesLoader::MoviesLoader(std::string directory) : directory_(std::move(directory)) {}
 
-void MoviesLoader::loadOnce() {
-  std::call_once(once_, [this] {
-    const std::string path = modulePath_.empty() ? findModule() : modulePath_;
-    void* module = ::dlopen(path.c_str(), RTLD_NOW | RTLD_LOCAL);
-    auto* open = module ? reinterpret_cast<OpenMovies>(::dlsym(module, kMoviesModuleEntry)) : nullptr;
-    if (open == nullptr) {
-      const char* why = ::dlerror();
-      error_ = loadError(why ? why : path);
-      QV_LOG_ERROR(logs::kMovie, "movie module: %s", error_->description().c_str());
-      return;
-    }
-    const MoviesModule services = open({forwardLine, detail::logThreshold.load(std::memory_order_relaxed)});
-    assetWriters_ = services.assetWriters;
-    exports_ = services.exports;
-  });
+std::filesystem::path MoviesLoader::pathOf(const char* module) const {
+  return (directory_.empty() ? findModules() : std::filesystem::path(directory_)) / module;
 }
 
-AssetWriterService* MoviesLoader::assetWriters() {
-  loadOnce();
-  return assetWriters_;
+const Result<AssetWriterService*>& MoviesLoader::assetWriters() {
+  std::call_once(assetWritersOnce_,
+                 [this] { assetWriters_.emplace(openModule<OpenMovies>(pathOf(kMoviesModule), kMoviesModuleEntry)); });
+  return *assetWriters_;
 }
 
-ExportService* MoviesLoader::exports() {
-  loadOnce();
-  return exports_;
+const Result<ExportService*>& MoviesLoader::exports() {
+  std::call_once(exportsOnce_,
+                 [this] { exports_.emplace(openModule<OpenExports>(pathOf(kExportsModule), kExportsModuleEntry)); });
+  return *exports_;
 }
 
 void MoviesLoader::prepareForWriting() {
   // The loader lives as long as the process; a load that is under way makes later ones wait for it.
-  globalQueue().post([this] { loadOnce(); });
+  globalQueue().post([this] { (void)assetWriters(); });
 }
 
 Result<std::unique_ptr<AssetWriter>> MoviesLoader::createAssetWriter(const URL& outputURL,
                                                                      const std::string& fileType) {
-  AssetWriterService* service = assetWriters();
-  if (service == nullptr) return *error_;
-  return service->createAssetWriter(outputURL, fileType);
+  const auto& service = assetWriters();
+  if (!service) return service.error();
+  return service.value()->createAssetWriter(outputURL, fileType);
 }
 
 std::shared_ptr<WriterInput> MoviesLoader::createWriterInput(MediaType type, const Dictionary& outputSettings) {
-  AssetWriterService* service = assetWriters();
-  return service ? service->createWriterInput(type, outputSettings) : nullptr;
+  const auto& service = assetWriters();
+  return service ? service.value()->createWriterInput(type, outputSettings) : nullptr;
 }
 
 std::shared_ptr<MovieAsset> MoviesLoader::openMovie(const URL& url) {
-  ExportService* service = exports();
-  if (service == nullptr) return std::make_shared<UnreadableMovie>();
-  return service->openMovie(url);
+  const auto& service = exports();
+  if (!service) return std::make_shared<UnreadableMovie>();
+  return service.value()->openMovie(url);
 }
 
 std::shared_ptr<ExportSession> MoviesLoader::createExportSession(std::shared_ptr<MovieAsset> asset,
                                                                  ExportPreset preset) {
-  ExportService* service = exports();
-  if (service == nullptr) return std::make_shared<FailedExportSession>(*error_);
-  return service->createExportSession(std::move(asset), preset);
+  const auto& service = exports();
+  if (!service) return std::make_shared<FailedExportSession>(service.error());
+  return service.value()->createExportSession(std::move(asset), preset);
 }
 
 }  // namespace qv::platform::ffmpeg

@@ -1,7 +1,9 @@
 #pragma once
 
+#include <filesystem>
 #include <memory>
 #include <mutex>
+#include <optional>
 #include <string>
 
 #include "platform/AssetWriter.h"
@@ -9,19 +11,20 @@
 
 namespace qv::platform::ffmpeg {
 
-/// The services of the movie module, loaded at the first use: the codec libraries take tens of
+/// The services of the movie modules, each loaded at its first use: the codec libraries take tens of
 /// megabytes, which a daemon that records nothing should not carry.
 ///
-/// The module is `quorveld-movies.so` beside the executable, or in ../lib/quorveld from there. Where
-/// it cannot be loaded every operation fails with the loader's words.
+/// The modules, `quorveld-movies.so` and `quorveld-exports.so`, stand beside the executable, or in
+/// ../lib/quorveld from there. Where one cannot be loaded every operation of it fails with the
+/// loader's words.
 ///
 /// Threading: thread-safe.
 class MoviesLoader final : public AssetWriterService, public ExportService {
  public:
-  /// `modulePath`: empty for the places above.
-  explicit MoviesLoader(std::string modulePath = {});
+  /// `directory`: of the modules; empty for the places above.
+  explicit MoviesLoader(std::string directory = {});
 
-  /// Loads the module on the global queue: it takes tens of milliseconds.
+  /// Loads what recordings need on the global queue: it takes tens of milliseconds.
   void prepareForWriting() override;
   Result<std::unique_ptr<AssetWriter>> createAssetWriter(const URL& outputURL, const std::string& fileType) override;
   /// Null where the module cannot be loaded; then no writer was created either.
@@ -30,15 +33,14 @@ class MoviesLoader final : public AssetWriterService, public ExportService {
   std::shared_ptr<ExportSession> createExportSession(std::shared_ptr<MovieAsset> asset, ExportPreset preset) override;
 
  private:
-  AssetWriterService* assetWriters();
-  ExportService* exports();
-  void loadOnce();
+  std::filesystem::path pathOf(const char* module) const;
+  const Result<AssetWriterService*>& assetWriters();
+  const Result<ExportService*>& exports();
 
-  const std::string modulePath_;
-  std::once_flag once_;
-  std::optional<Error> error_;
-  AssetWriterService* assetWriters_ = nullptr;
-  ExportService* exports_ = nullptr;
+  const std::string directory_;
+  std::once_flag assetWritersOnce_, exportsOnce_;
+  std::optional<Result<AssetWriterService*>> assetWriters_;
+  std::optional<Result<ExportService*>> exports_;
 };
 
 }  // namespace qv::platform::ffmpeg

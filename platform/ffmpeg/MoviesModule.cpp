@@ -4,10 +4,9 @@
 
 using namespace qv::platform;
 
-extern "C" __attribute__((visibility("default"))) ffmpeg::MoviesModule qvOpenMovies(const ffmpeg::MoviesHost& host) {
+extern "C" __attribute__((visibility("default"))) AssetWriterService* qvOpenMovies(const ffmpeg::MoviesHost& host) {
   setLogLevel(host.logLevel);
   setLogSink([log = host.log](const LogLine& line) { log(line.level, line.category, line.text.c_str()); });
   static auto* const assetWriters = new ffmpeg::FFmpegAssetWriterService;
-  static auto* const exports = new ffmpeg::FFmpegExportService;
-  return {assetWriters, exports};
+  return assetWriters;
 }

@@ -194,8 +194,8 @@ TEST_F(ExportTest, FailsWithoutLeavingAnything) {
   EXPECT_EQ(filesIn(results_.path()), before);
 }
 
-TEST_F(ExportTest, LoadsTheModuleOnFirstUseAndReportsAMissingOne) {
-  ffmpeg::MoviesLoader loader(QV_MOVIES_MODULE);
+TEST_F(ExportTest, LoadsModulesOnFirstUseAndReportsMissingOnes) {
+  ffmpeg::MoviesLoader loader(QV_MOVIE_MODULES);
   EXPECT_EQ(loader.openMovie(URL::fileURL(source_))->duration().seconds(), 8.0);
   const std::string path = results_ / "recorded.mp4";
   RecordingUnderTest recording(loader, path);
@@ -203,7 +203,7 @@ TEST_F(ExportTest, LoadsTheModuleOnFirstUseAndReportsAMissingOne) {
   recording.finish();
   EXPECT_EQ(probe(path).errors, "");
 
-  ffmpeg::MoviesLoader missing(results_ / "none.so");
+  ffmpeg::MoviesLoader missing(results_ / "none");
   EXPECT_FALSE(missing.createAssetWriter(URL::fileURL(results_ / "x.mp4"), kFileTypeMPEG4).hasValue());
   auto failing = missing.createExportSession(missing.openMovie(URL::fileURL(source_)), ExportPreset::PassThrough);
   runToEnd(*failing);
