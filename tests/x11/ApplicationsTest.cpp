@@ -154,12 +154,7 @@ TEST_F(ApplicationsTest, FollowsTheWindowManager) {
   ChildProcess manager({"openbox", "--sm-disable"}, {"DISPLAY=" + display_});
   const auto managerWindow = client_->waitForWindowManager();
   watch();
-  const auto activate = [&](const WindowProcess& process) {
-    ASSERT_EQ(
-        ChildProcess({"xdotool", "windowactivate", "--sync", std::to_string(process.window())}, {"DISPLAY=" + display_})
-            .wait(),
-        0);
-  };
+  const auto activate = [&](const WindowProcess& process) { ASSERT_TRUE(activateWindow(display_, process.window())); };
   // The manager gives a window the focus when it shows it, which may be after the request for it:
   // so one window at a time.
   auto game = launch(kGame);

@@ -88,10 +88,7 @@ TEST_F(UserAlertTest, TakesAndReturnsTheKeyboardUnderAWindowManager) {
   ChildProcess manager({"openbox", "--sm-disable"}, {"DISPLAY=" + display_});
   user_->waitForWindowManager();
   const WindowProcess game(display_);
-  ASSERT_EQ(
-      ChildProcess({"xdotool", "windowactivate", "--sync", std::to_string(game.window())}, {"DISPLAY=" + display_})
-          .wait(),
-      0);
+  ASSERT_TRUE(activateWindow(display_, game.window()));
   user_->waitForFocus(game.window());
   press({"a"});  // the user is busy with it
   EXPECT_EQ(answerByKeys(twoButtons_, {"Right", "Return"}), UserAlertAnswer::Default);

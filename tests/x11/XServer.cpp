@@ -279,6 +279,16 @@ void XClient::waitForFocus(xcb_window_t wanted) {
   waitForFocus([&](xcb_window_t window) { return window == wanted; });
 }
 
+bool activateWindow(const std::string& display, xcb_window_t window) {
+  constexpr int kAttempts = 20;
+  for (int attempt = 0; attempt < kAttempts; ++attempt) {
+    ChildProcess request({"timeout", "3", "xdotool", "windowactivate", "--sync", std::to_string(window)},
+                         {"DISPLAY=" + display});
+    if (request.wait() == 0) return true;
+  }
+  return false;
+}
+
 WindowProcess::WindowProcess(const std::string& display) {
   int ends[2];
   if (::pipe2(ends, O_CLOEXEC) != 0) throw std::runtime_error("pipe");
