@@ -22,6 +22,48 @@ function(qv_library name)
   endif()
 endfunction()
 
+# qv_module(name SOURCES a.cpp ... [DEPS libraries ...] [PACKAGES pkg-config modules ...])
+# A module that the daemon loads when it needs it (platform/LateModule.h). Only its entry is to be seen, and it
+# carries none but the libraries that it uses.
+function(qv_module name)
+  cmake_parse_arguments(ARG "" "" "SOURCES;DEPS;PACKAGES" ${ARGN})
+  add_library(${name} MODULE ${ARG_SOURCES})
+  set_target_properties(${name} PROPERTIES PREFIX "" CXX_VISIBILITY_PRESET hidden
+                        LIBRARY_OUTPUT_DIRECTORY ${PROJECT_BINARY_DIR}/lib/quorveld)
+  get_property(abi GLOBAL PROPERTY QV_MODULE_ABI)
+  target_compile_definitions(${name} PRIVATE QV_MODULE_ABI="${abi}")
+  target_link_libraries(${name} PRIVATE ${ARG_DEPS})
+  if(ARG_PACKAGES)
+    pkg_check_modules(${name}_packages REQUIRED IMPORTED_TARGET ${ARG_PACKAGES})
+    target_link_libraries(${name} PRIVATE PkgConfig::${name}_packages)
+  endif()
+  target_link_options(${name} PRIVATE -Wl,--exclude-libs,ALL -Wl,--as-needed)
+  install(TARGETS ${name} LIBRARY DESTINATION lib/quorveld)
+endfunction()
+
+# qv_sdk_library(name LIBRARY static-library ENTRY source PC template HEADERS header ...)
+# The shared library that others link, and name_static, the same in a form for tests, which sanitizers see through.
+# Nothing but the public names leaves it, and it stays loaded: its threads live as long as the process.
+function(qv_sdk_library name)
+  cmake_parse_arguments(ARG "" "LIBRARY;ENTRY;PC" "HEADERS" ${ARGN})
+  include(GNUInstallDirs)
+  set(map ${PROJECT_SOURCE_DIR}/sdk/common/quorvel.map)
+  add_library(${name} SHARED ${ARG_ENTRY})
+  target_link_libraries(${name} PRIVATE ${ARG_LIBRARY} qv_sdbus)
+  target_include_directories(${name} INTERFACE ${CMAKE_CURRENT_SOURCE_DIR} ${PROJECT_SOURCE_DIR}/sdk/common)
+  target_link_options(${name} PRIVATE -Wl,--whole-archive $<TARGET_FILE:${ARG_LIBRARY}> -Wl,--no-whole-archive
+                      -Wl,--version-script=${map} -Wl,-z,nodelete)
+  set_target_properties(${name} PROPERTIES VERSION ${PROJECT_VERSION} SOVERSION ${PROJECT_VERSION_MAJOR}
+                        CXX_VISIBILITY_PRESET hidden VISIBILITY_INLINES_HIDDEN ON LINK_DEPENDS ${map})
+  configure_file(${ARG_PC}.in ${ARG_PC} @ONLY)
+  install(TARGETS ${name} LIBRARY DESTINATION ${CMAKE_INSTALL_LIBDIR})
+  install(FILES ${ARG_HEADERS} ${PROJECT_SOURCE_DIR}/sdk/common/quorvel/Types.h
+          DESTINATION ${CMAKE_INSTALL_INCLUDEDIR}/quorvel)
+  install(FILES ${CMAKE_CURRENT_BINARY_DIR}/${ARG_PC} DESTINATION ${CMAKE_INSTALL_LIBDIR}/pkgconfig)
+
+  qv_library(${name}_static SOURCES ${ARG_ENTRY} DEPS ${ARG_LIBRARY} qv_sdbus)
+endfunction()
+
 # qv_test(name SOURCES a.cpp ... [DEPS libraries ...] [SERIAL] [TIMEOUT seconds])
 # One GoogleTest program; each of its cases is a case of ctest. SERIAL for what needs the machine.
 function(qv_test name)
@@ -35,4 +77,20 @@ function(qv_test name)
   endif()
   gtest_discover_tests(${name} TEST_PREFIX "${name}." DISCOVERY_MODE PRE_TEST DISCOVERY_TIMEOUT 60
                        PROPERTIES TIMEOUT ${ARG_TIMEOUT} RUN_SERIAL "${ARG_SERIAL}")
+endfunction()
+
+# qv_extension(program DIRECTORY bundle INFO Info.json SOURCES source ... [LIBRARIES library ...])
+# A broadcast extension in a bundle of its own. It has the extension library in its bundle: an extension may read its
+# own bundle and the system's libraries, and no build directory.
+function(qv_extension program)
+  cmake_parse_arguments(ARG "" "DIRECTORY;INFO" "SOURCES;LIBRARIES" ${ARGN})
+  add_executable(${program} ${ARG_SOURCES})
+  target_link_libraries(${program} PRIVATE quorvel-extension ${ARG_LIBRARIES})
+  set_target_properties(${program} PROPERTIES RUNTIME_OUTPUT_DIRECTORY ${ARG_DIRECTORY}/bin
+                        BUILD_WITH_INSTALL_RPATH ON INSTALL_RPATH "$ORIGIN/../lib")
+  add_custom_command(TARGET ${program} POST_BUILD
+    COMMAND ${CMAKE_COMMAND} -E make_directory ${ARG_DIRECTORY}/lib
+    COMMAND ${CMAKE_COMMAND} -E copy $<TARGET_FILE:quorvel-extension>
+            ${ARG_DIRECTORY}/lib/$<TARGET_SONAME_FILE_NAME:quorvel-extension> VERBATIM)
+  configure_file(${ARG_INFO} ${ARG_DIRECTORY}/Info.json COPYONLY)
 endfunction()

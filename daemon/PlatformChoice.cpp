@@ -2,13 +2,16 @@
 
 #include <cstdlib>
 
+#include "daemon/SoundChoice.h"
 #include "platform/Log.h"
+#include "platform/appstream/AppStreamStore.h"
 #include "platform/ffmpeg/MoviesLoader.h"
 #include "platform/headless/HeadlessPlatform.h"
+#include "platform/linux/LinuxExtensionService.h"
 #include "platform/linux/LinuxPlatform.h"
-#include "platform/pulse/PulsePlatform.h"
+#include "platform/mp4/MP4MovieSalvage.h"
+#include "platform/sdbus/LogindKeepAlive.h"
 #include "platform/sdbus/SdBusIPC.h"
-#include "platform/sdbus/SdBusKeepAlive.h"
 #include "platform/x11/X11Platform.h"
 
 namespace qv {
@@ -18,24 +21,43 @@ namespace logs = platform::logs;
 struct PlatformChoice::Backends {
   platform::LinuxPlatform linux{platform::deviceRootFromEnvironment(), platform::bundlePathFromEnvironment()};
   platform::SdBusIPCService ipc{linux.peerResolver()};
-  platform::SdBusKeepAlive keepAlive;
+  platform::LinuxExtensionService extensions{
+      ipc,
+      linux.bundles(),
+      platform::systemTimers(),
+      platform::globalQueue(),
+      {.deviceRoot = platform::deviceRootFromEnvironment(), .launcherPath = platform::installedExtensionLauncher()}};
+  // What is recorded may fill the disk, and nothing else of the daemon does.
+  platform::LogindKeepAlive keepAlive{
+      {.busAddress = {}, .activityHandler = [this](bool isOpen) { linux.watchFreeSpace(isOpen); }}};
   platform::ffmpeg::MoviesLoader movies;
+  platform::mp4::MP4MovieSalvage movieSalvage;
+  std::unique_ptr<platform::appstream::AppStreamStore> store;
   platform::HeadlessPlatform headless{platform::HeadlessOptions{}};
+  SoundChoice sound{headless};
   std::unique_ptr<platform::X11Platform> x11;
-  std::unique_ptr<platform::PulsePlatform> pulse;
+  std::shared_ptr<platform::DisplayLayoutMonitor> layoutMonitor;
 };
 
 PlatformChoice::PlatformChoice() : backends_(std::make_unique<Backends>()) {
   backends_->linux.addTo(platform_);
   platform_.ipc = &backends_->ipc;
+  platform_.extensions = &backends_->extensions;
   platform_.keepAlive = &backends_->keepAlive;
   platform_.assetWriter = &backends_->movies;
   platform_.exportService = &backends_->movies;
+  platform_.movieSalvage = &backends_->movieSalvage;
+  backends_->store = std::make_unique<platform::appstream::AppStreamStore>(
+      platform_.deviceRoot, *platform_.localization, platform::globalQueue());
+  platform_.storeLookup = backends_->store.get();
   chooseScreen();
   chooseSound();
 }
 
 PlatformChoice::~PlatformChoice() = default;
+
+platform::SuspendMonitor& PlatformChoice::suspendMonitor() { return backends_->keepAlive; }
+std::shared_ptr<platform::DisplayLayoutMonitor> PlatformChoice::layoutMonitor() { return backends_->layoutMonitor; }
 
 void PlatformChoice::chooseScreen() {
   platform::X11Dependencies dependencies;
@@ -59,6 +81,7 @@ void PlatformChoice::chooseScreen() {
     platform_.applications = &backends_->x11->applications();
     platform_.renderServer = &backends_->x11->renderServer();
     platform_.userAlerts = &backends_->x11->alerts();
+    backends_->layoutMonitor = backends_->x11->createLayoutMonitor();
   } else {
     platform_.screenCapture = &backends_->headless.screenCapture();
     platform_.applications = &backends_->headless.applications();
@@ -69,20 +92,10 @@ void PlatformChoice::chooseScreen() {
 }
 
 void PlatformChoice::chooseSound() {
-  auto connected = platform::PulsePlatform::connect();
-  if (connected) {
-    backends_->pulse = std::move(*connected);
-    platform_.appAudioTap = &backends_->pulse->appAudioTap();
-    platform_.deviceCapture = &backends_->pulse->deviceCapture();
-    platform_.sounds = &backends_->pulse->sounds();
-    platform_.screenReader = &backends_->pulse->screenReader();
-  } else {
-    platform_.appAudioTap = &backends_->headless.appAudioTap();
-    platform_.deviceCapture = &backends_->headless.deviceCapture();
-    platform_.sounds = &backends_->headless.sounds();
-    platform_.screenReader = &backends_->headless.screenReader();
-  }
-  QV_LOG(logs::kPlatform, "app audio, microphone and sounds: %s", backends_->pulse ? "PulseAudio" : "headless");
+  platform_.appAudioTap = &backends_->sound;
+  platform_.deviceCapture = &backends_->sound;
+  platform_.sounds = &backends_->sound;
+  platform_.screenReader = &backends_->sound;
 }
 
 }  // namespace qv

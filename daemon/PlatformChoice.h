@@ -3,6 +3,7 @@
 #include <memory>
 
 #include "platform/Platform.h"
+#include "platform/SuspendMonitor.h"
 
 namespace qv {
 
@@ -16,6 +17,9 @@ class PlatformChoice {
   ~PlatformChoice();
 
   [[nodiscard]] platform::Platform& platform() { return platform_; }
+  [[nodiscard]] platform::SuspendMonitor& suspendMonitor();
+  /// Null without a display.
+  [[nodiscard]] std::shared_ptr<platform::DisplayLayoutMonitor> layoutMonitor();
 
  private:
   struct Backends;

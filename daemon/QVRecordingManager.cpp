@@ -2,8 +2,10 @@
 
 #include "daemon/StartRequest.h"
 #include "daemon/client/QVDaemonProtocol.h"
+#include "extensions/QVExtensionHostContext.h"
 #include "platform/Log.h"
 #include "support/QVTemporaryFiles.h"
+#include "support/QVUnfinishedMovies.h"
 #include "support/QuorvelErrors.h"
 
 namespace qv {
@@ -28,8 +30,10 @@ QVRecordingManager::QVRecordingManager(QVCaptureManager& captureManager)
       captureManager_(captureManager),
       sequence_("com.tarnwick.quorveld.manager", *platform_.globalQueue) {
   _srSetupTempDirectory();
+  _srSalvageUnfinishedMovies();
   publicListener_ = platform_.ipc->createListener(kServiceName);
   publicListener_->setDelegate(this, sequence_);
+  if (platform_.extensions) QVExtensionHostContext::registerWith(*platform_.extensions);
   applicationStateMonitor_ = platform_.applications->createStateMonitor();
 }
 
@@ -43,7 +47,6 @@ std::optional<Error> QVRecordingManager::finishStartup() { return publicListener
 
 void QVRecordingManager::setLayoutMonitor(std::shared_ptr<platform::DisplayLayoutMonitor> monitor) {
   sequence_.sync([&] { layoutMonitor_ = std::move(monitor); });
-  layoutMonitor_->addObserver(weak_from_this());
 }
 
 void QVRecordingManager::shutDown(std::function<void()> handler) {
@@ -121,9 +124,10 @@ int64_t QVRecordingManager::purge(int32_t urgency) {
   }
   if (urgency >= kUrgencyStopsRecording) {
     if (found && found->isRecording()) {
+      const uint64_t generation = found->generation();
       stopRecordingSession(found, 0, 0, nullptr);
-      recordingSessionStoppedWithErrorMovieURL(found, _qvUserErrorForCode(errorcode::kInsufficientStorage),
-                                               std::nullopt);
+      recordingSessionStoppedWithErrorMovieURL(found,
+                                               {generation, _qvUserErrorForCode(errorcode::kInsufficientStorage)});
     }
     return _srDeleteAllTempFiles();
   }

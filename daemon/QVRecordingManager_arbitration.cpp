@@ -1,7 +1,9 @@
 #include <algorithm>
 
 #include "daemon/QVRecordingManager.h"
+#include "daemon/StartRequest.h"
 #include "platform/Log.h"
+#include "support/QVTemporaryFiles.h"
 #include "support/QuorvelErrors.h"
 
 namespace qv {
@@ -24,11 +26,13 @@ void QVRecordingManager::interruptOtherRecordingSessionAgainstSession(const Sess
   QV_LOG(logs::kDaemon, "QVRecordingManager:interruptRecordingSessions");
   for (const auto& [bundleID, other] : bundleIDToRecordingSessionLookup_) {
     if (bundleID == session->bundleID() || !other->isRecording()) continue;
-    finishRecording(other, 0, 0, [this, interrupted = other](const auto& movie, const auto& error) {
-      QV_LOG(logs::kDaemon, "interrupted session");
-      recordingSessionInterruptedWithError(interrupted, error, movie);
-      interrupted->setInterruptedMovieURL(movie);
-    });
+    finishRecording(
+        other, 0, 0,
+        [this, interrupted = other, generation = other->generation()](const auto& movie, const auto& error) {
+          QV_LOG(logs::kDaemon, "interrupted session");
+          recordingSessionInterruptedWithError(interrupted, {generation, error, movie});
+          interrupted->setInterruptedMovieURL(movie);
+        });
   }
 }
 
@@ -39,7 +43,9 @@ void QVRecordingManager::resetStatesForSession(const Session& session, uint64_t 
     session->setRecording(false);
     session->setPaused(false);
   }
+  broadcasts_->recordingEnded(session->bundleID(), generation);
   if (openTransactions_.erase({session.get(), generation}) > 0) endTransaction();
+  if (openTransactions_.empty() && layoutMonitor_) layoutMonitor_->removeObserver(this);
 }
 
 std::shared_ptr<void> QVRecordingManager::holdEnding(const std::string& bundleID) {
@@ -74,8 +80,13 @@ void QVRecordingManager::clientDidBecomeActive(const IPCArguments&, const IPCRep
   exemptions_.expireAcknowledgementExemptionsForBundleID(session->bundleID(), platform_.clock->now());
   if (!session->isRecording() || !session->interruptedMovieURL()) return;
   QV_LOG(logs::kDaemon, "current session was interrupted - notify client app of error");
-  recordingSessionStoppedWithErrorMovieURL(session, _qvUserErrorForCode(errorcode::kInterrupted),
-                                           session->interruptedMovieURL());
+  QV_LOG(logs::kDaemon, "QVRecordingManager:recordingSessionStoppedWithError:movieURL:");
+  // Of the former recording, and told a second time: now the application can be expected to listen. What
+  // it records now goes on.
+  const Error interrupted = _qvUserErrorForCode(errorcode::kInterrupted);
+  if (const auto proxy = session->clientProxy()) {
+    proxy->stopRecordingWithError(interrupted, session->interruptedMovieURL());
+  }
   session->setInterruptedMovieURL(std::nullopt);
 }
 
@@ -89,7 +100,7 @@ void QVRecordingManager::clientDidResignActive(const IPCArguments&, const IPCRep
 void QVRecordingManager::recordingSessionStoppedWithError(const Session& session, uint64_t generation,
                                                           const std::optional<Error>& error) {
   sequence_.async([self = shared_from_this(), session, generation, error] {
-    self->recordingSessionStoppedWithErrorMovieURL(session, error, std::nullopt);
+    self->recordingSessionStoppedWithErrorMovieURL(session, {generation, error});
     session->completeMovieAfterFailure(generation, [weakSelf = std::weak_ptr(self), session, generation,
                                                     hold = self->holdEnding(session->bundleID())] {
       const auto manager = weakSelf.lock();
@@ -116,17 +127,29 @@ void QVRecordingManager::replaceSessionAfterMediaServicesReset(const Session& se
   registered->second = std::move(fresh);
 }
 
-void QVRecordingManager::recordingSessionStoppedWithErrorMovieURL(const Session& session,
-                                                                  const std::optional<Error>& error,
-                                                                  const std::optional<URL>& movie) {
+void QVRecordingManager::recordingSessionStoppedWithErrorMovieURL(const Session& session, const RecordingEnd& end) {
   QV_LOG(logs::kDaemon, "QVRecordingManager:recordingSessionStoppedWithError:movieURL:");
+  alertUserOfEnd(session, end.error);
   clearSystemRecordingUI(session);
-  if (const auto proxy = session->clientProxy()) proxy->stopRecordingWithError(error, movie);
+  tellRecordingEnded(session, end);
 }
 
-void QVRecordingManager::recordingSessionInterruptedWithError(const Session& session, const std::optional<Error>& error,
-                                                              const std::optional<URL>& movie) {
-  if (const auto proxy = session->clientProxy()) proxy->stopRecordingWithError(error, movie);
+void QVRecordingManager::recordingSessionInterruptedWithError(const Session& session, const RecordingEnd& end) {
+  clearSystemRecordingUI(session);
+  tellRecordingEnded(session, end);
+}
+
+/// Once for each recording, whichever of several ways it ended on comes here first. A client that was
+/// not told yet that its recording began learns of the end as the answer to its start.
+void QVRecordingManager::tellRecordingEnded(const Session& session, const RecordingEnd& end) {
+  if (!session->takeEndReport(end.generation)) return;
+  if (const Start start = unansweredStart(session, end.generation)) {
+    if (end.movie) _srRemoveFile(*end.movie, nullptr);
+    refuseStart(start, end.error.value_or(_qvUserErrorForCode(errorcode::kInterrupted)));
+    return;
+  }
+  if (end.movie) handMovieTo(session->bundleID(), *end.movie);
+  if (const auto proxy = session->clientProxy()) proxy->stopRecordingWithError(end.error, end.movie);
 }
 
 void QVRecordingManager::broadcastSessionDidUpdateServiceInfo(const Session& session, const Dictionary& serviceInfo) {
@@ -135,6 +158,14 @@ void QVRecordingManager::broadcastSessionDidUpdateServiceInfo(const Session& ses
 }
 
 void QVRecordingManager::broadcastSessionDidUpdateDuration(QVRecordingSession&, double) {}
+
+/// The layout in which a recording begins is the one that it belongs to: what was counted during a former one says
+/// nothing about it.
+void QVRecordingManager::observeDisplayLayout() {
+  if (!layoutMonitor_) return;
+  previousElementCount_ = 0;
+  layoutMonitor_->addObserver(weak_from_this());
+}
 
 void QVRecordingManager::layoutMonitorDidUpdateDisplayLayout(platform::DisplayLayoutMonitor&,
                                                              const platform::DisplayLayout& layout) {
@@ -156,21 +187,38 @@ void QVRecordingManager::applyDisplayLayout(const platform::DisplayLayout& layou
   if (!stop) return;
   for (const auto& [bundleID, session] : bundleIDToRecordingSessionLookup_) {
     if (!session->isRecording() || session->isSystemRecording()) continue;
-    finishRecording(session, 0, 0, [this, ended = session](const auto& movie, const auto&) {
-      recordingSessionStoppedWithErrorMovieURL(ended, _qvUserErrorForCode(errorcode::kContentResize), movie);
-    });
+    finishRecording(session, 0, 0,
+                    [this, ended = session, generation = session->generation()](const auto& movie, const auto&) {
+                      const Error resized = _qvUserErrorForCode(errorcode::kContentResize);
+                      recordingSessionStoppedWithErrorMovieURL(ended, {generation, resized, movie});
+                    });
   }
 }
 
 void QVRecordingManager::installForegroundFollower(const Session& session) {
+  followedSession_ = session;
   applicationStateMonitor_->setHandler(
       [weakSelf = weak_from_this(), weakSession = std::weak_ptr(session)](const Dictionary& report) {
         const auto self = weakSelf.lock();
         if (!self) return;
         self->sequence_.async([self, weakSession, report] {
-          if (const auto followed = weakSession.lock()) self->followForeground(followed, report);
+          const auto followed = weakSession.lock();
+          if (followed && followed == self->followedSession_) self->followForeground(followed, report);
         });
       });
+  lookAtForeground(session);
+}
+
+/// The front may have changed between the question at the start and the follower's first look.
+void QVRecordingManager::lookAtForeground(const Session& session) {
+  frontmostSession(session, [weakSelf = weak_from_this(), session](int32_t processID) {
+    const auto self = weakSelf.lock();
+    if (!self || self->followedSession_ != session) return;
+    const bool isSilent = processID < 1 && session->frontmostPIDForAudioTap() < 1;
+    if (!isSilent && processID != session->frontmostPIDForAudioTap()) {
+      session->updateProcessIDForAudioCaptureWithPID(processID);
+    }
+  });
 }
 
 /// The audio of a system recording is that of the application in front.

@@ -6,8 +6,6 @@
 
 namespace qv {
 
-using platform::Array;
-using platform::Data;
 using platform::Dictionary;
 using platform::IPCArguments;
 using platform::IPCReply;
@@ -67,6 +65,7 @@ void QVRecordingManager::resumeRecordingWithWindowLayerContextID(const IPCArgume
   const auto contextID = static_cast<uint32_t>(arguments[0].asInteger());
   // A broadcast would be resumed by an alert; that alert presents nothing, so it stays paused.
   if (session->isBroadcasting() && session->isRecording() && !session->isSystemRecording() && !didAcceptResume_) {
+    (void)showResumeBroadcastAlert(session, contextID);
     return;
   }
   didAcceptResume_ = false;
@@ -77,9 +76,11 @@ void QVRecordingManager::resumeRecordingWithWindowLayerContextID(const IPCArgume
     session->resumeSessionWithContextID(contextID);
     return;
   }
-  stopRecordingSession(session, 0, 0, [this, session](const auto& movie, const auto&) {
-    recordingSessionStoppedWithErrorMovieURL(session, _qvUserErrorForCode(errorcode::kNoContextIDMatch), movie);
-  });
+  const auto stopped = [this, session, generation = session->generation()](const auto& movie, const auto&) {
+    const platform::Error mismatch = _qvUserErrorForCode(errorcode::kNoContextIDMatch);
+    recordingSessionStoppedWithErrorMovieURL(session, {generation, mismatch, movie});
+  };
+  stopRecordingSession(session, 0, 0, stopped);
 }
 
 void QVRecordingManager::setMicrophoneEnabled(const IPCArguments& arguments, const IPCReply&) {
@@ -144,19 +145,6 @@ void QVRecordingManager::reportCameraUsage(const IPCArguments& arguments, const 
   if (const Session session = getCallingConnectionRecordingSession()) {
     session->sessionReportCameraUsage(static_cast<int32_t>(arguments[0].asInteger()));
   }
-}
-
-void QVRecordingManager::setupBroadcastWithHostBundleID(const IPCArguments&, const IPCReply& reply) {
-  QV_LOG(logs::kDaemon, "looking for upload extension");
-  reply.fail(requesterror::kNoExtension, "no upload extension of that identifier is installed");
-}
-
-void QVRecordingManager::getCurrentBroadcastImages(const IPCArguments&, const IPCReply& reply) {
-  reply({Value(Data{}), Value(Data{})});
-}
-
-void QVRecordingManager::getSystemBroadcastExtensionInfo(const IPCArguments&, const IPCReply& reply) {
-  reply({Value(Array{}), Value(platform::encodeError(std::nullopt))});
 }
 
 }  // namespace qv

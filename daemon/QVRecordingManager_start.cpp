@@ -19,7 +19,6 @@ namespace logs = platform::logs;
 
 namespace {
 
-constexpr const char kPrivateEntitlement[] = "com.tarnwick.private.quorvel";
 constexpr double kLargestSide = 1e6;  // pixels; beyond it a size is nonsense, not a wish
 constexpr int32_t kNoProcess = -1;
 
@@ -143,15 +142,15 @@ void QVRecordingManager::beginRecording(const Start& start) {
   QV_LOG(logs::kDaemon, "starting...");
   beginTransaction();
   if (start->broadcast) {
-    QV_LOG(logs::kDaemon, "broadcast requested");
-    // No upload extension can be set up on this device yet, so no start finds one.
-    QV_LOG(logs::kDaemon, "attempted to start broadcast without a session, bailing out");
-    endTransaction();
-    refuseStart(start, Error{kQVRecordingErrorDomain, errorcode::kInvalidBroadcastSession, {}});
+    enableBroadcast(start);
     return;
   }
   QV_LOG(logs::kDaemon, "broadcast disabled");
   start->session->disableBroadcast();
+  recordWhatIsFrontmost(start);
+}
+
+void QVRecordingManager::recordWhatIsFrontmost(const Start& start) {
   configureSession(start);
   frontmostSession(start->session, [weakSelf = weak_from_this(), start](int32_t processID) {
     if (const auto self = weakSelf.lock()) self->startSession(start, processID);
@@ -206,8 +205,8 @@ void QVRecordingManager::recordingStarted(const Start& start) {
   const Session& session = start->session;
   if (!session->isRecording() || session->generation() != start->generation) {
     // It was ended while its file was being prepared; its end closes the transaction.
-    answerStart(*start, _qvUserErrorForCode(errorcode::kInterrupted), false, false);
-    endStart(start);
+    (void)session->takeEndReport(start->generation);
+    refuseStart(start, _qvUserErrorForCode(errorcode::kInterrupted));
     return;
   }
   checkAndPlaySystemRecordSound(session, true);
@@ -217,7 +216,9 @@ void QVRecordingManager::recordingStarted(const Start& start) {
   if (session->isSystemRecording()) {
     installForegroundFollower(session);
   } else {
+    followedSession_.reset();
     applicationStateMonitor_->setHandler(nullptr);
+    observeDisplayLayout();
   }
 }
 
@@ -233,13 +234,25 @@ void QVRecordingManager::endStart(const Start& start) {
   if (pending != pendingStarts_.end() && pending->second == start) pendingStarts_.erase(pending);
 }
 
-/// The client has gone: its alert goes away, and nobody gets an answer. A recording that has begun is
-/// ended by the disconnection itself.
+/// The client has gone: its alert goes away, and nobody gets an answer. What it had recorded of an
+/// application goes too, but a system recording needs no client, also while it begins.
 void QVRecordingManager::cancelPendingStart(const std::string& bundleID) {
   const auto pending = pendingStarts_.find(bundleID);
   if (pending == pendingStarts_.end()) return;
   const Start start = pending->second;
+  const bool hasBegun = start->generation != 0;
+  if (hasBegun && start->systemRecording) return;
   refuseStart(start, _qvUserErrorForCode(errorcode::kUserDeclined));
+  if (hasBegun && start->session->generation() == start->generation) {
+    stopRecordingSession(start->session, 0, 0, nullptr);
+  }
+}
+
+QVRecordingManager::Start QVRecordingManager::unansweredStart(const Session& session, uint64_t generation) const {
+  const auto pending = pendingStarts_.find(session->bundleID());
+  if (pending == pendingStarts_.end()) return nullptr;
+  const Start& start = pending->second;
+  return start->session == session && start->generation == generation ? start : nullptr;
 }
 
 }  // namespace qv

@@ -31,42 +31,42 @@ void QVRecordingManager::stopCurrentRecordingSessionWithHandler() {
   for (const auto& [bundleID, session] : sessions) {
     if (!session->isRecording()) continue;
     const auto hold = holdEnding(bundleID);
-    stopRecordingSession(session, 0, 0, [this, session, hold](const auto& movie, const auto&) {
+    const uint64_t generation = session->generation();
+    stopRecordingSession(session, 0, 0, [this, session = session, generation, hold](const auto& movie, const auto&) {
       if (session->isSystemRecording()) {
-        saveStoppedSystemRecording(session, movie);
+        saveStoppedSystemRecording(session, generation, movie);
       } else {
-        reportStoppedByOtherStart(session);
+        reportStoppedByOtherStart(session, generation);
       }
     });
   }
 }
 
-void QVRecordingManager::reportStoppedByOtherStart(const Session& session) {
+void QVRecordingManager::reportStoppedByOtherStart(const Session& session, uint64_t generation) {
   // The start that waits for this one's end goes on when the file is gone, and so is the hold.
   session->finishAndCleanupSessionFilesWithHandler(
-      [weakSelf = weak_from_this(), session, hold = holdEnding(session->bundleID())] {
+      [weakSelf = weak_from_this(), session, generation, hold = holdEnding(session->bundleID())] {
         const auto self = weakSelf.lock();
         if (!self) return;
-        self->sequence_.async([session, hold] {
-          if (const auto proxy = session->clientProxy()) {
-            proxy->stopRecordingWithError(_qvUserErrorForCode(errorcode::kInterrupted), std::nullopt);
-          }
+        self->sequence_.async([self, session, generation, hold] {
+          self->tellRecordingEnded(session, {generation, _qvUserErrorForCode(errorcode::kInterrupted)});
         });
       });
 }
 
-void QVRecordingManager::saveStoppedSystemRecording(const Session& session, const std::optional<URL>& movie) {
-  QV_LOG(logs::kDaemon, "stop monitoring foreground apps");
-  applicationStateMonitor_->setHandler(nullptr);
+void QVRecordingManager::saveStoppedSystemRecording(const Session& session, uint64_t generation,
+                                                    const std::optional<URL>& movie) {
+  clearSystemRecordingUI(session);
   const auto hold = holdEnding(session->bundleID());
-  const auto done = [weakSelf = weak_from_this(), session, hold](const std::optional<Error>& error) {
+  const auto done = [weakSelf = weak_from_this(), session, generation, hold](const std::optional<Error>& error) {
     if (error) {
       QV_LOG_ERROR(logs::kDaemon, "QVRecordingManager:stopCurrentRecordingSession: Video saved to camera roll failed");
     } else {
       QV_LOG(logs::kDaemon, "QVRecordingManager:stopCurrentRecordingSession: Video saved to camera roll successful");
     }
     const auto self = weakSelf.lock();
-    if (self) self->sequence_.async([self, session, hold] { self->reportStoppedByOtherStart(session); });
+    if (!self) return;
+    self->sequence_.async([self, session, generation, hold] { self->reportStoppedByOtherStart(session, generation); });
   };
   if (!movie) {
     done(_qvUserErrorForCode(errorcode::kFailedToSave));
@@ -93,17 +93,20 @@ void QVRecordingManager::requestStop(double startClipDuration, double endClipDur
   }
   stopRecordingSession(session, startClipDuration, endClipDuration,
                        [this, reply, bundleID = session->bundleID()](const auto& movie, const auto& error) {
-                         if (movie) handedMovies_[bundleID].insert(normalized(*movie));
+                         if (movie) handMovieTo(bundleID, *movie);
                          reply({encodeURL(movie), Value(platform::encodeError(error))});
                        });
 }
 
 void QVRecordingManager::stopRecordingSession(const Session& session, double startClipDuration, double endClipDuration,
                                               FinishHandler handler) {
-  checkAndPlaySystemRecordSound(session, false);
+  // A session remembers what its last recording was, so one that does not record is left alone whole:
+  // no sound when its client goes, and nobody else's follower taken away.
+  if (session->isRecording()) checkAndPlaySystemRecordSound(session, false);
   QV_LOG(logs::kDaemon, "QVRecordingManager: stopRecordingSession:handler:");
-  clearSystemRecordingUI(session);
+  broadcasts_->clearPresentation();
   if (!session->isRecording()) return;
+  clearSystemRecordingUI(session);
   if (layoutMonitor_) layoutMonitor_->removeObserver(this);
   if (handler) {
     finishRecording(session, startClipDuration, endClipDuration, std::move(handler));
@@ -148,6 +151,10 @@ void QVRecordingManager::discardRecordingWithHandler(const IPCArguments&, const 
     return;
   }
   session->finishAndCleanupSessionFilesWithHandler([reply, hold = holdEnding(session->bundleID())] { reply({}); });
+}
+
+void QVRecordingManager::handMovieTo(const std::string& bundleID, const URL& movie) {
+  handedMovies_[bundleID].insert(normalized(movie));
 }
 
 bool QVRecordingManager::wasHandedTo(const std::string& bundleID, const URL& movie) const {

@@ -8,8 +8,6 @@ namespace qv::requesterror {
 inline constexpr const char kNotRecording[] = "com.tarnwick.quorveld.Error.NotRecording";
 /// A discard during a recording.
 inline constexpr const char kRecording[] = "com.tarnwick.quorveld.Error.Recording";
-/// A broadcast set-up whose extension is not installed.
-inline constexpr const char kNoExtension[] = "com.tarnwick.quorveld.Error.NoExtension";
 inline constexpr const char kNotSupported[] = "com.tarnwick.quorveld.Error.NotSupported";
 
 }  // namespace qv::requesterror

@@ -1,8 +1,10 @@
+#include <malloc.h>
 #include <sys/stat.h>
 
 #include <cstdlib>
 #include <future>
 
+#include "daemon/DeviceSleep.h"
 #include "daemon/PlatformChoice.h"
 #include "daemon/QVRecordingManager.h"
 #include "platform/Log.h"
@@ -12,6 +14,8 @@ namespace {
 
 namespace logs = qv::platform::logs;
 
+/// Bytes. Blocks of this size and above are pages of their own, which go back to the system when they are freed.
+constexpr int kOwnPagesFrom = 128 * 1024;
 constexpr auto kShutDownPatience = std::chrono::seconds(5);
 
 /// Gives the running recordings' movies time to be completed; what is not can still be played.
@@ -29,12 +33,17 @@ void completeRecordings(qv::QVRecordingManager& manager) {
 int main() {
   // Before any thread is made, so that all inherit it.
   qv::platform::blockTerminationSignals();
+  // The allocator would raise this bound with the first picture that an encoder frees, and keep the heap of a
+  // recording.
+  ::mallopt(M_MMAP_THRESHOLD, kOwnPagesFrom);
   // Movies are for the clients that they are handed to; nobody else but root writes here.
   ::umask(022);
   QV_LOG(logs::kDaemon, "quorveld Starting!");
   qv::PlatformChoice choice;
   qv::platform::Platform::install(&choice.platform());
   const auto manager = qv::QVRecordingManager::create(qv::QVCaptureManager::sharedManager());
+  choice.suspendMonitor().setHandlers(qv::handlersOfDeviceSleep(manager));
+  if (auto monitor = choice.layoutMonitor()) manager->setLayoutMonitor(std::move(monitor));
   if (const auto error = manager->finishStartup()) {
     QV_LOG_ERROR(logs::kDaemon, "the service cannot be opened: %s", error->description().c_str());
     qv::platform::flushLog();

@@ -1,5 +1,8 @@
 #include "extensions/QVBroadcastConfiguration.h"
 
+#include <algorithm>
+#include <cmath>
+
 #include "platform/KeyedArchive.h"
 
 namespace qv {
@@ -24,6 +27,20 @@ platform::Result<QVBroadcastConfiguration> QVBroadcastConfiguration::decode(std:
       platform::valueForKey(*fields, kClipDuration).asDouble(),
       platform::valueForKey(*fields, kVideoCompressionProperties).asDictionary(),
   };
+}
+
+platform::Result<QVBroadcastConfiguration> QVBroadcastConfiguration::decodeReceived(std::span<const uint8_t> archive) {
+  if (archive.size() > kMaximumArchiveSize) return platform::Error::posix(EFBIG, "broadcast configuration");
+  auto configuration = decode(archive);
+  if (!configuration) return configuration.error();
+  const double duration = configuration->clipDuration;
+  if (!std::isfinite(duration) || duration < 0) return platform::Error::posix(EDOM, "clip duration");
+  return configuration;
+}
+
+double QVBroadcastConfiguration::effectiveClipDuration() const {
+  if (!(clipDuration > 0)) return kDefaultClipDuration;
+  return std::clamp(clipDuration, kShortestClipDuration, kLongestClipDuration);
 }
 
 }  // namespace qv

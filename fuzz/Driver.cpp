@@ -1,5 +1,6 @@
 // Runs a fuzz target without libFuzzer: on a fixed number of mutated seeds, the same in each run.
 //   fuzz_x [--runs N] [--seed N]  runs N mutations
+//   fuzz_x --seconds N [--seed N] runs as many as there is time for
 //   fuzz_x --only SEED:RUN        runs that one again
 //   fuzz_x --write-seeds FOLDER   writes the seeds, as a first corpus for libFuzzer
 //   fuzz_x FILE...                runs these inputs
@@ -7,8 +8,10 @@
 #include <unistd.h>
 
 #include <algorithm>
+#include <chrono>
 #include <fstream>
 #include <iterator>
+#include <limits>
 #include <random>
 
 #include "fuzz/Target.h"
@@ -16,6 +19,7 @@
 namespace {
 
 using Random = std::mt19937_64;
+using Clock = std::chrono::steady_clock;
 
 volatile unsigned long currentSeed = 1;
 volatile unsigned long currentRun = 0;
@@ -94,6 +98,7 @@ int main(int argc, char** argv) {
   for (const int signal : {SIGABRT, SIGSEGV, SIGBUS, SIGFPE}) ::signal(signal, tellRun);
   const auto seeds = qv::fuzz::seeds();
   unsigned long runs = 10000;
+  auto end = Clock::time_point::max();
   unsigned long seed = 1;
   const std::vector<std::string> arguments(argv + 1, argv + argc);
   for (size_t i = 0; i < arguments.size(); ++i) {
@@ -101,6 +106,9 @@ int main(int argc, char** argv) {
     if (isOption && i + 1 == arguments.size()) return 2;
     if (arguments[i] == "--runs") {
       runs = std::stoul(arguments[++i]);
+    } else if (arguments[i] == "--seconds") {
+      runs = std::numeric_limits<unsigned long>::max();
+      end = Clock::now() + std::chrono::seconds(std::stoul(arguments[++i]));
     } else if (arguments[i] == "--seed") {
       seed = std::stoul(arguments[++i]);
     } else if (arguments[i] == "--only") {
@@ -119,6 +127,7 @@ int main(int argc, char** argv) {
     }
   }
   for (const std::string& valid : seeds) runOne(valid);
-  for (unsigned long run = 0; run < runs; ++run) runMutation(seeds, seed, run);
-  std::printf("%lu runs\n", runs);
+  unsigned long run = 0;
+  for (; run < runs && Clock::now() < end; ++run) runMutation(seeds, seed, run);
+  std::printf("%lu runs\n", run);
 }

@@ -17,6 +17,8 @@ namespace bundleinfo {
 inline constexpr const char kIdentifier[] = "CFBundleIdentifier";
 inline constexpr const char kDisplayName[] = "CFBundleDisplayName";
 inline constexpr const char kName[] = "CFBundleName";
+/// The name of a PNG file in the bundle's resources, with or without ".png".
+inline constexpr const char kIconFile[] = "CFBundleIconFile";
 }  // namespace bundleinfo
 
 /// A directory with an information dictionary, resources and executables.

@@ -4,6 +4,7 @@
 #include <sys/syscall.h>
 #include <unistd.h>
 
+#include <chrono>
 #include <condition_variable>
 #include <deque>
 #include <mutex>
@@ -14,8 +15,11 @@ namespace {
 
 constexpr size_t kMaximumThreads = 64;
 constexpr int kBackgroundNice = 10;
+/// Long against the pauses within a recording, so that its work makes no threads over and over.
+constexpr std::chrono::seconds kIdleLife{2};
 
-/// Threads that outlive everything: the pool is never destroyed, so work at process end is safe.
+/// The pool is never destroyed, so work at process end is safe. A thread without work for a while ends: what one busy
+/// moment took is given back after it.
 class ThreadPool final : public Executor {
  public:
   explicit ThreadPool(int nice) : nice_(nice) {}
@@ -38,8 +42,12 @@ class ThreadPool final : public Executor {
     std::unique_lock lock(mutex_);
     for (;;) {
       ++idle_;
-      wake_.wait(lock, [this] { return !queue_.empty(); });
+      const bool hasWork = wake_.wait_for(lock, kIdleLife, [this] { return !queue_.empty(); });
       --idle_;
+      if (!hasWork) {
+        --threads_;
+        return;
+      }
       auto work = std::move(queue_.front());
       queue_.pop_front();
       lock.unlock();

@@ -15,8 +15,8 @@ class Executor {
   virtual void post(std::function<void()> work) = 0;
 };
 
-/// The process-wide concurrent queue: threads are made as work needs them (64 at most), sleep
-/// without wake-ups when there is none, and live as long as the process.
+/// The process-wide concurrent queue: threads are made as work needs them (64 at most), and end
+/// when there was none for them for two seconds.
 Executor& globalQueue();
 /// The same for work that nobody waits for, such as removing files; its threads yield the
 /// processor to all others.

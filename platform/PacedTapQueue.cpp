@@ -83,7 +83,8 @@ bool Tap::fill(const PCMBlock& block, size_t& offset) {
   std::memcpy(front.data + front.byteSize, block.bytes.data() + offset, bytes);
   front.byteSize += static_cast<uint32_t>(bytes);
   offset += bytes;
-  nextSampleTime = sampleTime + static_cast<double>(bytes / frameSize);
+  const size_t frames = bytes / frameSize;
+  nextSampleTime = sampleTime + static_cast<double>(frames);
   const bool full = front.capacity - front.byteSize < frameSize;
   return full || (front.byteSize >= kEarlyFrames * frameSize && enqueued.size() >= kBuffersForEarlyHandOver);
 }

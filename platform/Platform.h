@@ -11,10 +11,15 @@
 #include "platform/DeviceCapture.h"
 #include "platform/Executor.h"
 #include "platform/ExportSession.h"
+#include "platform/Extensions.h"
 #include "platform/FileSystem.h"
 #include "platform/IPC.h"
+#include "platform/MovieSalvage.h"
+#include "platform/NetworkReachability.h"
+#include "platform/RunLoop.h"
 #include "platform/ScreenCapture.h"
 #include "platform/Sounds.h"
+#include "platform/StoreLookup.h"
 #include "platform/SystemServices.h"
 #include "platform/Timer.h"
 #include "platform/UserAlert.h"
@@ -29,6 +34,7 @@ struct Platform {
   TimerService* timers = &systemTimers();
   Executor* globalQueue = &qv::platform::globalQueue();
   Executor* backgroundQueue = &qv::platform::globalBackgroundQueue();
+  SerialQueue* mainQueue = &qv::platform::mainQueue();
   /// What stands before every absolute path of the system; empty on a device. No trailing "/".
   std::string deviceRoot;
 
@@ -39,6 +45,7 @@ struct Platform {
   AppAudioTapService* appAudioTap = nullptr;
   AssetWriterService* assetWriter = nullptr;
   ExportService* exportService = nullptr;
+  MovieSalvage* movieSalvage = nullptr;
   ApplicationService* applications = nullptr;
   RenderServer* renderServer = nullptr;
   UserAlertService* userAlerts = nullptr;
@@ -52,6 +59,9 @@ struct Platform {
   PurgeableSpaceService* purgeableSpace = nullptr;
   PhotoLibrary* photoLibrary = nullptr;
   MetricsReporter* metrics = nullptr;
+  ExtensionService* extensions = nullptr;
+  StoreLookupService* storeLookup = nullptr;
+  NetworkReachabilityService* reachability = nullptr;
 
   /// The installed platform. Aborts when there is none.
   static Platform& current();

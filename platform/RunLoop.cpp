@@ -31,4 +31,9 @@ int runMainRunLoop() {
   return signal;
 }
 
+SerialQueue& mainQueue() {
+  static SerialQueue* const queue = new SerialQueue("com.tarnwick.quorveld.main");
+  return *queue;
+}
+
 }  // namespace qv::platform

@@ -12,12 +12,6 @@ using platform::Platform;
 using platform::URL;
 namespace logs = platform::logs;
 
-namespace {
-constexpr int64_t kActionStarted = 1;
-constexpr int64_t kActionPaused = 2;
-constexpr int64_t kActionResumed = 3;
-}  // namespace
-
 QVRecordingSession::QVRecordingSession(std::string bundleID, platform::SerialQueue& sequence,
                                        QVCaptureManager& captureManager)
     : sequence_(sequence), captureManager_(captureManager), bundleID_(std::move(bundleID)) {}
@@ -41,7 +35,7 @@ void QVRecordingSession::startSessionWithHandler(std::function<void()> handler) 
     self->sequence_.async([self, generation, handler] { self->afterStart(generation, handler); });
   };
   if (broadcastProcessMode_ == BroadcastProcessMode::Samples) {
-    _notifyExtensionOfAction(kActionStarted, whenReady);
+    notifyExtensionAndWait(BroadcastAction::Started, std::move(whenReady));
     return;
   }
   platform::Size size = windowSize_;
@@ -51,14 +45,23 @@ void QVRecordingSession::startSessionWithHandler(std::function<void()> handler) 
     QV_LOG(logs::kSession, "After windowSize w:%f h:%f", size.width, size.height);
   }
   auto writer = std::make_shared<QVMovieWriter>(size, outputPath());
-  writer->setBroadcastConfig(broadcastConfiguration_);
+  writer->setBroadcastConfig(broadcastConfiguration_.load());
   writer->setSystemRecording(systemRecording_);
   movieWriter_.store(writer);
-  movieURL_ = writer->outputURL();
+  if (isCuttingClips()) {
+    // Each clip's request removes it, so there is no movie to clean up.
+    movieURL_.reset();
+    beginClips();
+  } else {
+    movieURL_ = writer->outputURL();
+  }
   writer->startWritingHandler(std::move(whenReady));
 }
 
 void QVRecordingSession::afterStart(uint64_t generation, const std::function<void()>& handler) {
+  if (const auto failure = earlyBroadcastFailure_.exchange(std::nullopt); failure && hasBroadcastExtension()) {
+    stopRecordingWithNotification(true, failure);
+  }
   // Stopped or paused while the file was being prepared: the sources stay as they are.
   if (recording_ && !paused_ && generation_ == generation) _resumeOrStartSession();
   handler();
@@ -68,7 +71,7 @@ void QVRecordingSession::pauseSession() {
   if (paused_.exchange(true)) return;
   QV_LOG(logs::kSession, "QVRecordingSession: pauseSession");
   stopAllCapture();
-  if (hasBroadcastExtension()) _notifyExtensionOfAction(kActionPaused, [] {});
+  if (hasBroadcastExtension()) _notifyExtensionOfAction(BroadcastAction::Paused, [] {});
 }
 
 void QVRecordingSession::resumeSessionWithContextID(uint32_t contextID) {
@@ -81,13 +84,17 @@ void QVRecordingSession::resumeSessionWithContextID(uint32_t contextID) {
     sessionWasResumed_ = lastSampleTimestamp_.isValid();
   }
   paused_ = false;
-  if (hasBroadcastExtension()) _notifyExtensionOfAction(kActionResumed, [] {});
+  if (hasBroadcastExtension()) _notifyExtensionOfAction(BroadcastAction::Resumed, [] {});
   _resumeOrStartSession();
 }
 
 void QVRecordingSession::stopRecordingWithNotification(bool notify, const std::optional<Error>& error) {
+  endRecording(notify, error);
+}
+
+bool QVRecordingSession::endRecording(bool notify, const std::optional<Error>& error) {
   const uint64_t generation = generation_;
-  if (!recording_.exchange(false)) return;
+  if (!recording_.exchange(false)) return false;
   QV_LOG(logs::kSession, "QVRecordingSession: stop");
   stopAllCapture();
   isBroadcasting_ = false;
@@ -97,6 +104,13 @@ void QVRecordingSession::stopRecordingWithNotification(bool notify, const std::o
     }
   }
   reportSummaryEvent(error ? error->code : 0);
+  return true;
+}
+
+bool QVRecordingSession::takeEndReport(uint64_t generation) {
+  if (generation <= reportedGeneration_) return false;
+  reportedGeneration_ = generation;
+  return true;
 }
 
 void QVRecordingSession::finishSessionWithHandler(FinishHandler handler) {
@@ -107,7 +121,8 @@ void QVRecordingSession::finishSessionWithStartClipDuration(double startClipDura
                                                             FinishHandler handler) {
   if (!recording_) return;
   QV_LOG(logs::kSession, "QVRecordingSession: finishSessionWithHandler");
-  stopRecordingWithNotification(false, std::nullopt);
+  // A failure on a capture thread may be quicker: then that is how the recording ended, and was reported.
+  if (!endRecording(false, std::nullopt)) return;
   resetTiming();
   finishWriter(startClipDuration, endClipDuration, std::move(handler));
 }
@@ -120,6 +135,10 @@ void QVRecordingSession::resetTiming() {
 }
 
 void QVRecordingSession::finishWriter(double startClipDuration, double endClipDuration, FinishHandler handler) {
+  if (hasBroadcastExtension()) {
+    finishBroadcast([handler = std::move(handler)] { handler(std::nullopt, std::nullopt); });
+    return;
+  }
   const auto writer = movieWriter_.exchange(nullptr);
   if (!writer) {
     handFinishedMovie(std::nullopt, startClipDuration, endClipDuration, handler);
@@ -160,6 +179,10 @@ void QVRecordingSession::trimFinishedMovie(const URL& movie, double startClipDur
 }
 
 void QVRecordingSession::completeMovieAfterFailure(uint64_t generation, std::function<void()> handler) {
+  if (generation_ == generation && isBroadcastOpen()) {
+    finishBroadcast(std::move(handler));
+    return;
+  }
   // A later recording has a writer of its own; its start has let go of the failed one's file.
   const auto writer = generation_ == generation ? movieWriter_.exchange(nullptr) : nullptr;
   if (!writer) {
@@ -172,6 +195,10 @@ void QVRecordingSession::completeMovieAfterFailure(uint64_t generation, std::fun
 void QVRecordingSession::finishAndCleanupSessionFilesWithHandler(std::function<void()> handler) {
   QV_LOG(logs::kSession, "QVRecordingSession: cleanupSessionFiles");
   stopRecordingWithNotification(false, std::nullopt);
+  if (isBroadcastOpen()) {
+    finishBroadcast(std::move(handler));
+    return;
+  }
   // The last recording's own file: a name made now could be another one.
   const auto writer = movieWriter_.exchange(nullptr);
   const URL movie = movieURL_.value_or(outputURL());

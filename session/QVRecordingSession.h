@@ -11,8 +11,12 @@
 #include "capture/QVCaptureManager.h"
 #include "daemon/client/QVClientProxy.h"
 #include "extensions/QVBroadcastConfiguration.h"
+#include "extensions/QVBroadcastExtensionProxy.h"
+#include "extensions/QVBroadcastProtocols.h"
 #include "platform/Guarded.h"
 #include "platform/Platform.h"
+#include "session/ClipHandover.h"
+#include "session/ClipSeam.h"
 #include "session/QVReportingAgent.h"
 #include "writer/QVMovieWriter.h"
 
@@ -37,12 +41,9 @@ class QVRecordingSessionDelegate {
 /// What reaches a capture client, and the routing of samples.
 enum class SampleType : int64_t { Video = 1, AppAudio = 2, Microphone = 3 };
 
-/// How the session's samples leave the daemon in a broadcast.
-enum class BroadcastProcessMode : int64_t { MovieClips = 0, Samples = 1 };
-
 /// The recordings of one client application, one after another, each from start to finish: into a
-/// movie (of its own windows, or of the whole screen for the system), or handed to the client sample
-/// by sample ("capture").
+/// movie (of its own windows, or of the whole screen for the system), handed to the client sample by
+/// sample ("capture"), or to an upload extension ("broadcast"), sample by sample or in movie clips.
 ///
 /// The manager configures the session, marks it recording and starts it. Each such recording has a
 /// generation number, so that what still belongs to an ended one never touches the next. Paused, all
@@ -56,6 +57,8 @@ class QVRecordingSession final : public platform::ScreenCaptureControllerDelegat
                                  public std::enable_shared_from_this<QVRecordingSession> {
  public:
   using FinishHandler = std::function<void(const std::optional<platform::URL>&, const std::optional<platform::Error>&)>;
+
+  using EnableHandler = std::function<void(const std::optional<platform::Error>&)>;
 
   /// `sequence` is the manager's: lifecycle steps that follow a wait run there.
   QVRecordingSession(std::string bundleID, platform::SerialQueue& sequence, QVCaptureManager& captureManager);
@@ -93,6 +96,8 @@ class QVRecordingSession final : public platform::ScreenCaptureControllerDelegat
   [[nodiscard]] platform::Size originalWindowSize() const { return originalWindowSize_; }
   [[nodiscard]] platform::Size _maximumSizeWithSize(platform::Size size);
   [[nodiscard]] int64_t chipId();
+  /// So a system recording's movie is never wider than tall. The asset writer lays a wide screen into it by a quarter
+  /// turn, which players turn back.
   [[nodiscard]] bool isNativeScreenOrientationPortrait() const { return true; }
   void setDelegate(std::weak_ptr<QVRecordingSessionDelegate> delegate) { delegate_.store(std::move(delegate)); }
   void setFrontmostPIDForAudioTap(int32_t pid) { frontmostPIDForAudioTap_ = pid; }
@@ -101,7 +106,7 @@ class QVRecordingSession final : public platform::ScreenCaptureControllerDelegat
   void setClientProxy(std::shared_ptr<QVClientProxy> proxy) { clientProxy_.store(std::move(proxy)); }
   [[nodiscard]] const std::optional<platform::URL>& interruptedMovieURL() const { return interruptedMovieURL_; }
   void setInterruptedMovieURL(std::optional<platform::URL> url) { interruptedMovieURL_ = std::move(url); }
-  [[nodiscard]] bool hasBroadcastExtension() const { return false; }
+  [[nodiscard]] bool hasBroadcastExtension() const { return broadcastExtension_.load() != nullptr; }
   [[nodiscard]] std::shared_ptr<QVMovieWriter> movieWriter() const { return movieWriter_.load(); }
   /// The display server went away: this object passes no video any more.
   [[nodiscard]] bool shouldStop();
@@ -122,6 +127,9 @@ class QVRecordingSession final : public platform::ScreenCaptureControllerDelegat
   /// After a failure ended the recording: completes what was written, so that it can be played.
   void completeMovieAfterFailure(uint64_t generation, std::function<void()> handler);
   void stopAllCapture();
+  /// True once for each recording: whoever gets it tells the client that this recording has ended.
+  /// Sequence only.
+  [[nodiscard]] bool takeEndReport(uint64_t generation);
   void notifyRecordingMayBeStopped();
   void notifyRecordingResumed();
 
@@ -133,7 +141,15 @@ class QVRecordingSession final : public platform::ScreenCaptureControllerDelegat
 
   // --- Broadcast.
   void setBroadcastConfiguration(std::optional<QVBroadcastConfiguration> configuration);
+  /// The next recording is a broadcast to this extension. In samples mode its link is set up first: the extension is
+  /// launched, or connected to at `listenerEndpoint` where that is valid. The handler runs on the sequence, with an
+  /// error where the link could not be made: then broadcasting is disabled again.
+  void enableBroadcastWithExtension(const platform::ExtensionRecordRef& extension, BroadcastProcessMode processMode,
+                                    const platform::Dictionary& userInfo,
+                                    const platform::ListenerEndpoint& listenerEndpoint, EnableHandler handler);
   void disableBroadcast();
+  /// Ends the link of a broadcast that never started.
+  void abandonBroadcast();
 
   // --- Samples.
   void updateProcessIDForAudioCaptureWithPID(int32_t processID);
@@ -150,6 +166,8 @@ class QVRecordingSession final : public platform::ScreenCaptureControllerDelegat
   [[nodiscard]] std::shared_ptr<QVReportingAgent> reportingAgent() const { return reportingAgent_.load(); }
 
  private:
+  /// False when the recording had ended already, by whatever was quicker.
+  bool endRecording(bool notify, const std::optional<platform::Error>& error);
   void _resumeOrStartSession();
   void prepareScreenCapture(int32_t frameRate);
   void startScreenCapture(uint64_t stretch);
@@ -178,7 +196,33 @@ class QVRecordingSession final : public platform::ScreenCaptureControllerDelegat
   void updateBundleIdForFirstForegroundApp();
   void packageVideoSampleBufferForCapture(const platform::SampleBufferRef& sample);
   void packageAudioSampleBufferForCapture(const platform::SampleBufferRef& sample, SampleType type);
-  void _notifyExtensionOfAction(int64_t action, const std::function<void()>& completion);
+
+  // --- Broadcast: the link.
+  void adoptExtensionProxy(const std::shared_ptr<QVBroadcastExtensionProxy>& proxy);
+  void launchExtension(const std::shared_ptr<QVBroadcastExtensionProxy>& proxy, EnableHandler handler);
+  void broadcastFailed(const platform::Error& error);
+  void _notifyExtensionOfAction(BroadcastAction action, std::function<void()> completion);
+  /// The same, and the completion runs in any case: also when the extension fails, or has not answered in time.
+  void notifyExtensionAndWait(BroadcastAction action, std::function<void()> completion);
+  /// Tells the extension that the broadcast is over, waits for what it still has to be given, and lets it go.
+  void finishBroadcast(std::function<void()> handler);
+  [[nodiscard]] bool isBroadcastOpen() const;
+
+  // --- Broadcast: samples.
+  [[nodiscard]] std::shared_ptr<QVBroadcastExtensionProxy> readyExtensionProxy() const;
+  void _notifyExtensionOfVideoSampleBuffer(const platform::SampleBufferRef& sample, SampleType type,
+                                           uint32_t orientation);
+  void _notifyExtensionOfAudioSampleBuffer(const platform::SampleBufferRef& sample, SampleType type);
+  void _notifyExtensionOfFrontmostProcessBundleID(const std::string& bundleID);
+
+  // --- Broadcast: clips.
+  void beginClips();
+  [[nodiscard]] bool isCuttingClips() const;
+  [[nodiscard]] bool appendVideoToClip(const platform::SampleBufferRef& sample,
+                                       const platform::AffineTransform& transform);
+  void _processAudioSampleBufferForMP4ClipHandler(const platform::SampleBufferRef& sample);
+  void appendMicrophoneToClip(const platform::SampleBufferRef& sample);
+  void finishClips(std::function<void()> handler);
 
   [[nodiscard]] std::string _serviceNameForReporting() const;
   [[nodiscard]] uint64_t getRecordedFileSize() const;
@@ -199,6 +243,7 @@ class QVRecordingSession final : public platform::ScreenCaptureControllerDelegat
 
   std::atomic<bool> recording_{false};
   std::atomic<uint64_t> generation_{0};
+  uint64_t reportedGeneration_ = 0;
   std::atomic<bool> paused_{false};
   std::atomic<bool> systemRecording_{false};
   std::atomic<bool> isBroadcasting_{false};
@@ -207,6 +252,7 @@ class QVRecordingSession final : public platform::ScreenCaptureControllerDelegat
   std::atomic<bool> haveMicTap_{false};
   std::atomic<int32_t> frontmostPIDForAudioTap_{0};
   std::atomic<BroadcastProcessMode> broadcastProcessMode_{BroadcastProcessMode::MovieClips};
+  std::atomic<int64_t> broadcastFragmentIndex_{0};
 
   bool microphoneEnabledPersistent_ = false;
   bool hasUserConsentForCamera_ = false;
@@ -218,7 +264,6 @@ class QVRecordingSession final : public platform::ScreenCaptureControllerDelegat
   std::optional<std::string> broadcastURL_;
   std::optional<std::string> bundleIDOfFirstForegroundApp_;
   std::optional<platform::URL> interruptedMovieURL_;
-  std::optional<QVBroadcastConfiguration> broadcastConfiguration_;
   std::optional<platform::URL> movieURL_;
   platform::Guarded<std::optional<platform::Date>> captureStartTime_;
 
@@ -226,6 +271,34 @@ class QVRecordingSession final : public platform::ScreenCaptureControllerDelegat
   platform::Guarded<std::shared_ptr<QVClientProxy>> clientProxy_;
   platform::Guarded<std::shared_ptr<QVMovieWriter>> movieWriter_;
   platform::Guarded<std::shared_ptr<QVReportingAgent>> reportingAgent_;
+
+  platform::Guarded<platform::ExtensionRecordRef> broadcastExtension_;
+  platform::Guarded<platform::Dictionary> broadcastUserInfo_;
+  platform::Guarded<std::optional<QVBroadcastConfiguration>> broadcastConfiguration_;
+  platform::Guarded<std::shared_ptr<QVBroadcastExtensionProxy>> broadcastUploadExtensionProxy_;
+  /// Of the action that somebody waits for.
+  platform::Guarded<std::shared_ptr<AnswerDeadline>> awaitedAnswer_;
+  /// Of a link that failed before its recording had begun.
+  platform::Guarded<std::optional<platform::Error>> earlyBroadcastFailure_;
+
+  /// The clips of one broadcast; without a hand-over there are none.
+  struct Clips {
+    std::shared_ptr<ClipHandover> handover;
+    platform::MediaTime broadcastFragmentStartTime = platform::MediaTime::invalid();
+    platform::SampleBufferRef lastPicture;
+    platform::AffineTransform transform;
+    std::unique_ptr<ClipSeam> seam;
+    std::unique_ptr<platform::TimerHandle> repeatTimer;
+    bool isEmpty = true;  ///< the current clip has no picture yet
+  };
+  void cutClip(Clips& clips, platform::MediaTime time, platform::MediaTime soundEnd);
+  bool appendPicture(Clips& clips, const platform::SampleBufferRef& sample);
+  void repeatLastPicture(Clips& clips);
+  void closeSeamIfComplete(Clips& clips, platform::MediaTime now);
+  static void finishClip(const std::shared_ptr<ClipHandover>& handover, const std::shared_ptr<QVMovieWriter>& writer,
+                         int64_t number, bool finished, std::function<void()> handed);
+  mutable std::mutex clipLock_;  ///< taken after `shouldStopLock_`, where both are
+  Clips clips_;
 
   /// One stretch of capture lasts from a start or resume to the next stop: a tap that reports its
   /// start after that must not start the screen any more.

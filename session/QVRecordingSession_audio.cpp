@@ -25,7 +25,11 @@ void QVRecordingSession::handleAppAudio(const SampleBufferRef& sample) {
 }
 
 void QVRecordingSession::routeAppAudio(const SampleBufferRef& sample) {
-  if (captureRecording_) {
+  if (broadcastProcessMode_ == BroadcastProcessMode::Samples) {
+    _notifyExtensionOfAudioSampleBuffer(sample, SampleType::AppAudio);
+  } else if (isCuttingClips()) {
+    _processAudioSampleBufferForMP4ClipHandler(sample);
+  } else if (captureRecording_) {
     packageAudioSampleBufferForCapture(sample, SampleType::AppAudio);
   } else if (const auto writer = movieWriter()) {
     writer->appendAudio1SampleBuffer(sample);
@@ -50,8 +54,12 @@ void QVRecordingSession::handleMicrophone(const SampleBufferRef& sample) {
   if (paused_) return;
   // Muted, the track goes on with silence.
   const SampleBufferRef heard = microphoneEnabled_ ? sample : platform::SampleBuffer::silencedCopy(sample);
-  if (captureRecording_) {
+  if (broadcastProcessMode_ == BroadcastProcessMode::Samples) {
+    _notifyExtensionOfAudioSampleBuffer(heard, SampleType::Microphone);
+  } else if (captureRecording_) {
     packageAudioSampleBufferForCapture(heard, SampleType::Microphone);
+  } else if (isCuttingClips()) {
+    appendMicrophoneToClip(heard);
   } else if (const auto writer = movieWriter()) {
     writer->appendAudio2SampleBuffer(heard);
   }
@@ -99,7 +107,11 @@ void QVRecordingSession::checkAndStopAppAudioForPID(int32_t processID) {
 void QVRecordingSession::updateBundleIdForFirstForegroundApp() {
   if (!isBroadcasting_ || bundleIDOfFirstForegroundApp_) return;
   const auto bundle = bundleWithPID(frontmostPIDForAudioTap_);
-  if (bundle) bundleIDOfFirstForegroundApp_ = bundle->bundleIdentifier();
+  if (!bundle) return;
+  bundleIDOfFirstForegroundApp_ = bundle->bundleIdentifier();
+  if (broadcastProcessMode_ == BroadcastProcessMode::Samples) {
+    _notifyExtensionOfFrontmostProcessBundleID(bundle->bundleIdentifier());
+  }
 }
 
 }  // namespace qv

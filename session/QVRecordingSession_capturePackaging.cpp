@@ -1,23 +1,10 @@
-#include <cstring>
-
 #include "session/QVRecordingSession.h"
+#include "session/RawRecord.h"
 
 namespace qv {
 
 using platform::Data;
 using platform::SampleBufferRef;
-
-namespace {
-
-/// The raw bytes of a record that crosses to another process of this device.
-template <typename Record>
-Data rawBytes(const Record& record) {
-  Data bytes(sizeof record);
-  std::memcpy(bytes.data(), &record, sizeof record);
-  return bytes;
-}
-
-}  // namespace
 
 void QVRecordingSession::packageVideoSampleBufferForCapture(const SampleBufferRef& sample) {
   QVSharedFrameObject frame;

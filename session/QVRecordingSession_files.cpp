@@ -41,6 +41,11 @@ std::string movieName(const std::string& bundleID) {
 }  // namespace
 
 std::string QVRecordingSession::outputPath() const {
+  if (hasBroadcastExtension()) {
+    return _srTempPath() + "/QVMovie_" + fileNameFromDisplayName(bundleID_) + "_" +
+           std::to_string(Platform::current().clock->now().secondsSince1970) + "_" +
+           std::to_string(broadcastFragmentIndex_) + ".mp4";
+  }
   if (systemRecording_) {
     Platform& platform = Platform::current();
     std::string date = platform.localization->formatDate(platform.clock->now(), "MM-dd-yyyy HH:mm:ss");

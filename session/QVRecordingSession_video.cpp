@@ -125,8 +125,12 @@ bool QVRecordingSession::deliverVideo(const SampleBufferRef& sample, MediaTime u
   const AffineTransform transform =
       systemRecording_ ? _affineTransformFromVellTransformFlags(transformFlags) : AffineTransform::identity();
   bool accepted = true;
-  if (captureRecording_) {
+  if (broadcastProcessMode_ == BroadcastProcessMode::Samples) {
+    _notifyExtensionOfVideoSampleBuffer(sample, SampleType::Video, orientationFromVellTransform(transformFlags));
+  } else if (captureRecording_) {
     packageVideoSampleBufferForCapture(sample);
+  } else if (isCuttingClips()) {
+    accepted = appendVideoToClip(sample, transform);
   } else if (const auto writer = movieWriter()) {
     accepted = writer->appendVideoSampleBuffer(sample, transform);
   }

@@ -22,6 +22,7 @@ constexpr const char kTableName[] = "Localizable";
 constexpr const char kTableType[] = "strings";
 constexpr const char kDevelopmentRegionKey[] = "CFBundleDevelopmentRegion";
 constexpr const char kDefaultLocalization[] = "en";
+constexpr const char kIconSuffix[] = ".png";
 /// A longer executable path is none.
 constexpr size_t kMaximumPathLength = 4096;
 
@@ -95,6 +96,19 @@ std::string _qvLocalizedAppName(const Bundle& bundle) {
 std::optional<std::string> _qvLocalizedAppNameFromBundleID(const std::string& bundleID) {
   const BundleRef bundle = Platform::current().bundles->bundleWithIdentifier(bundleID);
   return bundle ? std::optional(_qvLocalizedAppName(*bundle)) : std::nullopt;
+}
+
+platform::Data _qvAppIconFromBundleID(const std::string& bundleID) {
+  const BundleRef bundle = Platform::current().bundles->bundleWithIdentifier(bundleID);
+  auto name = bundle ? text(bundle->infoDictionary(), bundleinfo::kIconFile) : std::nullopt;
+  if (!name) return {};
+  if (name->ends_with(kIconSuffix)) name->resize(name->size() - std::string_view(kIconSuffix).size());
+  // A name, not a way out of the bundle.
+  const bool isName = name->find('/') == std::string::npos;
+  const auto path = isName ? bundle->pathForResource(*name, "png", {}) : std::nullopt;
+  const auto content =
+      path ? Platform::current().fileSystem->readFile(*path) : platform::Result<std::string>(std::string());
+  return content ? platform::Data(content.value().begin(), content.value().end()) : platform::Data();
 }
 
 BundleRef bundleWithPID(pid_t pid) {

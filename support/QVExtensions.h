@@ -33,6 +33,9 @@ namespace qv {
 /// The same by bundle identifier; nothing when no such bundle is installed.
 [[nodiscard]] std::optional<std::string> _qvLocalizedAppNameFromBundleID(const std::string& bundleID);
 
+/// The PNG file that the bundle names as its icon, of 1 MiB at most; empty without.
+[[nodiscard]] platform::Data _qvAppIconFromBundleID(const std::string& bundleID);
+
 /// The bundle that encloses a process's executable.
 [[nodiscard]] platform::BundleRef bundleWithPID(pid_t pid);
 

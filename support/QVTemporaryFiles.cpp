@@ -148,6 +148,11 @@ uint64_t _srDeviceFreeDiskSpace() {
   return bytes ? bytes.value() : 0;
 }
 
+bool _srDeviceHasSufficientFreeSpaceToContinueRecording() {
+  const auto bytes = disk().freeSizeOfFileSystem(_srTempPath());
+  return !bytes || bytes.value() >= kMinimumFreeSpaceWhileRecording;
+}
+
 bool _srDeviceHasSufficientFreeSpaceForRecording() { return _srDeviceFreeDiskSpace() > kMinimumFreeSpaceForRecording; }
 
 }  // namespace qv

@@ -25,6 +25,9 @@ using FileCompletion = std::function<void(const std::optional<platform::Error>&)
 
 /// A recording starts only with more free bytes than this (decimal).
 inline constexpr uint64_t kMinimumFreeSpaceForRecording = 100'000'000;
+/// A movie recording ends when fewer bytes than this are free (decimal): room for what its file still has to take
+/// (32 MiB may wait for a slow disk, and the index of an hour has 4 MB), and for the rest of the device.
+inline constexpr uint64_t kMinimumFreeSpaceWhileRecording = 50'000'000;
 
 /// The store's directory, under the device root; ends with "/".
 [[nodiscard]] std::string _srTempPath();
@@ -56,5 +59,7 @@ void _srDeleteFilesWithPrefix(const std::string& prefix);
 /// Bytes free on the file system that holds the store; 0 where that cannot be read.
 [[nodiscard]] uint64_t _srDeviceFreeDiskSpace();
 [[nodiscard]] bool _srDeviceHasSufficientFreeSpaceForRecording();
+/// True also where the free space cannot be read: a recording is not given up for that.
+[[nodiscard]] bool _srDeviceHasSufficientFreeSpaceToContinueRecording();
 
 }  // namespace qv

@@ -5,6 +5,7 @@
 
 #include "platform/Error.h"
 #include "platform/Value.h"
+#include "support/RecordingErrorKeys.h"
 
 /// The errors that clients, extensions and the components of the daemon get: one domain, negative
 /// codes, a localized text.
@@ -54,9 +55,6 @@ inline constexpr int64_t kMediaServicesFailed = -5817;
 /// The microphone could not be mixed into the movie. The unmixed movie is still there.
 inline constexpr int64_t kMixingFailure = -5818;
 }  // namespace errorcode
-
-/// The strings-table key of a code's text; that of kUnknown for a code that is none of the above.
-[[nodiscard]] const char* localizationKeyForErrorCode(int64_t code);
 
 /// An error with the localized text of `code` in the user information, in place of any text that
 /// `userInfo` has; without the framework's texts only the caller's entries. The code is kept even

@@ -3,6 +3,7 @@
 #include "platform/Log.h"
 #include "platform/Platform.h"
 #include "support/QVExtensions.h"
+#include "ui/LocalizedTexts.h"
 
 namespace qv {
 
@@ -12,31 +13,23 @@ namespace logs = platform::logs;
 
 namespace {
 
-std::string text(const char* key) { return _qvLocalizedStringFromFrameworkBundleWithKey(key).value_or(key); }
-
-/// Puts `argument` in place of the format's one "%@".
-std::string formatted(std::string format, const std::string& argument) {
-  const size_t position = format.find("%@");
-  if (position != std::string::npos) format.replace(position, 2, argument);
-  return format;
-}
-
 UserAlertRequest buildAlert(const AcknowledgementRequest& request) {
   const std::string name = _qvLocalizedAppNameFromBundleID(request.bundleID).value_or(request.bundleID);
   UserAlertRequest alert;
-  alert.header =
-      formatted(text(request.capture ? "ACKNOWLEDGEMENT_CAPTURE_ALERT_TITLE" : "ACKNOWLEDGEMENT_ALERT_TITLE"), name);
-  alert.message = text(request.capture ? "ACKNOWLEDGEMENT_CAPTURE_ALERT_BODY_TV" : "ACKNOWLEDGEMENT_ALERT_BODY_TV");
+  alert.header = formatted(
+      localizedText(request.capture ? "ACKNOWLEDGEMENT_CAPTURE_ALERT_TITLE" : "ACKNOWLEDGEMENT_ALERT_TITLE"), name);
+  alert.message =
+      localizedText(request.capture ? "ACKNOWLEDGEMENT_CAPTURE_ALERT_BODY_TV" : "ACKNOWLEDGEMENT_ALERT_BODY_TV");
   if (request.camera || request.microphone) {
     alert.message +=
-        " " + text(request.camera ? "ACKNOWLEDGEMENT_ALERT_BODY_CAMERA" : "ACKNOWLEDGEMENT_ALERT_BODY_MIC");
-    alert.alternateButton =
-        text(request.camera ? "ACKNOWLEDGEMENT_ALERT_ACCEPT_BUTTON_1_CAMERA" : "ACKNOWLEDGEMENT_ALERT_ACCEPT_BUTTON_1");
-    alert.otherButton = text("ACKNOWLEDGEMENT_ALERT_ACCEPT_BUTTON_2");
-    alert.defaultButton = text("ACKNOWLEDGEMENT_ALERT_DECLINE_BUTTON");
+        " " + localizedText(request.camera ? "ACKNOWLEDGEMENT_ALERT_BODY_CAMERA" : "ACKNOWLEDGEMENT_ALERT_BODY_MIC");
+    alert.alternateButton = localizedText(request.camera ? "ACKNOWLEDGEMENT_ALERT_ACCEPT_BUTTON_1_CAMERA"
+                                                         : "ACKNOWLEDGEMENT_ALERT_ACCEPT_BUTTON_1");
+    alert.otherButton = localizedText("ACKNOWLEDGEMENT_ALERT_ACCEPT_BUTTON_2");
+    alert.defaultButton = localizedText("ACKNOWLEDGEMENT_ALERT_DECLINE_BUTTON");
   } else {
-    alert.defaultButton = text("ACKNOWLEDGEMENT_ALERT_ACCEPT_BUTTON_1_MICROPHONE_DISABLED");
-    alert.otherButton = text("ACKNOWLEDGEMENT_ALERT_DECLINE_BUTTON");
+    alert.defaultButton = localizedText("ACKNOWLEDGEMENT_ALERT_ACCEPT_BUTTON_1_MICROPHONE_DISABLED");
+    alert.otherButton = localizedText("ACKNOWLEDGEMENT_ALERT_DECLINE_BUTTON");
   }
   if (const auto framework = _qvFrameworkBundle()) alert.localizationPath = framework->path();
   return alert;

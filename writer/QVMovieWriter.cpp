@@ -1,5 +1,7 @@
 #include "writer/QVMovieWriter.h"
 
+#include <algorithm>
+
 #include "platform/Log.h"
 #include "support/QVTemporaryFiles.h"
 
@@ -95,8 +97,17 @@ void QVMovieWriter::finishNotWriting(const FinishHandler& handler) {
   didProcessFirstSample_ = false;
 }
 
+/// The file shows the picture of the time that ends it for one frame more.
+MediaTime QVMovieWriter::lastPictureTime() const {
+  const MediaTime end = endTime_.load();
+  if (!end.isValid()) return end;
+  const MediaTime last = video_.lastPresentationTime.load();
+  return std::max(last, end - MediaTime::make(1, expectedFrameRate()));
+}
+
 void QVMovieWriter::finishFile(FinishHandler handler) {
-  const MediaTime end = trimVideoPresentationTime_.exchange(MediaTime::invalid());
+  MediaTime end = trimVideoPresentationTime_.exchange(MediaTime::invalid());
+  if (!end.isValid()) end = lastPictureTime();
   if (end.isValid()) assetWriter_->endSessionAtSourceTime(end);
   assetWriter_->finishWriting([self = shared_from_this(), handler = std::move(handler)]() mutable {
     // Goes on on the writer's queue, so that the last reference never ends on the file's own thread.

@@ -43,7 +43,8 @@ class QVMovieWriter : public std::enable_shared_from_this<QVMovieWriter> {
   /// The same without removing a file, and waited for.
   void setupAssetWriter();
   /// False when the sample had to start the file and that failed, or the file has failed since:
-  /// the recording is then over. True in every other case, also for a dropped sample.
+  /// the recording is then over. The same when the disk is nearly full; what was written can then be finished.
+  /// True in every other case, also for a dropped sample.
   bool appendVideoSampleBuffer(const platform::SampleBufferRef& sample, const platform::AffineTransform& transform);
   void appendAudio1SampleBuffer(const platform::SampleBufferRef& sample);
   void appendAudio2SampleBuffer(const platform::SampleBufferRef& sample);
@@ -53,6 +54,9 @@ class QVMovieWriter : public std::enable_shared_from_this<QVMovieWriter> {
   /// The movie is to end at the last frame written so far, unless the recording resumes.
   void notifyRecordingMayBeStopped();
   void notifyRecordingResumed();
+  /// The movie is to end at this presentation time, whatever is written: its last picture lasts until then, so
+  /// that another movie that begins there continues it without a gap.
+  void endAtSourceTime(platform::MediaTime time) { endTime_.store(time); }
   /// Makes a copy of a finished movie without its first and last seconds (rounded to whole seconds).
   /// The handler gets the copy's URL, or nothing when the export failed or was cancelled.
   void trimMovieWithURL(platform::URL movie, double startClipDuration, double endClipDuration,
@@ -81,8 +85,12 @@ class QVMovieWriter : public std::enable_shared_from_this<QVMovieWriter> {
   void createInputs();
   [[nodiscard]] platform::Dictionary compressionProperties() const;
   [[nodiscard]] int64_t bitRate() const;
+  /// Pictures per second that the encoder is told of.
+  [[nodiscard]] int32_t expectedFrameRate() const;
+  [[nodiscard]] platform::MediaTime lastPictureTime() const;
   bool appendFirstVideoSample(const platform::SampleBufferRef& sample, const platform::AffineTransform& transform);
   bool ensureWriting(const platform::AffineTransform& transform);
+  [[nodiscard]] bool diskHasRoom(platform::MediaTime time);
   void drainVideo();
   void appendAudio(Track& track, int number, const platform::SampleBufferRef& sample);
   void drainAudio(Track& track, int number);
@@ -95,6 +103,7 @@ class QVMovieWriter : public std::enable_shared_from_this<QVMovieWriter> {
   std::optional<QVBroadcastConfiguration> broadcastConfig_;
   bool systemRecording_ = false;
   platform::Guarded<platform::MediaTime> trimVideoPresentationTime_;
+  platform::Guarded<platform::MediaTime> endTime_;
 
   // Writer queue only.
   std::unique_ptr<platform::AssetWriter> assetWriter_;
@@ -105,6 +114,7 @@ class QVMovieWriter : public std::enable_shared_from_this<QVMovieWriter> {
   bool didStartSession_ = false;
   bool didProcessFirstSample_ = false;
   bool isFinishingWriting_ = false;
+  platform::MediaTime lastDiskCheck_ = platform::MediaTime::invalid();
 };
 
 }  // namespace qv

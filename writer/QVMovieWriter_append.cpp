@@ -1,4 +1,5 @@
 #include "platform/Log.h"
+#include "support/QVTemporaryFiles.h"
 #include "writer/QVMovieWriter.h"
 
 namespace qv {
@@ -19,6 +20,7 @@ bool QVMovieWriter::dispatchedAppendVideoSampleBuffer(const SampleBufferRef& sam
   if (status() != AssetWriterStatus::Writing || !didProcessFirstSample_) {
     return appendFirstVideoSample(sample, transform);
   }
+  if (!diskHasRoom(sample->presentationTime())) return false;
   if (!video_.queue.enqueue(sample)) {
     QV_LOG_ERROR(logs::kWriter, "ERROR Enqueing the Sample Video Buffer");
     return true;
@@ -50,6 +52,15 @@ bool QVMovieWriter::appendFirstVideoSample(const SampleBufferRef& sample, const 
   (void)video_.input->append(sample);
   didProcessFirstSample_ = true;
   return true;
+}
+
+/// Looks once for each second of the movie: as often as anything is written.
+bool QVMovieWriter::diskHasRoom(MediaTime time) {
+  if (lastDiskCheck_.isValid() && time - lastDiskCheck_ < MediaTime::make(1, 1)) return true;
+  lastDiskCheck_ = time;
+  if (_srDeviceHasSufficientFreeSpaceToContinueRecording()) return true;
+  QV_LOG_ERROR(logs::kWriter, "insufficient disk space to go on recording");
+  return false;
 }
 
 void QVMovieWriter::drainVideo() {

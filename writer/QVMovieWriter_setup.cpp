@@ -19,6 +19,8 @@ constexpr double kLargeSide = 1920.0;
 constexpr int64_t kTabletBitRate = 7'000'000;
 constexpr int64_t kLargeBitRate = 5'000'000;
 constexpr int64_t kDefaultBitRate = 3'000'000;
+constexpr int32_t kDefaultFrameRate = 60;
+constexpr int64_t kMaximumFrameRate = 240;
 constexpr double kMaximumSide = 16384.0;
 
 /// Truncated to an integer and, when odd, one more: H.264 with 4:2:0 chroma wants even sides.
@@ -56,10 +58,18 @@ int64_t QVMovieWriter::bitRate() const {
   return windowSize_.width >= kLargeSide || windowSize_.height >= kLargeSide ? kLargeBitRate : kDefaultBitRate;
 }
 
+int32_t QVMovieWriter::expectedFrameRate() const {
+  if (!broadcastConfig_) return kDefaultFrameRate;
+  const int64_t rate =
+      platform::valueForKey(broadcastConfig_->videoCompressionProperties, settings::kExpectedSourceFrameRate)
+          .asInteger(kDefaultFrameRate);
+  return rate >= 1 && rate <= kMaximumFrameRate ? static_cast<int32_t>(rate) : kDefaultFrameRate;
+}
+
 Dictionary QVMovieWriter::compressionProperties() const {
   const int64_t rate = bitRate();
   QV_LOG(logs::kWriter, "bit rate set to %ld", static_cast<long>(rate));
-  Dictionary properties{{settings::kExpectedSourceFrameRate, Value(int32_t{60})},
+  Dictionary properties{{settings::kExpectedSourceFrameRate, Value(kDefaultFrameRate)},
                         {settings::kProfileLevel, Value(settings::kProfileHighAutoLevel)},
                         {settings::kAverageBitRate, Value(rate)},
                         {settings::kMaxKeyFrameInterval, Value(int32_t{60})}};

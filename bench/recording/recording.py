@@ -15,6 +15,7 @@ import time
 import urllib.parse
 from dataclasses import dataclass, field
 
+sys.path.insert(0, os.path.join(os.path.dirname(os.path.abspath(__file__)), "../../scripts/stage"))
 import processes
 import table
 from stage import Game, Stage
@@ -69,7 +70,7 @@ class Bench:
     def measured(self, pid, begin, end):
         """(processor seconds per second of the process, of the X server, of each thread by name)"""
         sleep_until(begin)
-        server = self.stage.display_server
+        server = self.stage.display_server.pid
         before = time.monotonic(), processes.processor_seconds(pid), processes.processor_seconds(server)
         threads_before = processes.thread_seconds(pid)
         sleep_until(end)
@@ -208,7 +209,7 @@ class Bench:
         picture's time, so it is looked at again and again.
         """
         kept = set.intersection(*(set(processes.shared_memory_files(pid)) for pid in
-                                  (self.stage.display_server, self.stage.daemon.pid)))
+                                  (self.stage.display_server.pid, self.stage.daemon.pid)))
         frames, rights = set(), set()
         until = time.monotonic() + 2
         while time.monotonic() < until:
@@ -260,15 +261,12 @@ def main():
         captures = [(mode, bench.capture(mode)) for mode in modes if mode.fps == 60]
         time.sleep(1)
         after = idle(stage.daemon.pid, idle_seconds)
-        finish_command = [os.path.join(stage.build, "bench/recording/bench_movie_finish"), stage.directory, "10", "600",
-                          "3600"]
-        finishes = stage.run(finish_command, seconds=120).stdout
 
         print(f"One run on {os.cpu_count()} processors that others share: load {load_before:.1f} before it, "
               f"{os.getloadavg()[0]:.1f} after. Compare ratios, not seconds.")
         for mode, rounds in costs:
             table.print_costs(mode, rounds)
-        table.print_times(first, first_stop, starts, stops, finishes)
+        table.print_times(first, first_stop, starts, stops)
         table.print_capture(captures)
         table.print_idle(before, after, bench.woken_beside_game, idle_seconds)
         print("\nCompared with, here for the first mode:")

@@ -29,7 +29,7 @@ def print_costs(mode, rounds):
     print("  the daemon's threads, s/s: " + ", ".join(f"{name} {cost:.3f}" for cost, name in costs if cost >= 0.001))
 
 
-def print_times(first, first_stop, starts, stops, finishes):
+def print_times(first, first_stop, starts, stops):
     print("\nTimes")
     row("first start: answer of the alert to reply", f"{first[1] * 1e3:.0f} ms",
         f"{first[0] * 1e3:.0f} ms from the key")
@@ -40,10 +40,6 @@ def print_times(first, first_stop, starts, stops, finishes):
     row("stop to playable movie: all others, median and worst",
         f"{statistics.median(stops) * 1e3:.0f}, {max(stops) * 1e3:.0f} ms",
         f"{len(stops)} recordings of the rounds above")
-    for line in finishes.splitlines():
-        seconds, milliseconds = line.split()
-        row(f"finish of a made-up movie of {int(seconds)} s", f"{milliseconds} ms",
-            "index and syncs alone: bench_movie_finish")
 
 
 def print_capture(results):

@@ -23,7 +23,7 @@ constexpr auto kLongestWaitForFocus = 3s;
 
 Game::Game(MainLoop& loop, const Options& options) : loop_(loop), options_(options) {
   if (!options.headless) {
-    window_ = Window::create(options.width, options.height, "Comet Run",
+    window_ = Window::create(options.width, options.height, options.title.c_str(),
                              {.key = [this](char key) { handleKey(key); },
                               .active = [this](bool active) { setActive(active); },
                               .exposed = [this] { shown_ = false; },
@@ -71,6 +71,7 @@ quorvel::RecorderOptions Game::recorderOptions() {
   options.events.audioSample = [this](const quorvel::AudioSample& sample) {
     ++(sample.source == quorvel::AudioSample::Source::Microphone ? microphoneSamples_ : audioSamples_);
   };
+  listenToBroadcast(options.events);
   return options;
 }
 
@@ -78,13 +79,19 @@ void Game::start(bool capture) {
   capturing_ = capture;
   videoFrames_ = audioSamples_ = microphoneSamples_ = 0;
   latencies_.clear();
+  if (options_.broadcast.empty() || capture) return startRecording();
+  setUpBroadcast();
+}
+
+void Game::startRecording() {
   // Without a window a device's headless screen knows us by our process.
   const uint32_t context = window_ ? window_->identifier() : static_cast<uint32_t>(::getpid());
   recorder_->start({.windows = {context},
                     .width = static_cast<double>(options_.width),
                     .height = static_cast<double>(options_.height),
                     .microphone = options_.microphone,
-                    .capture = capture},
+                    .broadcast = !options_.broadcast.empty() && !capturing_,
+                    .capture = capturing_},
                    [this](const quorvel::StartResult& result) { started(result); });
 }
 
@@ -113,11 +120,14 @@ void Game::pauseOrResume() {
 }
 
 void Game::stop() {
-  recorder_->stop([this](const quorvel::StopResult& result) {
+  auto handler = [this](const quorvel::StopResult& result) {
     stopped(result);
     if (result.error) return failScript();
     answered();
-  });
+  };
+  if (options_.startClip == 0 && options_.endClip == 0) return recorder_->stop(std::move(handler));
+  recorder_->stop({std::chrono::duration<double>(options_.startClip), std::chrono::duration<double>(options_.endClip)},
+                  std::move(handler));
 }
 
 /// After our own stop, or because the recording ended by itself.
@@ -190,7 +200,8 @@ void Game::drawAhead(Instant frame) {
   const auto pixels = window_->backBuffer();
   if (pixels.empty()) return;
   const Instant shown = options_.still ? Instant(0) : frame;
-  drawScene(pixels, options_.width, options_.height, shown, !options_.still && isFlash(shown));
+  drawScene(pixels, options_.width, options_.height, shown, !options_.still && isFlash(shown), options_.sky);
+  if (options_.numbered) drawNumber(pixels, options_.width, options_.height, ++number_);
   drawn_ = true;
   drawnFor_ = frame;
 }

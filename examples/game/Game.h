@@ -13,7 +13,7 @@
 
 namespace comet {
 
-/// The game and its recording: this file and Game.cpp are the example of the client library's use.
+/// The game and its recording: this file, Game.cpp and Game_broadcast.cpp are the example of the client library's use.
 ///
 /// Says what happens in lines on standard output, for people and for scripts.
 class Game {
@@ -26,6 +26,7 @@ class Game {
   // Recording
   quorvel::RecorderOptions recorderOptions();
   void start(bool capture);
+  void startRecording();
   void started(const quorvel::StartResult& result);
   void pauseOrResume();
   void stop();
@@ -35,6 +36,10 @@ class Game {
   void captured(const quorvel::VideoFrame& frame);
   void printCaptured();
   void report(const quorvel::Error& error);
+
+  // Broadcasts
+  void setUpBroadcast();
+  void listenToBroadcast(quorvel::Events& events);
 
   // The game
   void begin();
@@ -55,6 +60,7 @@ class Game {
   bool shown_ = false;  // something, since the window was last exposed
   bool drawn_ = false;  // the back buffer holds the next frame
   Instant drawnFor_{0};
+  uint32_t number_ = 0;  // of the picture drawn last
 
   bool recording_ = false, paused_ = false, capturing_ = false, microphone_ = false, ok_ = true;
   uint64_t videoFrames_ = 0, audioSamples_ = 0, microphoneSamples_ = 0;

@@ -12,6 +12,9 @@ namespace {
 constexpr char kUsage[] =
     "usage: quorvel-example-game [--size WxH] [--fps N] [--start] [--capture] [--microphone]\n"
     "                            [--no-sound] [--static] [--headless] [--script STEPS]\n"
+    "                            [--title TEXT] [--sky RRGGBB] [--tone HZ] [--numbered]\n"
+    "                            [--trim START,END]\n"
+    "                            [--broadcast EXTENSION_ID [--broadcast-info KEY=VALUE]... [--clip-duration S]]\n"
     "steps, separated by \";\": record S, pause S, wait S, capture S, stop, discard, quit\n"
     "keys: r start, p pause and resume, s stop, d discard, c capture, m microphone, q quit\n";
 
@@ -20,7 +23,33 @@ constexpr char kUsage[] =
   std::exit(2);
 }
 
-enum Option { kSize = 1, kFps, kStart, kCapture, kMicrophone, kNoSound, kStatic, kHeadless, kScript, kHelp };
+uint32_t colorFrom(const char* text) {
+  char* end = nullptr;
+  const unsigned long color = std::strtoul(text, &end, 16);
+  if (end == text || *end != '\0' || color > 0xffffff) refuse("--sky wants RRGGBB");
+  return static_cast<uint32_t>(color);
+}
+
+enum Option {
+  kSize = 1,
+  kFps,
+  kStart,
+  kCapture,
+  kMicrophone,
+  kNoSound,
+  kStatic,
+  kHeadless,
+  kScript,
+  kTitle,
+  kSky,
+  kTone,
+  kBroadcast,
+  kBroadcastInfo,
+  kClipDuration,
+  kNumbered,
+  kTrim,
+  kHelp
+};
 constexpr option kOptions[] = {{"size", required_argument, nullptr, kSize},
                                {"fps", required_argument, nullptr, kFps},
                                {"start", no_argument, nullptr, kStart},
@@ -30,6 +59,14 @@ constexpr option kOptions[] = {{"size", required_argument, nullptr, kSize},
                                {"static", no_argument, nullptr, kStatic},
                                {"headless", no_argument, nullptr, kHeadless},
                                {"script", required_argument, nullptr, kScript},
+                               {"title", required_argument, nullptr, kTitle},
+                               {"sky", required_argument, nullptr, kSky},
+                               {"tone", required_argument, nullptr, kTone},
+                               {"broadcast", required_argument, nullptr, kBroadcast},
+                               {"broadcast-info", required_argument, nullptr, kBroadcastInfo},
+                               {"clip-duration", required_argument, nullptr, kClipDuration},
+                               {"numbered", no_argument, nullptr, kNumbered},
+                               {"trim", required_argument, nullptr, kTrim},
                                {"help", no_argument, nullptr, kHelp},
                                {nullptr, 0, nullptr, 0}};
 
@@ -68,6 +105,38 @@ void apply(Options& options, int option) {
       options.script = std::move(*script);
       break;
     }
+    case kTitle:
+      options.title = optarg;
+      break;
+    case kSky:
+      options.sky = colorFrom(optarg);
+      break;
+    case kTone:
+      options.tone = std::atof(optarg);
+      if (!(*options.tone >= 20 && *options.tone <= 20'000)) refuse("--tone wants 20 to 20000");
+      break;
+    case kBroadcast:
+      options.broadcast = optarg;
+      break;
+    case kBroadcastInfo: {
+      const std::string entry = optarg;
+      const size_t end = entry.find('=');
+      if (end == std::string::npos) refuse("--broadcast-info wants KEY=VALUE");
+      options.broadcastInfo.emplace_back(entry.substr(0, end), entry.substr(end + 1));
+      break;
+    }
+    case kClipDuration:
+      options.clipDuration = std::atof(optarg);
+      if (!(options.clipDuration > 0 && options.clipDuration <= 3600)) refuse("--clip-duration wants seconds");
+      break;
+    case kNumbered:
+      options.numbered = true;
+      break;
+    case kTrim:
+      if (std::sscanf(optarg, "%lf,%lf", &options.startClip, &options.endClip) != 2 || !(options.startClip >= 0) ||
+          !(options.endClip >= 0))
+        refuse("--trim wants START,END in seconds");
+      break;
     case kHelp:
       std::printf("%s", kUsage);
       std::exit(0);

@@ -1,7 +1,9 @@
 #pragma once
 
 #include <cstdint>
+#include <optional>
 #include <string>
+#include <utility>
 #include <vector>
 
 #include "Script.h"
@@ -17,6 +19,14 @@ struct Options {
   bool sound = true;
   bool still = false;  ///< an unmoving picture
   bool headless = false;
+  std::string title = "Comet Run";
+  std::optional<uint32_t> sky;  ///< 0xRRGGBB instead of the night's
+  std::optional<double> tone;   ///< Hz, without end, instead of the beeps
+  std::string broadcast;        ///< recordings go to this extension; empty: into movies
+  std::vector<std::pair<std::string, std::string>> broadcastInfo;  ///< user information for it
+  double clipDuration = 0;                                         ///< seconds; 0: as the daemon does
+  bool numbered = false;                                           ///< each picture carries its number
+  double startClip = 0, endClip = 0;                               ///< seconds that a stop trims off
   std::vector<Step> script;
 };
 

@@ -4,6 +4,7 @@
 #include <chrono>
 #include <cmath>
 #include <numbers>
+#include <utility>
 #include <vector>
 
 #include "Scene.h"
@@ -24,12 +25,6 @@ constexpr auto kTolerance = 8ms;
 
 Instant durationOf(int64_t frames) { return Instant(frames * 1'000'000'000 / kRate); }
 
-int16_t sampleAt(Instant heard) {
-  if (!isFlash(heard)) return 0;
-  const double seconds = std::chrono::duration<double>(heard % 1s).count();
-  return static_cast<int16_t>(std::lround(kAmplitude * std::sin(2 * std::numbers::pi * kFrequency * seconds)));
-}
-
 /// Holds libpulse's lock, which its callbacks run under too.
 struct Lock {
   explicit Lock(pa_threaded_mainloop* held) : loop(held) { pa_threaded_mainloop_lock(loop); }
@@ -39,14 +34,14 @@ struct Lock {
 
 }  // namespace
 
-std::unique_ptr<Sound> Sound::create(const char* name, std::string& error) {
-  std::unique_ptr<Sound> sound(new Sound);
+std::unique_ptr<Sound> Sound::create(const char* name, std::optional<double> tone, std::string& error) {
+  std::unique_ptr<Sound> sound(new Sound(tone));
   if (sound->open(name)) return sound;
   error = sound->context_ ? pa_strerror(pa_context_errno(sound->context_)) : "out of memory";
   return nullptr;
 }
 
-Sound::Sound() : loop_(pa_threaded_mainloop_new()) {}
+Sound::Sound(std::optional<double> tone) : tone_(tone), loop_(pa_threaded_mainloop_new()) {}
 
 Sound::~Sound() {
   pa_threaded_mainloop_stop(loop_);
@@ -100,6 +95,14 @@ void Sound::anchorTo(Instant heard) {
   } else {
     *anchor_ += (anchor - *anchor_) / 16;
   }
+}
+
+int16_t Sound::sampleAt(Instant heard) const {
+  if (!tone_ && !isFlash(heard)) return 0;
+  // Frequencies are whole, so that a tone goes on smoothly into the next second.
+  const double seconds = std::chrono::duration<double>(heard % 1s).count();
+  const double turns = std::round(tone_.value_or(kFrequency)) * seconds;
+  return static_cast<int16_t>(std::lround(kAmplitude * std::sin(2 * std::numbers::pi * turns)));
 }
 
 void Sound::write(size_t bytes) {

@@ -14,7 +14,7 @@ int main(int argc, char** argv) {
   std::unique_ptr<comet::Sound> sound;
   if (options.sound) {
     std::string error;
-    sound = comet::Sound::create("Comet Run", error);
+    sound = comet::Sound::create(options.title.c_str(), options.tone, error);
     if (!sound) std::printf("sound error=%s\n", error.c_str());
   }
   comet::Game game(loop, options);

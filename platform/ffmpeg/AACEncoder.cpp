@@ -9,7 +9,7 @@ namespace qv::platform::ffmpeg {
 namespace {
 
 constexpr int kFramesPerPacket = 1024;
-/// After this many blocks of silence the encoder's state is that of silence.
+/// After this many blocks of silence the encoder's state is that of silence, and so is its latest packet.
 constexpr int kSettlingPackets = 4;
 
 Error encoderError(int code) { return mp4::movieError(mp4::kMovieEncoderFailed, "AAC encoder: " + errorText(code)); }
@@ -110,8 +110,22 @@ std::optional<Error> AACEncoder::flush(std::vector<mp4::EncodedSample>& out) {
   return send(nullptr, out);
 }
 
+bool AACEncoder::isBlockSilent() const {
+  for (int channel = 0; channel < 2; ++channel) {
+    const auto* samples = reinterpret_cast<const float*>(frame_->extended_data[channel]);
+    if (!std::all_of(samples, samples + kFramesPerPacket, [](float sample) { return sample == 0; })) return false;
+  }
+  return true;
+}
+
+/// A muted microphone, a game between two sounds: silence that goes on is not encoded again and again.
 std::optional<Error> AACEncoder::submit(std::vector<mp4::EncodedSample>& out) {
   filled_ = 0;
+  silentBlocks_ = isBlockSilent() ? silentBlocks_ + 1 : 0;
+  if (silentBlocks_ > kSettlingPackets) {
+    emit(lastPacket_, out);
+    return std::nullopt;
+  }
   frame_->pts = submitted_++ * kFramesPerPacket;
   return send(frame_.get(), out);
 }

@@ -26,13 +26,14 @@ class AACEncoder {
 
   std::optional<Error> append(const float* left, const float* right, int64_t count,
                               std::vector<mp4::EncodedSample>& out);
-  /// Long silence costs no encoding: the packet of silence is repeated.
+  /// As `append`. Silence that goes on, appended either way, costs no encoding: its packet is repeated.
   std::optional<Error> appendSilence(int64_t count, std::vector<mp4::EncodedSample>& out);
   /// No more sound follows.
   std::optional<Error> flush(std::vector<mp4::EncodedSample>& out);
 
  private:
   AACEncoder(CodecContext context, Frame frame);
+  [[nodiscard]] bool isBlockSilent() const;
   std::optional<Error> submit(std::vector<mp4::EncodedSample>& out);
   std::optional<Error> send(const AVFrame* frame, std::vector<mp4::EncodedSample>& out);
   void emit(std::vector<uint8_t> data, std::vector<mp4::EncodedSample>& out);
@@ -42,6 +43,7 @@ class AACEncoder {
   Frame frame_;
   Packet packet_;
   int filled_ = 0;
+  int64_t silentBlocks_ = 0;  ///< in a row, at the end of what was taken
   int64_t framesTaken_ = 0;
   int64_t submitted_ = 0;
   int64_t packets_ = 0;

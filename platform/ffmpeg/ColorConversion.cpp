@@ -43,6 +43,20 @@ void ColorConverter::convert(const PixelBuffer& image, const PlanarPicture& out)
   repeatEdges(width, height, out);
 }
 
+void ColorConverter::convertTurned(const PixelBuffer& image, const PlanarPicture& out) {
+  const int width = out.height, height = out.width;
+  const auto luma = size_t(width) * size_t(height);
+  upright_.resize(luma * 3 / 2);
+  const PlanarPicture upright{width,
+                              height,
+                              {upright_.data(), upright_.data() + luma, upright_.data() + luma * 5 / 4},
+                              {width, width / 2, width / 2}};
+  convert(image, upright);
+  libyuv::I420Rotate(upright.planes[0], upright.strides[0], upright.planes[1], upright.strides[1], upright.planes[2],
+                     upright.strides[2], out.planes[0], out.strides[0], out.planes[1], out.strides[1], out.planes[2],
+                     out.strides[2], width, height, libyuv::kRotate270);
+}
+
 void ColorConverter::scaleInto(const FrameLayout& layout, const uint8_t* pixels, const PlanarPicture& out) {
   const double ratio = std::min(double(out.width) / layout.width, double(out.height) / layout.height);
   const int width = std::min(out.width, evenPart(layout.width * ratio));

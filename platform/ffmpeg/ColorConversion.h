@@ -24,10 +24,13 @@ struct PlanarPicture {
 class ColorConverter {
  public:
   void convert(const PixelBuffer& image, const PlanarPicture& out);
+  /// The same, and then a quarter turn counterclockwise: the picture's top comes to lie on the left.
+  void convertTurned(const PixelBuffer& image, const PlanarPicture& out);
 
  private:
   void scaleInto(const FrameLayout& layout, const uint8_t* pixels, const PlanarPicture& out);
   std::vector<uint8_t> scaled_;
+  std::vector<uint8_t> upright_;
 };
 
 }  // namespace qv::platform::ffmpeg

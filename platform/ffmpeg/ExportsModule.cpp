@@ -3,9 +3,10 @@
 
 using namespace qv::platform;
 
-extern "C" __attribute__((visibility("default"))) ExportService* qvOpenExports(const ffmpeg::MoviesHost& host) {
-  setLogLevel(host.logLevel);
-  setLogSink([log = host.log](const LogLine& line) { log(line.level, line.category, line.text.c_str()); });
+QV_MODULE_DEFINE_ABI;
+
+QV_MODULE_EXPORT ExportService* qvOpenExports(const ModuleHost& host) {
+  logThroughHost(host);
   static auto* const exports = new ffmpeg::FFmpegExportService;
   return exports;
 }

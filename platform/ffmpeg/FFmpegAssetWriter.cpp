@@ -9,8 +9,9 @@
 
 namespace qv::platform::ffmpeg {
 
-FFmpegAssetWriter::FFmpegAssetWriter(URL outputURL, MovieFileFactory createFile)
-    : outputURL_(std::move(outputURL)), createFile_(std::move(createFile)) {}
+FFmpegAssetWriter::FFmpegAssetWriter(URL outputURL, MovieFileFactory createFile,
+                                     std::shared_ptr<VideoEncoderChoice> videoEncoders)
+    : outputURL_(std::move(outputURL)), createFile_(std::move(createFile)), videoEncoders_(std::move(videoEncoders)) {}
 
 FFmpegAssetWriter::~FFmpegAssetWriter() {
   if (!finishing_) state_->close();
@@ -38,8 +39,9 @@ bool FFmpegAssetWriter::startWriting() {
   std::vector<TrackPlan> plans;
   for (const auto& input : inputs_) plans.push_back(input->plan());
   state_->start();
-  encoderThread_ = std::thread([state = state_, movieFile = std::move(*file), plans = std::move(plans)]() mutable {
-    MovieEncoder(state, std::move(movieFile), plans).run();
+  encoderThread_ = std::thread([state = state_, movieFile = std::move(*file), plans = std::move(plans),
+                                videoEncoders = videoEncoders_]() mutable {
+    MovieEncoder(state, std::move(movieFile), plans, *videoEncoders).run();
     // Encoders leave tens of megabytes of free heap behind, which the next recording may never need.
     ::malloc_trim(0);
   });

@@ -10,6 +10,7 @@
 #include "platform/AssetWriter.h"
 #include "platform/ffmpeg/FFmpegMovies.h"
 #include "platform/ffmpeg/FFmpegWriterInput.h"
+#include "platform/ffmpeg/VideoEncoderChoice.h"
 #include "platform/ffmpeg/WriterState.h"
 
 namespace qv::platform::ffmpeg {
@@ -22,7 +23,7 @@ namespace qv::platform::ffmpeg {
 /// destroy the writer.
 class FFmpegAssetWriter final : public AssetWriter {
  public:
-  FFmpegAssetWriter(URL outputURL, MovieFileFactory createFile);
+  FFmpegAssetWriter(URL outputURL, MovieFileFactory createFile, std::shared_ptr<VideoEncoderChoice> videoEncoders);
   ~FFmpegAssetWriter() override;
 
   [[nodiscard]] AssetWriterStatus status() const override { return state_->status(); }
@@ -37,6 +38,7 @@ class FFmpegAssetWriter final : public AssetWriter {
  private:
   const URL outputURL_;
   const MovieFileFactory createFile_;
+  const std::shared_ptr<VideoEncoderChoice> videoEncoders_;
   const std::shared_ptr<WriterState> state_ = std::make_shared<WriterState>();
   std::vector<std::shared_ptr<FFmpegWriterInput>> inputs_;
   bool sessionStarted_ = false;

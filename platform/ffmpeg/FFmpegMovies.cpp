@@ -9,6 +9,7 @@
 #include "platform/ffmpeg/FFmpegAssetWriter.h"
 #include "platform/ffmpeg/FFmpegWriterInput.h"
 #include "platform/ffmpeg/LibraryLog.h"
+#include "platform/ffmpeg/VideoEncoderChoice.h"
 
 namespace qv::platform::ffmpeg {
 namespace {
@@ -27,15 +28,20 @@ std::optional<Error> checkDestination(const URL& url) {
 
 }  // namespace
 
-FFmpegAssetWriterService::FFmpegAssetWriterService(MovieFileFactory createFile) : createFile_(std::move(createFile)) {
+FFmpegAssetWriterService::FFmpegAssetWriterService(MovieFileFactory createFile, std::vector<H264Codec> codecs,
+                                                   std::chrono::milliseconds patience)
+    : createFile_(std::move(createFile)),
+      videoEncoders_(std::make_shared<VideoEncoderChoice>(std::move(codecs), patience)) {
   routeLibraryLog();
 }
+
+void FFmpegAssetWriterService::prepareForWriting() { videoEncoders_->prepare(); }
 
 Result<std::unique_ptr<AssetWriter>> FFmpegAssetWriterService::createAssetWriter(const URL& outputURL,
                                                                                  const std::string& fileType) {
   if (fileType != kFileTypeMPEG4) return Error::posix(ENOTSUP, fileType);
   if (auto error = checkDestination(outputURL)) return *error;
-  return std::unique_ptr<AssetWriter>(std::make_unique<FFmpegAssetWriter>(outputURL, createFile_));
+  return std::unique_ptr<AssetWriter>(std::make_unique<FFmpegAssetWriter>(outputURL, createFile_, videoEncoders_));
 }
 
 std::shared_ptr<WriterInput> FFmpegAssetWriterService::createWriterInput(MediaType type,

@@ -2,6 +2,7 @@
 
 #include <algorithm>
 #include <cinttypes>
+#include <future>
 
 #include "platform/Executor.h"
 #include "platform/Log.h"
@@ -20,40 +21,60 @@ constexpr int64_t kNanosecondsPerSecond = 1'000'000'000;
 }  // namespace
 
 MovieEncoder::MovieEncoder(std::shared_ptr<WriterState> state, std::unique_ptr<mp4::MovieFile> file,
-                           const std::vector<TrackPlan>& plans)
-    : state_(std::move(state)) {
-  check(open(plans, std::move(file)));
+                           const std::vector<TrackPlan>& plans, VideoEncoderChoice& videoEncoders)
+    : state_(std::move(state)), file_(std::move(file)) {
+  check(open(plans, videoEncoders));
 }
 
-std::optional<Error> MovieEncoder::open(const std::vector<TrackPlan>& plans, std::unique_ptr<mp4::MovieFile> file) {
-  std::vector<mp4::MovieTrack> descriptions;
+std::optional<Error> MovieEncoder::open(const std::vector<TrackPlan>& plans, VideoEncoderChoice& videoEncoders) {
   for (const TrackPlan& plan : plans) {
-    const auto trackID = static_cast<uint32_t>(descriptions.size() + 1);
-    Track track;
+    Track track{{}, {}, plan.transform};
     if (plan.type == MediaType::Video) {
       const VideoSettings settings = parseVideoSettings(plan.settings);
-      auto encoder = VideoEncoder::open(settings);
+      auto encoder = videoEncoders.open(settings);
       if (!encoder) return encoder.error();
       track.video = std::move(*encoder);
       expectedInterval_ = mp4::kMovieTimescale / settings.frameRate;
-      descriptions.push_back(track.video->track(trackID, plan.transform));
     } else {
       auto encoder = AACEncoder::open(parseAudioSettings(plan.settings));
       if (!encoder) return encoder.error();
       track.audio = std::make_unique<AudioTrackEncoder>(std::move(*encoder));
-      descriptions.push_back(track.audio->encoder().track(trackID));
     }
     tracks_.push_back(std::move(track));
   }
-  recorder_ = std::make_unique<mp4::MovieRecorder>(std::move(file), std::move(descriptions),
-                                                   [state = state_](const Error& error) { state->fail(error); });
   return std::nullopt;
 }
 
+void MovieEncoder::beginFile() {
+  if (recorder_ || tracks_.empty()) return;
+  std::vector<mp4::MovieTrack> descriptions;
+  for (const Track& track : tracks_) {
+    const auto trackID = static_cast<uint32_t>(descriptions.size() + 1);
+    descriptions.push_back(track.video ? track.video->track(trackID, track.transform)
+                                       : track.audio->encoder().track(trackID));
+  }
+  recorder_ = std::make_unique<mp4::MovieRecorder>(std::move(file_), std::move(descriptions),
+                                                   [state = state_](const Error& error) { state->fail(error); });
+}
+
 void MovieEncoder::check(const std::optional<Error>& error) {
-  if (!error) return;
+  if (!error || isFileEnded_ || state_->status() != AssetWriterStatus::Writing) return;
   QV_LOG_ERROR(logs::kMovie, "movie writing failed: %s", error->description().c_str());
-  state_->fail(*error);
+  endWith(*error);
+}
+
+/// The status tells of the failure only when the file is whole, since whoever sees it takes the file. Its parameter
+/// sets are fixed by then, so another encoder cannot go on with it.
+void MovieEncoder::endWith(const Error& error) {
+  if (recorder_) {
+    isFileEnded_ = true;
+    const mp4::MovieEnd end = movieEnd(std::nullopt);
+    finishTracks(end);
+    std::promise<void> ended;
+    recorder_->finish(end, [&ended](const std::optional<Error>&) { ended.set_value(); });
+    ended.get_future().wait();
+  }
+  state_->fail(error);
 }
 
 void MovieEncoder::run() {
@@ -109,8 +130,11 @@ std::optional<Error> MovieEncoder::handlePicture(size_t track, const SampleBuffe
   if (lastTick_) lastInterval_ = tick - *lastTick_;
   lastTick_ = tick;
   ++pictures_;
+  VideoEncoder& encoder = *tracks_[track].video;
+  if (!recorder_ && encoder.liesAcross(*sample.image())) encoder.turnPictures();
+  beginFile();
   std::vector<mp4::EncodedSample> samples;
-  if (auto error = tracks_[track].video->encode(*sample.image(), tick, samples)) return error;
+  if (auto error = encoder.encode(*sample.image(), tick, samples)) return error;
   write(track, samples);
   return std::nullopt;
 }
@@ -141,8 +165,7 @@ mp4::MovieEnd MovieEncoder::movieEnd(const std::optional<MediaTime>& endTime) co
   return end;
 }
 
-void MovieEncoder::finish(SessionFinish request) {
-  const mp4::MovieEnd end = movieEnd(request.endTime);
+void MovieEncoder::finishTracks(const mp4::MovieEnd& end) {
   const auto movieNanoseconds = static_cast<int64_t>(static_cast<__int128>(end.duration.value_or(0)) *
                                                      kNanosecondsPerSecond / mp4::kMovieTimescale);
   for (size_t i = 0; i < tracks_.size() && state_->status() == AssetWriterStatus::Writing; ++i) {
@@ -153,12 +176,18 @@ void MovieEncoder::finish(SessionFinish request) {
   }
   QV_LOG(logs::kMovie, "movie finished: %" PRIu64 " pictures, %" PRIu64 " dropped", pictures_,
          state_->droppedPictures());
+}
+
+void MovieEncoder::finish(SessionFinish request) {
+  const mp4::MovieEnd end = movieEnd(request.endTime);
+  if (state_->status() == AssetWriterStatus::Writing) beginFile();
+  if (!isFileEnded_) finishTracks(end);
   // Moved all the way: the last reference to whatever it holds must not end on a thread of the writer's.
   auto complete = [state = state_, completion = std::move(request.completion)](std::optional<Error> error) mutable {
     error ? state->fail(*error) : state->complete();
     globalQueue().post(std::move(completion));
   };
-  recorder_ ? recorder_->finish(end, std::move(complete)) : complete(state_->error());
+  recorder_ && !isFileEnded_ ? recorder_->finish(end, std::move(complete)) : complete(state_->error());
 }
 
 }  // namespace qv::platform::ffmpeg

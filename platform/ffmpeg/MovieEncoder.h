@@ -8,6 +8,7 @@
 #include "platform/ffmpeg/AudioTrackEncoder.h"
 #include "platform/ffmpeg/RecordingTimeline.h"
 #include "platform/ffmpeg/VideoEncoder.h"
+#include "platform/ffmpeg/VideoEncoderChoice.h"
 #include "platform/ffmpeg/WriterState.h"
 #include "platform/mp4/MovieRecorder.h"
 
@@ -26,7 +27,7 @@ struct TrackPlan {
 class MovieEncoder {
  public:
   MovieEncoder(std::shared_ptr<WriterState> state, std::unique_ptr<mp4::MovieFile> file,
-               const std::vector<TrackPlan>& plans);
+               const std::vector<TrackPlan>& plans, VideoEncoderChoice& videoEncoders);
   /// Deals with items until the movie is finished or the writer goes away.
   void run();
 
@@ -35,8 +36,11 @@ class MovieEncoder {
   struct Track {
     std::unique_ptr<VideoEncoder> video;
     std::unique_ptr<AudioTrackEncoder> audio;
+    AffineTransform transform;
   };
-  std::optional<Error> open(const std::vector<TrackPlan>& plans, std::unique_ptr<mp4::MovieFile> file);
+  std::optional<Error> open(const std::vector<TrackPlan>& plans, VideoEncoderChoice& videoEncoders);
+  /// Begins the file. Its header waits for the first picture, which tells how pictures lie in their track.
+  void beginFile();
   /// False after the finish.
   bool handle(WriterItem item);
   void handleSample(const QueuedSample& queued);
@@ -44,12 +48,16 @@ class MovieEncoder {
   void observe(MediaTime captureTime, MediaTime presentationTime);
   void advanceAudio();
   void finish(SessionFinish request);
+  void finishTracks(const mp4::MovieEnd& end);
   [[nodiscard]] mp4::MovieEnd movieEnd(const std::optional<MediaTime>& endTime) const;
   [[nodiscard]] int64_t tickOf(MediaTime presentationTime) const;
   void check(const std::optional<Error>& error);
+  /// The movie up to here is finished and kept.
+  void endWith(const Error& error);
   void write(size_t track, std::vector<mp4::EncodedSample>& samples);
 
   const std::shared_ptr<WriterState> state_;
+  std::unique_ptr<mp4::MovieFile> file_;  // until the recorder has it
   std::vector<Track> tracks_;
   std::unique_ptr<mp4::MovieRecorder> recorder_;
   RecordingTimeline timeline_;
@@ -58,6 +66,7 @@ class MovieEncoder {
   int64_t lastInterval_ = 0;
   int64_t expectedInterval_ = mp4::kMovieTimescale / 60;
   uint64_t pictures_ = 0;
+  bool isFileEnded_ = false;
 };
 
 }  // namespace qv::platform::ffmpeg

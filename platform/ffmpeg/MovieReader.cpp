@@ -1,5 +1,8 @@
 #include "platform/ffmpeg/MovieReader.h"
 
+#include <cstdlib>
+#include <limits>
+
 #include "platform/mp4/MovieTrack.h"
 #include "platform/mp4/MovieWriter.h"
 
@@ -10,13 +13,26 @@ int isCancelled(void* flag) { return static_cast<const std::atomic<bool>*>(flag)
 
 Error unreadable(const std::string& what) { return mp4::movieError(mp4::kMovieNotReadable, "movie: " + what); }
 
+/// Far beyond any movie, and small enough to be reckoned with.
+constexpr int64_t kLatestTime = int64_t{1} << 52;
+
+bool hasPlausibleTimes(const AVPacket& packet) {
+  const auto isPlausible = [](int64_t time) {
+    return time == AV_NOPTS_VALUE || (time > -kLatestTime && time < kLatestTime);
+  };
+  if (!isPlausible(packet.pts) || !isPlausible(packet.dts)) return false;
+  if (packet.duration < 0 || packet.duration > std::numeric_limits<uint32_t>::max()) return false;
+  if (packet.pts == AV_NOPTS_VALUE || packet.dts == AV_NOPTS_VALUE) return true;
+  return std::abs(packet.pts - packet.dts) <= std::numeric_limits<int32_t>::max();
+}
+
 }  // namespace
 
 Result<std::unique_ptr<MovieReader>> MovieReader::open(const std::string& path, const std::atomic<bool>* cancelled) {
   AVFormatContext* context = avformat_alloc_context();
   if (cancelled) context->interrupt_callback = {isCancelled, const_cast<std::atomic<bool>*>(cancelled)};
-  // The name is a file's, never a protocol's.
-  const int opened = avformat_open_input(&context, ("file:" + path).c_str(), nullptr, nullptr);
+  // The name is a file's, never a protocol's; and its content is a movie's, never a playlist's, which names others.
+  const int opened = avformat_open_input(&context, ("file:" + path).c_str(), av_find_input_format("mp4"), nullptr);
   if (opened < 0) return unreadable(errorText(opened));
   std::unique_ptr<MovieReader> reader(new MovieReader(std::unique_ptr<AVFormatContext, FormatDeleter>(context)));
   const int found = avformat_find_stream_info(context, nullptr);
@@ -56,6 +72,7 @@ Result<bool> MovieReader::read(AVPacket& packet) {
   if (got == AVERROR_EOF) return false;
   if (got < 0) return unreadable(errorText(got));
   if ((packet.flags & AV_PKT_FLAG_CORRUPT) != 0) return unreadable("damaged media");
+  if (!hasPlausibleTimes(packet)) return unreadable("impossible times");
   return true;
 }
 

@@ -1,7 +1,5 @@
 #include "platform/ffmpeg/MoviesLoader.h"
 
-#include <dlfcn.h>
-
 #include <utility>
 
 #include "platform/Executor.h"
@@ -11,26 +9,14 @@
 namespace qv::platform::ffmpeg {
 namespace {
 
-void forwardLine(LogLevel level, const char* category, const char* text) { QV_LOG_AT(level, category, "%s", text); }
-
-std::filesystem::path findModules() {
-  namespace fs = std::filesystem;
-  std::error_code error;
-  const fs::path directory = fs::read_symlink("/proc/self/exe", error).parent_path();
-  return fs::exists(directory / kMoviesModule, error) ? directory : directory / "../lib/quorveld";
-}
-
-/// The service that the module's entry opens. Never unloaded.
+/// The service that the module's entry opens.
 template <typename Open>
 auto openModule(const std::filesystem::path& path, const char* entry)
-    -> Result<decltype(std::declval<Open>()(std::declval<const MoviesHost&>()))> {
-  void* module = ::dlopen(path.c_str(), RTLD_NOW | RTLD_LOCAL);
-  auto* open = module ? reinterpret_cast<Open>(::dlsym(module, entry)) : nullptr;
-  if (open != nullptr) return open({forwardLine, detail::logThreshold.load(std::memory_order_relaxed)});
-  const char* why = ::dlerror();
-  Error error{"movie", ENOENT, {{kLocalizedDescriptionKey, Value(why ? why : path.c_str())}}};
-  QV_LOG_ERROR(logs::kMovie, "movie module: %s", error.description().c_str());
-  return error;
+    -> Result<decltype(std::declval<Open>()(std::declval<const ModuleHost&>()))> {
+  const auto open = entryOfModule(path, entry);
+  if (open) return reinterpret_cast<Open>(open.value())(moduleHost());
+  QV_LOG_ERROR(logs::kMovie, "movie module: %s", open.error().description().c_str());
+  return open.error();
 }
 
 /// What there is of a movie, and of an export, when nothing can be read.
@@ -66,25 +52,25 @@ class FailedExportSession final : public ExportSession {
 
 MoviesLoader::MoviesLoader(std::string directory) : directory_(std::move(directory)) {}
 
-std::filesystem::path MoviesLoader::pathOf(const char* module) const {
-  return (directory_.empty() ? findModules() : std::filesystem::path(directory_)) / module;
-}
-
 const Result<AssetWriterService*>& MoviesLoader::assetWriters() {
-  std::call_once(assetWritersOnce_,
-                 [this] { assetWriters_.emplace(openModule<OpenMovies>(pathOf(kMoviesModule), kMoviesModuleEntry)); });
+  std::call_once(assetWritersOnce_, [this] {
+    assetWriters_.emplace(openModule<OpenMovies>(pathOfModule(directory_, kMoviesModule), kMoviesModuleEntry));
+  });
   return *assetWriters_;
 }
 
 const Result<ExportService*>& MoviesLoader::exports() {
-  std::call_once(exportsOnce_,
-                 [this] { exports_.emplace(openModule<OpenExports>(pathOf(kExportsModule), kExportsModuleEntry)); });
+  std::call_once(exportsOnce_, [this] {
+    exports_.emplace(openModule<OpenExports>(pathOfModule(directory_, kExportsModule), kExportsModuleEntry));
+  });
   return *exports_;
 }
 
 void MoviesLoader::prepareForWriting() {
   // The loader lives as long as the process; a load that is under way makes later ones wait for it.
-  globalQueue().post([this] { (void)assetWriters(); });
+  globalQueue().post([this] {
+    if (const auto& service = assetWriters()) service.value()->prepareForWriting();
+  });
 }
 
 Result<std::unique_ptr<AssetWriter>> MoviesLoader::createAssetWriter(const URL& outputURL,

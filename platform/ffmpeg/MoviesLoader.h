@@ -24,7 +24,7 @@ class MoviesLoader final : public AssetWriterService, public ExportService {
   /// `directory`: of the modules; empty for the places above.
   explicit MoviesLoader(std::string directory = {});
 
-  /// Loads what recordings need on the global queue: it takes tens of milliseconds.
+  /// Loads what recordings need and tries out the encoders, on the global queue: it takes tens of milliseconds.
   void prepareForWriting() override;
   Result<std::unique_ptr<AssetWriter>> createAssetWriter(const URL& outputURL, const std::string& fileType) override;
   /// Null where the module cannot be loaded; then no writer was created either.
@@ -33,7 +33,6 @@ class MoviesLoader final : public AssetWriterService, public ExportService {
   std::shared_ptr<ExportSession> createExportSession(std::shared_ptr<MovieAsset> asset, ExportPreset preset) override;
 
  private:
-  std::filesystem::path pathOf(const char* module) const;
   const Result<AssetWriterService*>& assetWriters();
   const Result<ExportService*>& exports();
 

@@ -4,9 +4,10 @@
 
 using namespace qv::platform;
 
-extern "C" __attribute__((visibility("default"))) AssetWriterService* qvOpenMovies(const ffmpeg::MoviesHost& host) {
-  setLogLevel(host.logLevel);
-  setLogSink([log = host.log](const LogLine& line) { log(line.level, line.category, line.text.c_str()); });
+QV_MODULE_DEFINE_ABI;
+
+QV_MODULE_EXPORT AssetWriterService* qvOpenMovies(const ModuleHost& host) {
+  logThroughHost(host);
   static auto* const assetWriters = new ffmpeg::FFmpegAssetWriterService;
   return assetWriters;
 }

@@ -108,6 +108,7 @@ void TrackCopier::add(const AVPacket& packet, std::vector<mp4::EncodedSample>& o
 void TrackCopier::begin(std::vector<mp4::EncodedSample>& out) {
   begun_ = true;
   if (held_.empty()) return;
+  if (track_.kind == mp4::MovieTrack::Kind::Video) alignWithStart();
   base_ = held_.front().sample.decodeTime;
   int64_t first = held_.front().presentationTime;
   for (const Held& held : held_) first = std::min(first, held.presentationTime);
@@ -120,6 +121,21 @@ void TrackCopier::begin(std::vector<mp4::EncodedSample>& out) {
     out.push_back(std::move(held.sample));
   }
   held_.clear();
+}
+
+/// The picture that is shown at the start begins there and not before. Readers differ about a picture that an edit list
+/// cuts in two: some leave it out and show the next one in its place, too early, which on a still screen is half a
+/// second. Reordered pictures stay as they are.
+void TrackCopier::alignWithStart() {
+  const bool isReordered = std::any_of(held_.begin(), held_.end(), [this](const Held& held) {
+    return held.sample.compositionOffset != held_.front().sample.compositionOffset;
+  });
+  const auto after =
+      std::find_if(held_.begin(), held_.end(), [this](const Held& held) { return held.presentationTime > start_; });
+  if (isReordered || after == held_.begin()) return;
+  Held& shown = *std::prev(after);
+  shown.sample.decodeTime += start_ - shown.presentationTime;
+  shown.presentationTime = start_;
 }
 
 void TrackCopier::finish(std::vector<mp4::EncodedSample>& out) {

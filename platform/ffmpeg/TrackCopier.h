@@ -42,6 +42,7 @@ class TrackCopier {
   mp4::EncodedSample makeSample(const AVPacket& packet) const;
   /// The start has passed: what was held is needed.
   void begin(std::vector<mp4::EncodedSample>& out);
+  void alignWithStart();
 
   struct Held {
     mp4::EncodedSample sample;

@@ -28,7 +28,8 @@ class TestPattern {
   static void paintCode(SharedFrame& frame, uint64_t code, uint64_t changed);
   static void paintBar(SharedFrame& frame, uint64_t hostTime);
 
-  static constexpr size_t kFrames = 8;
+  /// As many as a real screen source has.
+  static constexpr size_t kFrames = 14;
   SharedFramePool pool_{kFrames};
   /// The pool keeps its frames as long as the layout stays the same, so that an address is a frame.
   std::unordered_map<const SharedFrame*, Painted> painted_;

@@ -63,7 +63,9 @@ void JSONLineMetricsReporter::rotate() const {
 }
 
 std::optional<Error> JSONLineMetricsReporter::append(const std::string& line) const {
-  const FileDescriptor file(::open(path_.c_str(), O_WRONLY | O_APPEND | O_CREAT | O_CLOEXEC | O_NOFOLLOW, 0600));
+  // Not blocking: a pipe that nobody reads must not hold up the end of a recording.
+  constexpr int kFlags = O_WRONLY | O_APPEND | O_CREAT | O_CLOEXEC | O_NOFOLLOW | O_NONBLOCK;
+  const FileDescriptor file(::open(path_.c_str(), kFlags, 0600));
   if (!file.isValid()) return Error::posix(errno, path_);
   const off_t before = ::lseek(file.get(), 0, SEEK_END);
   const ssize_t count = ::write(file.get(), line.data(), line.size());

@@ -8,6 +8,8 @@
 #include <climits>
 #include <cstdlib>
 #include <filesystem>
+#include <functional>
+#include <map>
 #include <memory>
 #include <system_error>
 
@@ -110,7 +112,9 @@ bool isWorthSearching(const fs::directory_entry& entry) {
   return !name.starts_with('.') && !name.ends_with(kLocalizationSuffix) && name != "Resources";
 }
 
-BundleRef searchRoot(const std::string& root, const std::string& identifier, Localization& localization, int& budget) {
+/// Shows `visit` the bundles below a root, until it answers false; whether it never did.
+bool visitBundles(const std::string& root, Localization& localization, int& budget,
+                  const std::function<bool(const BundleRef&)>& visit) {
   std::error_code failure;
   fs::recursive_directory_iterator it(root, fs::directory_options::skip_permission_denied, failure);
   for (const fs::recursive_directory_iterator end; !failure && it != end && budget > 0; it.increment(failure)) {
@@ -121,10 +125,9 @@ BundleRef searchRoot(const std::string& root, const std::string& identifier, Loc
     --budget;
     if (it.depth() + 1 >= kMaximumDepth) it.disable_recursion_pending();
     if (!hasInfo(it->path())) continue;
-    auto bundle = std::make_shared<const DirectoryBundle>(it->path(), localization);
-    if (bundle->bundleIdentifier() == identifier) return bundle;
+    if (!visit(std::make_shared<const DirectoryBundle>(it->path(), localization))) return false;
   }
-  return nullptr;
+  return true;
 }
 
 }  // namespace
@@ -153,10 +156,30 @@ BundleRef LinuxBundleService::bundleAtPath(const std::string& path) {
 BundleRef LinuxBundleService::bundleWithIdentifier(const std::string& identifier) {
   if (identifier.empty()) return nullptr;
   int budget = kMaximumDirectories;
+  BundleRef found;
+  const auto visit = [&](const BundleRef& bundle) {
+    if (bundle->bundleIdentifier() == identifier) found = bundle;
+    return found == nullptr;
+  };
   for (const std::string& root : roots_) {
-    if (auto bundle = searchRoot(root, identifier, localization_, budget)) return bundle;
+    if (!visitBundles(root, localization_, budget, visit)) break;
   }
-  return nullptr;
+  return found;
+}
+
+std::vector<BundleRef> LinuxBundleService::installedBundles() {
+  int budget = kMaximumDirectories;
+  std::map<std::string, BundleRef> byPath;
+  for (const std::string& root : roots_) {
+    // A root may be given twice, or lie in another.
+    visitBundles(canonicalPath(root), localization_, budget, [&](const BundleRef& bundle) {
+      byPath.emplace(bundle->path(), bundle);
+      return true;
+    });
+  }
+  std::vector<BundleRef> bundles;
+  for (auto& [path, bundle] : byPath) bundles.push_back(std::move(bundle));
+  return bundles;
 }
 
 BundleRef LinuxBundleService::bundleEnclosingExecutable(const std::string& executablePath) {

@@ -27,6 +27,8 @@ class LinuxBundleService final : public BundleService {
   [[nodiscard]] BundleRef bundleAtPath(const std::string& path) override;
   /// Searches the roots in their order, to a depth of 6 directories.
   [[nodiscard]] BundleRef bundleWithIdentifier(const std::string& identifier) override;
+  /// Every bundle below the roots, also those in other bundles, sorted by path; paths have no links in them.
+  [[nodiscard]] std::vector<BundleRef> installedBundles();
   [[nodiscard]] BundleRef bundleEnclosingExecutable(const std::string& executablePath) override;
   [[nodiscard]] std::optional<std::string> executablePathOfProcess(pid_t pid) override;
 

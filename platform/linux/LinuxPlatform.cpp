@@ -8,6 +8,9 @@
 namespace qv::platform {
 namespace {
 
+/// The temporary store, whose disk is watched.
+constexpr const char kStore[] = "/private/var/mobile/Library/Quorvel";
+
 std::string environment(const char* name) {
   const char* value = std::getenv(name);
   return value ? value : "";
@@ -29,9 +32,10 @@ LinuxPlatform::LinuxPlatform(std::string deviceRoot, const std::string& bundlePa
       bundles_(deviceRoot_, bundlePath, localization_),
       deviceInfo_(deviceRoot_),
       entitlements_(deviceRoot_),
-      purgeableSpace_(systemTimers(), globalBackgroundQueue()),
+      purgeableSpace_(systemTimers(), globalBackgroundQueue(), [this] { return freeSpaceOfStore(); }),
       photoLibrary_(deviceRoot_, globalQueue()),
-      metrics_(deviceRoot_, systemClock()) {}
+      metrics_(deviceRoot_, systemClock()),
+      reachability_(globalQueue()) {}
 
 void LinuxPlatform::addTo(Platform& platform) {
   platform.deviceRoot = deviceRoot_;
@@ -43,6 +47,12 @@ void LinuxPlatform::addTo(Platform& platform) {
   platform.purgeableSpace = &purgeableSpace_;
   platform.photoLibrary = &photoLibrary_;
   platform.metrics = &metrics_;
+  platform.reachability = &reachability_;
+}
+
+std::optional<uint64_t> LinuxPlatform::freeSpaceOfStore() {
+  const auto bytes = fileSystem_.freeSizeOfFileSystem(deviceRoot_ + kStore);
+  return bytes ? std::optional(bytes.value()) : std::nullopt;
 }
 
 IPCPeerResolver LinuxPlatform::peerResolver() {

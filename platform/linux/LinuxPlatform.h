@@ -1,5 +1,7 @@
 #pragma once
 
+#include <cstdint>
+#include <optional>
 #include <string>
 
 #include "platform/IPC.h"
@@ -7,12 +9,13 @@
 #include "platform/linux/DeviceDescription.h"
 #include "platform/linux/EntitlementStore.h"
 #include "platform/linux/FolderPhotoLibrary.h"
+#include "platform/linux/FreeSpaceWatch.h"
 #include "platform/linux/ICULocalization.h"
 #include "platform/linux/JSONLineMetricsReporter.h"
 #include "platform/linux/JSONPreferenceStore.h"
 #include "platform/linux/LinuxBundleService.h"
-#include "platform/linux/PeriodicPurgeableSpaceService.h"
 #include "platform/linux/PosixFileSystem.h"
+#include "platform/linux/RouteReachability.h"
 
 namespace qv::platform {
 
@@ -33,13 +36,19 @@ class LinuxPlatform {
   LinuxPlatform& operator=(const LinuxPlatform&) = delete;
 
   /// Sets the device root, fileSystem, bundles, localization, preferences, deviceInfo,
-  /// purgeableSpace, photoLibrary and metrics.
+  /// purgeableSpace, photoLibrary, metrics and reachability.
   void addTo(Platform& platform);
   /// Fills in a peer's bundle identifier and entitlements. It borrows this object. A process that has
   /// ended, or whose executable lies in no bundle, keeps neither.
   [[nodiscard]] IPCPeerResolver peerResolver();
+  /// What the extension service searches.
+  [[nodiscard]] LinuxBundleService& bundles() { return bundles_; }
+
+  /// While files of the temporary store grow, the free space around them is watched.
+  void watchFreeSpace(bool isOn) { purgeableSpace_.setActive(isOn); }
 
  private:
+  [[nodiscard]] std::optional<uint64_t> freeSpaceOfStore();
   void resolve(IPCPeer& peer);
 
   const std::string deviceRoot_;
@@ -49,9 +58,10 @@ class LinuxPlatform {
   LinuxBundleService bundles_;
   DeviceDescription deviceInfo_;
   EntitlementStore entitlements_;
-  PeriodicPurgeableSpaceService purgeableSpace_;
+  FreeSpaceWatch purgeableSpace_;
   FolderPhotoLibrary photoLibrary_;
   JSONLineMetricsReporter metrics_;
+  RouteReachabilityService reachability_;
 };
 
 /// QUORVEL_DEVICE_ROOT without trailing separators; empty on a device.

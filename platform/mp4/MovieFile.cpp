@@ -1,6 +1,7 @@
 #include "platform/mp4/MovieFile.h"
 
 #include <fcntl.h>
+#include <sys/file.h>
 #include <unistd.h>
 
 #include <cerrno>
@@ -10,6 +11,8 @@ namespace qv::platform::mp4 {
 Result<std::unique_ptr<MovieFile>> DiskMovieFile::create(const std::string& path) {
   FileDescriptor fd(::open(path.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_CLOEXEC, 0644));
   if (!fd.isValid()) return Error::posix(errno, path);
+  // For whoever looks for unfinished movies. Where the file system has no locks, nobody is kept away.
+  (void)::flock(fd.get(), LOCK_EX | LOCK_NB);
   return std::unique_ptr<MovieFile>(std::make_unique<DiskMovieFile>(std::move(fd)));
 }
 

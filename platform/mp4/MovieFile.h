@@ -33,7 +33,7 @@ class MovieFile {
 /// Threading: confined to one thread at a time.
 class DiskMovieFile final : public MovieFile {
  public:
-  /// A new file; EEXIST where there is one already.
+  /// A new file; EEXIST where there is one already. It is locked (flock) until it is closed.
   static Result<std::unique_ptr<MovieFile>> create(const std::string& path);
   explicit DiskMovieFile(FileDescriptor fd) : fd_(std::move(fd)) {}
 

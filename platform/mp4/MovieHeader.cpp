@@ -117,34 +117,69 @@ void writeTrack(ByteWriter& out, const MovieTrack& track, const TrackIndex* inde
 }
 
 constexpr uint32_t kDefaultBaseIsMoof = 0x020000;
+constexpr uint32_t kDefaultDurationPresent = 0x000008;
+constexpr uint32_t kDefaultFlagsPresent = 0x000020;
 constexpr uint32_t kDataOffsetPresent = 0x000001;
+constexpr uint32_t kFirstSampleFlagsPresent = 0x000004;
 constexpr uint32_t kSampleDurationPresent = 0x000100;
 constexpr uint32_t kSampleSizePresent = 0x000200;
-constexpr uint32_t kSampleFlagsPresent = 0x000400;
 
-/// Returns where the data offset stands, to be filled in when the fragment's head is complete.
-size_t writeFragmentRun(ByteWriter& out, const FragmentTrack& part) {
+std::vector<uint32_t> durationsOf(std::span<const EncodedSample> samples) {
+  std::vector<uint32_t> durations;
+  for (size_t i = 0; i + 1 < samples.size(); ++i) {
+    durations.push_back(static_cast<uint32_t>(samples[i + 1].decodeTime - samples[i].decodeTime));
+  }
+  durations.push_back(samples.back().duration);
+  return durations;
+}
+
+/// How many samples, from `from` on, one run can hold: all depend on others, but maybe the first.
+size_t runLength(std::span<const EncodedSample> samples, size_t from, bool allSync) {
+  if (allSync) return samples.size() - from;
+  size_t end = from + 1;
+  while (end < samples.size() && !samples[end].isSync) ++end;
+  return end - from;
+}
+
+/// A run's place for where its data is, to be filled in when the fragment's head is complete.
+struct RunOffset {
+  size_t position;
+  uint64_t dataSize;
+};
+
+/// Writes one track's part, with no more said of each sample than differs: that is most of what fragments cost.
+void writeFragmentRuns(ByteWriter& out, const FragmentTrack& part, std::vector<RunOffset>& runs) {
+  const auto durations = durationsOf(part.samples);
+  const bool isRegular = std::all_of(durations.begin(), durations.end(), [&](auto d) { return d == durations[0]; });
+  const bool allSync = std::all_of(part.samples.begin(), part.samples.end(), [](const auto& s) { return s.isSync; });
   BoxScope traf(out, "traf");
   {
-    BoxScope box(out, "tfhd", 0, kDefaultBaseIsMoof);
+    BoxScope box(out, "tfhd", 0, kDefaultBaseIsMoof | kDefaultFlagsPresent | (isRegular ? kDefaultDurationPresent : 0));
     out.u32(part.track->trackID);
+    if (isRegular) out.u32(durations[0]);
+    out.u32(allSync ? kSyncSampleFlags : kDependentSampleFlags);
   }
   {
     BoxScope box(out, "tfdt", 1, 0);
     out.u64(static_cast<uint64_t>(part.samples.front().decodeTime));
   }
-  BoxScope box(out, "trun", 0, kDataOffsetPresent | kSampleDurationPresent | kSampleSizePresent | kSampleFlagsPresent);
-  out.u32(part.samples.size());
-  const size_t dataOffset = out.size();
-  out.u32(0);
-  for (size_t i = 0; i < part.samples.size(); ++i) {
-    const EncodedSample& sample = part.samples[i];
-    const bool isLast = i + 1 == part.samples.size();
-    out.u32(isLast ? sample.duration : static_cast<uint64_t>(part.samples[i + 1].decodeTime - sample.decodeTime));
-    out.u32(sample.data.size());
-    out.u32(sample.isSync ? kSyncSampleFlags : kDependentSampleFlags);
+  for (size_t from = 0, length = 0; from < part.samples.size(); from += length) {
+    length = runLength(part.samples, from, allSync);
+    const bool marksFirst = !allSync && part.samples[from].isSync;
+    BoxScope box(out, "trun", 0,
+                 kDataOffsetPresent | kSampleSizePresent | (marksFirst ? kFirstSampleFlagsPresent : 0) |
+                     (isRegular ? 0 : kSampleDurationPresent));
+    out.u32(length);
+    RunOffset run{out.size(), 0};
+    out.u32(0);
+    if (marksFirst) out.u32(kSyncSampleFlags);
+    for (size_t i = from; i < from + length; ++i) {
+      if (!isRegular) out.u32(durations[i]);
+      out.u32(part.samples[i].data.size());
+      run.dataSize += part.samples[i].data.size();
+    }
+    runs.push_back(run);
   }
-  return dataOffset;
 }
 
 }  // namespace
@@ -198,20 +233,20 @@ void writeMovieHeader(ByteWriter& out, std::span<const IndexedTrack> tracks) {
 
 void writeFragmentHead(ByteWriter& out, uint32_t sequenceNumber, std::span<const FragmentTrack> tracks) {
   const size_t start = out.size();
-  std::vector<size_t> dataOffsets;
+  std::vector<RunOffset> runs;
   {
     BoxScope moof(out, "moof");
     {
       BoxScope box(out, "mfhd", 0, 0);
       out.u32(sequenceNumber);
     }
-    for (const FragmentTrack& part : tracks) dataOffsets.push_back(writeFragmentRun(out, part));
+    for (const FragmentTrack& part : tracks) writeFragmentRuns(out, part, runs);
   }
   const size_t headEnd = out.size() + 8;
   uint64_t offset = headEnd - start;
-  for (size_t i = 0; i < tracks.size(); ++i) {
-    out.patch32(dataOffsets[i], offset);
-    for (const EncodedSample& sample : tracks[i].samples) offset += sample.data.size();
+  for (const RunOffset& run : runs) {
+    out.patch32(run.position, offset);
+    offset += run.dataSize;
   }
   out.u32(offset - (headEnd - 8 - start));
   out.code("mdat");

@@ -32,6 +32,7 @@ void MovieRecorder::append(size_t track, EncodedSample sample) {
     if (failed_) return;
     queuedBytes_ += sample.data.size();
     queue_.push_back({track, std::move(sample)});
+    if (isGathering_ && !isCrowded()) return;
   }
   changed_.notify_one();
 }
@@ -55,6 +56,7 @@ void MovieRecorder::run() {
       const auto isDue = [this] { return !queue_.empty() || finish_ || stopping_; };
       hasPending() ? (void)changed_.wait_until(lock, pendingSince_ + kFragmentLength, isDue)
                    : changed_.wait(lock, isDue);
+      gather(lock);
       items.swap(queue_);
       queuedBytes_ = 0;
       finish = std::move(finish_);
@@ -70,6 +72,13 @@ void MovieRecorder::run() {
     }
     if (stopping) return;
   }
+}
+
+/// Nothing is written until a fragment is full, so nothing is gained by waking up for each sample.
+void MovieRecorder::gather(std::unique_lock<std::mutex>& lock) {
+  isGathering_ = true;
+  changed_.wait_for(lock, kGathering, [this] { return isCrowded() || finish_ || stopping_; });
+  isGathering_ = false;
 }
 
 void MovieRecorder::take(std::vector<Item> items) {

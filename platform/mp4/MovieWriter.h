@@ -60,11 +60,12 @@ class MovieWriter {
   /// Takes over a file that was read back: `size` is the end of its last whole fragment.
   void adopt(uint64_t placeholderOffset, uint64_t size, std::vector<TrackIndex> index);
   [[nodiscard]] uint64_t size() const { return size_; }
+  /// The movie's length with this end, in kMovieTimescale.
+  [[nodiscard]] uint64_t movieDuration(const MovieEnd& end) const;
 
  private:
   std::optional<Error> appendBytes(std::span<const uint8_t> bytes);
   std::vector<uint8_t> buildHeader(const MovieEnd& end);
-  uint64_t movieDuration(const MovieEnd& end) const;
   std::optional<Error> syncFile();
 
   std::unique_ptr<MovieFile> file_;

@@ -37,9 +37,19 @@ void TrackIndex::addEntry(int64_t decodeTime, int32_t compositionOffset, uint32_
   if (startsChunk || chunks_.empty()) chunks_.push_back({offset, static_cast<uint32_t>(count())});
   sizes_.push_back(size);
   extend(compositionOffsets_, static_cast<uint32_t>(compositionOffset));
-  if (isSync) syncSamples_.push_back(static_cast<uint32_t>(count()));
+  addSync(isSync);
   lastDecodeTime_ = decodeTime;
   lastDuration_ = duration;
+}
+
+/// Where all are, as those of sound, none is listed.
+void TrackIndex::addSync(bool isSync) {
+  if (allSync_ && !isSync) {
+    allSync_ = false;
+    for (size_t number = 1; number < count(); ++number) syncSamples_.push_back(static_cast<uint32_t>(number));
+  } else if (!allSync_ && isSync) {
+    syncSamples_.push_back(static_cast<uint32_t>(count()));
+  }
 }
 
 void TrackIndex::dropLast() {
@@ -81,7 +91,7 @@ void TrackIndex::writeTimes(ByteWriter& out) const {
 }
 
 void TrackIndex::writeSyncSamples(ByteWriter& out) const {
-  if (syncSamples_.size() == count()) return;
+  if (allSync_) return;
   BoxScope box(out, "stss", 0, 0);
   out.u32(syncSamples_.size());
   for (const uint32_t number : syncSamples_) out.u32(number);

@@ -48,6 +48,7 @@ class TrackIndex {
                 uint64_t offset, bool startsChunk);
   static void extend(std::vector<Run>& runs, uint32_t value);
   static void shorten(std::vector<Run>& runs);
+  void addSync(bool isSync);
   void dropLast();
   void writeTimes(ByteWriter& out) const;
   void writeSyncSamples(ByteWriter& out) const;
@@ -56,7 +57,8 @@ class TrackIndex {
   std::vector<uint32_t> sizes_;
   std::vector<Run> durations_;  ///< of all samples but the last
   std::vector<Run> compositionOffsets_;
-  std::vector<uint32_t> syncSamples_;  ///< counted from 1
+  bool allSync_ = true;
+  std::vector<uint32_t> syncSamples_;  ///< counted from 1; only where there are others
   std::vector<Chunk> chunks_;
   int64_t firstDecodeTime_ = 0;
   int64_t lastDecodeTime_ = 0;

@@ -305,7 +305,9 @@ void BusLink::close() {
   const auto self = shared_from_this();
   if (timer_ != 0) context_->io.cancel(std::exchange(timer_, 0));
   if (drainTimer_ != 0) context_->io.cancel(std::exchange(drainTimer_, 0));
-  if (watch_ != 0) context_->io.unwatch(std::exchange(watch_, 0), fd_);
+  // sd-bus closes a broken connection's descriptor by itself. Then the number may be another thread's by now.
+  const int open = bus_ ? sd_bus_get_fd(bus_.get()) : -1;
+  if (watch_ != 0) context_->io.unwatch(std::exchange(watch_, 0), open);
   received_.clear();
   callsByCookie_.clear();
   bus_.reset();

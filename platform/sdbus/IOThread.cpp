@@ -81,7 +81,7 @@ void IOThread::modify(Token token, int fd, uint32_t epollEvents) {
 
 void IOThread::unwatch(Token token, int fd) {
   watches_.erase(token);
-  ::epoll_ctl(epoll_.get(), EPOLL_CTL_DEL, fd, nullptr);
+  if (fd >= 0) ::epoll_ctl(epoll_.get(), EPOLL_CTL_DEL, fd, nullptr);
 }
 
 IOThread::Token IOThread::after(std::chrono::milliseconds delay, std::function<void()> work) {

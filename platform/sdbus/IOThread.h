@@ -33,7 +33,7 @@ class IOThread {
 
   Token watch(int fd, uint32_t epollEvents, EventHandler handler);
   void modify(Token token, int fd, uint32_t epollEvents);
-  /// Before the descriptor is closed.
+  /// Before the descriptor is closed; with -1 where it is closed already, which ends the watch too.
   void unwatch(Token token, int fd);
   Token after(std::chrono::milliseconds delay, std::function<void()> work);
   void cancel(Token timer);

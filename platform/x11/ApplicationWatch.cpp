@@ -139,7 +139,7 @@ void ApplicationWatch::learn(std::vector<RunningApplication> present, std::vecto
     application.isFrontmost = false;
     if (hasEnded(process)) {
       losses.push_back(applicationReport(application, kApplicationTerminated));
-      std::erase_if(present, [&](const auto& running) { return running.pid == application.pid; });
+      std::erase_if(present, [pid = known->first](const auto& running) { return running.pid == pid; });
       known = known_.erase(known);
       continue;
     }

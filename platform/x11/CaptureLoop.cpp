@@ -16,8 +16,9 @@ namespace {
 
 using std::chrono::nanoseconds;
 
-/// Frames that may be on their way to encoders and clients at once.
-constexpr size_t kPoolCapacity = 8;
+/// Frames that may be on their way to encoders, clients and extensions at once: more than the link to an extension
+/// holds (12), so that of a slow one's frames the oldest are dropped there and not the newest here.
+constexpr size_t kPoolCapacity = 14;
 /// Below half a second by what a loaded machine may oversleep.
 constexpr nanoseconds kHeartbeat = std::chrono::milliseconds(450);
 /// Longer than any grab takes on a loaded machine; a server that is silent for longer is lost.

@@ -3,6 +3,7 @@
 #include <cstdlib>
 
 #include "platform/x11/X11Applications.h"
+#include "platform/x11/X11DisplayLayoutMonitor.h"
 #include "platform/x11/X11RenderServer.h"
 #include "platform/x11/X11ScreenCapture.h"
 #include "platform/x11/X11UserAlert.h"
@@ -23,11 +24,13 @@ struct X11Platform::Services {
   Services(const std::string& display, X11Dependencies dependencies)
       : queries(std::make_shared<QueryConnection>(display)),
         screenCapture(display, *dependencies.clock),
-        applications(queries, std::move(dependencies.bundleIdentifierOfProcess)),
+        bundleOfProcess(std::move(dependencies.bundleIdentifierOfProcess)),
+        applications(queries, bundleOfProcess),
         alerts(display) {}
 
   const std::shared_ptr<QueryConnection> queries;
   X11ScreenCaptureService screenCapture;
+  const BundleLookup bundleOfProcess;
   X11ApplicationService applications;
   X11RenderServer renderServer{*queries};
   X11UserAlertService alerts;
@@ -46,5 +49,8 @@ ScreenCaptureService& X11Platform::screenCapture() { return services_->screenCap
 ApplicationService& X11Platform::applications() { return services_->applications; }
 RenderServer& X11Platform::renderServer() { return services_->renderServer; }
 UserAlertService& X11Platform::alerts() { return services_->alerts; }
+std::shared_ptr<DisplayLayoutMonitor> X11Platform::createLayoutMonitor() {
+  return std::make_shared<X11DisplayLayoutMonitor>(services_->queries->display(), services_->bundleOfProcess);
+}
 
 }  // namespace qv::platform

@@ -11,6 +11,7 @@
 #include "platform/Clock.h"
 #include "platform/Result.h"
 #include "platform/ScreenCapture.h"
+#include "platform/SystemServices.h"
 #include "platform/UserAlert.h"
 
 namespace qv::platform {
@@ -41,6 +42,7 @@ class X11Platform {
   ApplicationService& applications();
   RenderServer& renderServer();
   UserAlertService& alerts();
+  std::shared_ptr<DisplayLayoutMonitor> createLayoutMonitor();
 
  private:
   struct Services;

@@ -7,6 +7,7 @@
 #include <cerrno>
 #include <cstring>
 #include <ctime>
+#include <mutex>
 
 namespace qv::platform {
 namespace {
@@ -22,6 +23,14 @@ xcb_screen_t* screenOfNumber(xcb_connection_t* connection, int number) {
   auto screens = xcb_setup_roots_iterator(xcb_get_setup(connection));
   for (; number > 0 && screens.rem > 1; --number) xcb_screen_next(&screens);
   return screens.data;
+}
+
+/// libXau, in which a connection looks for its authorization, keeps the file's name in a buffer of the process's: two
+/// threads that connect at once would write it together.
+xcb_connection_t* connectOneAtATime(const std::string& display, int& screenNumber) {
+  static std::mutex mutex;
+  const std::lock_guard lock(mutex);
+  return xcb_connect(display.empty() ? nullptr : display.c_str(), &screenNumber);
 }
 
 }  // namespace
@@ -45,7 +54,7 @@ Result<std::unique_ptr<XcbConnection>> XcbConnection::open(const std::string& di
                                                            std::chrono::milliseconds replyLimit) {
   int screenNumber = 0;
   const ScopedSigpipeBlock noSigpipe;
-  xcb_connection_t* connection = xcb_connect(display.empty() ? nullptr : display.c_str(), &screenNumber);
+  xcb_connection_t* connection = connectOneAtATime(display, screenNumber);
   if (const int failure = xcb_connection_has_error(connection); failure != 0) {
     xcb_disconnect(connection);
     return Error::posix(failure == XCB_CONN_CLOSED_PARSE_ERR ? EINVAL : ECONNREFUSED, "X display " + display);

@@ -1,43 +1,14 @@
 #include "sdk/client/Errors.h"
 
-#include <iterator>
-
 #include "platform/IPC.h"
+#include "support/RecordingErrorKeys.h"
+
+static_assert(quorvel::kErrorUnknown == qv::kFirstRecordingErrorCode &&
+              quorvel::kErrorMixingFailure == qv::kLastRecordingErrorCode);
 
 namespace quorvel {
 
-namespace {
-
-/// By code, from -5800 downwards.
-constexpr std::string_view kErrorKeys[] = {
-    "RECORDING_ERROR_UNKNOWN",
-    "RECORDING_ERROR_USER_DECLINED",
-    "RECORDING_ERROR_DISABLED",
-    "RECORDING_ERROR_FAILED_TO_START",
-    "RECORDING_ERROR_FAILED",
-    "RECORDING_ERROR_INSUFFICIENT_STORAGE",
-    "RECORDING_ERROR_INTERRUPTED",
-    "RECORDING_ERROR_CONTENT_RESIZE",
-    "RECORDING_ERROR_INVALID_BROADCAST_SESSION",
-    "RECORDING_ERROR_SYSTEM_DORMANCY",
-    "RECORDING_ERROR_ENTITLEMENTS",
-    "RECORDING_ERROR_ACTIVE_PHONE_CALL",
-    "RECORDING_ERROR_FAILED_TO_SAVE",
-    "RECORDING_ERROR_DASHVEX",
-    "RECORDING_ERROR_CONNECTION_INVALID",
-    "RECORDING_ERROR_CONNECTION_INTERRUPTED",
-    "RECORDING_ERROR_NO_CONTEXTID_MATCH",
-    "RECORDING_ERROR_MEDIASERVICES_FAILED",
-    "RECORDING_ERROR_MIXING_FAILURE",
-};
-static_assert(std::size(kErrorKeys) == kErrorUnknown - kErrorMixingFailure + 1);
-
-}  // namespace
-
-std::string_view errorKey(int64_t code) {
-  if (code > kErrorUnknown || code < kErrorMixingFailure) code = kErrorUnknown;
-  return kErrorKeys[kErrorUnknown - code];
-}
+std::string_view errorKey(int64_t code) { return qv::localizationKeyForErrorCode(code); }
 
 }  // namespace quorvel
 

@@ -12,6 +12,9 @@ namespace quorvel {
 Recorder::~Recorder() = default;
 
 std::string filePath(std::string_view url) { return qv::platform::URL(std::string(url)).path(); }
+std::vector<uint8_t> archivedConfiguration(const BroadcastConfiguration& configuration) {
+  return qv::sdk::archive(configuration);
+}
 
 }  // namespace quorvel
 

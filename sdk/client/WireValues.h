@@ -4,17 +4,15 @@
 
 #include "platform/IPC.h"
 #include "sdk/client/quorvel/Recorder.h"
+#include "sdk/common/ValueCoding.h"
 
 namespace qv::client {
 
 // Between what crosses the connection and the application's types. What arrives may be malformed in
 // ways that its wire type allows: such a sample is nothing, such a field is its default.
 
-platform::Value toWire(const quorvel::Value& value);
-platform::Dictionary toWire(const quorvel::Dictionary& dictionary);
-/// Descriptors have no form for applications and are left out; dates become seconds since 1970.
-quorvel::Value fromWire(const platform::Value& value);
-quorvel::Dictionary fromWire(const platform::Dictionary& dictionary);
+using sdk::fromWire;
+using sdk::toWire;
 
 /// The start request's arguments; nothing when the endpoint's descriptor cannot be duplicated.
 std::optional<platform::IPCArguments> startArguments(const quorvel::StartOptions& options);

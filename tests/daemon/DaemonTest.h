@@ -52,6 +52,11 @@ class TestClient {
   };
 
   void send(const char* member, platform::IPCArguments arguments = {}) {
+    post(member, std::move(arguments));
+    device_.run();
+  }
+  /// Like `send`, but nothing has run yet.
+  void post(const char* member, platform::IPCArguments arguments = {}) {
     seen_->answer.reset();
     connection_->call(
         member, std::move(arguments),
@@ -61,28 +66,33 @@ class TestClient {
         [seen = seen_](const platform::Error& error) {
           seen->answer = Answer{{}, error};
         });
-    device_.run();
   }
   std::optional<Answer> request(const char* member, platform::IPCArguments arguments = {}) {
     send(member, std::move(arguments));
     return seen_->answer;
   }
-  std::optional<Answer> start(const StartOptions& o) {
+  void postStart(const StartOptions& o) {
     using platform::Value;
     platform::Array contexts;
     for (const uint32_t context : o.contexts) contexts.emplace_back(context);
-    return request("startRecordingWindowLayerContextIDs",
-                   {Value(contexts), Value(platform::Array{Value(o.width), Value(o.height)}), Value(o.microphone),
-                    Value(o.camera), Value(o.broadcast), Value(o.system), Value(o.capture), Value(platform::Array{})});
+    post("startRecordingWindowLayerContextIDs",
+         {Value(contexts), Value(platform::Array{Value(o.width), Value(o.height)}), Value(o.microphone),
+          Value(o.camera), Value(o.broadcast), Value(o.system), Value(o.capture), Value(platform::Array{})});
+  }
+  std::optional<Answer> start(const StartOptions& o) {
+    postStart(o);
+    device_.run();
+    return seen_->answer;
   }
   std::optional<Answer> start() { return start(StartOptions{}); }
   std::optional<Answer> stop() { return request("stopRecordingWithHandler"); }
   platform::Dictionary state() { return request("synchronousGetCurrentState")->values.at(0).asDictionary(); }
   bool isRecording() { return valueForKey(state(), "isRecording").asBool(); }
   void disconnect() {
-    connection_->invalidate();
+    leave();
     device_.run();
   }
+  void leave() { connection_->invalidate(); }
   /// The codes of the end-of-recording messages so far; 0 for none. Takes them.
   std::vector<int64_t> takeEnds() {
     std::vector<int64_t> codes;

@@ -80,7 +80,7 @@ TEST_F(ArbitrationTest, ASystemRecordingFollowsTheFront) {
   system.start({.width = 1920, .height = 1080, .system = true});
   device_.run();
   EXPECT_EQ(device_.tap.tap->process, 100);
-  EXPECT_EQ(device_.movies.video().settings.at(platform::settings::kVideoWidth).asDouble(), 1080);
+  EXPECT_EQ(device_.movies.video().settings.at(platform::settings::kVideoWidth).asDouble(), 1080) << "never wider than tall";
   device_.applications.report(platform::kApplicationForeground, 200, true);
   device_.run();
   EXPECT_EQ(device_.tap.tap->process, 200);
@@ -94,6 +94,49 @@ TEST_F(ArbitrationTest, ASystemRecordingFollowsTheFront) {
   system.stop();
   EXPECT_EQ(device_.sounds.played, (std::vector<uint32_t>{1117, 1118}));
   EXPECT_FALSE(device_.applications.handler);
+}
+
+TEST_F(ArbitrationTest, TheFollowerSeesASwitchDuringTheStartAndOutlivesTheFormerRecordingsEnd) {
+  install("Other", "com.example.other-system", 400);
+  TestClient other(device_, "com.example.other-system", 400, {{"com.tarnwick.private.quorvel", Value(true)}});
+  auto system = systemUI();
+  system.start({.system = true});
+  sendFrame(kSecond);
+  device_.applications.frontmost = "com.example.game";
+  other.postStart({.system = true});
+  // The front is asked for when the recording begins; before it has started it changes.
+  while (device_.movies.movies.size() < 2) ASSERT_TRUE(device_.executor.runOne());
+  device_.applications.frontmost = "com.example.chat";
+  device_.run();
+  EXPECT_EQ(device_.tap.tap->process, 200);
+  EXPECT_EQ(system.takeEnds(), std::vector<int64_t>{errorcode::kInterrupted});
+  // The former client goes: that recording's end is long over.
+  system.disconnect();
+  ASSERT_TRUE(device_.applications.handler);
+  device_.applications.report(platform::kApplicationForeground, 100, true);
+  device_.run();
+  EXPECT_EQ(device_.tap.tap->process, 100);
+}
+
+TEST_F(ArbitrationTest, ADeviceThatInterruptsKeepsTheSystemRecordingInThePhotoLibrary) {
+  auto system = systemUI();
+  system.start({.system = true});
+  sendFrame(kSecond);
+  // What is recorded from the warning on is left out, unless the warning is taken back.
+  manager_->notifySystemRecordingMayBeStopped();
+  manager_->notifySystemRecordingResumed();
+  device_.run();
+  sendFrame(2 * kSecond);
+  manager_->notifySystemRecordingMayBeStopped();
+  device_.run();
+  sendFrame(3 * kSecond);
+  manager_->stopSystemRecordingWithInterruption();
+  manager_->stopSystemRecordingWithInterruption();
+  device_.run();
+  EXPECT_EQ(device_.movies.last().sessionEnd, platform::MediaTime::make(2 * kSecond, platform::kHostTimescale));
+  EXPECT_EQ(system.takeEnds(), std::vector<int64_t>{errorcode::kInterrupted});
+  EXPECT_EQ(device_.photoLibrary.stored.size(), 1u);
+  EXPECT_EQ(openTransactions(), 0);
 }
 
 TEST_F(ArbitrationTest, TheDisplayLayoutRuleEndsApplicationRecordings) {
@@ -118,6 +161,8 @@ TEST_F(ArbitrationTest, TheDisplayLayoutRuleEndsApplicationRecordings) {
   layout({0});
   EXPECT_EQ(client.takeEnds(), std::vector<int64_t>{errorcode::kContentResize});
   EXPECT_TRUE(client.lastMovie().ends_with("Game.mp4"));
+  device_.disk.addFile(platform::URL(client.lastMovie()).path(), "movie");
+  EXPECT_EQ(client.request("saveVideoToCameraRoll", {Value(client.lastMovie())})->code(), 0);
   EXPECT_EQ(openTransactions(), 0);
 }
 

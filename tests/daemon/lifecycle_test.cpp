@@ -118,6 +118,22 @@ TEST_F(LifecycleTest, ARefusedFrameEndsTheRecording) {
   EXPECT_EQ(openTransactions(), 0);
 }
 
+TEST_F(LifecycleTest, ANearlyFullDiskEndsTheRecordingAndItsMovieIsKept) {
+  auto client = game();
+  client.start();
+  device_.disk.setFreeSize(50'000'000);
+  for (int64_t half = 2; half < 8; ++half) sendFrame(half * kSecond / 2);
+  device_.disk.failOn(fakes::FakeFileSystem::Operation::FreeSize, fakes::kStore, EIO);  // unknown is not full
+  sendFrame(5 * kSecond);
+  EXPECT_TRUE(client.isRecording());
+  device_.disk.failOn(fakes::FakeFileSystem::Operation::FreeSize, fakes::kStore, 0);
+  device_.disk.setFreeSize(49'999'999);
+  sendFrame(6 * kSecond);
+  EXPECT_EQ(client.takeEnds(), std::vector<int64_t>{errorcode::kFailedToSave});
+  EXPECT_EQ(device_.movies.last().status, platform::AssetWriterStatus::Completed);
+  EXPECT_EQ(openTransactions(), 0);
+}
+
 TEST_F(LifecycleTest, MetricsCountBothStretchesOfAPausedRecording) {
   auto client = game();
   client.start();

@@ -64,12 +64,6 @@ TEST_F(RequestsTest, RequestsWithoutAnAnswerFailByName) {
   client.start();
   EXPECT_EQ(client.request("discardRecordingWithHandler")->failureName(), requesterror::kRecording);
   EXPECT_TRUE(client.isRecording());
-  EXPECT_EQ(client
-                .request("setupBroadcastWithHostBundleID",
-                         {Value("a"), Value("b"), Value(platform::Data{}), Value(platform::Dictionary{})})
-                ->failureName(),
-            requesterror::kNoExtension);
-  EXPECT_TRUE(client.request("getSystemBroadcastExtensionInfo")->values[0].asArray().empty());
 }
 
 TEST_F(RequestsTest, StateHoldsWhatTheClientSet) {

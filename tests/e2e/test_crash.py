@@ -16,8 +16,9 @@ FEWEST_FRAGMENTS = 2
 LARGEST_LOSS = 4.0 if is_sanitized() else 1.0 + FRAME_INTERVAL
 
 
-def record_and_kill(device, length, killed_path):
-    """The moments of the start and the kill. Pictures follow CLOCK_MONOTONIC, as time.monotonic() does."""
+def record_and_kill(device, length, killed_path=None):
+    """The moments of the start and the kill. Pictures follow CLOCK_MONOTONIC, as time.monotonic() does. The file is
+    moved to `killed_path`, or stays where a daemon that starts finds it."""
     daemon = device.start_daemon()
     game = device.start_game('record 600; stop')
     wait_for_line(game, 'started')
@@ -32,7 +33,8 @@ def record_and_kill(device, length, killed_path):
     wait_for_line(game, 'stopped')  # the client is told
     game.kill()
     game.wait()
-    os.rename(path, killed_path)
+    if killed_path:
+        os.rename(path, killed_path)
     return started, killed
 
 
@@ -66,5 +68,23 @@ def kill_at_random_moments(rounds):
         check('error=0' in device.run_game('record 1; stop; quit'), 'no recording after the crashes')
 
 
+def salvage_at_the_next_start():
+    """The killed recording is finished, and the application's next one leaves it alone."""
+    with Device(log='notice') as device:
+        started, killed = record_and_kill(device, SHORTEST)
+        daemon = device.start_daemon()
+        check('finished an unfinished movie' in daemon.log(), daemon.log())
+        kept, = device.movie_files()
+        loss = judge(kept, started, killed)
+        check(loss <= LARGEST_LOSS, f'{loss:.3f} s of the movie are lost')
+        check(movie.fragment_count(kept) == 0, 'the movie is not finished')
+        with open(kept, 'rb') as file:
+            content = file.read()
+        check('error=0' in device.run_game('record 1; stop; quit'), 'no recording after the salvage')
+        check(len(device.movie_files()) == 2, f'{device.movie_files()}')
+        with open(kept, 'rb') as file:
+            check(file.read() == content, 'the next recording changed the movie')
+
+
 if __name__ == '__main__':
-    main({'kill': kill_at_random_moments})
+    main({'kill': kill_at_random_moments, 'salvage': salvage_at_the_next_start})

@@ -81,8 +81,25 @@ def disk_without_room():
         check(records(device), 'no recording with room again')
 
 
+def fill_disk(path, room):
+    """Leaves about `room` bytes free."""
+    with open(path, 'wb', buffering=0) as file:
+        status = os.fstatvfs(file.fileno())
+        while room == 0 or status.f_bavail * status.f_frsize > room:
+            try:
+                file.write(bytes(1 << 20))
+            except OSError:
+                return
+            status = os.fstatvfs(file.fileno())
+
+
 def disk_that_fills():
     """What was recorded before the disk was full can be played; the daemon goes on."""
+    for room in (30_000_000, 0):
+        record_while_disk_fills(room)
+
+
+def record_while_disk_fills(room):
     with Device() as device:
         device.mount_disk(device.media, '120m')
         device.start_daemon()
@@ -92,16 +109,13 @@ def disk_that_fills():
         path, = device.movie_files()
         wait_until(lambda: movie.fragment_count(path) >= 1, 'the movie to grow')
         ballast = os.path.join(device.media, 'ballast')
-        with open(ballast, 'wb', buffering=0) as file:
-            try:
-                while True:
-                    file.write(bytes(1 << 20))
-            except OSError:
-                pass
+        fill_disk(ballast, room)
         output, _ = game.communicate(timeout=PATIENCE)
         check(f'stopped url= error={FAILED_TO_SAVE}\n' in output, output)
         path, = device.movie_files()
         check(float(movie.streams(path)[0]['duration']) > 0.5, 'nothing is left of the recording')
+        if room > 0:
+            check(movie.fragment_count(path) == 0, 'the movie was not finished')
         movie.check_decodes(path)
         os.remove(ballast)
         check(records(device), 'no recording with room again')

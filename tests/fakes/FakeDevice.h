@@ -9,12 +9,15 @@
 #include "tests/fakes/FakeBundles.h"
 #include "tests/fakes/FakeClock.h"
 #include "tests/fakes/FakeDeviceInfo.h"
+#include "tests/fakes/FakeExtensions.h"
 #include "tests/fakes/FakeFileSystem.h"
 #include "tests/fakes/FakeIPC.h"
 #include "tests/fakes/FakeLocalization.h"
 #include "tests/fakes/FakeMedia.h"
+#include "tests/fakes/FakeMovieSalvage.h"
 #include "tests/fakes/FakePreferences.h"
 #include "tests/fakes/FakeServices.h"
+#include "tests/fakes/FakeTimers.h"
 #include "tests/fakes/LogRecorder.h"
 #include "tests/fakes/ManualExecutor.h"
 
@@ -26,8 +29,10 @@ inline constexpr const char kStore[] = "/private/var/mobile/Library/Quorvel";
 struct FakeDevice {
   FakeDevice() {
     platform.clock = &clock;
+    platform.timers = &timers;
     platform.globalQueue = &executor;
     platform.backgroundQueue = &executor;
+    platform.mainQueue = &mainQueue;
     platform.ipc = &ipc;
     platform.keepAlive = &keepAlive;
     platform.screenCapture = &screen;
@@ -35,6 +40,7 @@ struct FakeDevice {
     platform.appAudioTap = &tap;
     platform.assetWriter = &movies;
     platform.exportService = &exports;
+    platform.movieSalvage = &salvage;
     platform.applications = &applications;
     platform.renderServer = &applications;
     platform.userAlerts = &alerts;
@@ -48,6 +54,7 @@ struct FakeDevice {
     platform.purgeableSpace = &purgeableSpace;
     platform.photoLibrary = &photoLibrary;
     platform.metrics = &metrics;
+    platform.extensions = &extensions;
     disk.addDirectory(kStore);
     disk.setFreeSize(1'000'000'000);
     platform::Platform::install(&platform);
@@ -60,7 +67,9 @@ struct FakeDevice {
 
   LogRecorder log;
   ManualExecutor executor;
+  platform::SerialQueue mainQueue{"main", executor};
   FakeClock clock;
+  FakeTimers timers;
   FakeIPCService ipc{executor};
   FakeKeepAlive keepAlive;
   FakeScreenCapture screen;
@@ -68,6 +77,7 @@ struct FakeDevice {
   FakeAppAudioTap tap;
   FakeAssetWriterService movies;
   FakeExportService exports;
+  FakeMovieSalvage salvage;
   FakeApplications applications;
   FakeUserAlerts alerts;
   FakeSounds sounds;
@@ -79,6 +89,7 @@ struct FakeDevice {
   FakePurgeableSpace purgeableSpace;
   FakePhotoLibrary photoLibrary;
   FakeMetrics metrics;
+  FakeExtensionService extensions{executor};
   platform::Platform platform;
 };
 

@@ -28,8 +28,12 @@ inline platform::SampleBufferRef makeFrame(int64_t nanoseconds) {
 /// Frames come when a test sends them, in the test's thread.
 class FakeScreenCaptureController final : public platform::ScreenCaptureController {
  public:
-  FakeScreenCaptureController(platform::Size of, platform::MediaTime minimumInterval)
-      : size(of), interval(minimumInterval) {}
+  FakeScreenCaptureController(platform::Size of, platform::MediaTime minimumInterval,
+                              std::vector<FakeScreenCaptureController*>& all)
+      : size(of), interval(minimumInterval), living(all) {
+    living.push_back(this);
+  }
+  ~FakeScreenCaptureController() override { std::erase(living, this); }
   void setDelegate(std::weak_ptr<platform::ScreenCaptureControllerDelegate> to) override { delegate = std::move(to); }
   void startCapture() override { running = true; }
   void stopCapture() override { running = false; }
@@ -43,6 +47,7 @@ class FakeScreenCaptureController final : public platform::ScreenCaptureControll
 
   const platform::Size size;
   const platform::MediaTime interval;
+  std::vector<FakeScreenCaptureController*>& living;
   std::weak_ptr<platform::ScreenCaptureControllerDelegate> delegate;
   bool running = false;
 };
@@ -51,14 +56,12 @@ class FakeScreenCapture final : public platform::ScreenCaptureService, public pl
  public:
   std::unique_ptr<platform::ScreenCaptureController> createController(platform::Size size,
                                                                       platform::MediaTime interval) override {
-    auto controller = std::make_unique<FakeScreenCaptureController>(size, interval);
-    controllers.push_back(controller.get());
-    return controller;
+    return std::make_unique<FakeScreenCaptureController>(size, interval, controllers);
   }
   platform::DisplayCloneService& displayClone() override { return *this; }
   void setMirroringMode(platform::DisplayCloneMode to) override { mode = to; }
   void setCloneContexts(std::set<uint32_t> to) override { contexts = std::move(to); }
-  /// The newest controller; valid as long as its session.
+  /// The newest controller of those that live, each as long as its session.
   FakeScreenCaptureController& last() { return *controllers.back(); }
 
   std::vector<FakeScreenCaptureController*> controllers;
@@ -217,11 +220,18 @@ class FakeAppAudioTap final : public platform::AppAudioTapService {
     return fill(*tap, frames, hostTime, packetCount);
   }
   static bool fill(State& state, uint32_t frames, uint64_t hostTime, uint32_t packetCount) {
+    return fill(state, std::vector<uint8_t>(size_t{frames} * 2, 7), hostTime, packetCount);
+  }
+  /// The same with these bytes, of one packet for each frame of two bytes.
+  static bool fill(State& state, const std::vector<uint8_t>& bytes, uint64_t hostTime) {
+    return fill(state, bytes, hostTime, static_cast<uint32_t>(bytes.size() / 2));
+  }
+  static bool fill(State& state, const std::vector<uint8_t>& bytes, uint64_t hostTime, uint32_t packetCount) {
     if (state.enqueued.empty()) return false;
     platform::QueueBuffer* buffer = state.enqueued.front();
     state.enqueued.erase(state.enqueued.begin());
-    buffer->byteSize = frames * 2;
-    std::fill_n(buffer->data, buffer->byteSize, uint8_t{7});
+    buffer->byteSize = static_cast<uint32_t>(bytes.size());
+    std::copy(bytes.begin(), bytes.end(), buffer->data);
     platform::AudioTimeStamp start;
     start.hostTime = hostTime;
     state.callback(buffer, start, packetCount);

@@ -104,6 +104,24 @@ TEST_F(ExportTest, TrimsToTheFrameAndTheBeep) {
   }
 }
 
+/// A range that begins and ends between pictures: the one shown there is shown from the start, none too early.
+TEST_F(ExportTest, TrimsBetweenPictures) {
+  const std::string path = results_ / "between.mp4";
+  auto trim = session(source_, path, ExportPreset::PassThrough);
+  trim->setTimeRange({MediaTime::make(601, 300), MediaTime::make(900, 300)});  // 2.0033 s, a tenth into picture 60
+  runToEnd(*trim);
+  ASSERT_EQ(trim->status(), ExportStatus::Completed);
+  const auto movie = probe(path);
+  EXPECT_EQ(movie.errors, "");
+  EXPECT_NEAR(movie.duration, 3.0, 1e-4);
+  const auto pictures = decodePictures(path);
+  ASSERT_EQ(pictures.size(), 91u);
+  for (uint32_t i = 0; i < 91; ++i) {
+    EXPECT_EQ(pictures[i].number, 60 + i);
+    EXPECT_NEAR(pictures[i].time, i == 0 ? 0 : i / 30.0 - 1 / 300.0, 1e-4);
+  }
+}
+
 TEST_F(ExportTest, MixesTracksAtTheirLevelsAndCopiesThePicture) {
   const std::string path = results_ / "mix.mp4";
   auto mix = session(source_, path, ExportPreset::HighestQuality);
@@ -161,10 +179,16 @@ TEST_F(ExportTest, FailsWithoutLeavingAnything) {
     std::filesystem::resize_file(results_ / name, std::filesystem::file_size(results_ / name) / 2);
   }
   std::ofstream(results_ / "empty.mp4");
+  std::ofstream(results_ / "text.mp4") << "no movie";
+  // A list of other files is no movie, whatever the library could make of it.
+  std::ofstream(results_ / "list.mp4") << "#EXTM3U\n#EXT-X-TARGETDURATION:8\n#EXTINF:8,\nfile:" << source_
+                                       << "\n#EXT-X-ENDLIST\n";
+  std::filesystem::create_directory(results_ / "directory.mp4");
   const size_t before = filesIn(results_.path());
   const std::string output = results_ / "output.mp4";
   for (const auto preset : {ExportPreset::PassThrough, ExportPreset::HighestQuality}) {
-    for (const char* name : {"short.mp4", "front.mp4", "empty.mp4", "missing.mp4"}) {
+    for (const char* name :
+         {"short.mp4", "front.mp4", "empty.mp4", "text.mp4", "list.mp4", "directory.mp4", "missing.mp4"}) {
       auto bad = session(results_ / name, output, preset);
       runToEnd(*bad);
       EXPECT_EQ(bad->status(), ExportStatus::Failed) << name;
@@ -176,6 +200,9 @@ TEST_F(ExportTest, FailsWithoutLeavingAnything) {
                                      {second, MediaTime::make(8, 1)},
                                      {MediaTime::make(9, 1), second},
                                      {MediaTime::fromSeconds(std::nan(""), 1), second},
+                                     {MediaTime::fromSeconds(-INFINITY, 1), second},
+                                     {second, MediaTime::fromSeconds(1e300, 1)},
+                                     {MediaTime::make(INT64_MAX, 1), MediaTime::make(INT64_MAX, 1)},
                                      {second, MediaTime::zero()}};
     for (const auto& range : ranges) {
       auto bad = session(source_, output, preset);
@@ -192,6 +219,66 @@ TEST_F(ExportTest, FailsWithoutLeavingAnything) {
     EXPECT_EQ(unwritable->status(), ExportStatus::Failed);
   }
   EXPECT_EQ(filesIn(results_.path()), before);
+}
+
+/// Movies that are unusual but good: each is trimmed and mixed whole, whatever it lacks.
+TEST_F(ExportTest, TakesMoviesWithoutATrackAndWithOddTimes) {
+  struct Case {
+    const char* name;
+    const char* options;
+    size_t tracks, mixedTracks;
+    double duration;
+  };
+  const Case cases[] = {
+      {"silent.mp4", "-map 0:v -c copy", 1, 1, 8},
+      {"sound.mp4", "-map 0:a -c copy", 2, 1, 8},
+      {"one.mp4", "-map 0:a:0 -c copy", 1, 1, 8},
+      {"late.mp4", "-map 0:v -map 0:a:0 -c copy -output_ts_offset 2.5 -avoid_negative_ts disabled", 2, 2, 10.5},
+      {"uneven.mp4", "-map 0:v -c:v libx264 -bf 2 -vf select='mod(n\\,7)' -fps_mode vfr -video_track_timescale 1001", 1,
+       1, 8},
+  };
+  for (const Case& odd : cases) {
+    const std::string source = results_ / odd.name;
+    run("ffmpeg -v error -nostdin -i '" + source_ + "' " + odd.options + " '" + source + "'");
+    for (const auto preset : {ExportPreset::PassThrough, ExportPreset::HighestQuality}) {
+      const std::string path = results_ / "output.mp4";
+      auto whole = session(source, path, preset);
+      runToEnd(*whole);
+      ASSERT_EQ(whole->status(), ExportStatus::Completed) << odd.name << ": " << whole->error()->description();
+      const auto movie = probe(path);
+      EXPECT_EQ(movie.errors, "") << odd.name;
+      EXPECT_EQ(movie.tracks.size(), preset == ExportPreset::PassThrough ? odd.tracks : odd.mixedTracks) << odd.name;
+      EXPECT_NEAR(movie.duration, odd.duration, 0.05) << odd.name;
+      auto part = session(source, path, preset);
+      part->setTimeRange({MediaTime::make(27, 10), MediaTime::make(41, 10)});
+      runToEnd(*part);
+      ASSERT_EQ(part->status(), ExportStatus::Completed) << odd.name << ": " << part->error()->description();
+      EXPECT_EQ(probe(path).errors, "") << odd.name;
+      EXPECT_NEAR(probe(path).duration, 4.1, 0.05) << odd.name;
+    }
+  }
+}
+
+/// A source that goes away, or is cut short, while it is read: the whole result, or an error and nothing.
+TEST_F(ExportTest, SurvivesTheLossOfItsSource) {
+  const std::string source = results_ / "source.mp4";
+  const std::string path = results_ / "output.mp4";
+  for (const bool removed : {true, false}) {
+    for (const auto preset : {ExportPreset::PassThrough, ExportPreset::HighestQuality}) {
+      std::filesystem::copy_file(source_, source, std::filesystem::copy_options::overwrite_existing);
+      auto copy = session(source, path, preset);
+      std::promise<void> done;
+      copy->exportAsynchronously([&] { done.set_value(); });
+      removed ? (void)std::filesystem::remove(source) : std::filesystem::resize_file(source, 40'000);
+      done.get_future().wait();
+      const bool completed = copy->status() == ExportStatus::Completed;
+      EXPECT_NE(completed, copy->error().has_value());
+      EXPECT_EQ(completed ? probe(path).errors : "", "");
+      EXPECT_EQ(std::filesystem::remove(path), completed);
+      std::filesystem::remove(source);
+      EXPECT_EQ(filesIn(results_.path()), 0u);
+    }
+  }
 }
 
 TEST_F(ExportTest, LoadsModulesOnFirstUseAndReportsMissingOnes) {

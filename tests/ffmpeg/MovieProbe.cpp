@@ -1,10 +1,12 @@
 #include "tests/ffmpeg/MovieProbe.h"
 
+#include <algorithm>
 #include <cmath>
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
 #include <filesystem>
+#include <fstream>
 #include <nlohmann/json.hpp>
 #include <sstream>
 
@@ -21,20 +23,63 @@ std::string run(const std::string& command) {
   return output;
 }
 
+namespace {
+
+double seconds(const nlohmann::json& object, const char* key) { return std::atof(object.value(key, "0").c_str()); }
+
+/// A movie without its index, which mediainfo can tell less of.
+bool isUnfinished(const std::string& path) {
+  char head[64] = {};
+  std::ifstream(path, std::ios::binary).read(head, sizeof head);
+  const auto fileType = static_cast<size_t>(head[3]);
+  return fileType + 8 <= sizeof head && std::string_view(head + fileType + 4, 4) == "free";
+}
+
+/// Whether mediainfo, which has a reader of its own, finds the same tracks of the same lengths.
+std::string disagreement(const std::string& path, const ProbedMovie& movie) {
+  constexpr double kRounding = 0.0011;  // it tells milliseconds
+  constexpr double kPacket = 0.024;
+  const auto json = nlohmann::json::parse(run("mediainfo --Output=JSON '" + path + "' 2>&1"), nullptr, false);
+  if (!json.is_object() || !json["media"].is_object()) return "mediainfo cannot read it";
+  size_t tracks = 0;
+  for (const auto& track : json["media"]["track"]) {
+    const std::string type = track.value("@type", "");
+    if (isUnfinished(path)) {
+      tracks += type != "General";
+      continue;
+    }
+    ProbedTrack expected;
+    expected.duration = movie.duration;
+    if (type != "General" && tracks < movie.tracks.size()) expected = movie.tracks[tracks++];
+    const double found = seconds(track, "Duration");
+    // Of a track that begins late it may tell the end, to the packet of sound.
+    const double delay = expected.startTime;
+    const bool isEnd = delay > kPacket && std::abs(found - delay - expected.duration) <= kPacket;
+    if (!isEnd && std::abs(found - expected.duration) > kRounding) {
+      return type + " lasts " + std::to_string(found) + " s for mediainfo, " + std::to_string(expected.duration) +
+             " for ffprobe";
+    }
+  }
+  return tracks == movie.tracks.size() ? "" : "mediainfo finds " + std::to_string(tracks) + " tracks";
+}
+
+}  // namespace
+
 ProbedMovie probe(const std::string& path) {
   ProbedMovie movie;
   movie.errors = run("ffmpeg -v error -nostdin -i '" + path + "' -map 0 -f null - 2>&1");
-  const auto json = nlohmann::json::parse(
-      run("ffprobe -v error -of json -show_format -show_streams '" + path + "' 2>/dev/null"), nullptr, false);
+  const std::string report = run("ffprobe -v error -of json -show_format -show_streams '" + path + "' 2>&1");
+  const auto json = nlohmann::json::parse(report, nullptr, false);
+  if (!json.is_object()) movie.errors += report;  // what it complains of is no part of its JSON
   if (!json.is_object() || !json.contains("streams")) return movie;
-  movie.duration = std::atof(json["format"].value("duration", "0").c_str());
+  movie.duration = seconds(json["format"], "duration");
   for (const auto& stream : json["streams"]) {
     ProbedTrack track;
     track.type = stream.value("codec_type", "");
     track.codec = stream.value("codec_name", "");
     track.profile = stream.value("profile", "");
-    track.duration = std::atof(stream.value("duration", "0").c_str());
-    track.startTime = std::atof(stream.value("start_time", "0").c_str());
+    track.duration = seconds(stream, "duration");
+    track.startTime = seconds(stream, "start_time");
     track.width = stream.value("width", 0);
     track.height = stream.value("height", 0);
     for (const auto& side : stream.value("side_data_list", nlohmann::json::array())) {
@@ -42,10 +87,11 @@ ProbedMovie probe(const std::string& path) {
     }
     movie.tracks.push_back(track);
   }
+  movie.errors += disagreement(path, movie);
   return movie;
 }
 
-std::vector<DecodedPicture> decodePictures(const std::string& path) {
+std::vector<DecodedPicture> decodePictures(const std::string& path, Turning turning) {
   std::vector<DecodedPicture> pictures;
   std::istringstream lines(
       run("ffprobe -v error -select_streams v:0 -show_entries frame=pts_time,key_frame -of csv=p=0 '" + path +
@@ -58,7 +104,8 @@ std::vector<DecodedPicture> decodePictures(const std::string& path) {
   // Decoded pixels of the same pictures, scaled to one height so that the size need not be known.
   constexpr uint32_t kWidth = 320;
   constexpr uint32_t kHeight = 16;
-  const std::string pixels = run("ffmpeg -v error -nostdin -noautorotate -i '" + path +
+  const std::string pixels = run("ffmpeg -v error -nostdin " +
+                                 std::string(turning == Turning::AsCoded ? "-noautorotate" : "") + " -i '" + path +
                                  "' -map 0:v:0 -fps_mode passthrough -vf scale=320:16:flags=area -f rawvideo -pix_fmt "
                                  "gray - 2>/dev/null");
   const size_t count = pixels.size() / (kWidth * kHeight);
@@ -68,6 +115,20 @@ std::vector<DecodedPicture> decodePictures(const std::string& path) {
     pictures[i].number = numberInPicture(luma, kWidth, kHeight, kWidth);
   }
   return pictures;
+}
+
+std::vector<PicturePacket> packetsOfPictures(const std::string& path) {
+  std::vector<PicturePacket> packets;
+  std::istringstream lines(
+      run("ffprobe -v error -select_streams v:0 -show_entries packet=pts_time,size,flags -of csv=p=0 '" + path + "'"));
+  for (std::string line; std::getline(lines, line);) {
+    PicturePacket packet{};
+    char flag = 0;
+    if (std::sscanf(line.c_str(), "%lf,%zu,%c", &packet.time, &packet.size, &flag) != 3) continue;
+    packet.isKey = flag == 'K';
+    packets.push_back(packet);
+  }
+  return packets;
 }
 
 std::vector<float> decodeSound(const std::string& path, int track) {

@@ -6,7 +6,7 @@
 
 namespace qv::platform::test {
 
-/// What an independent reader (ffprobe and ffmpeg, as programs) says of a movie.
+/// What independent readers (ffprobe and ffmpeg, as programs) say of a movie.
 struct ProbedTrack {
   std::string type;
   std::string codec;
@@ -18,7 +18,9 @@ struct ProbedTrack {
   double rotation = 0;
 };
 struct ProbedMovie {
-  std::string errors;  ///< of the whole file read and decoded; empty for a good movie
+  /// Of the whole file read and decoded, and of a second reader (mediainfo) about its tracks and
+  /// durations; empty for a good movie.
+  std::string errors;
   double duration = 0;
   std::vector<ProbedTrack> tracks;
 };
@@ -29,8 +31,15 @@ struct DecodedPicture {
   uint32_t number;
   bool isKey;
 };
+enum class Turning { AsCoded, AsShown };
 /// Every picture that is shown, its number read off the decoded pixels.
-std::vector<DecodedPicture> decodePictures(const std::string& path);
+std::vector<DecodedPicture> decodePictures(const std::string& path, Turning turning = Turning::AsCoded);
+struct PicturePacket {
+  double time;
+  size_t size;  ///< bytes
+  bool isKey;
+};
+std::vector<PicturePacket> packetsOfPictures(const std::string& path);
 /// The sound of the n-th audio track as shown, its left side at 44100 Hz.
 std::vector<float> decodeSound(const std::string& path, int track);
 /// Where each beep begins, in seconds.

@@ -80,6 +80,22 @@ SampleBufferRef picture(uint32_t number, double captureTime, double presentation
   return SampleBuffer::copyWithNewTiming(fresh, {{MediaTime::invalid(), at(presentationTime), MediaTime::invalid()}});
 }
 
+SampleBufferRef texturedPicture(uint32_t offset, double time) {
+  constexpr uint32_t kWidth = 1280;
+  constexpr uint32_t kHeight = 720;
+  auto frame = SharedFrame::create({kWidth, kHeight, kWidth * 4}).value();
+  uint8_t* pixel = frame->mutableBytes().data();
+  for (uint32_t y = 0; y < kHeight; ++y) {
+    for (uint32_t x = offset; x < offset + kWidth; ++x, pixel += 4) {
+      const uint32_t grain = (x * 374761393u + y * 668265263u) * 1274126177u >> 29;
+      pixel[0] = static_cast<uint8_t>((x * x + y * y) >> 10);
+      pixel[1] = static_cast<uint8_t>(((x ^ y) & 0x70) + 16 * grain);
+      pixel[2] = static_cast<uint8_t>((x + 2 * y) >> 2);
+    }
+  }
+  return SampleBuffer::makeVideo(std::make_shared<PixelBuffer>(frame), at(time), MediaTime::invalid());
+}
+
 Dictionary videoSettings(double width, double height, int64_t bitRate, int32_t frameRate) {
   return {{settings::kVideoCodec, Value(settings::kCodecH264)},
           {settings::kVideoWidth, Value(width)},

@@ -30,6 +30,9 @@ MediaTime at(double seconds);
 SampleBufferRef picture(uint32_t number, double captureTime, double presentationTime, uint32_t width = 320,
                         uint32_t height = 180);
 
+/// 1280x720, full of detail that costs an encoder bits, moved to the left by `offset` pixels.
+SampleBufferRef texturedPicture(uint32_t offset, double time);
+
 Dictionary videoSettings(double width, double height, int64_t bitRate = 1'000'000, int32_t frameRate = 60);
 Dictionary audioSettings();
 

@@ -7,9 +7,7 @@
 #include <filesystem>
 
 #include "support/QuorvelErrors.h"
-#include "tests/fakes/FakeTimers.h"
 #include "tests/fakes/LogRecorder.h"
-#include "tests/fakes/ManualExecutor.h"
 #include "tests/linux/TemporaryRoot.h"
 
 namespace qv::platform {
@@ -65,31 +63,6 @@ TEST(LinuxPlatformTest, PeersAreKnownByTheBundleAroundTheirExecutable) {
   LinuxPlatform(root.path(), "").peerResolver()(outside);
   EXPECT_EQ(outside.bundleIdentifier, std::nullopt);
   EXPECT_TRUE(outside.entitlements.empty());
-}
-
-TEST(PeriodicPurgeableSpaceServiceTest, CallsOnceADayAndTheLatestRegistrationOnly) {
-  fakes::FakeTimers timers;
-  fakes::ManualExecutor executor;
-  PeriodicPurgeableSpaceService service(timers, executor);
-  int first = 0;
-  int second = 0;
-  const auto registerCounter = [&](int& counter) {
-    service.registerCallbacks("cache", {.purgeable = {}, .purge = {}, .cancel = {}, .periodic = [&](int64_t, int32_t) {
-                                          return static_cast<int64_t>(++counter);
-                                        }});
-  };
-  registerCounter(first);
-  timers.advance(std::chrono::hours(23));
-  EXPECT_EQ(executor.pending(), 0u);
-  timers.advance(std::chrono::hours(25));
-  executor.runUntilIdle();
-  EXPECT_EQ(first, 2);
-  registerCounter(second);
-  timers.advance(std::chrono::hours(24));
-  executor.runUntilIdle();
-  EXPECT_EQ(first, 2);
-  EXPECT_EQ(second, 1);
-  EXPECT_EQ(timers.pending(), 1u);
 }
 
 }  // namespace

@@ -7,8 +7,8 @@
 
 #include "platform/mp4/AnnexB.h"
 #include "platform/mp4/BoxReader.h"
+#include "platform/mp4/MP4MovieSalvage.h"
 #include "platform/mp4/MovieWriter.h"
-#include "platform/mp4/Salvage.h"
 
 namespace qv::platform::mp4 {
 namespace {
@@ -48,6 +48,7 @@ class MovieWriterTest : public ::testing::Test {
     return {std::istreambuf_iterator<char>(file), {}};
   }
 
+  MP4MovieSalvage salvage_;
   std::string directory_;
   std::string path_;
 };
@@ -94,15 +95,37 @@ TEST_F(MovieWriterTest, SalvagesOrRefusesDamagedFiles) {
     }
     std::ofstream(path_, std::ios::binary | std::ios::trunc)
         .write(reinterpret_cast<const char*>(bytes.data()), std::ssize(bytes));
-    if (salvageMovie(path_)) {
-      EXPECT_EQ(contents(), bytes) << "a refused file is left untouched";
-    } else {
+    const auto length = salvage_.salvageMovie(path_);
+    if (length && length.value() > MediaTime::zero()) {
       ++salvaged;
+      EXPECT_EQ(salvage_.stateOfMovie(path_).value(), MovieState::Finished);
+    } else {
+      EXPECT_EQ(contents(), bytes) << "a refused file is left untouched";
     }
   }
   EXPECT_GT(salvaged, 50);
-  EXPECT_TRUE(salvageMovie(directory_).has_value());
-  EXPECT_TRUE(salvageMovie(directory_ + "/none").has_value());
+}
+
+TEST_F(MovieWriterTest, LeavesAloneWhatIsNoPlainFileOrIsBeingWritten) {
+  writeCrashed(2);
+  const auto before = contents();
+  const std::string link = directory_ + "/link.mp4";
+  std::filesystem::create_symlink(path_, link);
+  for (const std::string& path : {link, directory_, directory_ + "/none"}) {
+    EXPECT_FALSE(salvage_.stateOfMovie(path)) << path;
+    EXPECT_FALSE(salvage_.salvageMovie(path)) << path;
+  }
+  EXPECT_EQ(contents(), before);
+  EXPECT_EQ(salvage_.stateOfMovie(path_).value(), MovieState::Unfinished);
+
+  std::filesystem::remove(path_);
+  MovieWriter writer(std::move(DiskMovieFile::create(path_).value()), {pictureTrack()},
+                     MovieWriter::Layout::Fragmented);
+  ASSERT_FALSE(writer.writeHeader());
+  ASSERT_FALSE(writer.writeFragment(second(0)));
+  EXPECT_EQ(salvage_.stateOfMovie(path_).value(), MovieState::InUse);
+  EXPECT_FALSE(salvage_.salvageMovie(path_));
+  EXPECT_FALSE(writer.writeFragment(second(1)));
 }
 
 TEST_F(MovieWriterTest, SplitsByteStreams) {

@@ -108,5 +108,21 @@ TEST(ExecutorTest, WorkThatWaitsForOtherWorkDoesNotStopIt) {
   for (auto& future : done) future.get();
 }
 
+TEST(ExecutorTest, AThreadWithoutWorkEndsAndLaterWorkIsDone) {
+  struct EndOfThread {
+    std::promise<void> promise;
+    ~EndOfThread() { promise.set_value(); }
+  };
+  std::promise<std::future<void>> posted;
+  globalBackgroundQueue().post([&posted] {
+    thread_local EndOfThread end;
+    posted.set_value(end.promise.get_future());
+  });
+  posted.get_future().get().get();
+  std::promise<void> later;
+  globalBackgroundQueue().post([&later] { later.set_value(); });
+  later.get_future().get();
+}
+
 }  // namespace
 }  // namespace qv::platform

@@ -5,7 +5,6 @@
 
 #include <future>
 
-#include "platform/sdbus/SdBusKeepAlive.h"
 #include "tests/sdbus/RawPeer.h"
 #include "tests/sdbus/SdBusTest.h"
 
@@ -234,19 +233,6 @@ TEST_F(PeersTest, TypesWithoutMeaningAreAnErrorReply) {
   peer.send(rawCall(testInterface().name, "unheardOf", "", ""));
   EXPECT_TRUE(peer.readUntil("org.freedesktop.DBus.Error.UnknownMethod"));
   EXPECT_TRUE(delegate_.ended.isEmpty());
-}
-
-TEST(SdBusKeepAliveTest, CountsAndIgnoresUnbalancedEnds) {
-  SdBusKeepAlive keepAlive;
-  keepAlive.beginTransaction();
-  keepAlive.beginTransaction();
-  keepAlive.endTransaction();
-  EXPECT_EQ(keepAlive.openTransactionCount(), 1);
-  keepAlive.endTransaction();
-  keepAlive.endTransaction();
-  EXPECT_EQ(keepAlive.openTransactionCount(), 0);
-  keepAlive.beginTransaction();
-  EXPECT_EQ(keepAlive.openTransactionCount(), 1);
 }
 
 }  // namespace

@@ -81,8 +81,10 @@ class ApplicationsTest : public XServerTest {
     client_ = std::make_unique<XClient>(name);
   }
   std::unique_ptr<WindowProcess> launch(const std::string& bundleID) {
-    auto process = std::make_unique<WindowProcess>(display_);
+    // Held while the window comes up: a monitor that sees it before its bundle is known waits, as on a
+    // device, where a process has its bundle from the start.
     std::lock_guard lock(mutex_);
+    auto process = std::make_unique<WindowProcess>(display_);
     bundles_[process->pid()] = bundleID;
     return process;
   }
@@ -151,18 +153,15 @@ TEST_F(ApplicationsTest, FollowsTheWindowManager) {
   if (!hasProgram("openbox") || !hasProgram("xdotool")) GTEST_SKIP() << "openbox or xdotool is not installed";
   XServer own;
   open(own.display());
+  auto game = launch(kGame), film = launch(kFilm);
+  watch();  // the film is the topmost: only the game's coming to the front is certain to be a change
   ChildProcess manager({"openbox", "--sm-disable"}, {"DISPLAY=" + display_});
   const auto managerWindow = client_->waitForWindowManager();
-  watch();
   const auto activate = [&](const WindowProcess& process) { ASSERT_TRUE(activateWindow(display_, process.window())); };
-  // The manager gives a window the focus when it shows it, which may be after the request for it:
-  // so one window at a time.
-  auto game = launch(kGame);
   activate(*game);
   ASSERT_TRUE(recorder_.waitForFront(kGame));
   EXPECT_EQ(stateOf(kGame), kApplicationForeground);
   EXPECT_EQ(decode(infoOf(kGame)), (Report{kGame, game->pid(), kApplicationForeground, true}));
-  auto film = launch(kFilm);
   activate(*film);
   ASSERT_TRUE(recorder_.waitForFront(kFilm));
   EXPECT_EQ(stateOf(kGame), kApplicationBackground);

@@ -259,7 +259,7 @@ TEST_F(CaptureTest, SkipsPicturesWhileAllFramesAreHeld) {
     held.push_back(recorder_->last());
     frames.insert(held.back()->image()->sharedFrame().get());
   }
-  EXPECT_LE(frames.size(), 8u);
+  EXPECT_LE(frames.size(), 14u);
   held.clear();
   app_->fill(window, kGreen);
   EXPECT_TRUE(recorder_->waitForColor(kGreen, 5, 5));

@@ -229,8 +229,8 @@ void XClient::select(xcb_window_t window, uint32_t mask) {
 }
 
 xcb_window_t XClient::waitForWindowManager() {
-  // The list of its clients is the last that it publishes before it manages windows. A window that
-  // asks to be shown between the announcement and that may be overlooked.
+  // The list of its clients is the last that it publishes. openbox overlooks a window that asks to be shown while
+  // it comes up; one that is shown before it starts, or after this, it manages.
   select(screen_->root, XCB_EVENT_MASK_PROPERTY_CHANGE);
   while (!hasProperty(screen_->root, "_NET_CLIENT_LIST_STACKING")) waitForEvent();
   const std::string check = property(screen_->root, "_NET_SUPPORTING_WM_CHECK");
@@ -280,13 +280,9 @@ void XClient::waitForFocus(xcb_window_t wanted) {
 }
 
 bool activateWindow(const std::string& display, xcb_window_t window) {
-  constexpr int kAttempts = 20;
-  for (int attempt = 0; attempt < kAttempts; ++attempt) {
-    ChildProcess request({"timeout", "3", "xdotool", "windowactivate", "--sync", std::to_string(window)},
-                         {"DISPLAY=" + display});
-    if (request.wait() == 0) return true;
-  }
-  return false;
+  ChildProcess request({"timeout", "60", "xdotool", "windowactivate", "--sync", std::to_string(window)},
+                       {"DISPLAY=" + display});
+  return request.wait() == 0;
 }
 
 WindowProcess::WindowProcess(const std::string& display) {

@@ -105,8 +105,7 @@ class XClient {
   xcb_screen_t* screen_;
 };
 
-/// Lets the window manager activate a window. openbox may overlook a window that was mapped while it
-/// came up, until the next request reaches it: so a request that got nowhere is made again.
+/// Lets the window manager activate a window, and waits until it has.
 bool activateWindow(const std::string& display, xcb_window_t window);
 
 /// A process of its own that shows one window, 200 x 200, until it is killed.

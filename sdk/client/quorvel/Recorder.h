@@ -10,63 +10,19 @@
 //
 // Link with `pkg-config --cflags --libs quorvel`. docs/app-developers.md is the guide.
 
+#include <quorvel/Types.h>
 #include <sys/types.h>
 
 #include <chrono>
 #include <cstdint>
 #include <functional>
-#include <map>
 #include <memory>
 #include <optional>
-#include <span>
 #include <string>
 #include <string_view>
-#include <variant>
 #include <vector>
 
-#define QUORVEL_API __attribute__((visibility("default")))
-
 namespace quorvel {
-
-/// What `Error::code` may be in `kErrorDomain`, and what to do about it.
-enum ErrorCode : int64_t {
-  kErrorUnknown = -5800,                  ///< Anything else; the text says more. Log it.
-  kErrorUserDeclined = -5801,             ///< The user said no. Do not ask again by yourself.
-  kErrorDisabled = -5802,                 ///< Recording is switched off on this device.
-  kErrorFailedToStart = -5803,            ///< Not in front, or a window that is not yours.
-  kErrorFailed = -5804,                   ///< The recording broke off.
-  kErrorInsufficientStorage = -5805,      ///< Too little free space; tell the user.
-  kErrorInterrupted = -5806,              ///< Another recording took over, or the app left the front.
-  kErrorContentResize = -5807,            ///< The picture's size changed during the recording.
-  kErrorInvalidBroadcastSession = -5808,  ///< No broadcast was set up, or its extension is gone.
-  kErrorSystemDormancy = -5809,           ///< The device went to sleep.
-  kErrorEntitlements = -5810,             ///< The application lacks the right to do this.
-  kErrorActivePhoneCall = -5811,
-  kErrorFailedToSave = -5812,  ///< The movie could not be written.
-  kErrorDashvex = -5813,
-  kErrorConnectionInvalid = -5814,      ///< The daemon cannot be reached. Try again later.
-  kErrorConnectionInterrupted = -5815,  ///< The daemon went away meanwhile; a recording is lost.
-  kErrorNoContextIDMatch = -5816,       ///< Resumed with a window that is not yours; recording ended.
-  kErrorMediaServicesFailed = -5817,    ///< Screen or sound capture failed.
-  kErrorMixingFailure = -5818,
-};
-
-inline constexpr const char kErrorDomain[] = "com.tarnwick.Quorvel.QVRecordingErrorDomain";
-
-struct Error {
-  int64_t code = kErrorUnknown;
-  std::string key;   ///< its name, e.g. "RECORDING_ERROR_USER_DECLINED"
-  std::string text;  ///< for the user, in the user's language where it comes from the daemon
-  std::string domain = kErrorDomain;
-};
-
-/// One entry of user information: nothing, a flag, a number, a text, bytes, or a container of these.
-struct Value {
-  using Array = std::vector<Value>;
-  using Dictionary = std::map<std::string, Value>;
-  std::variant<std::monostate, bool, int64_t, double, std::string, std::vector<uint8_t>, Array, Dictionary> content;
-};
-using Dictionary = Value::Dictionary;
 
 struct StartOptions {
   /// The windows (layer contexts) to record, all of this application. X11 window ids on X11.
@@ -104,7 +60,7 @@ struct StopResult {
 struct BroadcastOptions {
   std::string hostBundleID = {};
   std::string extensionBundleID = {};
-  std::vector<uint8_t> configuration = {};  ///< an archived broadcast configuration
+  std::vector<uint8_t> configuration = {};  ///< of archivedConfiguration()
   Dictionary userInfo = {};                 ///< handed to the extension
 };
 
@@ -140,42 +96,6 @@ struct StateResult {
   State state;
 };
 
-/// Times of samples are on CLOCK_MONOTONIC. A pause is taken out of the times of video, not of
-/// those of audio: after each pause the two lie apart by the pause's length.
-using SampleTime = std::chrono::nanoseconds;
-
-/// A captured picture. Copies share it. The pixels are shared with the daemon, which has few such
-/// frames: the last copy that goes gives the frame back, so let go of it within a frame or two, and
-/// copy out what you want to keep.
-struct VideoFrame {
-  std::span<const uint8_t> pixels;  ///< BGRX, 4 bytes a pixel, `stride` bytes a row, read-only
-  uint32_t width = 0, height = 0, stride = 0;
-  SampleTime presentationTime{0};
-  std::optional<SampleTime> duration;
-  std::shared_ptr<const void> surface;  ///< keeps `pixels` readable
-};
-
-struct AudioFormat {
-  double sampleRate = 0;  ///< frames per second
-  uint32_t channels = 0;  ///< interleaved
-  uint32_t bitsPerChannel = 0;
-  uint32_t bytesPerFrame = 0;
-  bool isFloat = false;
-  bool isSigned = false;
-  bool isBigEndian = false;
-};
-
-/// A run of captured sound, linear PCM.
-struct AudioSample {
-  enum class Source { Application, Microphone };
-  Source source = Source::Application;
-  std::vector<uint8_t> bytes;
-  AudioFormat format;
-  int64_t frameCount = 0;
-  SampleTime presentationTime{0};
-  std::optional<SampleTime> duration;
-};
-
 /// What happens without having been asked for. Every entry may be empty.
 struct Events {
   /// The recording ended, and neither by this application's stop nor because a later start of its own
@@ -191,6 +111,8 @@ struct Events {
   std::function<void(bool recording)> recordingStateChanged = {};
   std::function<void(Dictionary)> broadcastServiceInfoChanged = {};
   std::function<void(std::string url)> broadcastURLChanged = {};
+  /// Of a capture. A pause is taken out of the times of video, not of those of audio: after each pause the two lie
+  /// apart by the pause's length.
   std::function<void(VideoFrame)> videoFrame = {};
   std::function<void(AudioSample)> audioSample = {};
   std::function<void(Error)> recordingLockInterrupted = {};
@@ -284,5 +206,8 @@ class QUORVEL_API Recorder {
 [[nodiscard]] QUORVEL_API std::string filePath(std::string_view url);
 /// The name of a code, e.g. "RECORDING_ERROR_USER_DECLINED".
 [[nodiscard]] QUORVEL_API std::string_view errorKey(int64_t code);
+
+/// The form of a configuration in BroadcastOptions.
+[[nodiscard]] QUORVEL_API std::vector<uint8_t> archivedConfiguration(const BroadcastConfiguration& configuration);
 
 }  // namespace quorvel

@@ -1,0 +1,72 @@
+#pragma once
+
+#include <functional>
+#include <map>
+#include <memory>
+#include <optional>
+#include <string>
+
+#include "extensions/QVBroadcastConfiguration.h"
+#include "extensions/QVExtensions.h"
+#include "platform/Extensions.h"
+#include "platform/SerialQueue.h"
+
+namespace qv {
+
+/// What was set up for the next broadcast of a host application.
+struct QVBroadcastInfo {
+  platform::ExtensionRecordRef extension;
+  BroadcastProcessMode extensionProcessMode = BroadcastProcessMode::MovieClips;
+  platform::Dictionary extensionUserInfo;
+  QVBroadcastConfiguration extensionConfiguration;
+  /// The first recording of the host's session that it is for: it survives the end of one that was running before.
+  uint64_t generation = 0;
+};
+
+/// The broadcasts that were set up, and what is shown of the current one. Memory only.
+///
+/// Threading: the manager's sequence only. Handlers run there.
+class QVBroadcastBook : public std::enable_shared_from_this<QVBroadcastBook> {
+ public:
+  struct SetupRequest {
+    std::string hostBundleID;
+    std::string extensionBundleID;
+    platform::Data configuration;
+    platform::Dictionary userInfo;
+    uint64_t generation = 0;
+  };
+  using SetupHandler = std::function<void(const std::optional<platform::Error>&)>;
+  using InfoHandler = std::function<void(platform::Array, const std::optional<platform::Error>&)>;
+
+  explicit QVBroadcastBook(platform::SerialQueue& sequence) : sequence_(sequence) {}
+
+  /// Finds the upload extension with the same base identifier and notes it, in place of any earlier one of that host.
+  /// RECORDING_ERROR_INVALID_BROADCAST_SESSION, and nothing noted, where there is none or the configuration is none.
+  void setupBroadcast(SetupRequest request, SetupHandler handler);
+  [[nodiscard]] const QVBroadcastInfo* infoForHostBundleID(const std::string& hostBundleID) const;
+  /// The recording of this generation has ended.
+  void recordingEnded(const std::string& hostBundleID, uint64_t generation);
+  /// One dictionary for each installed upload extension: "displayName", "extBundleID", "extAppImgData" (PNG). An
+  /// extension without name or icon lacks that key.
+  void getSystemBroadcastExtensionInfo(InfoHandler handler);
+
+  /// Of the broadcast that was set up last; PNG images, empty without.
+  [[nodiscard]] const platform::Data& currentHostAppImage() const { return currentHostAppImage_; }
+  [[nodiscard]] const platform::Data& currentExtensionAppImage() const { return currentExtensionAppImage_; }
+  [[nodiscard]] const std::string& currentExtensionDisplayName() const { return currentExtensionDisplayName_; }
+  void clearPresentation();
+
+ private:
+  using LoadHandler = std::function<void(const platform::ExtensionRecordRef&)>;
+  void loadBroadcastUploadExtensionWithBaseIdentifier(const std::string& base, LoadHandler handler);
+  void store(const SetupRequest& request, const platform::ExtensionRecordRef& extension,
+             const QVBroadcastConfiguration& configuration);
+
+  platform::SerialQueue& sequence_;
+  std::map<std::string, QVBroadcastInfo> hostBundleIDtoExtensionInfoLookup_;
+  platform::Data currentHostAppImage_;
+  platform::Data currentExtensionAppImage_;
+  std::string currentExtensionDisplayName_;
+};
+
+}  // namespace qv

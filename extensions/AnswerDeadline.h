@@ -1,0 +1,33 @@
+#pragma once
+
+#include <chrono>
+#include <functional>
+#include <memory>
+#include <mutex>
+
+#include "platform/Timer.h"
+
+namespace qv {
+
+/// How long another process may take for an answer that somebody waits for.
+inline constexpr std::chrono::seconds kExtensionPatience{10};
+
+/// A continuation that waits for another process. It runs once: at the answer, or at the deadline. Dropped, it does not
+/// run at all.
+///
+/// Threading: thread-safe. The continuation runs in the thread that answers, or on the global queue when it is late.
+class AnswerDeadline : public std::enable_shared_from_this<AnswerDeadline> {
+ public:
+  using Continuation = std::function<void(bool isLate)>;
+  static std::shared_ptr<AnswerDeadline> start(std::chrono::nanoseconds patience, Continuation continuation);
+  void answer() { resume(false); }
+
+ private:
+  void resume(bool isLate);
+
+  std::mutex mutex_;
+  Continuation continuation_;
+  std::unique_ptr<platform::TimerHandle> timer_;
+};
+
+}  // namespace qv

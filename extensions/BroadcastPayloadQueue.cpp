@@ -1,0 +1,48 @@
+#include "extensions/BroadcastPayloadQueue.h"
+
+#include <algorithm>
+#include <utility>
+
+namespace qv {
+
+using Kind = BroadcastPayload::Kind;
+
+void BroadcastPayloadQueue::push(Item item) {
+  const Kind kind = item.payload.kind;
+  items_.push_back(std::move(item));
+  if (kind == Kind::Video) {
+    while (count(kind) > kMaximumFrames && dropOldest(kind)) ++droppedFrames_;
+  } else if (kind != Kind::Control) {
+    while (seconds(kind) > kMaximumAudioSeconds && dropOldest(kind)) ++droppedAudio_;
+  }
+}
+
+std::optional<BroadcastPayloadQueue::Item> BroadcastPayloadQueue::pop() {
+  if (items_.empty()) return std::nullopt;
+  Item item = std::move(items_.front());
+  items_.pop_front();
+  return item;
+}
+
+bool BroadcastPayloadQueue::dropOldest(Kind kind) {
+  const auto oldest =
+      std::find_if(items_.begin(), items_.end(), [kind](const Item& item) { return item.payload.kind == kind; });
+  if (oldest == items_.end()) return false;
+  items_.erase(oldest);
+  return true;
+}
+
+size_t BroadcastPayloadQueue::count(Kind kind) const {
+  return static_cast<size_t>(
+      std::count_if(items_.begin(), items_.end(), [kind](const Item& item) { return item.payload.kind == kind; }));
+}
+
+double BroadcastPayloadQueue::seconds(Kind kind) const {
+  double sum = 0;
+  for (const Item& item : items_) {
+    if (item.payload.kind == kind) sum += item.payload.duration;
+  }
+  return sum;
+}
+
+}  // namespace qv

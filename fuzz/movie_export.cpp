@@ -1,0 +1,48 @@
+// Movies that are trimmed and mixed: read by libavformat, their tracks copied by our own code.
+#include <atomic>
+#include <filesystem>
+
+#include "fuzz/MovieSeeds.h"
+#include "fuzz/Target.h"
+#include "platform/ffmpeg/LibraryLog.h"
+#include "platform/ffmpeg/MovieExport.h"
+
+namespace {
+
+using namespace qv::platform;
+
+constexpr int64_t kLongestMix = 5 * int64_t{mp4::kMovieTimescale};
+
+std::optional<Error> exportMovie(const std::string& from, const std::string& to, ExportPreset preset,
+                                 MediaTimeRange range) {
+  std::atomic<double> progress{0};
+  const std::atomic<bool> cancelled{false};
+  return ffmpeg::MovieExport({from, to, preset, range}, progress, cancelled).run();
+}
+
+}  // namespace
+
+std::vector<std::string> qv::fuzz::seeds() { return {growingMovie(1), growingMovie(3), finishedMovie(2)}; }
+
+extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
+  static const qv::fuzz::ScratchFile file;
+  static const std::string result = file.path() + ".out";
+  ffmpeg::routeLibraryLog();
+  file.write({reinterpret_cast<const char*>(data), size});
+  const auto reader = ffmpeg::MovieReader::open(file.path(), nullptr);
+  if (!reader) return 0;
+  const int64_t duration = reader.value()->duration();
+  const MediaTimeRange ranges[] = {
+      {MediaTime::invalid(), MediaTime::invalid()},
+      {MediaTime::make(duration / 3, mp4::kMovieTimescale), MediaTime::make(duration / 2, mp4::kMovieTimescale)}};
+  // A mix takes a hundred times as long as a trim.
+  const bool isMixed = size % 16 == 0 && duration < kLongestMix;
+  const auto& range = ranges[size % 2];
+  const auto preset = isMixed ? ExportPreset::HighestQuality : ExportPreset::PassThrough;
+  const auto error = exportMovie(file.path(), result, preset, range);
+  qv::fuzz::require(std::filesystem::exists(result) == !error, "a result where there is no error, else none");
+  qv::fuzz::require(error || ffmpeg::MovieReader::open(result, nullptr), "a result can be read");
+  std::filesystem::remove(result);
+  qv::fuzz::require(file.isAlone(), "nothing is left beside the movie");
+  return 0;
+}

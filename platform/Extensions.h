@@ -1,0 +1,136 @@
+#pragma once
+
+#include <cstdint>
+#include <functional>
+#include <memory>
+#include <optional>
+#include <string>
+#include <string_view>
+#include <vector>
+
+#include "platform/Error.h"
+#include "platform/IPC.h"
+#include "platform/Result.h"
+#include "platform/Value.h"
+
+namespace qv::platform {
+
+/// Keys of an extension's manifest: the bundle's information dictionary has the section, the section the rest.
+namespace extensioninfo {
+inline constexpr const char kSection[] = "QVExtension";
+inline constexpr const char kPointIdentifier[] = "QVExtensionPointIdentifier";  ///< string, in the section
+inline constexpr const char kExecutable[] = "QVExtensionExecutable";            ///< string: path within the bundle
+inline constexpr const char kIcons[] = "QVExtensionIcons";  ///< array of strings: PNG files in the bundle's resources
+inline constexpr const char kAttributes[] = "QVExtensionAttributes";          ///< dictionary, in the section
+inline constexpr const char kActivationRule[] = "QVExtensionActivationRule";  ///< rule key to bool, in the attributes
+/// The rule by which an extension says that it only supports streaming set-up.
+inline constexpr const char kSupportsStreaming[] = "QVExtensionActivationSupportsStreaming";
+}  // namespace extensioninfo
+
+/// The only data type that item providers here carry: any transferable value.
+inline constexpr const char kGenericDataType[] = "public.data";
+
+/// One value under a type identifier, loaded when it is asked for.
+struct ItemProvider {
+  std::string typeIdentifier = kGenericDataType;
+  Value value;
+  [[nodiscard]] bool hasItemConformingToTypeIdentifier(std::string_view type) const { return typeIdentifier == type; }
+};
+
+/// What goes into and comes out of an extension request: values under a title.
+struct ExtensionItem {
+  std::string attributedTitle;
+  std::vector<ItemProvider> attachments;
+};
+
+/// An installed extension, as its manifest describes it.
+///
+/// Threading: immutable.
+struct ExtensionRecord {
+  std::string identifier;                ///< its bundle identifier
+  std::string extensionPointIdentifier;  ///< what it extends
+  Dictionary attributes;                 ///< kAttributes of the section; empty without
+  Dictionary infoDictionary;             ///< the whole manifest
+  std::string displayName;               ///< localized; empty without
+  std::vector<Data> icons;               ///< PNG files, at most 1 MiB each; empty without
+  std::string bundlePath;
+  std::string executablePath;
+};
+using ExtensionRecordRef = std::shared_ptr<const ExtensionRecord>;
+
+/// Tells one request of an extension from all others, for the life of this process.
+using ExtensionRequestID = uint64_t;
+
+/// The daemon's side of the auxiliary connection with an extension's process. A class of these is named by the
+/// extension point; the platform asks it for the two interfaces and hands it the connection.
+///
+/// Threading: called on the platform's threads, one call at a time.
+class ExtensionHostContext {
+ public:
+  virtual ~ExtensionHostContext() = default;
+  [[nodiscard]] virtual const IPCInterface& _extensionAuxiliaryHostProtocol() const = 0;
+  [[nodiscard]] virtual const IPCInterface& _extensionAuxiliaryVendorProtocol() const = 0;
+  /// The extension's process has connected.
+  virtual void didConnectToVendor(const std::shared_ptr<IPCConnection>& vendor) = 0;
+};
+
+/// How one request goes. Both on threads of the platform's.
+struct ExtensionRequestHandlers {
+  /// Once: the extension has taken the request, or the error that kept it from that (launch failed, process died, no
+  /// answer within 10 s).
+  std::function<void(ExtensionRequestID, const std::optional<Error>&)> began;
+  /// After `began` without an error, once: what the extension returned, or the error that ended it (its process died,
+  /// it was killed). Each request has its own, so that overlapping ones are never mistaken for each other.
+  std::function<void(ExtensionRequestID, const Result<std::vector<ExtensionItem>>&)> completed;
+};
+
+/// The installed extensions and their processes. An extension's process is launched at its first request, confined
+/// (see docs/broadcast-extensions.md), takes further requests while it lives, and is found dead by its pidfd.
+///
+/// Threading: thread-safe. Handlers come on threads of the platform's, never within the call.
+class ExtensionService {
+ public:
+  virtual ~ExtensionService() = default;
+  /// The extensions whose attributes match: kPointIdentifier is the only key that is understood. In a steady order.
+  virtual void extensionsMatchingAttributes(
+      const Dictionary& attributes,
+      std::function<void(const std::vector<ExtensionRecordRef>&, const std::optional<Error>&)> completion) = 0;
+  /// Makes the host context of each process launched for an extension point.
+  virtual void setHostContextClass(const std::string& extensionPointIdentifier,
+                                   std::function<std::shared_ptr<ExtensionHostContext>()> make) = 0;
+  virtual void beginExtensionRequest(const ExtensionRecordRef& extension, std::vector<ExtensionItem> inputItems,
+                                     ExtensionRequestHandlers handlers) = 0;
+  /// Of the process that took the request; nothing once it is gone.
+  [[nodiscard]] virtual std::shared_ptr<ExtensionHostContext> contextForRequest(ExtensionRequestID request) = 0;
+  /// Its remote interface is the vendor's; nothing once it is gone.
+  [[nodiscard]] virtual std::shared_ptr<IPCConnection> auxiliaryConnectionForRequest(ExtensionRequestID request) = 0;
+  /// Ends the extension's process, if it runs: every request that it had ends in an error.
+  virtual void killExtension(const ExtensionRecordRef& extension, int signal) = 0;
+  /// The right to read one file, once, for this extension's process and nobody else. A random text; what it names is
+  /// opened now, so that a later swap of the path changes nothing. Nothing where the file is no plain file.
+  /// Unused, it ends with the request that it was given to, with the process, or by `revokeSandboxToken`.
+  [[nodiscard]] virtual std::optional<std::string> issueSandboxToken(const std::string& tokenClass,
+                                                                     const std::string& path,
+                                                                     const ExtensionRecordRef& extension) = 0;
+  virtual void revokeSandboxToken(const std::string& token) = 0;
+};
+
+/// Between the daemon and an extension's process, by two connections that the process makes to the endpoints which it
+/// inherits: their descriptor numbers stand in these environment variables. The first is for requests, by the
+/// interfaces below; the second, the auxiliary one, for those of the host context.
+inline constexpr const char kExtensionRequestsEndpointVariable[] = "QUORVEL_EXTENSION_REQUESTS";
+inline constexpr const char kExtensionAuxiliaryEndpointVariable[] = "QUORVEL_EXTENSION_AUXILIARY";
+
+/// Called on the extension: "beginRequest" (t request, aa{sv} items) -> (). It is answered when the request was taken.
+const IPCInterface& extensionRequestProtocol();
+/// Called on the daemon: "completeRequest" (t request, aa{sv} items), and "openFile" (s token) -> (h file), which fails
+/// with "com.tarnwick.quorveld.Error.NoSuchFile" for any token that is not this extension's to use.
+const IPCInterface& extensionRequestHostProtocol();
+inline constexpr const char kNoSuchFileErrorName[] = "com.tarnwick.quorveld.Error.NoSuchFile";
+
+/// Items as they stand in those messages: an array of dictionaries with "title" (s) and "attachments" (av). Titles and
+/// attachments that are missing or of another type are left out.
+[[nodiscard]] Value valueOfExtensionItems(const std::vector<ExtensionItem>& items);
+[[nodiscard]] std::vector<ExtensionItem> extensionItemsOfValue(const Value& value);
+
+}  // namespace qv::platform

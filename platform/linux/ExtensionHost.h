@@ -1,0 +1,37 @@
+#pragma once
+
+#include <functional>
+#include <map>
+#include <memory>
+#include <optional>
+#include <string>
+
+#include "platform/Extensions.h"
+#include "platform/Guarded.h"
+#include "platform/Timer.h"
+#include "platform/linux/ExtensionLaunch.h"
+#include "platform/linux/SandboxTokenBook.h"
+
+namespace qv::platform {
+
+/// What the processes of all extensions share. The services are borrowed and outlive it.
+///
+/// Threading: thread-safe; the first members do not change.
+struct ExtensionHost {
+  /// Where a request went, for as long as it can be asked.
+  struct Place {
+    std::shared_ptr<ExtensionHostContext> context;
+    std::shared_ptr<IPCConnection> auxiliary;
+  };
+  using MakeContext = std::function<std::shared_ptr<ExtensionHostContext>()>;
+
+  IPCService& ipc;
+  TimerService& timers;
+  Executor& executor;
+  const ExtensionLaunchOptions options;
+  SandboxTokenBook tokens{};
+  Guarded<std::map<std::string, MakeContext>> contextClasses{};  ///< by extension point
+  Guarded<std::map<ExtensionRequestID, Place>> places{};         ///< of the requests that were begun
+};
+
+}  // namespace qv::platform

@@ -1,0 +1,33 @@
+#pragma once
+
+#include <string>
+
+#include "platform/Extensions.h"
+#include "platform/Result.h"
+#include "platform/linux/LaunchedProcess.h"
+
+namespace qv::platform {
+
+/// How extensions are launched on this device.
+struct ExtensionLaunchOptions {
+  std::string deviceRoot;    ///< as in Platform
+  std::string launcherPath;  ///< of quorvel-extension-launcher
+  /// As root: runs extensions as users of their own even where the kernel confines well enough without.
+  bool alwaysAnotherUser = false;
+};
+
+/// Where the daemon's own installation has the launcher: beside the daemon, else in ../lib/quorveld.
+[[nodiscard]] std::string installedExtensionLauncher();
+
+/// Makes the extension's container where there is none yet, `<device root>/private/var/mobile/Containers/<identifier>`,
+/// and puts together its launch: confinement, a minimal environment, its output in "stderr.log" of its container, and
+/// the two endpoints. Blocking.
+[[nodiscard]] Result<LaunchRequest> makeExtensionLaunch(const ExtensionRecord& extension,
+                                                        const ExtensionLaunchOptions& options,
+                                                        const ListenerEndpoint& requests,
+                                                        const ListenerEndpoint& auxiliary);
+
+/// What the end of an extension's process was, for the log and for the requests that it ends.
+[[nodiscard]] Error errorOfExtensionEnd(const std::string& identifier, int status);
+
+}  // namespace qv::platform

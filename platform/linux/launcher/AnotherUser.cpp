@@ -1,0 +1,83 @@
+#include "platform/linux/launcher/AnotherUser.h"
+
+#include <fcntl.h>
+#include <grp.h>
+#include <linux/capability.h>
+#include <sched.h>
+#include <sys/mount.h>
+#include <sys/prctl.h>
+#include <sys/stat.h>
+#include <sys/syscall.h>
+#include <unistd.h>
+
+#include <cerrno>
+#include <cstdint>
+#include <filesystem>
+#include <system_error>
+
+namespace qv::platform::launcher {
+namespace {
+
+/// Up to 2^31: no login, service or container has its users here.
+constexpr uint32_t kFirstUser = 0x7F000000;
+constexpr uint32_t kUserMask = 0x00FFFFFF;
+
+void check(long result, const std::string& what) {
+  if (result < 0) throw std::system_error(errno, std::generic_category(), what);
+}
+
+/// FNV-1a, 32 bit.
+uint32_t hashOf(const std::string& text) {
+  uint32_t hash = 2166136261u;
+  for (const char c : text) hash = (hash ^ static_cast<uint8_t>(c)) * 16777619u;
+  return hash;
+}
+
+void giveTo(const std::string& directory, uid_t user) {
+  check(::lchown(directory.c_str(), user, user), directory);
+  for (const auto& entry : std::filesystem::recursive_directory_iterator(directory)) {
+    check(::lchown(entry.path().c_str(), user, user), entry.path());
+  }
+}
+
+void hideAllBut(const std::string& container, const std::string& dataDirectory) {
+  check(::unshare(CLONE_NEWNS), "mount namespace");
+  check(::mount(nullptr, "/", nullptr, MS_REC | MS_PRIVATE, nullptr), "private mounts");
+  // Within the new namespace: what belongs to another one cannot be mounted.
+  const int kept = ::open(container.c_str(), O_PATH | O_DIRECTORY | O_CLOEXEC);
+  check(kept, container);
+  constexpr unsigned long kFlags = MS_NOSUID | MS_NODEV | MS_NOEXEC;
+  check(::mount("none", dataDirectory.c_str(), "tmpfs", kFlags, "mode=0755,size=64k"), dataDirectory);
+  std::filesystem::create_directories(container);
+  const std::string source = "/proc/self/fd/" + std::to_string(kept);
+  check(::mount(source.c_str(), container.c_str(), nullptr, MS_BIND, nullptr), container);
+  check(::mount(nullptr, dataDirectory.c_str(), nullptr, MS_REMOUNT | MS_RDONLY | kFlags, nullptr), dataDirectory);
+  ::close(kept);
+}
+
+}  // namespace
+
+AnotherUser::AnotherUser(const std::string& dataDirectory, const std::string& container)
+    : userIdentifier_(kFirstUser | (hashOf(std::filesystem::path(container).filename()) & kUserMask)) {
+  giveTo(container, userIdentifier_);
+  hideAllBut(container, dataDirectory);
+}
+
+void AnotherUser::become() const {
+  check(::setgroups(0, nullptr), "groups");
+  check(::setresgid(userIdentifier_, userIdentifier_, userIdentifier_), "group");
+  check(::setresuid(userIdentifier_, userIdentifier_, userIdentifier_), "user");
+}
+
+void dropCapabilities() {
+  for (unsigned long capability = 0; ::prctl(PR_CAPBSET_READ, capability, 0, 0, 0) >= 0; ++capability) {
+    // Refused to whoever is not root, who has none to drop.
+    (void)::prctl(PR_CAPBSET_DROP, capability, 0, 0, 0);
+  }
+  (void)::prctl(PR_CAP_AMBIENT, PR_CAP_AMBIENT_CLEAR_ALL, 0, 0, 0);
+  __user_cap_header_struct header{_LINUX_CAPABILITY_VERSION_3, 0};
+  const __user_cap_data_struct none[2] = {};
+  check(::syscall(SYS_capset, &header, none), "capabilities");
+}
+
+}  // namespace qv::platform::launcher

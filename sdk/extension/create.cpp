@@ -1,0 +1,51 @@
+#include <csignal>
+#include <cstdio>
+#include <cstdlib>
+
+#include "platform/Log.h"
+#include "platform/sdbus/SdBusIPC.h"
+#include "sdk/extension/ExtensionProcess.h"
+#include "sdk/extension/ListenerBroadcasts.h"
+
+namespace quorvel {
+
+namespace {
+
+using namespace std::chrono_literals;
+
+constexpr auto kLongestFarewell = 5s;
+
+int run(qv::extension::ExtensionProcess::Factory make) {
+  const auto endpoints = qv::extension::ExtensionProcess::inheritedEndpoints();
+  if (!endpoints.requests.isValid() || !endpoints.auxiliary.isValid()) {
+    std::fprintf(stderr, "a broadcast extension is launched by the recording daemon only\n");
+    return 2;
+  }
+  // A server that closes its socket is an error of the write, not the end of the process.
+  std::signal(SIGPIPE, SIG_IGN);
+  qv::platform::SdBusIPCService ipc;
+  const auto process = qv::extension::ExtensionProcess::create(ipc, std::move(make));
+  if (const auto error = process->start(endpoints)) {
+    std::fprintf(stderr, "no connection to the recording daemon: %s\n", error->description().c_str());
+    return 1;
+  }
+  process->waitForHost();
+  if (!process->finish(kLongestFarewell)) {
+    std::fprintf(stderr, "the extension did not return\n");
+    qv::platform::flushLog();
+    std::_Exit(1);
+  }
+  return 0;
+}
+
+}  // namespace
+
+int runSampleExtension(SampleExtensionFactory make) { return run(std::move(make)); }
+int runClipExtension(ClipExtensionFactory make) { return run(std::move(make)); }
+
+std::unique_ptr<BroadcastListener> BroadcastListener::create(SampleExtensionFactory make) {
+  return qv::extension::ListenerBroadcasts::create(std::make_unique<qv::platform::SdBusIPCService>(), std::move(make),
+                                                   qv::platform::systemClock());
+}
+
+}  // namespace quorvel

@@ -1,0 +1,155 @@
+#include "session/ClipHandover.h"
+
+#include <utility>
+
+#include "extensions/QVBroadcastProtocols.h"
+#include "extensions/QVExtensions.h"
+#include "platform/Log.h"
+#include "platform/Platform.h"
+#include "support/QVTemporaryFiles.h"
+
+namespace qv {
+
+using platform::Dictionary;
+using platform::Error;
+using platform::ExtensionItem;
+using platform::ExtensionRequestID;
+using platform::Platform;
+using platform::Result;
+using platform::URL;
+using platform::Value;
+namespace logs = platform::logs;
+
+namespace {
+constexpr const char kReadTokenClass[] = "com.tarnwick.quorveld.read-only";
+
+void removeClip(const URL& clip) {
+  _srRemoveFile(clip,
+                [](const std::optional<Error>&) { QV_LOG(logs::kSession, "extension finished, clean up movie clip"); });
+}
+}  // namespace
+
+ClipHandover::ClipHandover(platform::ExtensionRecordRef extension, Dictionary userInfo, ClipHandoverEvents events)
+    : extension_(std::move(extension)),
+      userInfo_(std::move(userInfo)),
+      events_(std::move(events)),
+      use_(ExtensionUse::of(extension_)) {}
+
+/// Files are finished by several writers at once, so a later clip may be complete before an earlier one.
+void ClipHandover::clipCompleted(int64_t number, std::optional<URL> clip, bool finished, std::function<void()> handed) {
+  std::unique_lock lock(mutex_);
+  completed_[number] = {std::move(clip), finished, std::move(handed)};
+  if (std::exchange(isHanding_, true)) return;
+  for (auto next = completed_.find(next_); next != completed_.end(); next = completed_.find(++next_)) {
+    const Completed ready = std::move(next->second);
+    completed_.erase(next);
+    lock.unlock();
+    if (ready.clip) _notifyBroadcastExtensionOfCompletedMovieWithURL(*ready.clip, ready.finished);
+    if (ready.finished) awaitLastRequests();
+    if (ready.handed) ready.handed();
+    lock.lock();
+  }
+  isHanding_ = false;
+}
+
+void ClipHandover::_notifyBroadcastExtensionOfCompletedMovieWithURL(const URL& clip, bool finished) {
+  QV_LOG(logs::kSession, "QVRecordingSession: notifyBroadcastExtensionOfCompletedMovieWithURL:");
+  {
+    std::lock_guard lock(mutex_);
+    if (outstanding_ >= kMaximumOutstanding && !finished) {
+      QV_LOG_ERROR(logs::kSession, "the broadcast extension is too far behind, a clip is left out");
+      _srRemoveFile(clip, nullptr);
+      return;
+    }
+    ++outstanding_;
+  }
+  platform::ExtensionService& extensions = *Platform::current().extensions;
+  const auto token = extensions.issueSandboxToken(kReadTokenClass, clip.path(), extension_);
+  if (!token) {
+    QV_LOG_ERROR(logs::kSession, "sb token is null!");
+    std::lock_guard lock(mutex_);
+    --outstanding_;
+    return;
+  }
+  platform::ExtensionRequestHandlers handlers;
+  handlers.began = [self = shared_from_this(), clip, token](ExtensionRequestID, const auto& error) {
+    self->requestBegan(clip, *token, error);
+  };
+  handlers.completed = [self = shared_from_this(), clip](ExtensionRequestID, const auto& items) {
+    self->requestCompleted(clip, items);
+  };
+  QV_LOG(logs::kSession, "begining extension request");
+  extensions.beginExtensionRequest(extension_, itemsForClip(clip, *token, finished), std::move(handlers));
+}
+
+std::vector<ExtensionItem> ClipHandover::itemsForClip(const URL& clip, const std::string& token, bool finished) const {
+  return {itemWithTitle(broadcastitem::kRequestedFinish, Value(finished ? "1" : "0")),
+          itemWithTitle(broadcastitem::kSandboxToken, Value(token)),
+          itemWithTitle(broadcastitem::kUserInfo, Value(userInfo_)),
+          itemWithTitle(broadcastitem::kMovieClipURL, Value(clip.absoluteString()))};
+}
+
+void ClipHandover::requestBegan(const URL& clip, const std::string& token, const std::optional<Error>& error) {
+  QV_LOG(logs::kSession, "finished extension request with items with error code: %i)",
+         error ? static_cast<int>(error->code) : 0);
+  if (!error) return;
+  Platform::current().extensions->revokeSandboxToken(token);
+  requestEnded(clip);
+  events_.extensionFailed();
+}
+
+void ClipHandover::requestCompleted(const URL& clip, const Result<std::vector<ExtensionItem>>& items) {
+  if (items) {
+    for (const ExtensionItem& item : items.value()) loadReturnedItem(item);
+  } else {
+    QV_LOG_ERROR(logs::kSession, "the broadcast extension failed over a clip: %s", items.error().description().c_str());
+    events_.extensionFailed();
+  }
+  requestEnded(clip);
+}
+
+void ClipHandover::requestEnded(const URL& clip) {
+  removeClip(clip);
+  std::unique_lock lock(mutex_);
+  if (--outstanding_ > 0 || !isFinished_) return;
+  const auto last = std::exchange(lastRequests_, nullptr);
+  lock.unlock();
+  if (last) last->answer();
+}
+
+void ClipHandover::loadReturnedItem(const ExtensionItem& item) {
+  if (item.attachments.empty()) return;
+  const platform::ItemProvider& provider = item.attachments.front();
+  if (!provider.hasItemConformingToTypeIdentifier(platform::kGenericDataType)) return;
+  if (item.attributedTitle == broadcastitem::kBroadcastConfiguration) {
+    QV_LOG(logs::kSession, "received updated broadcast configuration from extension");
+    const auto configuration = QVBroadcastConfiguration::decodeReceived(provider.value.asData());
+    if (!configuration) {
+      QV_LOG_ERROR(logs::kSession, "Error loading input item for type");
+      return;
+    }
+    events_.configurationReceived(configuration.value());
+  } else if (item.attributedTitle == broadcastitem::kServiceInfo) {
+    QV_LOG_DEBUG(logs::kSession, "received service info from broadcast service");
+    events_.serviceInfoReceived(provider.value.asDictionary());
+  }
+}
+
+void ClipHandover::awaitLastRequests() {
+  std::unique_lock lock(mutex_);
+  isFinished_ = true;
+  // It holds this until the extension is let go, whatever becomes of the session.
+  auto deadline = AnswerDeadline::start(kLastClipsPatience, [self = shared_from_this()](bool isLate) {
+    if (isLate) QV_LOG_ERROR(logs::kSession, "the broadcast extension did not finish its last clips in time");
+    std::lock_guard releaseLock(self->mutex_);
+    self->use_.reset();
+  });
+  if (outstanding_ > 0) {
+    lastRequests_ = std::move(deadline);
+    return;
+  }
+  lock.unlock();
+  deadline->answer();
+}
+
+}  // namespace qv

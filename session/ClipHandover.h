@@ -1,0 +1,73 @@
+#pragma once
+
+#include <functional>
+#include <map>
+#include <memory>
+#include <mutex>
+#include <optional>
+#include <string>
+
+#include "extensions/AnswerDeadline.h"
+#include "extensions/ExtensionUse.h"
+#include "extensions/QVBroadcastConfiguration.h"
+#include "platform/Extensions.h"
+
+namespace qv {
+
+/// What a broadcast's clips bring back, on threads of the platform's.
+struct ClipHandoverEvents {
+  std::function<void(const QVBroadcastConfiguration&)> configurationReceived;
+  std::function<void(const platform::Dictionary&)> serviceInfoReceived;
+  /// The extension's process did not take a clip or died over it.
+  std::function<void()> extensionFailed;
+};
+
+/// Hands the finished clips of one broadcast to its upload extension, in the order of their numbers, each in a request
+/// of its own, and removes each clip's file when its own request has ended. So requests may overlap.
+///
+/// An extension that lags `kMaximumOutstanding` clips behind misses the next ones. After the request of the last clip,
+/// or when that takes too long, the extension's process is ended, and what it still held with it.
+///
+/// Threading: thread-safe.
+class ClipHandover : public std::enable_shared_from_this<ClipHandover> {
+ public:
+  static constexpr size_t kMaximumOutstanding = 32;
+  /// For what is left to be sent after the end of the broadcast.
+  static constexpr std::chrono::seconds kLastClipsPatience{120};
+
+  ClipHandover(platform::ExtensionRecordRef extension, platform::Dictionary userInfo, ClipHandoverEvents events);
+
+  /// The clip of this number, from 1, is complete; nothing where it came to no movie. `handed` (may be empty) runs when
+  /// it and all before it were handed over.
+  void clipCompleted(int64_t number, std::optional<platform::URL> clip, bool finished, std::function<void()> handed);
+
+ private:
+  struct Completed {
+    std::optional<platform::URL> clip;
+    bool finished = false;
+    std::function<void()> handed;
+  };
+  void _notifyBroadcastExtensionOfCompletedMovieWithURL(const platform::URL& clip, bool finished);
+  [[nodiscard]] std::vector<platform::ExtensionItem> itemsForClip(const platform::URL& clip, const std::string& token,
+                                                                  bool finished) const;
+  void requestBegan(const platform::URL& clip, const std::string& token, const std::optional<platform::Error>& error);
+  void requestCompleted(const platform::URL& clip, const platform::Result<std::vector<platform::ExtensionItem>>& items);
+  void requestEnded(const platform::URL& clip);
+  void loadReturnedItem(const platform::ExtensionItem& item);
+  void awaitLastRequests();
+
+  const platform::ExtensionRecordRef extension_;
+  const platform::Dictionary userInfo_;
+  const ClipHandoverEvents events_;
+
+  std::mutex mutex_;
+  std::map<int64_t, Completed> completed_;
+  int64_t next_ = 1;
+  bool isHanding_ = false;
+  size_t outstanding_ = 0;
+  bool isFinished_ = false;
+  std::shared_ptr<AnswerDeadline> lastRequests_;
+  std::shared_ptr<ExtensionUse> use_;
+};
+
+}  // namespace qv

@@ -1,0 +1,17 @@
+#pragma once
+
+#include <cstring>
+
+#include "platform/Value.h"
+
+namespace qv {
+
+/// The raw bytes of a record that crosses to another process of this device.
+template <typename Record>
+platform::Data rawBytes(const Record& record) {
+  platform::Data bytes(sizeof record);
+  std::memcpy(bytes.data(), &record, sizeof record);
+  return bytes;
+}
+
+}  // namespace qv

@@ -1,0 +1,329 @@
+#include <cmath>
+
+#include "extensions/QVBroadcastProtocols.h"
+#include "platform/KeyedArchive.h"
+#include "tests/daemon/DaemonTest.h"
+
+namespace qv {
+namespace {
+
+using platform::Data;
+using platform::Dictionary;
+using platform::ExtensionItem;
+using platform::Value;
+
+class BroadcastTest : public DaemonTest {
+ protected:
+  BroadcastTest() : client_(game()) {}
+  ~BroadcastTest() override {
+    client_.disconnect();
+    // What still waits for an extension's answer gives up.
+    device_.timers.advance(std::chrono::minutes(5));
+    device_.run();
+  }
+
+  int64_t setUp(const Data& configuration = QVBroadcastConfiguration{}.encode(),
+                const std::string& extension = "com.example.game.setup", const std::string& host = "com.example.game") {
+    const auto answer = client_.request(
+        "setupBroadcastWithHostBundleID",
+        {Value(host), Value(extension), Value(configuration), Value(Dictionary{{"key", Value("stream")}})});
+    return answer ? answer->code() : -1;
+  }
+  int64_t startBroadcast() {
+    client_.send("noSuchRequest");
+    const auto answer = client_.start({.broadcast = true});
+    return answer && !answer->failure ? answer->code() : -1;
+  }
+  void installSampleExtension() {
+    device_.extensions.install("com.example.game.upload", broadcastpoint::kUpload,
+                               "QVBroadcastProcessModeSampleBuffer");
+  }
+  /// A broadcast in samples mode that runs.
+  void broadcastSamples() {
+    installSampleExtension();
+    setUp();
+    client_.send("startRecordingWindowLayerContextIDs", startArguments());
+    extension_.connect();
+    device_.run();
+    extension_.call("ping");
+    device_.run();
+  }
+  static platform::IPCArguments startArguments() {
+    return {Value(platform::Array{}),
+            Value(platform::Array{Value(1280.0), Value(720.0)}),
+            Value(false),
+            Value(false),
+            Value(true),
+            Value(false),
+            Value(false),
+            Value(platform::Array{})};
+  }
+  std::vector<int64_t> actions() {
+    std::vector<int64_t> actions;
+    for (const auto& payload : extension_.received) {
+      if (const Value* action = find(payload, broadcastpayload::kActionType)) actions.push_back(action->asInteger());
+    }
+    return actions;
+  }
+  /// A tenth of a second of sound.
+  void sound(int64_t tenths) {
+    ASSERT_TRUE(device_.tap.fill(4410 * 2, static_cast<uint64_t>(tenths * kSecond / 10), 4410));
+    device_.run();
+  }
+  void frame(int64_t tenths) { sendFrame(tenths * kSecond / 10); }
+  /// Sound that reaches the daemon `lag` tenths after the pictures of the same time.
+  void play(int64_t from, int64_t to, int64_t lag = 0) {
+    for (int64_t tenth = from; tenth < to; ++tenth) {
+      frame(tenth);
+      if (tenth - lag >= from) sound(tenth - lag);
+    }
+  }
+  std::string finishFlag(size_t request) {
+    return device_.extensions.requests.at(request).value(broadcastitem::kRequestedFinish).asString();
+  }
+  std::string clipPath(size_t request) {
+    return platform::URL(device_.extensions.requests.at(request).value(broadcastitem::kMovieClipURL).asString()).path();
+  }
+  fakes::FakeAssetWriterService::Movie& movie(size_t index) { return *device_.movies.movies.at(index); }
+
+  fakes::FakeBroadcastExtension extension_{device_.ipc, device_.extensions, device_.executor};
+  TestClient client_;
+};
+
+TEST_F(BroadcastTest, SetUpRefusesWhatNoBroadcastCouldComeOf) {
+  const auto invalid = errorcode::kInvalidBroadcastSession;
+  EXPECT_EQ(setUp(), invalid) << "no extension";
+  installSampleExtension();
+  EXPECT_EQ(setUp({1, 2, 3}), invalid);
+  EXPECT_EQ(setUp(platform::encodeKeyedArchive("Other", {})), invalid);
+  EXPECT_EQ(setUp(QVBroadcastConfiguration{-1, {}}.encode()), invalid);
+  EXPECT_EQ(setUp(QVBroadcastConfiguration{std::nan(""), {}}.encode()), invalid);
+  EXPECT_EQ(setUp(QVBroadcastConfiguration{1, {{"k", Value(std::string(2 << 20, 'x'))}}}.encode()), invalid);
+  EXPECT_EQ(setUp(QVBroadcastConfiguration{}.encode(), "com"), invalid) << "would match every extension";
+  EXPECT_EQ(setUp(QVBroadcastConfiguration{}.encode(), "com.example.game.setup", "com.example.chat"),
+            errorcode::kEntitlements);
+  EXPECT_EQ(startBroadcast(), invalid);
+  EXPECT_EQ(openTransactions(), 0);
+}
+
+TEST_F(BroadcastTest, SetUpFindsTheExtensionAndShowsItsImages) {
+  const Data icon{1, 2, 3};
+  auto general = std::make_shared<platform::ExtensionRecord>();
+  general->identifier = "com.example.game.general";
+  general->extensionPointIdentifier = broadcastpoint::kGeneral;
+  general->icons = {icon};
+  device_.extensions.installed.push_back(general);
+  auto app = std::make_shared<fakes::FakeBundle>("/Applications/Game", "com.example.game");
+  app->info[platform::bundleinfo::kIconFile] = Value("Icon.png");
+  app->resources[""] = {"Icon.png"};
+  device_.bundles.add(app);
+  device_.disk.addFile(app->resourcePath() + "/Icon.png", "PNG");
+  EXPECT_EQ(setUp(), 0);
+  const auto images = client_.request("getCurrentBroadcastImages")->values;
+  EXPECT_EQ(images[0].asData(), (Data{'P', 'N', 'G'}));
+  EXPECT_EQ(images[1].asData(), icon);
+  EXPECT_TRUE(client_.request("getSystemBroadcastExtensionInfo")->values[0].asArray().empty()) << "none of that point";
+
+  auto upload = std::make_shared<platform::ExtensionRecord>(*general);
+  upload->identifier = "com.example.chat.upload";
+  upload->extensionPointIdentifier = broadcastpoint::kUpload;
+  upload->displayName = "Live";
+  device_.extensions.installed.push_back(upload);
+  device_.extensions.install("com.example.plain", broadcastpoint::kUpload);
+  const auto list = client_.request("getSystemBroadcastExtensionInfo")->values[0].asArray();
+  EXPECT_EQ(list.at(0), Value(Dictionary{{"displayName", Value("Live")},
+                                         {"extBundleID", Value("com.example.chat.upload")},
+                                         {"extAppImgData", Value(icon)}}));
+  EXPECT_EQ(list.at(1), Value(Dictionary{{"extBundleID", Value("com.example.plain")}}));
+}
+
+TEST_F(BroadcastTest, SamplesReachTheExtensionBetweenStartedAndFinished) {
+  broadcastSamples();
+  ASSERT_TRUE(client_.answer());
+  EXPECT_EQ(client_.answer()->code(), 0);
+  EXPECT_TRUE(device_.alerts.shown.empty());
+  EXPECT_TRUE(valueForKey(client_.state(), "isBroadcasting").asBool());
+  frame(10);
+  sound(11);
+  client_.request("updateProcessIDForAudioCaptureWithPID", {Value(int32_t{200})});
+  extension_.call("updateBroadcastURL", {Value("https://live")});
+  client_.stop();
+  EXPECT_EQ(client_.answer()->values[0].asString(), "");
+  EXPECT_EQ(client_.answer()->code(1), 0);
+  EXPECT_EQ(client_.object().takeCall().member, "updateBroadcastURL");
+
+  const auto& payloads = extension_.received;
+  ASSERT_EQ(payloads.size(), 5u);
+  EXPECT_EQ(payloads[0].at(broadcastpayload::kUserInfo), Value(Dictionary{{"key", Value("stream")}}));
+  EXPECT_EQ(payloads[1].size(), 4u);
+  EXPECT_TRUE(QVSharedFrameObject::decodeFromIPC(payloads[1].at(broadcastpayload::kSharedFrame)).sharedFrame());
+  EXPECT_EQ(payloads[1].at(broadcastpayload::kTimingInfo).asData().size(), 72u);
+  EXPECT_EQ(payloads[2].size(), 5u);
+  EXPECT_EQ(payloads[2].at(broadcastpayload::kNumSamples).asInteger(), 4410);
+  EXPECT_EQ(payloads[2].at(broadcastpayload::kAudioFormatDescription).asData().size(), 40u);
+  EXPECT_EQ(payloads[3], (Dictionary{{broadcastpayload::kFrontmostApp, Value("com.example.chat")}}));
+  EXPECT_EQ(actions(), (std::vector<int64_t>{1, 4}));
+  EXPECT_EQ(device_.extensions.killed.size(), 1u);
+  EXPECT_TRUE(device_.movies.movies.empty());
+  EXPECT_EQ(openTransactions(), 0);
+  EXPECT_EQ(startBroadcast(), errorcode::kInvalidBroadcastSession) << "a set-up is for one broadcast";
+}
+
+TEST_F(BroadcastTest, AnExtensionThatGoesEndsItsBroadcastOnly) {
+  broadcastSamples();
+  frame(10);
+  extension_.connection->invalidate();
+  device_.run();
+  EXPECT_EQ(client_.takeEnds(), std::vector<int64_t>{errorcode::kInvalidBroadcastSession});
+  EXPECT_FALSE(client_.isRecording());
+  EXPECT_FALSE(device_.screen.last().running);
+  EXPECT_EQ(openTransactions(), 0);
+
+  // One that hangs instead costs the stop ten seconds.
+  device_.extensions.installed.clear();
+  broadcastSamples();
+  extension_.answers = false;
+  client_.send("stopRecordingWithHandler");
+  EXPECT_FALSE(client_.answer());
+  device_.timers.advance(kExtensionPatience);
+  device_.run();
+  ASSERT_TRUE(client_.answer());
+  EXPECT_EQ(device_.extensions.killed.size(), 2u);
+  EXPECT_EQ(openTransactions(), 0);
+}
+
+TEST_F(BroadcastTest, AStartWhoseExtensionNeverConnectsAsksForARecordingInstead) {
+  installSampleExtension();
+  setUp();
+  client_.send("startRecordingWindowLayerContextIDs", startArguments());
+  EXPECT_FALSE(client_.answer());
+  auto other = chat();
+  EXPECT_TRUE(other.state().size() > 0) << "the manager serves others meanwhile";
+  device_.timers.advance(kExtensionPatience);
+  device_.run();
+  ASSERT_EQ(device_.alerts.shown.size(), 1u) << "nobody was asked about a recording yet";
+  device_.alerts.answer(platform::UserAlertAnswer::Default);
+  device_.run();
+  ASSERT_TRUE(client_.answer());
+  EXPECT_EQ(client_.answer()->code(), 0);
+  EXPECT_FALSE(valueForKey(client_.state(), "isBroadcasting").asBool());
+  EXPECT_EQ(device_.extensions.killed.size(), 1u);
+  EXPECT_EQ(device_.movies.movies.size(), 1u);
+  EXPECT_EQ(openTransactions(), 1);
+}
+
+TEST_F(BroadcastTest, AClientThatLeavesWhileTheExtensionIsLaunchedLeavesNothing) {
+  installSampleExtension();
+  setUp();
+  client_.send("startRecordingWindowLayerContextIDs", startArguments());
+  client_.disconnect();
+  extension_.connect();
+  device_.run();
+  extension_.call("ping");
+  device_.run();
+  EXPECT_EQ(openTransactions(), 0);
+  EXPECT_EQ(device_.extensions.killed.size(), 1u);
+  EXPECT_TRUE(device_.screen.controllers.empty());
+}
+
+TEST_F(BroadcastTest, ClipsFollowOneAnotherWithoutAGap) {
+  device_.extensions.install("com.example.game.upload", broadcastpoint::kUpload);
+  EXPECT_EQ(setUp(QVBroadcastConfiguration{2.5, {}}.encode()), 0);
+  EXPECT_EQ(startBroadcast(), 0);
+  play(100, 160, 2);
+  // Sound began at 10.0 s, so the first cut is at the sound of 12.6 s, which comes with the picture of 12.8 s.
+  ASSERT_EQ(device_.movies.movies.size(), 3u);
+  const auto& first = movie(0);
+  const auto& second = movie(1);
+  EXPECT_EQ(first.inputs[0]->times().back(), 128 * kSecond / 10);
+  EXPECT_EQ(second.inputs[0]->times().front(), 129 * kSecond / 10);
+  EXPECT_EQ(first.inputs[0]->times().size() + second.inputs[0]->times().size() + movie(2).inputs[0]->times().size(),
+            60u);
+  // The sound of each clip ends and begins with its pictures.
+  const auto& lastSound = first.inputs[1]->samples.back();
+  EXPECT_EQ((lastSound->presentationTime() + lastSound->duration()).seconds(), 12.9);
+  EXPECT_EQ(second.inputs[1]->times().front(), 129 * kSecond / 10);
+  EXPECT_NEAR(first.sessionEnd.seconds(), 12.9 - 1.0 / 60, 1e-6);
+  ASSERT_GE(device_.extensions.requests.size(), 1u);
+  EXPECT_EQ(finishFlag(0), "0");
+  EXPECT_TRUE(clipPath(0).ends_with("_1.mp4")) << clipPath(0);
+  EXPECT_EQ(device_.extensions.requests[0].value(broadcastitem::kSandboxToken).asString(),
+            "com.tarnwick.quorveld.read-only for " + clipPath(0));
+  client_.stop();
+  EXPECT_EQ(client_.answer()->values[0].asString(), "");
+  ASSERT_EQ(device_.extensions.requests.size(), 3u);
+  EXPECT_EQ(finishFlag(1), "0");
+  EXPECT_EQ(finishFlag(2), "1");
+}
+
+TEST_F(BroadcastTest, AStillScreensClipBeginsWithTheLastPictureAndCutsTheSoundThere) {
+  device_.extensions.install("com.example.game.upload", broadcastpoint::kUpload);
+  setUp(QVBroadcastConfiguration{0.5, {}}.encode());
+  startBroadcast();
+  frame(100);
+  for (int64_t tenth = 100; tenth <= 106; ++tenth) sound(tenth);
+  ASSERT_EQ(device_.movies.movies.size(), 2u);
+  EXPECT_TRUE(movie(1).inputs[0]->samples.empty());
+  device_.timers.advance(std::chrono::milliseconds(34));
+  device_.run();
+  EXPECT_EQ(movie(1).inputs[0]->times(), std::vector<int64_t>{107 * kSecond / 10}) << "where the sound had got to";
+  EXPECT_EQ(movie(1).inputs[0]->samples[0]->image(), movie(0).inputs[0]->samples[0]->image());
+  // A picture that was taken before that is not lost, and sound across a seam is cut at it.
+  frame(106);
+  EXPECT_EQ(movie(1).inputs[0]->samples.size(), 2u);
+  for (int64_t tenth = 107; tenth <= 112; ++tenth) sound(tenth);
+  ASSERT_EQ(device_.movies.movies.size(), 3u);
+  sendFrame(113 * kSecond / 10 + kSecond / 20);
+  sound(113);
+  EXPECT_EQ(movie(1).inputs[1]->samples.back()->numSamples(), 2205);
+  EXPECT_EQ(movie(2).inputs[1]->samples.front()->numSamples(), 2205);
+  EXPECT_EQ(movie(2).inputs[1]->times().front(), movie(2).inputs[0]->times().front());
+}
+
+TEST_F(BroadcastTest, EachRequestRemovesItsOwnClipAndMayChangeTheNext) {
+  device_.extensions.install("com.example.game.upload", broadcastpoint::kUpload);
+  setUp(QVBroadcastConfiguration{1, {}}.encode());
+  startBroadcast();
+  play(100, 125);
+  ASSERT_EQ(device_.extensions.requests.size(), 2u);
+  device_.disk.addFile(clipPath(0), "1");
+  device_.disk.addFile(clipPath(1), "2");
+  const auto item = [](const char* title, Value value) {
+    return ExtensionItem{title, {{platform::kGenericDataType, std::move(value)}}};
+  };
+  device_.extensions.complete(
+      1, std::vector<ExtensionItem>{
+             item(broadcastitem::kBroadcastConfiguration, Value(Data{9})),
+             item(broadcastitem::kBroadcastConfiguration, Value(QVBroadcastConfiguration{3, {}}.encode())),
+             item(broadcastitem::kServiceInfo, Value(Dictionary{{"viewers", Value(int64_t{5})}}))});
+  device_.run();
+  EXPECT_TRUE(device_.disk.itemExists(clipPath(0)));
+  EXPECT_FALSE(device_.disk.itemExists(clipPath(1)));
+  EXPECT_EQ(client_.object().takeCall().member, "updateBroadcastServiceInfo");
+  play(125, 145);
+  EXPECT_EQ(device_.extensions.requests.size(), 2u) << "clips are longer now";
+  client_.stop();
+  ASSERT_EQ(device_.extensions.requests.size(), 3u);
+  EXPECT_TRUE(device_.extensions.killed.empty()) << "it still sends";
+  device_.extensions.complete(2, std::vector<ExtensionItem>{});
+  device_.extensions.complete(0, std::vector<ExtensionItem>{});
+  device_.run();
+  EXPECT_FALSE(device_.disk.itemExists(clipPath(0)));
+  EXPECT_EQ(device_.extensions.killed, std::vector<std::string>{"com.example.game.upload"});
+}
+
+TEST_F(BroadcastTest, AnExtensionThatDiesOverAClipEndsTheBroadcastWithItsLastClip) {
+  device_.extensions.install("com.example.game.upload", broadcastpoint::kUpload);
+  setUp(QVBroadcastConfiguration{1, {}}.encode());
+  startBroadcast();
+  play(100, 115);
+  device_.extensions.complete(0, platform::Error{"d", 1, {}});
+  device_.run();
+  EXPECT_EQ(client_.takeEnds(), std::vector<int64_t>{errorcode::kInvalidBroadcastSession});
+  ASSERT_EQ(device_.extensions.requests.size(), 2u);
+  EXPECT_EQ(finishFlag(1), "1");
+  EXPECT_EQ(openTransactions(), 0);
+}
+
+}  // namespace
+}  // namespace qv

@@ -1,0 +1,186 @@
+#include "daemon/DeviceSleep.h"
+#include "tests/daemon/DaemonTest.h"
+
+namespace qv {
+namespace {
+
+using platform::UserAlertAnswer;
+using platform::Value;
+
+/// A monitor that says who observes it.
+struct FakeLayoutMonitor final : platform::DisplayLayoutMonitor {
+  void addObserver(std::weak_ptr<platform::DisplayLayoutObserver>) override { isObserved = true; }
+  void removeObserver(const platform::DisplayLayoutObserver*) override { isObserved = false; }
+  void invalidate() override { isObserved = false; }
+  bool isObserved = false;
+};
+
+/// Every way in which a recording starts or does not, with every way in which it ends.
+class TransactionsTest : public DaemonTest {
+ protected:
+  TransactionsTest() { manager_->setLayoutMonitor(monitor_); }
+
+  struct Case {
+    std::string name;
+    std::function<void(TransactionsTest&, TestClient&)> run;
+  };
+  void showLayout(const std::vector<int64_t>& levels) {
+    platform::DisplayLayout layout;
+    for (const int64_t level : levels) layout.elements.push_back({"e", level});
+    manager_->layoutMonitorDidUpdateDisplayLayout(*monitor_, layout);
+  }
+  static const std::vector<Case>& refusals();
+  static const std::vector<Case>& ends();
+
+  const std::shared_ptr<FakeLayoutMonitor> monitor_ = std::make_shared<FakeLayoutMonitor>();
+};
+
+const std::vector<TransactionsTest::Case>& TransactionsTest::refusals() {
+  static const std::vector<Case> cases{
+      {"no size", [](auto&, TestClient& client) { client.start({.width = 0}); }},
+      {"no entitlement", [](auto&, TestClient& client) { client.start({.system = true}); }},
+      {"broadcast", [](auto&, TestClient& client) { client.start({.broadcast = true}); }},
+      {"full disk",
+       [](TransactionsTest& t, TestClient& client) {
+         t.device_.disk.setFreeSize(0);
+         client.start();
+         t.device_.disk.setFreeSize(1'000'000'000);
+       }},
+      {"background",
+       [](TransactionsTest& t, TestClient& client) {
+         t.device_.applications.states[client.bundleID()] = platform::kApplicationBackground;
+         client.start();
+         t.device_.applications.states[client.bundleID()] = platform::kApplicationForeground;
+       }},
+      {"declined",
+       [](TransactionsTest& t, TestClient& client) {
+         client.start({.capture = true});
+         t.device_.alerts.answer(UserAlertAnswer::Other);
+       }},
+      {"left in the alert",
+       [](TransactionsTest&, TestClient& client) {
+         client.start();
+         client.disconnect();
+       }},
+  };
+  return cases;
+}
+
+const std::vector<TransactionsTest::Case>& TransactionsTest::ends() {
+  static const std::vector<Case> cases{
+      {"stop", [](auto&, TestClient& client) { client.stop(); }},
+      {"stop with clips",
+       [](auto&, TestClient& client) {
+         client.request("stopRecordingWithStartClipDuration", {Value(1.0), Value(1.0)});
+       }},
+      {"discard after a stop",
+       [](auto&, TestClient& client) {
+         client.request("discardRecordingWithHandler");
+         client.stop();
+         client.request("discardRecordingWithHandler");
+       }},
+      {"a resume with another's window",
+       [](auto&, TestClient& client) {
+         client.request("pauseRecording");
+         client.request("resumeRecordingWithWindowLayerContextID", {Value(uint32_t{77})});
+       }},
+      {"stop in a pause",
+       [](auto&, TestClient& client) {
+         client.request("pauseRecording");
+         client.stop();
+       }},
+      {"disconnection", [](auto&, TestClient& client) { client.disconnect(); }},
+      {"two stops",
+       [](auto&, TestClient& client) {
+         client.stop();
+         client.stop();
+       }},
+      {"another start",
+       [](TransactionsTest& t, TestClient&) {
+         auto other = t.chat();
+         other.start();
+         EXPECT_EQ(t.openTransactions(), 1);
+         other.stop();
+       }},
+      {"a start of its own",
+       [](TransactionsTest& t, TestClient& client) {
+         client.start();
+         EXPECT_EQ(t.openTransactions(), 1);
+         client.stop();
+       }},
+      {"preemption and stop",
+       [](TransactionsTest& t, TestClient& client) {
+         auto& controller = t.device_.screen.last();
+         controller.delegate.lock()->screenCaptureControllerWasPreempted(controller);
+         client.stop();
+       }},
+      {"purge", [](TransactionsTest& t, TestClient&) { t.device_.purgeableSpace.callbacks.purge(1, 3); }},
+      {"layout",
+       [](TransactionsTest& t, TestClient&) {
+         t.showLayout({0, 0});
+         t.showLayout({0, 0});
+       }},
+      {"shutdown", [](TransactionsTest& t, TestClient&) { t.manager_->shutDown([] {}); }},
+  };
+  return cases;
+}
+
+TEST_F(TransactionsTest, ARefusedStartLeavesNoneOpen) {
+  for (const Case& refusal : refusals()) {
+    auto client = game();
+    refusal.run(*this, client);
+    device_.run();
+    EXPECT_EQ(openTransactions(), 0) << refusal.name;
+    EXPECT_FALSE(monitor_->isObserved) << refusal.name;
+  }
+}
+
+TEST_F(TransactionsTest, EveryEndOfARecordingClosesItsOwn) {
+  suppressAlert();
+  for (const bool capture : {false, true}) {
+    for (const bool hasFrame : {true, false}) {
+      for (const Case& end : ends()) {
+        const std::string name = end.name + (capture ? " of a capture" : "") + (hasFrame ? "" : " without a frame");
+        auto client = game();
+        const int begun = device_.keepAlive.begun;
+        EXPECT_EQ(client.start({.capture = capture})->code(), 0) << name;
+        EXPECT_EQ(openTransactions(), 1) << name;
+        EXPECT_TRUE(monitor_->isObserved) << name;
+        if (hasFrame) sendFrame(kSecond);
+        end.run(*this, client);
+        device_.run();
+        EXPECT_EQ(openTransactions(), 0) << name;
+        EXPECT_FALSE(monitor_->isObserved) << name;
+        EXPECT_GT(device_.keepAlive.begun, begun);
+      }
+    }
+  }
+}
+
+TEST_F(TransactionsTest, ALongSleepEndsASystemRecordingAShortOneDoesNot) {
+  const auto handlers = handlersOfDeviceSleep(manager_);
+  auto system = systemUI();
+  system.start({.width = 1920, .height = 1080, .system = true});
+  EXPECT_FALSE(monitor_->isObserved) << "the whole screen may be divided as it likes";
+  sendFrame(kSecond);
+  const auto sleep = [&](std::chrono::seconds time) {
+    auto hold = std::make_shared<int>();
+    const std::weak_ptr<int> held = hold;
+    handlers.willSleep(std::move(hold));
+    EXPECT_FALSE(held.expired()) << "the device waits for the manager";
+    device_.run();
+    EXPECT_TRUE(held.expired());
+    handlers.didWake(time);
+    device_.run();
+  };
+  sleep(std::chrono::seconds(30));
+  EXPECT_TRUE(system.isRecording());
+  sleep(std::chrono::hours(8));
+  EXPECT_FALSE(system.isRecording());
+  EXPECT_EQ(system.takeEnds(), std::vector<int64_t>{errorcode::kInterrupted});
+  EXPECT_EQ(device_.photoLibrary.stored.size(), 1u);
+  EXPECT_EQ(openTransactions(), 0);
+}
+
+}  // namespace
+}  // namespace qv

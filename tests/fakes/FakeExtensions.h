@@ -1,0 +1,152 @@
+#pragma once
+
+#include <algorithm>
+#include <map>
+#include <memory>
+#include <string>
+#include <utility>
+#include <vector>
+
+#include "extensions/QVBroadcastProtocols.h"
+#include "platform/Extensions.h"
+#include "tests/fakes/FakeIPC.h"
+
+namespace qv::fakes {
+
+/// Installed extensions and the requests that they got; the test is the extension.
+///
+/// Threading: for a test in one thread.
+class FakeExtensionService final : public platform::ExtensionService {
+ public:
+  struct Request {
+    platform::ExtensionRecordRef extension;
+    std::vector<platform::ExtensionItem> items;
+    platform::ExtensionRequestHandlers handlers;
+    [[nodiscard]] platform::Value value(const std::string& title) const {
+      for (const auto& item : items) {
+        if (item.attributedTitle == title) return item.attachments.at(0).value;
+      }
+      return {};
+    }
+  };
+
+  explicit FakeExtensionService(platform::Executor& executor) : executor_(executor) {}
+
+  void extensionsMatchingAttributes(
+      const platform::Dictionary& attributes,
+      std::function<void(const std::vector<platform::ExtensionRecordRef>&, const std::optional<platform::Error>&)>
+          completion) override {
+    const std::string point = platform::valueForKey(attributes, platform::extensioninfo::kPointIdentifier).asString();
+    std::vector<platform::ExtensionRecordRef> found;
+    for (const auto& extension : installed) {
+      if (extension->extensionPointIdentifier == point) found.push_back(extension);
+    }
+    executor_.post([completion = std::move(completion), found, error = queryError] { completion(found, error); });
+  }
+  void setHostContextClass(const std::string& point,
+                           std::function<std::shared_ptr<platform::ExtensionHostContext>()> make) override {
+    hostContexts[point] = std::move(make);
+  }
+  void beginExtensionRequest(const platform::ExtensionRecordRef& extension, std::vector<platform::ExtensionItem> items,
+                             platform::ExtensionRequestHandlers handlers) override {
+    requests.push_back({extension, std::move(items), std::move(handlers)});
+    const auto id = requests.size();
+    executor_.post([began = requests.back().handlers.began, id, error = launchError] { began(id, error); });
+  }
+  std::shared_ptr<platform::ExtensionHostContext> contextForRequest(platform::ExtensionRequestID) override {
+    return nullptr;
+  }
+  std::shared_ptr<platform::IPCConnection> auxiliaryConnectionForRequest(platform::ExtensionRequestID) override {
+    return vendor;
+  }
+  void killExtension(const platform::ExtensionRecordRef& extension, int) override {
+    killed.push_back(extension->identifier);
+  }
+  std::optional<std::string> issueSandboxToken(const std::string& tokenClass, const std::string& path,
+                                               const platform::ExtensionRecordRef&) override {
+    if (refusesTokens) return std::nullopt;
+    return tokenClass + " for " + path;
+  }
+  void revokeSandboxToken(const std::string& token) override { revoked.push_back(token); }
+
+  /// Ends a request, counted from 0.
+  void complete(size_t index, platform::Result<std::vector<platform::ExtensionItem>> returned) {
+    executor_.post(
+        [completed = requests.at(index).handlers.completed, index, returned] { completed(index + 1, returned); });
+  }
+  platform::ExtensionRecordRef install(const std::string& identifier, const std::string& point,
+                                       const std::string& processMode = {}) {
+    using platform::Value;
+    auto record = std::make_shared<platform::ExtensionRecord>();
+    record->identifier = identifier;
+    record->extensionPointIdentifier = point;
+    const platform::Dictionary section{{broadcastpoint::kProcessMode, Value(processMode)}};
+    record->infoDictionary = {{platform::extensioninfo::kSection, Value(section)}};
+    installed.push_back(record);
+    return record;
+  }
+
+  std::vector<platform::ExtensionRecordRef> installed;
+  std::vector<Request> requests;
+  std::vector<std::string> killed, revoked;
+  std::map<std::string, std::function<std::shared_ptr<platform::ExtensionHostContext>()>> hostContexts;
+  std::shared_ptr<platform::IPCConnection> vendor;
+  std::optional<platform::Error> queryError, launchError;
+  bool refusesTokens = false;
+
+ private:
+  platform::Executor& executor_;
+};
+
+/// A broadcast extension's own process, as the daemon sees it: takes the endpoint, connects, answers payloads.
+class FakeBroadcastExtension {
+ public:
+  FakeBroadcastExtension(FakeIPCService& ipc, FakeExtensionService& service, platform::Executor& executor) : ipc_(ipc) {
+    auto mail = std::make_shared<FakeIPCMail>();
+    auto [daemon, extension] = FakeIPCConnection::makePair(executor, mail, {}, {}, false);
+    daemon->setRemoteInterface(extensionVendorProtocol());
+    daemon->resume();
+    vendorEnd_ = extension;
+    vendorEnd_->setExportedInterface(extensionVendorProtocol(), vendor);
+    vendorEnd_->resume();
+    service.vendor = daemon;
+  }
+  /// Connects to the endpoint that it was given. Payloads are answered at once while `answers`.
+  void connect() {
+    auto call = vendor->takeCall();
+    connect(platform::ListenerEndpoint(*call.arguments.at(0).getIf<platform::SharedFileDescriptor>()));
+    call.reply({});
+  }
+  void connect(const platform::ListenerEndpoint& endpoint) { serve(*ipc_.connect(endpoint)); }
+  void serve(std::shared_ptr<platform::IPCConnection> to) {
+    connection = std::move(to);
+    connection->setRemoteInterface(broadcastDaemonProtocol());
+    connection->setExportedInterface(broadcastExtensionProtocol(), payloads);
+    connection->resume();
+  }
+  void call(const char* member, platform::IPCArguments arguments = {}) {
+    connection->call(member, std::move(arguments), nullptr, nullptr);
+  }
+
+  bool answers = true;
+  const std::shared_ptr<RecordingExportedObject> vendor = std::make_shared<RecordingExportedObject>();
+  /// The payloads' descriptors are let go with the calls.
+  std::vector<platform::Dictionary> received;
+  std::vector<platform::IPCReply> unanswered;
+  const std::shared_ptr<RecordingExportedObject> payloads =
+      std::make_shared<RecordingExportedObject>([this](const RecordingExportedObject::ReceivedCall& payload) {
+        received.push_back(payload.arguments.at(0).asDictionary());
+        if (answers) {
+          payload.reply({});
+        } else {
+          unanswered.push_back(payload.reply);
+        }
+      });
+  std::shared_ptr<platform::IPCConnection> connection;
+
+ private:
+  FakeIPCService& ipc_;
+  std::shared_ptr<FakeIPCConnection> vendorEnd_;
+};
+
+}  // namespace qv::fakes

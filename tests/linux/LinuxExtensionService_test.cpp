@@ -1,0 +1,239 @@
+#include "platform/linux/LinuxExtensionService.h"
+
+#include <gtest/gtest.h>
+#include <signal.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <cerrno>
+
+#include "platform/Executor.h"
+#include "platform/linux/ICULocalization.h"
+#include "platform/linux/JSONPreferenceStore.h"
+#include "tests/fakes/LogRecorder.h"
+#include "tests/fakes/ManualTimers.h"
+#include "tests/linux/TemporaryRoot.h"
+#include "tests/sdbus/SdBusTest.h"
+
+namespace qv::platform {
+namespace {
+
+constexpr const char kPoint[] = "com.tarnwick.broadcast-services-upload";
+constexpr const char kReadOnly[] = "com.tarnwick.quorveld.read-only";
+const std::string kUploadBundle = "/Applications/Game/PlugIns/Upload";
+
+std::string infoOf(const std::string& identifier, const std::string& executable = "bin/up") {
+  return R"({"CFBundleIdentifier":")" + identifier + R"(","CFBundleName":"Upload","QVExtension":{
+      "QVExtensionPointIdentifier":")" +
+         kPoint + R"(","QVExtensionExecutable":")" + executable +
+         R"(","QVExtensionIcons":["icon.png","../../up"],
+      "QVExtensionAttributes":{"QVExtensionActivationRule":{"x":true}}}})";
+}
+
+class TestContext final : public ExtensionHostContext {
+ public:
+  const IPCInterface& _extensionAuxiliaryHostProtocol() const override { return extensionRequestHostProtocol(); }
+  const IPCInterface& _extensionAuxiliaryVendorProtocol() const override { return extensionRequestProtocol(); }
+  void didConnectToVendor(const std::shared_ptr<IPCConnection>& to) override { vendor = to; }
+  std::weak_ptr<IPCConnection> vendor;
+};
+
+/// One request as its owner sees it.
+struct Flow {
+  test::Events<std::pair<ExtensionRequestID, int64_t>> began;  ///< and its error's code
+  test::Events<std::string> completed;                         ///< the first item's title, or the error
+};
+
+class LinuxExtensionServiceTest : public ::testing::Test {
+ protected:
+  explicit LinuxExtensionServiceTest(bool alwaysAnotherUser = false)
+      : service_(
+            ipc_, bundles_, timers_, globalQueue(),
+            {.deviceRoot = root_.path(), .launcherPath = EXTENSION_LAUNCHER, .alwaysAnotherUser = alwaysAnotherUser}) {
+    ::chmod(root_.path().c_str(), 0755);
+    install(kUploadBundle, "com.example.game.upload");
+  }
+  void install(const std::string& bundle, const std::string& identifier) {
+    root_.write(bundle + "/Info.json", infoOf(identifier));
+    std::filesystem::create_directories(root_.path(bundle + "/bin"));
+    std::filesystem::copy_file(TEST_EXTENSION, root_.path(bundle + "/bin/up"));
+  }
+  std::vector<ExtensionRecordRef> find(const Dictionary& attributes = {{extensioninfo::kPointIdentifier, kPoint}}) {
+    test::Events<std::vector<ExtensionRecordRef>> found;
+    service_.extensionsMatchingAttributes(
+        attributes, [&](const std::vector<ExtensionRecordRef>& records, const auto&) { found.add(records); });
+    return found.next();
+  }
+  std::shared_ptr<Flow> begin(const std::string& command, const std::string& argument = {}) {
+    return beginOn(extension_ ? extension_ : extension_ = find().at(0), command, argument);
+  }
+  std::shared_ptr<Flow> beginOn(const ExtensionRecordRef& extension, const std::string& command,
+                                const std::string& argument) {
+    const auto flow = std::make_shared<Flow>();
+    service_.beginExtensionRequest(extension, {{command, {{kGenericDataType, Value(argument)}}}},
+                                   {.began =
+                                        [flow](auto id, const auto& error) {
+                                          flow->began.add({id, error ? error->code : 0});
+                                        },
+                                    .completed =
+                                        [flow](auto, const auto& items) {
+                                          flow->completed.add(items ? items.value().at(0).attributedTitle
+                                                                    : "error " + std::to_string(items.error().code));
+                                        }});
+    return flow;
+  }
+  std::string run(const std::string& command, const std::string& argument = {}) {
+    const auto flow = begin(command, argument);
+    EXPECT_EQ(flow->began.next().second, 0)
+        << root_.read("/private/var/mobile/Containers/com.example.game.upload/stderr.log");
+    return flow->completed.next();
+  }
+  static std::string failure(int code) { return "error " + std::to_string(code); }
+
+  TemporaryRoot root_;
+  JSONPreferenceStore preferences_{root_.path()};
+  ICULocalization localization_{preferences_};
+  LinuxBundleService bundles_{root_.path(), "", localization_};
+  SdBusIPCService ipc_;
+  fakes::ManualTimers timers_;
+  ExtensionRecordRef extension_;
+  LinuxExtensionService service_;
+};
+
+TEST_F(LinuxExtensionServiceTest, FindsWhatIsInstalledAndLeavesOutWhatIsBroken) {
+  root_.write(kUploadBundle + "/Resources/en.lproj/InfoPlist.json", R"({"CFBundleDisplayName":"Send it"})");
+  root_.write(kUploadBundle + "/Resources/icon.png", "\x89PNG\r\n\x1a\nrest");
+  root_.write("/Applications/A/Info.json", "this is no manifest");
+  root_.write("/Applications/B/Info.json", R"({"CFBundleIdentifier":"b","QVExtension":"no dictionary"})");
+  root_.write("/Applications/C/Info.json", infoOf("c", "../../../usr/bin/true"));
+  root_.write("/Applications/D/Info.json", infoOf("d"));
+  std::filesystem::create_directories(root_.path("/Applications/D/bin"));
+  std::filesystem::create_symlink("/usr/bin/true", root_.path("/Applications/D/bin/up"));
+  install("/System/Applications/Other", "com.example.other");
+  install("/System/Applications/Twice", "com.example.other");
+  const fakes::LogRecorder log;
+
+  const auto found = find();
+  ASSERT_EQ(found.size(), 2u);
+  EXPECT_EQ(found[0]->identifier, "com.example.game.upload");
+  EXPECT_EQ(found[0]->displayName, "Send it");
+  EXPECT_EQ(found[0]->icons.size(), 1u);
+  EXPECT_EQ(found[0]->bundlePath, root_.path(kUploadBundle));
+  EXPECT_NE(platform::find(found[0]->attributes.at(extensioninfo::kActivationRule).asDictionary(), "x"), nullptr);
+  EXPECT_EQ(found[1]->bundlePath, root_.path("/System/Applications/Other"));
+  EXPECT_TRUE(found[1]->icons.empty());
+  EXPECT_EQ(log.countContaining("is left out: "), 6u) << "B, C, D, Twice, and an icon of two";
+  EXPECT_TRUE(find({{extensioninfo::kPointIdentifier, "another.point"}}).empty());
+}
+
+TEST_F(LinuxExtensionServiceTest, CompletesEachRequestWithItsOwnItems) {
+  service_.setHostContextClass(kPoint, [] { return std::make_shared<TestContext>(); });
+  const auto held = begin("hold");
+  const auto [id, error] = held->began.next();
+  ASSERT_EQ(error, 0);
+  const auto context = std::dynamic_pointer_cast<TestContext>(service_.contextForRequest(id));
+  ASSERT_NE(context, nullptr);
+  EXPECT_EQ(context->vendor.lock(), service_.auxiliaryConnectionForRequest(id));
+  EXPECT_EQ(run("echo", "second"), "second");
+  EXPECT_TRUE(held->completed.isEmpty());
+  const fakes::LogRecorder log;
+  EXPECT_EQ(run("flood"), failure(EMSGSIZE));
+  EXPECT_EQ(log.countContaining("which it does not have"), 16u);
+  EXPECT_EQ(run("release"), "ok");
+  EXPECT_EQ(held->completed.next(), "released");
+  EXPECT_EQ(held->began.count() + held->completed.count(), 0u);
+}
+
+TEST_F(LinuxExtensionServiceTest, LosesOnlyTheRequestsOfAProcessThatDies) {
+  const auto held = begin("hold");
+  const auto id = held->began.next().first;
+  const auto crashing = begin("crash");
+  EXPECT_EQ(crashing->began.next().second, ECONNRESET);
+  EXPECT_EQ(held->completed.next(), failure(ECONNRESET));
+
+  const auto second = begin("hold");
+  EXPECT_GT(second->began.next().first, id) << "a new process";
+  service_.killExtension(extension_, SIGKILL);
+  EXPECT_EQ(run("echo", "third process"), "third process");
+  EXPECT_EQ(second->completed.next(), failure(ECONNRESET));
+}
+
+TEST_F(LinuxExtensionServiceTest, GivesUpOnAnExtensionThatDoesNotAnswer) {
+  const auto held = begin("hold");
+  held->began.next();
+  const auto hanging = begin("hang");
+  EXPECT_EQ(held->completed.next(), "hanging") << "the extension has the second request";
+  timers_.advance(std::chrono::seconds(10));
+  EXPECT_EQ(hanging->began.next().second, ETIMEDOUT);
+  const fakes::LogRecorder log;
+  EXPECT_EQ(run("echo", "again"), "again");
+
+  std::filesystem::remove(root_.path(kUploadBundle + "/bin/up"));
+  service_.killExtension(extension_, SIGKILL);
+  EXPECT_EQ(begin("echo")->began.next().second, ENOEXEC);
+}
+
+/// The same rules hold for both ways of confinement.
+class ConfinementTest : public LinuxExtensionServiceTest, public ::testing::WithParamInterface<bool> {
+ protected:
+  ConfinementTest() : LinuxExtensionServiceTest(GetParam()) {}
+  bool isRefused(const std::string& command, const std::string& argument) {
+    const std::string answer = run(command, argument);
+    return answer == "errno " + std::to_string(EACCES) || answer == "errno " + std::to_string(ENOENT) ||
+           answer == "errno " + std::to_string(EPERM);
+  }
+};
+
+TEST_P(ConfinementTest, ReachesItsContainerTheNetworkAndNothingElse) {
+  if (GetParam() && ::geteuid() != 0) GTEST_SKIP() << "another user takes root";
+  const std::string data = "/private/var/mobile";
+  EXPECT_EQ(run("write home", "kept"), "ok");
+  EXPECT_TRUE(root_.exists(data + "/Containers/com.example.game.upload/kept"));
+  EXPECT_EQ(run("network socket"), "ok");
+  EXPECT_EQ(run("user") != std::to_string(::getuid()), GetParam());
+  const std::string movie = root_.write(data + "/Library/Quorvel/movie.mp4", "secret");
+  for (const std::string& path :
+       {movie, root_.write(data + "/Media/Movies/old.mp4", "secret"),
+        root_.write(data + "/Containers/com.example.other/token", "secret"), root_.path("/Applications/Game"),
+        std::string("/etc/shadow"), "/proc/" + std::to_string(::getpid()) + "/environ"}) {
+    EXPECT_TRUE(isRefused("read", path)) << path;
+  }
+  EXPECT_TRUE(isRefused("local socket", ""));
+  EXPECT_TRUE(isRefused("fork", ""));
+  EXPECT_TRUE(isRefused("signal", std::to_string(::getpid())));
+  EXPECT_EQ(run("environment", "TMPDIR"), "set");
+  EXPECT_EQ(run("environment", "PWD"), "unset");
+}
+
+TEST_P(ConfinementTest, OpensOneFileByItsTokenOnce) {
+  if (GetParam() && ::geteuid() != 0) GTEST_SKIP() << "another user takes root";
+  install("/System/Applications/Other", "com.example.other");
+  const auto extensions = find();
+  extension_ = extensions.at(0);
+  const std::string clip = root_.write("/private/var/mobile/Library/Quorvel/clip.mp4", "frames");
+  std::filesystem::create_symlink(clip, clip + ".link");
+  EXPECT_FALSE(service_.issueSandboxToken(kReadOnly, clip + ".link", extension_));
+  EXPECT_FALSE(service_.issueSandboxToken(kReadOnly, root_.path("/private"), extension_));
+  EXPECT_FALSE(service_.issueSandboxToken("another.class", clip, extension_));
+
+  const auto token = service_.issueSandboxToken(kReadOnly, clip, extension_).value();
+  const auto foreign = beginOn(extensions.at(1), "open token", token);
+  EXPECT_EQ(foreign->completed.next(), kNoSuchFileErrorName) << "another extension's";
+  root_.write("/private/var/mobile/Library/Quorvel/other", "swapped");
+  std::filesystem::rename(root_.path("/private/var/mobile/Library/Quorvel/other"), clip);
+  EXPECT_EQ(run("open token", token), "frames");
+  EXPECT_EQ(run("open token", token), kNoSuchFileErrorName) << "used";
+
+  const auto revoked = service_.issueSandboxToken(kReadOnly, clip, extension_).value();
+  service_.revokeSandboxToken(revoked);
+  EXPECT_EQ(run("open token", revoked), kNoSuchFileErrorName);
+  const auto unused = service_.issueSandboxToken(kReadOnly, clip, extension_).value();
+  EXPECT_EQ(run("echo", unused), unused);
+  EXPECT_EQ(run("open token", unused), kNoSuchFileErrorName) << "ended with its request";
+}
+
+INSTANTIATE_TEST_SUITE_P(Users, ConfinementTest, ::testing::Bool(),
+                         [](const auto& which) { return which.param ? "Another" : "Same"; });
+
+}  // namespace
+}  // namespace qv::platform

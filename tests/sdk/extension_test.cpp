@@ -1,0 +1,354 @@
+#include <gtest/gtest.h>
+#include <sys/mman.h>
+#include <unistd.h>
+
+#include <cstring>
+#include <future>
+#include <thread>
+
+#include "extensions/QVBroadcastConfiguration.h"
+#include "extensions/QVBroadcastProtocols.h"
+#include "extensions/QVSharedFrameObject.h"
+#include "platform/SampleBuffer.h"
+#include "platform/sdbus/SdBusIPC.h"
+#include "sdk/extension/ExtensionProcess.h"
+#include "sdk/extension/ListenerBroadcasts.h"
+#include "tests/fakes/FakeIPC.h"
+
+namespace qv::extension {
+namespace {
+
+using fakes::RecordingExportedObject;
+using platform::Array;
+using platform::Data;
+using platform::Dictionary;
+using platform::ExtensionItem;
+using platform::IPCArguments;
+using platform::IPCConnection;
+using platform::MediaTime;
+using platform::Value;
+using namespace std::chrono_literals;
+
+template <typename T>
+T valueOf(std::future<T> future) {
+  // A time that only a hang reaches.
+  if (future.wait_for(30s) != std::future_status::ready) throw std::runtime_error("nothing came");
+  return future.get();
+}
+
+template <typename T>
+Data bytesOf(const T& record) {
+  Data bytes(sizeof(T));
+  std::memcpy(bytes.data(), &record, sizeof(T));
+  return bytes;
+}
+
+Data timingAt(int64_t milliseconds) {
+  return bytesOf(platform::SampleTimingInfo{MediaTime::invalid(), MediaTime::make(milliseconds, 1000), {}});
+}
+
+/// A listener of the host's, with the one connection that came.
+class Accepting : public platform::IPCListenerDelegate {
+ public:
+  Accepting(platform::IPCService& ipc, const platform::IPCInterface& exported, const platform::IPCInterface& remote)
+      : exported_(exported), remote_(remote), listener_(ipc.createAnonymousListener()) {
+    listener_->setDelegate(this, queue_);
+    EXPECT_FALSE(listener_->resume());
+  }
+  ~Accepting() override { listener_->invalidate(); }
+  [[nodiscard]] platform::ListenerEndpoint endpoint() const { return listener_->endpoint(); }
+  IPCConnection& connection() {
+    if (!connection_) connection_ = valueOf(accepted_.get_future());
+    return *connection_;
+  }
+  /// Calls and waits: the reply, or nothing for an error.
+  std::optional<IPCArguments> call(const char* member, IPCArguments arguments) {
+    std::promise<std::optional<IPCArguments>> answered;
+    connection().call(
+        member, std::move(arguments), [&](const IPCArguments& reply) { answered.set_value(reply); },
+        [&](const platform::Error&) { answered.set_value(std::nullopt); });
+    return valueOf(answered.get_future());
+  }
+
+  const std::shared_ptr<RecordingExportedObject> calls = std::make_shared<RecordingExportedObject>();
+
+ private:
+  bool listenerShouldAcceptNewConnection(platform::IPCListener&,
+                                         const std::shared_ptr<IPCConnection>& connection) override {
+    connection->setExportedInterface(exported_, calls);
+    connection->setRemoteInterface(remote_);
+    connection->resume();
+    accepted_.set_value(connection);
+    return true;
+  }
+
+  const platform::IPCInterface& exported_;
+  const platform::IPCInterface& remote_;
+  platform::SerialQueue queue_{"test host"};
+  std::promise<std::shared_ptr<IPCConnection>> accepted_;
+  std::shared_ptr<IPCConnection> connection_;
+  const std::unique_ptr<platform::IPCListener> listener_;
+};
+
+/// Writes down what it is told. It is read when a call has been answered.
+struct Diary {
+  std::vector<std::string> words;
+  std::optional<quorvel::VideoFrame> frame;
+  std::optional<quorvel::AudioSample> sound;
+  quorvel::Broadcast* broadcast = nullptr;
+  std::promise<void> gone;
+};
+
+class Author final : public quorvel::SampleExtension {
+ public:
+  Author(Diary& diary, quorvel::Broadcast& broadcast) : diary_(diary) { diary_.broadcast = &broadcast; }
+  ~Author() override { diary_.gone.set_value(); }
+  void started(quorvel::Dictionary userInfo) override {
+    say("started " + std::get<std::string>(userInfo.at("url").content));
+  }
+  void paused() override { say("paused"); }
+  void resumed() override { say("resumed"); }
+  void finished() override { say("finished"); }
+  void processVideo(quorvel::VideoFrame frame, quorvel::Orientation orientation) override {
+    say("video " + std::to_string(static_cast<int>(orientation)));
+    diary_.frame = std::move(frame);
+  }
+  void processAudio(quorvel::AudioSample sample) override {
+    say("audio");
+    diary_.sound = std::move(sample);
+  }
+  void frontmostApplication(std::string bundleID) override { say("front " + bundleID); }
+
+ private:
+  void say(std::string word) { diary_.words.push_back(std::move(word)); }
+  Diary& diary_;
+};
+
+quorvel::SampleExtensionFactory authorWith(Diary& diary) {
+  return [&diary](quorvel::Broadcast& broadcast) { return std::make_unique<Author>(diary, broadcast); };
+}
+
+Dictionary videoPayload(platform::SharedFrameRef frame) {
+  return {{broadcastpayload::kVideoOrientation, Value(uint32_t{6})},
+          {broadcastpayload::kSampleType, Value(int64_t{1})},
+          {broadcastpayload::kSharedFrame, QVSharedFrameObject(std::move(frame)).encodeForIPC()},
+          {broadcastpayload::kTimingInfo, Value(timingAt(500))}};
+}
+
+Dictionary audioPayload(int64_t numSamples) {
+  const platform::AudioStreamDescription format{
+      44100, platform::kAudioFormatLinearPCM, platform::kAudioFormatFlagIsSignedInteger, 2, 1, 2, 1, 16, 0};
+  return {{broadcastpayload::kSampleType, Value(int64_t{3})},
+          {broadcastpayload::kAudioBufferList, Value(Data{1, 2, 3, 4})},
+          {broadcastpayload::kAudioFormatDescription, Value(bytesOf(format))},
+          {broadcastpayload::kTimingInfo, Value(timingAt(250))},
+          {broadcastpayload::kNumSamples, Value(numSamples)}};
+}
+
+/// The library's process over the real messaging, with a host of the test's in this process.
+class ExtensionLibrary : public ::testing::Test {
+ protected:
+  void launch(ExtensionProcess::Factory make) {
+    process_ = ExtensionProcess::create(ipc_, std::move(make));
+    const auto error = process_->start({requests_.endpoint(), auxiliary_.endpoint()});
+    ASSERT_FALSE(error) << error->description();
+  }
+  ~ExtensionLibrary() override {
+    if (process_) {
+      EXPECT_TRUE(process_->finish(30s));
+    }
+  }
+  [[nodiscard]] static Value items(std::vector<ExtensionItem> items) { return valueOfExtensionItems(items); }
+  void beginClip(uint64_t request, const std::string& token, bool isLast) {
+    const auto item = [](const char* title, Value value) {
+      return ExtensionItem{title, {{platform::kGenericDataType, std::move(value)}}};
+    };
+    EXPECT_TRUE(requests_.call(
+        "beginRequest",
+        {request,
+         items({item(broadcastitem::kRequestedFinish, isLast ? "1" : "0"), item(broadcastitem::kSandboxToken, token),
+                item(broadcastitem::kUserInfo, Dictionary{{"url", "u"}}),
+                item(broadcastitem::kMovieClipURL, "file:///x/QVMovie_" + token + "_1.mp4")})}));
+  }
+
+  platform::SdBusIPCService ipc_;
+  Accepting requests_{ipc_, platform::extensionRequestHostProtocol(), platform::extensionRequestProtocol()};
+  Accepting auxiliary_{ipc_, extensionHostProtocol(), extensionVendorProtocol()};
+  std::shared_ptr<ExtensionProcess> process_;
+};
+
+TEST_F(ExtensionLibrary, TakesSamplesAndTellsOfItsService) {
+  Diary diary;
+  launch(authorWith(diary));
+  EXPECT_TRUE(requests_.call("beginRequest", {uint64_t{7}, items({ExtensionItem{}})}));
+  Accepting daemon(ipc_, broadcastDaemonProtocol(), broadcastExtensionProtocol());
+  ASSERT_TRUE(auxiliary_.call("setEndpoint", {daemon.endpoint().rendezvous()}));
+  EXPECT_EQ(daemon.calls->takeCall().member, "ping");
+
+  const auto send = [&](Dictionary payload) { EXPECT_TRUE(daemon.call("processPayload", {std::move(payload)})); };
+  send({{broadcastpayload::kActionType, int64_t{1}}, {broadcastpayload::kUserInfo, Dictionary{{"url", "rtmp://x"}}}});
+  send({{broadcastpayload::kFrontmostApp, "com.example.game"}});
+  auto pixels = *platform::SharedFrame::create({4, 4, 16, platform::PixelFormat::BGRX});
+  std::memset(pixels->mutableBytes().data(), 0x55, 64);
+  std::promise<void> returned;
+  std::shared_ptr<void> hold(nullptr, [&](void*) { returned.set_value(); });
+  send(videoPayload(platform::SharedFrame::withAttachment(std::move(pixels), std::move(hold))));
+  send(audioPayload(2));
+  // Malformed ones are answered all the same, or the daemon would wait for them.
+  send(audioPayload(3));
+  send({{broadcastpayload::kSampleType, int64_t{1}}});
+  send({{broadcastpayload::kActionType, int64_t{9}}});
+  send({});
+  EXPECT_EQ(diary.words, (std::vector<std::string>{"started rtmp://x", "front com.example.game", "video 6", "audio"}));
+  ASSERT_TRUE(diary.frame && diary.sound);
+  EXPECT_EQ(diary.frame->pixels[63], 0x55);
+  EXPECT_EQ(diary.frame->presentationTime, 500ms);
+  EXPECT_EQ(diary.sound->source, quorvel::AudioSample::Source::Microphone);
+  EXPECT_EQ(diary.sound->presentationTime, 250ms);
+  diary.frame.reset();
+  valueOf(returned.get_future());  // the daemon may use the memory again
+
+  diary.broadcast->updateServiceInfo({{"viewers", {int64_t{3}}}});
+  EXPECT_EQ(daemon.calls->takeCall().arguments[0], Value(Dictionary{{"viewers", int64_t{3}}}));
+  diary.broadcast->updateBroadcastURL("https://x/watch");
+  EXPECT_EQ(daemon.calls->takeCall().arguments[0].asString(), "https://x/watch");
+  diary.broadcast->finishBroadcastWithError({-7, "", "no", "d"});
+  const auto error = platform::decodeError(daemon.calls->takeCall().arguments[0].asDictionary());
+  ASSERT_TRUE(error);
+  EXPECT_EQ(error->code, -7);
+  EXPECT_EQ(error->localizedDescription(), "no");
+
+  daemon.connection().invalidate();
+  valueOf(diary.gone.get_future());
+  requests_.connection().invalidate();
+  process_->waitForHost();
+}
+
+TEST_F(ExtensionLibrary, AnEndpointWhoseOwnerHasGoneIsRefused) {
+  Diary diary;
+  launch(authorWith(diary));
+  auto endpoint = Accepting(ipc_, broadcastDaemonProtocol(), broadcastExtensionProtocol()).endpoint();
+  const bool isTaken = auxiliary_.call("setEndpoint", {endpoint.rendezvous()}).has_value();
+  // Whether the loss is seen at once or by the connection, no author's object stays.
+  if (isTaken) valueOf(diary.gone.get_future());
+  EXPECT_TRUE(diary.words.empty());
+}
+
+/// Keeps what it is given until the test ends it.
+class Editor final : public quorvel::ClipExtension {
+ public:
+  struct Work {
+    quorvel::Clip clip;
+    quorvel::ClipCompletion done;
+  };
+  struct Desk {
+    std::mutex mutex;
+    std::condition_variable changed;
+    std::vector<Work> works;
+    Work take() {
+      std::unique_lock lock(mutex);
+      EXPECT_TRUE(changed.wait_for(lock, 30s, [&] { return !works.empty(); }));
+      Work work = std::move(works.front());
+      works.erase(works.begin());
+      return work;
+    }
+  };
+  explicit Editor(Desk& desk) : desk_(desk) {}
+  void processClip(quorvel::Clip clip, quorvel::ClipCompletion done) override {
+    std::lock_guard lock(desk_.mutex);
+    desk_.works.push_back({std::move(clip), std::move(done)});
+    desk_.changed.notify_all();
+  }
+
+ private:
+  Desk& desk_;
+};
+
+platform::SharedFileDescriptor fileWith(const std::string& text) {
+  platform::FileDescriptor file(::memfd_create("clip", MFD_CLOEXEC));
+  EXPECT_EQ(::pwrite(file.get(), text.data(), text.size(), 0), ssize_t(text.size()));
+  return platform::shareFileDescriptor(std::move(file));
+}
+
+TEST_F(ExtensionLibrary, OverlappingClipsKeepTheirOrderAndTheirAnswers) {
+  Editor::Desk desk;
+  launch(quorvel::ClipExtensionFactory([&] { return std::make_unique<Editor>(desk); }));
+  beginClip(1, "one", false);
+  beginClip(2, "two", true);
+  beginClip(3, "bad", false);
+  auto first = requests_.calls->takeCall();
+  auto second = requests_.calls->takeCall();
+  auto third = requests_.calls->takeCall();
+  EXPECT_EQ(first.member, "openFile");
+  EXPECT_EQ(first.arguments[0], Value("one"));
+  third.reply.fail(platform::kNoSuchFileErrorName, "no such token");
+  second.reply({fileWith("2")});  // the later file comes first
+  first.reply({fileWith("1")});
+
+  Editor::Work one = desk.take(), two = desk.take();
+  char text = 0;
+  EXPECT_EQ(::read(one.clip.file, &text, 1), 1);
+  EXPECT_EQ(text, '1');
+  EXPECT_EQ(one.clip.name, "QVMovie_one_1.mp4");
+  EXPECT_FALSE(one.clip.isLast);
+  EXPECT_TRUE(two.clip.isLast);
+  EXPECT_EQ(std::get<std::string>(two.clip.userInfo.at("url").content), "u");
+
+  const auto unreadable = requests_.calls->takeCall();
+  EXPECT_EQ(unreadable.arguments[0], Value(uint64_t{3})) << "completed by itself";
+  two.done({.configuration = quorvel::BroadcastConfiguration{2.5},
+            .serviceInfo = quorvel::Dictionary{{"state", {std::string("live")}}}});
+  two.done({});  // once is enough
+  const auto answer = requests_.calls->takeCall();
+  EXPECT_EQ(answer.member, "completeRequest");
+  EXPECT_EQ(answer.arguments[0], Value(uint64_t{2}));
+  const auto returned = platform::extensionItemsOfValue(answer.arguments[1]);
+  ASSERT_EQ(returned.size(), 2u);
+  EXPECT_EQ(returned[0].attributedTitle, broadcastitem::kBroadcastConfiguration);
+  EXPECT_EQ(QVBroadcastConfiguration::decode(returned[0].attachments[0].value.asData())->clipDuration, 2.5);
+  EXPECT_EQ(returned[1].attachments[0].value, Value(Dictionary{{"state", "live"}}));
+  one.done = nullptr;  // forgotten
+  EXPECT_EQ(requests_.calls->takeCall().arguments[0], Value(uint64_t{1}));
+}
+
+TEST_F(ExtensionLibrary, AListenerTakesBroadcastsWithoutALaunch) {
+  Diary diary;
+  auto listener = ListenerBroadcasts::create(std::make_unique<platform::SdBusIPCService>(), authorWith(diary),
+                                             platform::systemClock());
+  ASSERT_TRUE(listener);
+  platform::FileDescriptor endpoint(::dup(listener->endpoint()));
+  auto connection = ipc_.connect(platform::ListenerEndpoint(platform::shareFileDescriptor(std::move(endpoint))));
+  ASSERT_TRUE(connection);
+  (*connection)->setRemoteInterface(broadcastExtensionProtocol());
+  (*connection)->resume();
+  std::promise<void> answered;
+  (*connection)
+      ->call("processPayload", {Dictionary{{broadcastpayload::kActionType, int64_t{4}}}},
+             [&](const IPCArguments&) { answered.set_value(); }, {});
+  valueOf(answered.get_future());
+  EXPECT_EQ(diary.words, std::vector<std::string>{"finished"});
+  listener.reset();
+  valueOf(diary.gone.get_future());
+}
+
+TEST(PauseTimeline, PutsSoundWhereThePicturesOfItsTimeAre) {
+  PauseTimeline timeline;
+  EXPECT_EQ(timeline.place(900ms), 900ms) << "before any picture";
+  timeline.notePicture(1000ms, 1007ms);
+  timeline.notePicture(1033ms, 1037ms);  // 4 ms on the way at the least
+  timeline.paused(1050ms);
+  timeline.resumed(3050ms);
+  EXPECT_EQ(timeline.place(3100ms), 1087ms) << "until a picture tells better";
+  timeline.notePicture(1033ms, 3070ms);  // captured 3061 or so
+  timeline.notePicture(1066ms, 3098ms);  // captured 3094: the pause was 2028 ms
+  EXPECT_EQ(timeline.place(3128ms), 1100ms);
+  EXPECT_EQ(timeline.place(1040ms), 1040ms) << "captured before the pause, delivered after it";
+  EXPECT_EQ(timeline.place(2000ms), std::nullopt) << "within the pause";
+  timeline.paused(3200ms);
+  timeline.resumed(4200ms);
+  timeline.notePicture(1100ms, 4132ms + 28ms + 4ms);
+  EXPECT_EQ(timeline.place(4200ms), 1140ms);
+}
+
+}  // namespace
+}  // namespace qv::extension

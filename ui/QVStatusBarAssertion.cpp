@@ -1,0 +1,55 @@
+#include "ui/QVStatusBarAssertion.h"
+
+#include <chrono>
+#include <cstdio>
+
+#include "platform/Platform.h"
+#include "ui/LocalizedTexts.h"
+
+namespace qv {
+
+using platform::Platform;
+
+namespace {
+constexpr std::chrono::milliseconds kTick{500};
+constexpr double kLongest = 1e12;  // seconds; more is no time that anybody sees
+}  // namespace
+
+void QVStatusBarAssertion::showDoubleHeightStatusBarWithPid(int32_t) {}
+void QVStatusBarAssertion::invalidateDoubleHeightStatusBar() {}
+void QVStatusBarAssertion::updateDoubleHeightStatusBarWithDuration(double, bool) {}
+void QVStatusBarAssertion::updateStatusStringWithTimer(platform::TimerHandle&) {}
+
+void QVStatusBarAssertion::startRepeatingTimer() {
+  Platform::current().mainQueue->async(weak_from_this(), [](QVStatusBarAssertion& self) {
+    self.timerStartDate_ = Platform::current().clock->now();
+    self.timer_.reset();
+    // A tick that was queued before a new start finds that its timer has gone.
+    auto timer = std::make_shared<std::weak_ptr<platform::TimerHandle>>();
+    self.timer_ = Platform::current().timers->every(kTick, [weak = self.weak_from_this(), timer] {
+      Platform::current().mainQueue->async(weak, [timer](QVStatusBarAssertion& ticked) {
+        const auto current = timer->lock();
+        if (current && current == ticked.timer_) ticked.updateStatusStringWithTimer(*current);
+      });
+    });
+    *timer = self.timer_;
+  });
+}
+
+std::string QVStatusBarAssertion::stringWithTimeInterval(double seconds) {
+  const auto whole = seconds > 0 && seconds < kLongest ? static_cast<long long>(seconds) : 0;
+  const bool hasHours = whole >= 3600;
+  const long long large = hasHours ? whole / 3600 : whole / 60;
+  const long long small = hasHours ? whole / 60 % 60 : whole % 60;
+  char text[32];
+  std::snprintf(text, sizeof text, "%lld:%02lld", large, small);
+  return text;
+}
+
+std::string QVStatusBarAssertion::qvLocalizedRecordingDuration(double, bool isPaused) const {
+  if (!broadcasting) return localizedText(isPaused ? "RECORDING_PAUSED_STATUS_BAR" : "RECORDING_STATUS_BAR");
+  return formatted(localizedText(isPaused ? "BROADCASTING_PAUSED_STATUS_BAR_FORMAT" : "BROADCASTING_STATUS_BAR_FORMAT"),
+                   broadcastServiceName);
+}
+
+}  // namespace qv
