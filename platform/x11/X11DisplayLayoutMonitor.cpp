@@ -79,8 +79,9 @@ void X11DisplayLayoutMonitor::watchOnce() {
     sleep(false, std::chrono::steady_clock::now() + kReconnectInterval);
     return;
   }
-  if (!lookAt_ && drainEvents()) lookAt_ = std::chrono::steady_clock::now() + kSettling;
   if (lookAt_ && std::chrono::steady_clock::now() >= *lookAt_) look();
+  // After the look: an event that came in beside its replies does not wake the poll any more.
+  if (!lookAt_ && drainEvents()) lookAt_ = std::chrono::steady_clock::now() + kSettling;
   if (connection_->isLost()) {
     QV_LOG_INFO(logs::kPlatform, "display layout: the X server has gone");
     connection_.reset();
