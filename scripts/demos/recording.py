@@ -70,8 +70,10 @@ def ensure_display(directory):
     if not number:
         sys.exit("demo: Xvfb did not start")
     os.environ["DISPLAY"] = ":" + number
-    start(["openbox", "--sm-disable"], stdout=log, stderr=log)
-    wait_until("the window manager", lambda: quiet(["xdotool", "get_num_desktops"]))
+    # What openbox is sent while it comes up may wait long. The command runs when it is up.
+    manager = start(["openbox", "--sm-disable", "--startup", "echo up"], stdout=subprocess.PIPE, stderr=log)
+    if not any(line == b"up\n" for line in manager.stdout):
+        sys.exit("demo: the window manager did not come up")
     print(f"display: Xvfb {os.environ['DISPLAY']} with openbox")
 
 

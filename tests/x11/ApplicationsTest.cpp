@@ -150,13 +150,12 @@ TEST_F(ApplicationsTest, ReportsChangesWithoutWindowManager) {
 }
 
 TEST_F(ApplicationsTest, FollowsTheWindowManager) {
-  if (!hasProgram("openbox") || !hasProgram("xdotool")) GTEST_SKIP() << "openbox or xdotool is not installed";
+  if (!WindowManager::isInstalled() || !hasProgram("xdotool")) GTEST_SKIP() << "openbox or xdotool is not installed";
   XServer own;
   open(own.display());
   auto game = launch(kGame), film = launch(kFilm);
   watch();  // the film is the topmost: only the game's coming to the front is certain to be a change
-  ChildProcess manager({"openbox", "--sm-disable"}, {"DISPLAY=" + display_});
-  const auto managerWindow = client_->waitForWindowManager();
+  WindowManager manager(display_);
   const auto activate = [&](const WindowProcess& process) { ASSERT_TRUE(activateWindow(display_, process.window())); };
   activate(*game);
   ASSERT_TRUE(recorder_.waitForFront(kGame));
@@ -172,8 +171,7 @@ TEST_F(ApplicationsTest, FollowsTheWindowManager) {
   activate(*film);
   ASSERT_TRUE(recorder_.waitForFront(kFilm));
   monitor_->setHandler({});
-  manager.kill();
-  client_->waitForEnd(managerWindow);  // its properties stay behind, and say that the film is active
+  manager.kill();  // its properties stay behind, and say that the film is active
   client_->raise(game->window());
   client_->focus(game->window());
   EXPECT_EQ(frontmost(), kGame);

@@ -65,14 +65,16 @@ class DisplayLayoutTest : public XServerTest, public ::testing::WithParamInterfa
   void SetUp() override {
     XServerTest::SetUp();
     if (IsSkipped()) return;
-    if (GetParam() && !hasProgram("openbox")) GTEST_SKIP() << "openbox is not installed";
+    if (GetParam() && !WindowManager::isInstalled()) GTEST_SKIP() << "openbox is not installed";
     client_ = std::make_unique<XClient>(server_.display());
-    if (GetParam()) {
-      const std::vector<std::string> environment{"DISPLAY=" + server_.display()};
-      manager_ = std::make_unique<ChildProcess>(std::vector<std::string>{"openbox", "--sm-disable"}, environment);
-      client_->waitForWindowManager();
-    }
-    platform_ = std::move(X11Platform::connect(server_.display(), {}).value());
+    if (GetParam()) manager_ = std::make_unique<WindowManager>(server_.display());
+    X11Dependencies dependencies;
+    dependencies.bundleIdentifierOfProcess = [this](pid_t) -> std::optional<std::string> {
+      std::lock_guard lock(lookMutex_);
+      if (auto duringLook = std::exchange(duringNextLook_, nullptr)) duringLook();
+      return std::nullopt;
+    };
+    platform_ = std::move(X11Platform::connect(server_.display(), std::move(dependencies)).value());
     monitor_ = platform_->createLayoutMonitor();
   }
   void place(const WindowProcess& process, int16_t x, uint16_t width) {
@@ -86,12 +88,20 @@ class DisplayLayoutTest : public XServerTest, public ::testing::WithParamInterfa
     while (log_.countContaining("display layout: observed") == before) std::this_thread::yield();
   }
 
+  /// Runs in the middle of the monitor's next look at the windows.
+  void duringNextLook(std::function<void()> change) {
+    std::lock_guard lock(lookMutex_);
+    duringNextLook_ = std::move(change);
+  }
+
   static constexpr uint16_t kHalf = XServer::kWidth / 2;
   fakes::LogRecorder log_;
   XServer server_;
   std::unique_ptr<XClient> client_;
-  std::unique_ptr<ChildProcess> manager_;
+  std::unique_ptr<WindowManager> manager_;
   std::unique_ptr<X11Platform> platform_;
+  std::mutex lookMutex_;
+  std::function<void()> duringNextLook_;  // guarded by lookMutex_
   std::shared_ptr<DisplayLayoutMonitor> monitor_;
 };
 INSTANTIATE_TEST_SUITE_P(, DisplayLayoutTest, ::testing::Bool(),
@@ -124,6 +134,20 @@ TEST_P(DisplayLayoutTest, OnlyADivisionOfTheScreenIsReported) {
   observe(observer);
   film->kill();
   EXPECT_EQ(observer->next(), std::vector<int64_t>{0});
+}
+
+TEST_P(DisplayLayoutTest, AChangeDuringALookIsSeen) {
+  const WindowProcess game(server_.display()), film(server_.display());
+  place(game, 0, XServer::kWidth);
+  client_->raise(game.window());
+  const auto observer = std::make_shared<Observer>();
+  observe(observer);
+  duringNextLook([&] {
+    place(game, 0, kHalf);
+    place(film, kHalf, kHalf);
+  });
+  client_->raise(film.window());
+  EXPECT_EQ(observer->next(), (std::vector<int64_t>{0, 0}));
 }
 
 }  // namespace

@@ -82,12 +82,11 @@ TEST_F(UserAlertTest, GivesTheKeyboardBack) {
 }
 
 TEST_F(UserAlertTest, TakesAndReturnsTheKeyboardUnderAWindowManager) {
-  if (!hasProgram("openbox")) GTEST_SKIP() << "openbox is not installed";
+  if (!WindowManager::isInstalled()) GTEST_SKIP() << "openbox is not installed";
   XServer own;
   open(own.display());
   const WindowProcess game(display_);
-  ChildProcess manager({"openbox", "--sm-disable"}, {"DISPLAY=" + display_});
-  user_->waitForWindowManager();
+  WindowManager manager(display_);
   ASSERT_TRUE(activateWindow(display_, game.window()));
   user_->waitForFocus(game.window());
   press({"a"});  // the user is busy with it

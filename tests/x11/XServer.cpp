@@ -11,6 +11,7 @@
 #include <cstring>
 #include <sstream>
 #include <stdexcept>
+#include <utility>
 
 extern char** environ;
 
@@ -63,6 +64,39 @@ int ChildProcess::wait() {
   return WIFEXITED(status) ? WEXITSTATUS(status) : -1;
 }
 
+OutputPipe::OutputPipe() {
+  if (::pipe2(ends_, O_CLOEXEC) != 0) throw std::runtime_error("pipe");
+}
+
+OutputPipe::~OutputPipe() {
+  ::close(ends_[0]);
+  closeWriteEnd();
+}
+
+void OutputPipe::closeWriteEnd() {
+  if (ends_[1] >= 0) ::close(std::exchange(ends_[1], -1));
+}
+
+std::string OutputPipe::read(size_t size) {
+  closeWriteEnd();
+  std::string bytes;
+  bytes.resize(size);
+  size_t length = 0;
+  while (length < size) {
+    const ssize_t got = ::read(ends_[0], bytes.data() + length, size - length);
+    if (got <= 0) break;
+    length += static_cast<size_t>(got);
+  }
+  bytes.resize(length);
+  return bytes;
+}
+
+std::string OutputPipe::readLine() {
+  std::string line;
+  for (std::string next = read(1); !next.empty() && next != "\n"; next = read(1)) line += next;
+  return line;
+}
+
 bool hasProgram(const std::string& name) {
   std::istringstream directories(std::getenv("PATH"));
   for (std::string directory; std::getline(directories, directory, ':');)
@@ -71,24 +105,14 @@ bool hasProgram(const std::string& name) {
 }
 
 XServer::XServer() {
-  int ends[2];
-  if (::pipe2(ends, O_CLOEXEC) != 0) throw std::runtime_error("pipe");
-  process_ =
-      std::make_unique<ChildProcess>(std::vector<std::string>{"Xvfb", "-displayfd", std::to_string(ends[1]), "-screen",
-                                                              "0", "640x480x24", "-nolisten", "tcp", "-noreset"},
-                                     std::vector<std::string>{}, ends[1]);
-  ::close(ends[1]);
-  char number[32] = {};
-  size_t length = 0;
-  while (length < sizeof number - 1) {
-    const ssize_t got = ::read(ends[0], number + length, sizeof number - 1 - length);
-    if (got <= 0) break;
-    length += static_cast<size_t>(got);
-    if (number[length - 1] == '\n') break;
-  }
-  ::close(ends[0]);
-  if (length == 0) throw std::runtime_error("the X server did not start");
-  display_ = ":" + std::string(number, length - 1);
+  OutputPipe output;
+  process_ = std::make_unique<ChildProcess>(
+      std::vector<std::string>{"Xvfb", "-displayfd", std::to_string(output.writeEnd()), "-screen", "0", "640x480x24",
+                               "-nolisten", "tcp", "-noreset"},
+      std::vector<std::string>{}, output.writeEnd());
+  const std::string number = output.readLine();
+  if (number.empty()) throw std::runtime_error("the X server did not start");
+  display_ = ":" + number;
 }
 
 XClient::XClient(const std::string& display) : connection_(xcb_connect(display.c_str(), nullptr)) {
@@ -193,17 +217,6 @@ xcb_window_t XClient::focused() {
   return window;
 }
 
-bool XClient::hasProperty(xcb_window_t window, const char* name) {
-  auto* atom = xcb_intern_atom_reply(
-      connection_, xcb_intern_atom(connection_, 0, static_cast<uint16_t>(std::strlen(name)), name), nullptr);
-  auto* reply = xcb_get_property_reply(
-      connection_, xcb_get_property(connection_, 0, window, atom->atom, XCB_ATOM_ANY, 0, 0), nullptr);
-  const bool isSet = reply != nullptr && reply->type != XCB_ATOM_NONE;
-  std::free(reply);
-  std::free(atom);
-  return isSet;
-}
-
 std::string XClient::property(xcb_window_t window, const char* name) {
   auto* atom = xcb_intern_atom_reply(
       connection_, xcb_intern_atom(connection_, 0, static_cast<uint16_t>(std::strlen(name)), name), nullptr);
@@ -226,17 +239,6 @@ void XClient::waitForEvent() {
 
 void XClient::select(xcb_window_t window, uint32_t mask) {
   xcb_change_window_attributes(connection_, window, XCB_CW_EVENT_MASK, &mask);
-}
-
-xcb_window_t XClient::waitForWindowManager() {
-  // The list of its clients is the last that it publishes. openbox overlooks a window that asks to be shown while
-  // it comes up; one that is shown before it starts, or after this, it manages.
-  select(screen_->root, XCB_EVENT_MASK_PROPERTY_CHANGE);
-  while (!hasProperty(screen_->root, "_NET_CLIENT_LIST_STACKING")) waitForEvent();
-  const std::string check = property(screen_->root, "_NET_SUPPORTING_WM_CHECK");
-  xcb_window_t window = XCB_NONE;
-  if (check.size() == sizeof window) std::memcpy(&window, check.data(), sizeof window);
-  return window;
 }
 
 void XClient::waitForEnd(xcb_window_t window) {
@@ -285,15 +287,32 @@ bool activateWindow(const std::string& display, xcb_window_t window) {
   return request.wait() == 0;
 }
 
+WindowManager::WindowManager(const std::string& display) : client_(display) {
+  // The command runs as the last thing before its main loop.
+  process_ = std::make_unique<ChildProcess>(std::vector<std::string>{"openbox", "--sm-disable", "--startup", "echo up"},
+                                            std::vector<std::string>{"DISPLAY=" + display}, -1, output_.writeEnd());
+  std::string line;  // it writes messages as well
+  do {
+    line = output_.readLine();
+    if (line.empty()) throw std::runtime_error("the window manager did not start");
+  } while (line != "up");
+  const std::string check = client_.property(client_.root(), "_NET_SUPPORTING_WM_CHECK");
+  if (check.size() == sizeof window_) std::memcpy(&window_, check.data(), sizeof window_);
+}
+
+void WindowManager::kill() {
+  process_->kill();
+  client_.waitForEnd(window_);
+}
+
 WindowProcess::WindowProcess(const std::string& display) {
-  int ends[2];
-  if (::pipe2(ends, O_CLOEXEC) != 0) throw std::runtime_error("pipe");
+  OutputPipe output;
   process_ = std::make_unique<ChildProcess>(std::vector<std::string>{X11_TEST_WINDOW_PROGRAM, display},
-                                            std::vector<std::string>{}, -1, ends[1]);
+                                            std::vector<std::string>{}, -1, output.writeEnd());
   pid_ = process_->pid();
-  ::close(ends[1]);
-  if (::read(ends[0], &window_, sizeof window_) != sizeof window_) throw std::runtime_error("no window");
-  ::close(ends[0]);
+  const std::string id = output.read(sizeof window_);
+  if (id.size() != sizeof window_) throw std::runtime_error("no window");
+  std::memcpy(&window_, id.data(), sizeof window_);
 }
 
 void XServerTest::SetUpTestSuite() {

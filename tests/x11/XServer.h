@@ -35,6 +35,25 @@ class ChildProcess {
   pid_t pid_ = -1;
 };
 
+/// A pipe for what a child process writes.
+class OutputPipe {
+ public:
+  OutputPipe();
+  ~OutputPipe();
+  OutputPipe(const OutputPipe&) = delete;
+  OutputPipe& operator=(const OutputPipe&) = delete;
+  /// For the child; closed here with the first reading.
+  [[nodiscard]] int writeEnd() const { return ends_[1]; }
+  /// As many bytes; fewer where the child ended before.
+  std::string read(size_t size);
+  /// Up to the end of a line, without it.
+  std::string readLine();
+
+ private:
+  void closeWriteEnd();
+  int ends_[2];
+};
+
 bool hasProgram(const std::string& name);
 
 /// An X server without hardware, 640 x 480.
@@ -79,10 +98,10 @@ class XClient {
   void focus(xcb_window_t window);
   /// The window that has the keyboard focus.
   [[nodiscard]] xcb_window_t focused();
-  /// Returns when a window manager manages windows; the window that stands for it.
-  xcb_window_t waitForWindowManager();
   /// Returns when the window exists no more.
   void waitForEnd(xcb_window_t window);
+  /// A property of text or plain bytes; empty where the window has none.
+  std::string property(xcb_window_t window, const char* name);
   /// Returns when a window of this title, or one within it, has the focus.
   xcb_window_t waitForFocusedWindow(const std::string& title);
   /// Returns when this window, or one within it, has the focus.
@@ -98,11 +117,25 @@ class XClient {
   void selectFocusEvents();
   xcb_window_t waitForFocus(const std::function<bool(xcb_window_t)>& isWanted);
   xcb_window_t parentOf(xcb_window_t window);
-  bool hasProperty(xcb_window_t window, const char* name);
-  std::string property(xcb_window_t window, const char* name);
 
   xcb_connection_t* connection_;
   xcb_screen_t* screen_;
+};
+
+/// A window manager (openbox) on a display, that is up when the constructor returns. It takes no notice of what it is
+/// sent while it comes up until something else wakes it.
+class WindowManager {
+ public:
+  static bool isInstalled() { return hasProgram("openbox"); }
+  explicit WindowManager(const std::string& display);
+  /// Returns when it and its windows are gone.
+  void kill();
+
+ private:
+  XClient client_;
+  OutputPipe output_;
+  std::unique_ptr<ChildProcess> process_;
+  xcb_window_t window_ = XCB_NONE;
 };
 
 /// Lets the window manager activate a window, and waits until it has.
