@@ -15,20 +15,18 @@ namespace qv::platform::mp4 {
 namespace {
 
 struct OpenMovie {
-  FileDescriptor fd;
+  std::unique_ptr<DiskMovieFile> file;
   uint64_t size = 0;
 };
 
 /// EWOULDBLOCK where a writer has it. Not every file system has locks: without them nothing is in use.
 Result<OpenMovie> openMovie(const std::string& path, int access, int lock) {
-  OpenMovie movie;
-  movie.fd.reset(::open(path.c_str(), access | O_CLOEXEC | O_NOFOLLOW | O_NONBLOCK));
+  FileDescriptor fd(::open(path.c_str(), access | O_CLOEXEC | O_NOFOLLOW | O_NONBLOCK));
   struct stat info {};
-  if (!movie.fd.isValid() || ::fstat(movie.fd.get(), &info) != 0) return Error::posix(errno, path);
+  if (!fd.isValid() || ::fstat(fd.get(), &info) != 0) return Error::posix(errno, path);
   if (!S_ISREG(info.st_mode)) return Error::posix(EINVAL, path);
-  if (::flock(movie.fd.get(), lock | LOCK_NB) != 0 && errno == EWOULDBLOCK) return Error::posix(EWOULDBLOCK, path);
-  movie.size = static_cast<uint64_t>(info.st_size);
-  return movie;
+  if (::flock(fd.get(), lock | LOCK_NB) != 0 && errno == EWOULDBLOCK) return Error::posix(EWOULDBLOCK, path);
+  return OpenMovie{std::make_unique<DiskMovieFile>(std::move(fd)), static_cast<uint64_t>(info.st_size)};
 }
 
 }  // namespace
@@ -37,7 +35,7 @@ Result<MovieState> MP4MovieSalvage::stateOfMovie(const std::string& path) {
   const auto movie = openMovie(path, O_RDONLY, LOCK_SH);
   if (!movie && movie.error().code == EWOULDBLOCK) return MovieState::InUse;
   if (!movie) return movie.error();
-  const auto isFinished = isFinishedMovie(FileBoxes(movie.value().fd.get(), movie.value().size));
+  const auto isFinished = isFinishedMovie(FileBoxes(movie.value().file->fd(), movie.value().size));
   if (!isFinished) return isFinished.error();
   return isFinished.value() ? MovieState::Finished : MovieState::Unfinished;
 }
@@ -45,7 +43,7 @@ Result<MovieState> MP4MovieSalvage::stateOfMovie(const std::string& path) {
 Result<MediaTime> MP4MovieSalvage::salvageMovie(const std::string& path) {
   auto movie = openMovie(path, O_RDWR, LOCK_EX);
   if (!movie) return movie.error();
-  const FileBoxes boxes(movie->fd.get(), movie->size);
+  const FileBoxes boxes(movie->file->fd(), movie->size);
   const auto isFinished = isFinishedMovie(boxes);
   if (!isFinished) return isFinished.error();
   if (isFinished.value()) return MediaTime::invalid();
@@ -54,9 +52,8 @@ Result<MediaTime> MP4MovieSalvage::salvageMovie(const std::string& path) {
   if (!remains->hasPicture()) return MediaTime::zero();
 
   const uint64_t end = remains->end;
-  auto file = std::make_unique<DiskMovieFile>(std::move(movie->fd));
-  MovieFile& disk = *file;
-  MovieWriter writer(std::move(file), std::move(remains->tracks), MovieWriter::Layout::Fragmented);
+  MovieFile& disk = *movie->file;
+  MovieWriter writer(std::move(movie->file), std::move(remains->tracks), MovieWriter::Layout::Fragmented);
   writer.adopt(remains->placeholder, end, std::move(remains->index));
   const auto length = static_cast<int64_t>(writer.movieDuration({}));
   if (length == 0) return MediaTime::zero();

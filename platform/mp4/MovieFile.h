@@ -36,7 +36,11 @@ class DiskMovieFile final : public MovieFile {
   /// A new file; EEXIST where there is one already. It is locked (flock) until it is closed.
   static Result<std::unique_ptr<MovieFile>> create(const std::string& path);
   explicit DiskMovieFile(FileDescriptor fd) : fd_(std::move(fd)) {}
+  /// Gives the lock back, rather than to leave that to the last close: whoever lists the descriptors of this process
+  /// holds each of them for a moment.
+  ~DiskMovieFile() override;
 
+  [[nodiscard]] int fd() const { return fd_.get(); }
   int64_t writeAt(std::span<const uint8_t> bytes, uint64_t offset) override;
   int truncate(uint64_t size) override;
   int sync() override;
