@@ -5,6 +5,7 @@ import mmap
 import os
 import signal
 import struct
+from fractions import Fraction
 
 import dbus
 import dbus.connection
@@ -25,9 +26,9 @@ glib = ctypes.CDLL(ctypes.util.find_library('glib-2.0'))
 
 
 def times(timing):
-    """Duration, presentation and decode time in seconds, None where invalid."""
+    """Duration, presentation and decode time in seconds, exactly; None where invalid."""
     def seconds(value, timescale, flags, _epoch):
-        return value / timescale if flags & 1 else None
+        return Fraction(value, timescale) if flags & 1 else None
     return [seconds(*fields) for fields in struct.iter_unpack('=qiIq', bytes(timing))]
 
 
