@@ -105,9 +105,9 @@ def main():
             before, _ = processes.resident_kilobytes(stage.daemon.pid)
             admissions = [crowd.add() for _ in range(options.clients)]
             after, _ = processes.resident_kilobytes(stage.daemon.pid)
-            idle = processes.wake_ups(stage.daemon.pid)
+            before_idle = processes.wake_ups(stage.daemon.pid)
             time.sleep(3)
-            idle = processes.wake_ups(stage.daemon.pid) - idle
+            idle = processes.woken_since(before_idle, stage.daemon.pid)
             queries, finished = query_beside_recording(stage, crowd)
         finally:
             crowd.end()

@@ -140,7 +140,7 @@ class Bench:
             round_, stop = self.record(game, mode)
             idle = processes.wake_ups(self.stage.daemon.pid)
             self.x11grab(mode, round_)
-            self.woken_beside_game = processes.wake_ups(self.stage.daemon.pid) - idle
+            self.woken_beside_game = processes.woken_since(idle, self.stage.daemon.pid)
             round_.bare = self.bare(mode)
             results.append(round_)
             stops.append(stop)
@@ -232,7 +232,7 @@ def progress(text):
 def idle(pid, seconds):
     before = processes.wake_ups(pid)
     time.sleep(seconds)
-    return (*processes.resident_kilobytes(pid), processes.wake_ups(pid) - before)
+    return (*processes.resident_kilobytes(pid), processes.woken_since(before, pid))
 
 
 def main():

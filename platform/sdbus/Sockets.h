@@ -40,7 +40,7 @@ std::optional<FileDescriptor> acceptFrom(int rendezvous);
 IPCPeer peerOf(int socket);
 
 /// Lets this process have as many descriptors as it may ask for by itself, at most 65536: each
-/// client takes two.
+/// client takes two. To be called before there are clients: it may hold the process up for some milliseconds.
 void raiseDescriptorLimit();
 
 }  // namespace qv::platform::sdbus

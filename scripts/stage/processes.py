@@ -107,9 +107,14 @@ def children(pid):
 
 
 def wake_ups(pid):
-    """How often threads of the process went to sleep, so were woken, since it began."""
-    return sum(int(line.split()[1]) for *_, status in _tasks(pid) for line in status.splitlines()
-               if line.startswith("voluntary_ctxt_switches"))
+    """{thread id: how often it went to sleep, so was woken, since it began}"""
+    return {task: int(line.split()[1]) for task, _, _, status in _tasks(pid) for line in status.splitlines()
+            if line.startswith("voluntary_ctxt_switches")}
+
+
+def woken_since(before, pid):
+    """Of all threads together. The last ones of a thread that ended since are not known."""
+    return sum(count - before.get(task, 0) for task, count in wake_ups(pid).items())
 
 
 def resident_kilobytes(pid):
