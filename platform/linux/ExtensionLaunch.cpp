@@ -60,19 +60,20 @@ std::string installedExtensionLauncher() {
   return fs::exists(directory / kLauncher, error) ? directory / kLauncher : directory / "../lib/quorveld" / kLauncher;
 }
 
-Result<LaunchRequest> makeExtensionLaunch(const ExtensionRecord& extension, const ExtensionLaunchOptions& options,
-                                          const ListenerEndpoint& requests, const ListenerEndpoint& auxiliary) {
+Result<SpawnRequest> makeExtensionLaunch(const ExtensionRecord& extension, const ExtensionLaunchOptions& options,
+                                         const ListenerEndpoint& requests, const ListenerEndpoint& auxiliary) {
   if (!isSafeFileStem(extension.identifier)) return Error::posix(EINVAL, extension.identifier);
   const std::string dataDirectory = options.deviceRoot + kDataDirectory;
   const std::string container = dataDirectory + kContainers + "/" + extension.identifier;
   if (auto error = makeContainer(container)) return *error;
-  LaunchRequest launch;
+  SpawnRequest launch;
   launch.program = options.launcherPath;
   launch.arguments = {std::to_string(::getpid()), dataDirectory, extension.bundlePath, container,
                       extension.executablePath};
   if (options.alwaysAnotherUser) launch.arguments.emplace_back("another-user");
   launch.environment = makeEnvironment(container);
   launch.output = openOutput(container);
+  launch.joinsErrors = true;
   launch.descriptors = {requests.rendezvous(), auxiliary.rendezvous()};
   return launch;
 }

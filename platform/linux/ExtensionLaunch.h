@@ -4,7 +4,7 @@
 
 #include "platform/Extensions.h"
 #include "platform/Result.h"
-#include "platform/linux/LaunchedProcess.h"
+#include "platform/SpawnedProcess.h"
 
 namespace qv::platform {
 
@@ -22,10 +22,10 @@ struct ExtensionLaunchOptions {
 /// Makes the extension's container where there is none yet, `<device root>/private/var/mobile/Containers/<identifier>`,
 /// and puts together its launch: confinement, a minimal environment, its output in "stderr.log" of its container, and
 /// the two endpoints. Blocking.
-[[nodiscard]] Result<LaunchRequest> makeExtensionLaunch(const ExtensionRecord& extension,
-                                                        const ExtensionLaunchOptions& options,
-                                                        const ListenerEndpoint& requests,
-                                                        const ListenerEndpoint& auxiliary);
+[[nodiscard]] Result<SpawnRequest> makeExtensionLaunch(const ExtensionRecord& extension,
+                                                       const ExtensionLaunchOptions& options,
+                                                       const ListenerEndpoint& requests,
+                                                       const ListenerEndpoint& auxiliary);
 
 /// What the end of an extension's process was, for the log and for the requests that it ends.
 [[nodiscard]] Error errorOfExtensionEnd(const std::string& identifier, int status);

@@ -9,6 +9,7 @@
 
 #include "platform/SerialQueue.h"
 #include "platform/linux/ExtensionHost.h"
+#include "platform/linux/LaunchedProcess.h"
 
 namespace qv::platform {
 

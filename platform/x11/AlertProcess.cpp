@@ -1,11 +1,6 @@
 #include "platform/x11/AlertProcess.h"
 
 #include <fcntl.h>
-#include <poll.h>
-#include <signal.h>
-#include <spawn.h>
-#include <sys/syscall.h>
-#include <sys/wait.h>
 #include <unistd.h>
 
 #include <algorithm>
@@ -50,41 +45,6 @@ std::vector<std::string> childEnvironment(const std::string& display) {
   return variables;
 }
 
-std::vector<char*> pointersTo(std::vector<std::string>& strings) {
-  std::vector<char*> pointers;
-  for (auto& string : strings) pointers.push_back(string.data());
-  pointers.push_back(nullptr);
-  return pointers;
-}
-
-class SpawnSettings {
- public:
-  explicit SpawnSettings(int outputFd) {
-    posix_spawn_file_actions_init(&actions);
-    posix_spawn_file_actions_addopen(&actions, STDIN_FILENO, "/dev/null", O_RDONLY, 0);
-    posix_spawn_file_actions_adddup2(&actions, outputFd, STDOUT_FILENO);
-    posix_spawn_file_actions_addopen(&actions, STDERR_FILENO, "/dev/null", O_WRONLY, 0);
-    // The daemon blocks and ignores signals; the program must not inherit that. In a process group
-    // of its own a terminal's interrupt does not answer the alert.
-    sigset_t none, all;
-    sigemptyset(&none);
-    sigfillset(&all);
-    posix_spawnattr_init(&attributes);
-    posix_spawnattr_setsigmask(&attributes, &none);
-    posix_spawnattr_setsigdefault(&attributes, &all);
-    posix_spawnattr_setpgroup(&attributes, 0);
-    posix_spawnattr_setflags(&attributes, POSIX_SPAWN_SETSIGMASK | POSIX_SPAWN_SETSIGDEF | POSIX_SPAWN_SETPGROUP);
-  }
-  ~SpawnSettings() {
-    posix_spawnattr_destroy(&attributes);
-    posix_spawn_file_actions_destroy(&actions);
-  }
-  SpawnSettings(const SpawnSettings&) = delete;
-  SpawnSettings& operator=(const SpawnSettings&) = delete;
-  posix_spawn_file_actions_t actions;
-  posix_spawnattr_t attributes;
-};
-
 }  // namespace
 
 std::vector<AlertProcess::Button> AlertProcess::buttonsOf(const UserAlertRequest& request) {
@@ -103,50 +63,21 @@ std::vector<AlertProcess::Button> AlertProcess::buttonsOf(const UserAlertRequest
 Result<AlertProcess> AlertProcess::start(const UserAlertRequest& request, const std::string& display) {
   auto buttons = buttonsOf(request);
   if (buttons.empty()) return Error::posix(EINVAL, "an alert without a button");
-  std::vector<std::string> arguments{kProgram,
-                                     "--question",
-                                     "--switch",
-                                     "--no-markup",
-                                     "--title=" + request.header,
-                                     "--text=" + plainText(request.header + "\n\n" + request.message)};
-  for (const auto& button : buttons) arguments.push_back("--extra-button=" + button.label);
+  SpawnRequest program;
+  program.program = kProgram;
+  program.arguments = {"--question", "--switch", "--no-markup", "--title=" + request.header,
+                       "--text=" + plainText(request.header + "\n\n" + request.message)};
+  for (const auto& button : buttons) program.arguments.push_back("--extra-button=" + button.label);
+  program.environment = childEnvironment(display);
 
   int ends[2];
   if (::pipe2(ends, O_CLOEXEC) != 0) return Error::posix(errno, "pipe2");
-  FileDescriptor output(ends[0]), childOutput(ends[1]);
+  FileDescriptor output(ends[0]);
+  program.output.reset(ends[1]);
   ::fcntl(output.get(), F_SETFL, O_NONBLOCK);
-  const SpawnSettings settings(childOutput.get());
-  auto environment = childEnvironment(display);
-  pid_t pid = -1;
-  const int failure = ::posix_spawnp(&pid, kProgram, &settings.actions, &settings.attributes,
-                                     pointersTo(arguments).data(), pointersTo(environment).data());
-  if (failure != 0) return Error::posix(failure, kProgram);
-  FileDescriptor process(static_cast<int>(::syscall(SYS_pidfd_open, pid, 0)));
-  if (!process.isValid()) {
-    const int reason = errno;
-    ::kill(pid, SIGKILL);
-    ::waitpid(pid, nullptr, 0);
-    return Error::posix(reason, "pidfd_open");
-  }
-  return AlertProcess(pid, std::move(process), std::move(output), std::move(buttons));
-}
-
-AlertProcess::AlertProcess(pid_t pid, FileDescriptor process, FileDescriptor output, std::vector<Button> buttons)
-    : pid_(pid), process_(std::move(process)), output_(std::move(output)), buttons_(std::move(buttons)) {}
-
-AlertProcess::AlertProcess(AlertProcess&& other) noexcept
-    : pid_(other.pid_),
-      process_(std::move(other.process_)),
-      output_(std::move(other.output_)),
-      buttons_(std::move(other.buttons_)),
-      text_(std::move(other.text_)) {}
-
-AlertProcess::~AlertProcess() {
-  if (!process_.isValid()) return;
-  ::syscall(SYS_pidfd_send_signal, process_.get(), SIGKILL, nullptr, 0);
-  siginfo_t info{};
-  while (::waitid(P_PIDFD, static_cast<id_t>(process_.get()), &info, WEXITED) != 0 && errno == EINTR) {
-  }
+  auto process = SpawnedProcess::start(std::move(program));
+  if (!process) return process.error();
+  return AlertProcess(std::move(*process), std::move(output), std::move(buttons));
 }
 
 bool AlertProcess::readOutput() {

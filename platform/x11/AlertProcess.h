@@ -1,13 +1,11 @@
 #pragma once
 
-#include <sys/types.h>
-
 #include <optional>
 #include <string>
+#include <utility>
 #include <vector>
 
-#include "platform/FileDescriptor.h"
-#include "platform/Result.h"
+#include "platform/SpawnedProcess.h"
 #include "platform/UserAlert.h"
 
 namespace qv::platform {
@@ -21,13 +19,10 @@ namespace qv::platform {
 class AlertProcess {
  public:
   static Result<AlertProcess> start(const UserAlertRequest& request, const std::string& display);
-  AlertProcess(AlertProcess&& other) noexcept;
-  AlertProcess& operator=(AlertProcess&&) = delete;
-  ~AlertProcess();
 
-  [[nodiscard]] pid_t pid() const { return pid_; }
+  [[nodiscard]] pid_t pid() const { return process_.processIdentifier(); }
   /// Readable when the program has ended.
-  [[nodiscard]] int endFd() const { return process_.get(); }
+  [[nodiscard]] int endFd() const { return process_.handle(); }
   /// Readable when `readOutput` is due; then until `readOutput` answers false.
   [[nodiscard]] int outputFd() const { return output_.get(); }
   bool readOutput();
@@ -40,10 +35,10 @@ class AlertProcess {
     UserAlertAnswer answer;
   };
   static std::vector<Button> buttonsOf(const UserAlertRequest& request);
-  AlertProcess(pid_t pid, FileDescriptor process, FileDescriptor output, std::vector<Button> buttons);
+  AlertProcess(SpawnedProcess process, FileDescriptor output, std::vector<Button> buttons)
+      : process_(std::move(process)), output_(std::move(output)), buttons_(std::move(buttons)) {}
 
-  pid_t pid_;
-  FileDescriptor process_;
+  SpawnedProcess process_;
   FileDescriptor output_;
   std::vector<Button> buttons_;
   std::string text_;
