@@ -55,6 +55,8 @@ function(qv_sdk_library name)
                       -Wl,--version-script=${map} -Wl,-z,nodelete)
   set_target_properties(${name} PROPERTIES VERSION ${PROJECT_VERSION} SOVERSION ${PROJECT_VERSION_MAJOR}
                         CXX_VISIBILITY_PRESET hidden VISIBILITY_INLINES_HIDDEN ON LINK_DEPENDS ${map})
+  # Relative to the file itself: the prefix is chosen at the installation, and an image has a root of its own.
+  file(RELATIVE_PATH include_from_pc /root/${CMAKE_INSTALL_LIBDIR}/pkgconfig /root/${CMAKE_INSTALL_INCLUDEDIR})
   configure_file(${ARG_PC}.in ${ARG_PC} @ONLY)
   install(TARGETS ${name} LIBRARY DESTINATION ${CMAKE_INSTALL_LIBDIR})
   install(FILES ${ARG_HEADERS} ${PROJECT_SOURCE_DIR}/sdk/common/quorvel/Types.h
