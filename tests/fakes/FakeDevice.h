@@ -27,42 +27,10 @@ inline constexpr const char kStore[] = "/private/var/mobile/Library/Quorvel";
 
 /// A whole device of fakes, installed as the platform while it lives. Work waits until `run`.
 struct FakeDevice {
-  FakeDevice() {
-    platform.clock = &clock;
-    platform.timers = &timers;
-    platform.globalQueue = &executor;
-    platform.backgroundQueue = &executor;
-    platform.mainQueue = &mainQueue;
-    platform.ipc = &ipc;
-    platform.keepAlive = &keepAlive;
-    platform.screenCapture = &screen;
-    platform.deviceCapture = &deviceCapture;
-    platform.appAudioTap = &tap;
-    platform.assetWriter = &movies;
-    platform.exportService = &exports;
-    platform.movieSalvage = &salvage;
-    platform.applications = &applications;
-    platform.renderServer = &applications;
-    platform.userAlerts = &alerts;
-    platform.sounds = &sounds;
-    platform.screenReader = &sounds;
-    platform.fileSystem = &disk;
-    platform.bundles = &bundles;
-    platform.localization = &localization;
-    platform.preferences = &preferences;
-    platform.deviceInfo = &deviceInfo;
-    platform.purgeableSpace = &purgeableSpace;
-    platform.photoLibrary = &photoLibrary;
-    platform.metrics = &metrics;
-    platform.extensions = &extensions;
-    disk.addDirectory(kStore);
-    disk.setFreeSize(1'000'000'000);
-    platform::Platform::install(&platform);
-  }
-  ~FakeDevice() {
-    run();
-    platform::Platform::install(nullptr);
-  }
+  FakeDevice();
+  ~FakeDevice();
+  FakeDevice(const FakeDevice&) = delete;
+  FakeDevice& operator=(const FakeDevice&) = delete;
   void run() { executor.runUntilIdle(); }
 
   LogRecorder log;

@@ -1,0 +1,43 @@
+#include "tests/fakes/FakeDevice.h"
+
+namespace qv::fakes {
+
+FakeDevice::FakeDevice() {
+  platform.clock = &clock;
+  platform.timers = &timers;
+  platform.globalQueue = &executor;
+  platform.backgroundQueue = &executor;
+  platform.mainQueue = &mainQueue;
+  platform.ipc = &ipc;
+  platform.keepAlive = &keepAlive;
+  platform.screenCapture = &screen;
+  platform.deviceCapture = &deviceCapture;
+  platform.appAudioTap = &tap;
+  platform.assetWriter = &movies;
+  platform.exportService = &exports;
+  platform.movieSalvage = &salvage;
+  platform.applications = &applications;
+  platform.renderServer = &applications;
+  platform.userAlerts = &alerts;
+  platform.sounds = &sounds;
+  platform.screenReader = &sounds;
+  platform.fileSystem = &disk;
+  platform.bundles = &bundles;
+  platform.localization = &localization;
+  platform.preferences = &preferences;
+  platform.deviceInfo = &deviceInfo;
+  platform.purgeableSpace = &purgeableSpace;
+  platform.photoLibrary = &photoLibrary;
+  platform.metrics = &metrics;
+  platform.extensions = &extensions;
+  disk.addDirectory(kStore);
+  disk.setFreeSize(1'000'000'000);
+  platform::Platform::install(&platform);
+}
+
+FakeDevice::~FakeDevice() {
+  run();
+  platform::Platform::install(nullptr);
+}
+
+}  // namespace qv::fakes
