@@ -3,8 +3,8 @@
 //   played-host PROGRAM samples SECONDS KEY=VALUE...     a flash and a beep each second, 640x360 at 30 frames/s
 //   played-host PROGRAM clips FILE.mp4,FILE.mp4,... KEY=VALUE...
 //
-// Prints what the extension says. KEY=VALUE become the user information. With PAUSE=SECONDS, the stream pauses for a
-// second at that time.
+// Prints what the extension says. KEY=VALUE become the user information. With the environment's PAUSE=SECONDS,
+// the stream pauses for a second at that time; ORIENTATION=N is the EXIF orientation that the pictures come with.
 
 #include <fcntl.h>
 #include <spawn.h>
@@ -168,7 +168,7 @@ Data timingOf(Time presentation) {
 /// A stream of pictures and sound in real time.
 class Film {
  public:
-  explicit Film(Door& door) : door_(door) {}
+  Film(Door& door, uint32_t orientation) : door_(door), orientation_(orientation) {}
   void play(Time duration, Time pauseAt) {
     start_ = now();
     for (int64_t frame = 0; frame * Time(1s) / kFrameRate < duration; ++frame) {
@@ -198,7 +198,7 @@ class Film {
     const bool isFlash = at % 1s < kFlash;
     for (size_t i = 0; i < pixels.size(); ++i)
       pixels[i] = isFlash ? 0xff : static_cast<uint8_t>(i / 97 + static_cast<size_t>(number) * 3) & 0x3f;
-    send({{broadcastpayload::kVideoOrientation, 1u},
+    send({{broadcastpayload::kVideoOrientation, orientation_},
           {broadcastpayload::kSampleType, int64_t{1}},
           {broadcastpayload::kSharedFrame, QVSharedFrameObject(std::move(picture)).encodeForIPC()},
           {broadcastpayload::kTimingInfo, timingOf(start_ + at)}});
@@ -229,6 +229,7 @@ class Film {
   }
 
   Door& door_;
+  const uint32_t orientation_;
   Time start_{0}, pauses_{0};
   int64_t soundPosition_ = 0;
 };
@@ -246,7 +247,9 @@ void playSamples(IPCService& ipc, const std::shared_ptr<Calls>& calls, Door& req
   act(BroadcastAction::Started);
   const char* pause = std::getenv("PAUSE");
   const auto time = [](double value) { return std::chrono::duration_cast<Time>(std::chrono::duration<double>(value)); };
-  Film(door).play(time(seconds), time(pause ? std::atof(pause) : 0));
+  const char* orientation = std::getenv("ORIENTATION");
+  Film(door, orientation ? static_cast<uint32_t>(std::atoi(orientation)) : 1)
+      .play(time(seconds), time(pause ? std::atof(pause) : 0));
   act(BroadcastAction::Finished);
 }
 
