@@ -21,20 +21,6 @@ CodecParameters parametersOf(const AVCodecContext& context) {
   return parameters;
 }
 
-const char* nameOf(StreamSender::State state) {
-  switch (state) {
-    case StreamSender::State::Connecting:
-      return "connecting";
-    case StreamSender::State::Live:
-      return "live";
-    case StreamSender::State::Reconnecting:
-      return "reconnecting";
-    case StreamSender::State::Failed:
-      break;
-  }
-  return "failed";
-}
-
 quorvel::Value number(uint64_t count) { return {static_cast<int64_t>(count)}; }
 
 }  // namespace
@@ -130,7 +116,7 @@ bool LiveUpload::open(const Picture& first) {
     return false;
   }
   sender_ = std::make_unique<StreamSender>(
-      settings_, StreamSender::Parameters{parametersOf(pictures_->context()), parametersOf(sounds_->context())},
+      settings_, StreamParameters{parametersOf(pictures_->context()), parametersOf(sounds_->context())},
       [this](const StreamSender::Report& state) { report(state); });
   origin_ = first.frame.presentationTime;
   return true;
@@ -166,7 +152,7 @@ void LiveUpload::encodeSound() {
 
 void LiveUpload::report(const StreamSender::Report& report) {
   if (report.state == StreamSender::State::Failed)
-    return fail("The streaming server cannot be reached: " + report.error);
+    return fail("The stream cannot be sent to the server: " + report.error);
   if (report.state == StreamSender::State::Live && !settings_.playbackURL.empty() && !hasToldURL_.exchange(true))
     broadcast_.updateBroadcastURL(settings_.playbackURL);
   broadcast_.updateServiceInfo({{"state", {std::string(nameOf(report.state))}},

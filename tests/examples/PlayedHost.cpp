@@ -5,6 +5,7 @@
 //
 // Prints what the extension says. KEY=VALUE become the user information. With the environment's PAUSE=SECONDS,
 // the stream pauses for a second at that time; ORIENTATION=N is the EXIF orientation that the pictures come with.
+// SIGTERM ends a stream early, in order.
 
 #include <fcntl.h>
 #include <spawn.h>
@@ -13,6 +14,7 @@
 
 #include <cmath>
 #include <condition_variable>
+#include <csignal>
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
@@ -41,8 +43,15 @@ constexpr FrameLayout kLayout{640, 360, 640 * 4, PixelFormat::BGRX};
 constexpr int kFrameRate = 30;
 constexpr auto kFlash = 100ms;
 
+volatile std::sig_atomic_t isToEnd = 0;
+
 std::string textOf(const Value& value) {
   if (const auto* text = value.getIf<std::string>()) return *text;
+  if (value.getIf<Dictionary>() != nullptr) {
+    std::string texts;
+    for (const auto& [key, inner] : value.asDictionary()) texts += textOf(inner);
+    return texts;
+  }
   if (value.getIf<double>() != nullptr) return std::to_string(value.asDouble());
   return std::to_string(value.asInteger());
 }
@@ -171,7 +180,7 @@ class Film {
   Film(Door& door, uint32_t orientation) : door_(door), orientation_(orientation) {}
   void play(Time duration, Time pauseAt) {
     start_ = now();
-    for (int64_t frame = 0; frame * Time(1s) / kFrameRate < duration; ++frame) {
+    for (int64_t frame = 0; isToEnd == 0 && frame * Time(1s) / kFrameRate < duration; ++frame) {
       const Time at = frame * Time(1s) / kFrameRate;
       if (pauseAt > Time(0) && at >= pauseAt) {
         pauseFor(1s);
@@ -279,6 +288,7 @@ int main(int argc, char** argv) {
     std::fprintf(stderr, "usage: %s PROGRAM samples SECONDS | clips FILES [KEY=VALUE...]\n", argv[0]);
     return 2;
   }
+  std::signal(SIGTERM, [](int) { isToEnd = 1; });
   std::setvbuf(stdout, nullptr, _IOLBF, 0);
   Dictionary userInfo;
   for (int i = 4; i < argc; ++i) {
