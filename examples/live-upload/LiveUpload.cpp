@@ -21,20 +21,6 @@ CodecParameters parametersOf(const AVCodecContext& context) {
   return parameters;
 }
 
-const char* nameOf(StreamSender::State state) {
-  switch (state) {
-    case StreamSender::State::Connecting:
-      return "connecting";
-    case StreamSender::State::Live:
-      return "live";
-    case StreamSender::State::Reconnecting:
-      return "reconnecting";
-    case StreamSender::State::Failed:
-      break;
-  }
-  return "failed";
-}
-
 quorvel::Value number(uint64_t count) { return {static_cast<int64_t>(count)}; }
 
 }  // namespace
@@ -59,9 +45,9 @@ void LiveUpload::finished() {
   if (sender_) sender_->finish();
 }
 
-void LiveUpload::processVideo(quorvel::VideoFrame frame, quorvel::Orientation) {
+void LiveUpload::processVideo(quorvel::VideoFrame frame, quorvel::Orientation orientation) {
   ++receivedFrames_;
-  enqueue({std::move(frame), now()});
+  enqueue({Picture{std::move(frame), orientation}, now()});
 }
 
 void LiveUpload::processAudio(quorvel::AudioSample sample) { enqueue({std::move(sample), now()}); }
@@ -70,7 +56,7 @@ void LiveUpload::enqueue(Input input) {
   {
     std::lock_guard lock(mutex_);
     if (isEnding_ || hasFailed_ || inputs_.size() >= kMostInputs) return;
-    const auto isFrame = [](const Input& i) { return std::holds_alternative<quorvel::VideoFrame>(i.sample); };
+    const auto isFrame = [](const Input& i) { return std::holds_alternative<Picture>(i.sample); };
     if (isFrame(input) && ++waitingFrames_ > kMostWaitingFrames) {
       inputs_.erase(std::find_if(inputs_.begin(), inputs_.end(), isFrame));
       --waitingFrames_;
@@ -102,11 +88,11 @@ void LiveUpload::encodeInputs() {
       if (inputs_.empty()) return;
       input = std::move(inputs_.front());
       inputs_.pop_front();
-      if (std::holds_alternative<quorvel::VideoFrame>(input.sample)) --waitingFrames_;
+      if (std::holds_alternative<Picture>(input.sample)) --waitingFrames_;
     }
     if (hasFailed_) continue;
-    if (const auto* frame = std::get_if<quorvel::VideoFrame>(&input.sample)) {
-      encode(*frame, input.received);
+    if (const auto* picture = std::get_if<Picture>(&input.sample)) {
+      encode(*picture, input.received);
     } else if (const auto* sound = std::get_if<quorvel::AudioSample>(&input.sample); sound && origin_) {
       mixer_.add(*sound, streamTime(sound->presentationTime));
     }
@@ -118,25 +104,27 @@ int64_t LiveUpload::streamTime(quorvel::SampleTime time) const {
   return kStreamStart + std::chrono::duration_cast<std::chrono::microseconds>(time - *origin_).count();
 }
 
-/// The first picture begins the stream and settles its size.
-bool LiveUpload::open(const quorvel::VideoFrame& first) {
+/// The first picture begins the stream and settles its size: the upright one.
+bool LiveUpload::open(const Picture& first) {
   const AVOutputFormat* format = av_guess_format(settings_.format(), nullptr, nullptr);
   const bool hasGlobalHeader = format != nullptr && (format->flags & AVFMT_GLOBALHEADER) != 0;
-  pictures_ = PictureEncoder::open(settings_, first.width, first.height, hasGlobalHeader);
+  const PictureSize size{static_cast<int>(first.frame.width), static_cast<int>(first.frame.height)};
+  pictures_ = PictureEncoder::open(settings_, uprightSize(size, first.orientation), hasGlobalHeader);
   sounds_ = SoundEncoder::open(settings_.audioBitRate, hasGlobalHeader);
   if (!pictures_ || !sounds_) {
     fail("This device has no encoder for H.264 and AAC.");
     return false;
   }
   sender_ = std::make_unique<StreamSender>(
-      settings_, StreamSender::Parameters{parametersOf(pictures_->context()), parametersOf(sounds_->context())},
+      settings_, StreamParameters{parametersOf(pictures_->context()), parametersOf(sounds_->context())},
       [this](const StreamSender::Report& state) { report(state); });
-  origin_ = first.presentationTime;
+  origin_ = first.frame.presentationTime;
   return true;
 }
 
-void LiveUpload::encode(const quorvel::VideoFrame& frame, std::chrono::nanoseconds received) {
-  if (!origin_ && !open(frame)) return;
+void LiveUpload::encode(const Picture& picture, std::chrono::nanoseconds received) {
+  if (!origin_ && !open(picture)) return;
+  const quorvel::VideoFrame& frame = picture.frame;
   const int64_t time = streamTime(frame.presentationTime);
   mixer_.notePicture(time);
   if (!hasPaused_) {
@@ -151,7 +139,7 @@ void LiveUpload::encode(const quorvel::VideoFrame& frame, std::chrono::nanosecon
   }
   nextPicture_ = std::max(nextPicture_ + interval, time + interval / 2);
   lastPicture_ = time;
-  pictures_->encode(frame, time, sender_->takeKeyFrameWish(),
+  pictures_->encode(frame, picture.orientation, time, sender_->takeKeyFrameWish(),
                     [&](Packet packet) { sender_->sendVideo(std::move(packet), received); });
 }
 
@@ -164,7 +152,7 @@ void LiveUpload::encodeSound() {
 
 void LiveUpload::report(const StreamSender::Report& report) {
   if (report.state == StreamSender::State::Failed)
-    return fail("The streaming server cannot be reached: " + report.error);
+    return fail("The stream cannot be sent to the server: " + report.error);
   if (report.state == StreamSender::State::Live && !settings_.playbackURL.empty() && !hasToldURL_.exchange(true))
     broadcast_.updateBroadcastURL(settings_.playbackURL);
   broadcast_.updateServiceInfo({{"state", {std::string(nameOf(report.state))}},

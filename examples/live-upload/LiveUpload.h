@@ -32,7 +32,11 @@ class LiveUpload final : public quorvel::SampleExtension {
   void processAudio(quorvel::AudioSample sample) override;
 
  private:
-  using Sample = std::variant<quorvel::VideoFrame, quorvel::AudioSample>;
+  struct Picture {
+    quorvel::VideoFrame frame;
+    quorvel::Orientation orientation;
+  };
+  using Sample = std::variant<Picture, quorvel::AudioSample>;
   struct Input {
     Sample sample;
     std::chrono::nanoseconds received;
@@ -40,9 +44,9 @@ class LiveUpload final : public quorvel::SampleExtension {
   void enqueue(Input input);
   void stopEncoding();
   void encodeInputs();
-  void encode(const quorvel::VideoFrame& frame, std::chrono::nanoseconds received);
+  void encode(const Picture& picture, std::chrono::nanoseconds received);
   void encodeSound();
-  [[nodiscard]] bool open(const quorvel::VideoFrame& first);
+  [[nodiscard]] bool open(const Picture& first);
   [[nodiscard]] int64_t streamTime(quorvel::SampleTime time) const;
   void report(const StreamSender::Report& report);
   void fail(const std::string& text);

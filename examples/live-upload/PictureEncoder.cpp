@@ -3,10 +3,6 @@
 #include <algorithm>
 #include <utility>
 
-extern "C" {
-#include <libswscale/swscale.h>
-}
-
 namespace upload {
 
 namespace {
@@ -14,10 +10,10 @@ namespace {
 /// Bits for a pixel where the application names no rate: 2.8 Mbit/s for 1280x720 at 30.
 constexpr double kBitsPerPixel = 0.1;
 
-CodecContext makeContext(const AVCodec& codec, const Settings& settings, uint32_t width, uint32_t height) {
+CodecContext makeContext(const AVCodec& codec, const Settings& settings, PictureSize size) {
   CodecContext context(avcodec_alloc_context3(&codec));
-  context->width = static_cast<int>(width & ~1u);
-  context->height = static_cast<int>(height & ~1u);
+  context->width = size.width & ~1;
+  context->height = size.height & ~1;
   context->pix_fmt = AV_PIX_FMT_YUV420P;
   context->time_base = kMicroseconds;
   context->framerate = {settings.frameRate, 1};
@@ -41,11 +37,10 @@ CodecContext makeContext(const AVCodec& codec, const Settings& settings, uint32_
 
 }  // namespace
 
-std::unique_ptr<PictureEncoder> PictureEncoder::open(const Settings& settings, uint32_t width, uint32_t height,
-                                                     bool hasGlobalHeader) {
+std::unique_ptr<PictureEncoder> PictureEncoder::open(const Settings& settings, PictureSize size, bool hasGlobalHeader) {
   const AVCodec* codec = avcodec_find_encoder_by_name("libx264");
-  if (codec == nullptr || width < 2 || height < 2) return nullptr;
-  CodecContext context = makeContext(*codec, settings, width, height);
+  if (codec == nullptr || size.width < 2 || size.height < 2) return nullptr;
+  CodecContext context = makeContext(*codec, settings, size);
   if (hasGlobalHeader) context->flags |= AV_CODEC_FLAG_GLOBAL_HEADER;
   if (avcodec_open2(context.get(), codec, nullptr) < 0) return nullptr;
   std::unique_ptr<PictureEncoder> encoder(
@@ -60,24 +55,9 @@ std::unique_ptr<PictureEncoder> PictureEncoder::open(const Settings& settings, u
 PictureEncoder::PictureEncoder(CodecContext context, int64_t keyFrameInterval)
     : context_(std::move(context)), picture_(av_frame_alloc()), keyFrameInterval_(keyFrameInterval) {}
 
-PictureEncoder::~PictureEncoder() { sws_freeContext(scaler_); }
-
-bool PictureEncoder::convert(const quorvel::VideoFrame& frame) {
-  if (av_frame_make_writable(picture_.get()) < 0) return false;
-  scaler_ = sws_getCachedContext(scaler_, static_cast<int>(frame.width), static_cast<int>(frame.height),
-                                 AV_PIX_FMT_BGR0, context_->width, context_->height, context_->pix_fmt,
-                                 SWS_FAST_BILINEAR, nullptr, nullptr, nullptr);
-  if (scaler_ == nullptr) return false;
-  sws_setColorspaceDetails(scaler_, sws_getCoefficients(SWS_CS_ITU709), 1, sws_getCoefficients(SWS_CS_ITU709), 0, 0,
-                           1 << 16, 1 << 16);
-  const uint8_t* const planes[] = {frame.pixels.data()};
-  const int strides[] = {static_cast<int>(frame.stride)};
-  return sws_scale(scaler_, planes, strides, 0, static_cast<int>(frame.height), picture_->data, picture_->linesize) > 0;
-}
-
-void PictureEncoder::encode(const quorvel::VideoFrame& frame, int64_t time, bool asKeyFrame,
-                            const std::function<void(Packet)>& output) {
-  if (!convert(frame)) return;
+void PictureEncoder::encode(const quorvel::VideoFrame& frame, quorvel::Orientation orientation, int64_t time,
+                            bool asKeyFrame, const std::function<void(Packet)>& output) {
+  if (av_frame_make_writable(picture_.get()) < 0 || !converter_.convert(frame, orientation, *picture_)) return;
   // By time too: on a still screen few pictures come, and a viewer who joins waits for a key frame.
   const bool isKey = asKeyFrame || time - lastKeyFrame_ >= keyFrameInterval_;
   picture_->pict_type = isKey ? AV_PICTURE_TYPE_I : AV_PICTURE_TYPE_NONE;

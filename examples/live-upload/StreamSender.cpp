@@ -1,9 +1,8 @@
 #include "StreamSender.h"
 
 #include <algorithm>
+#include <cstdio>
 #include <utility>
-
-#include "PictureEncoder.h"
 
 namespace upload {
 
@@ -12,17 +11,15 @@ namespace {
 using namespace std::chrono_literals;
 
 constexpr int64_t kLongestBacklog = 2'000'000;  // microseconds of stream
-constexpr auto kFirstPause = 250ms, kLongestPause = 8000ms;
-constexpr auto kLongestAbsence = 60s;
+constexpr std::chrono::milliseconds kFirstPause = 250ms, kLongestPause = 8s;
+constexpr auto kHolding = 3s;  // from then on a connection is not one that the server drops at once
+/// Somebody waits for the stream to begin, and the URL may be wrong.
+constexpr std::chrono::seconds kLongestFirstTry = 20s;
 constexpr auto kLongestFinish = 3s;
-constexpr const char kNetworkTimeout[] = "5000000";  // microseconds
-constexpr int64_t kInterleaving = 500'000;           // microseconds
-
-enum Streams { kVideo = 0, kAudio = 1 };
 
 }  // namespace
 
-StreamSender::StreamSender(Settings settings, Parameters parameters, std::function<void(const Report&)> reported)
+StreamSender::StreamSender(Settings settings, StreamParameters parameters, std::function<void(const Report&)> reported)
     : settings_(std::move(settings)),
       parameters_(std::move(parameters)),
       reported_(std::move(reported)),
@@ -87,78 +84,55 @@ void StreamSender::dropBacklog() {
 
 void StreamSender::run() {
   report(State::Connecting);
-  for (;;) {
+  do {
     if (connect()) {
       while (sendNext()) {
       }
     }
-    {
-      std::lock_guard lock(mutex_);
-      if (isFinishing_) break;
-    }
-    if (!waitBeforeRetry()) break;
-  }
-  disconnect(true);
+  } while (waitBeforeRetry());
+  if (connection_) connection_->finish();
+  connection_.reset();
 }
 
-/// False where nothing more is to be tried.
-bool StreamSender::waitBeforeRetry() {
-  disconnect(false);
-  if (Clock::now() - lastLive_ > kLongestAbsence) {
-    report(State::Failed, report_.error);
-    return false;
-  }
-  report(report_.connections > 0 ? State::Reconnecting : State::Connecting, report_.error);
-  std::unique_lock lock(mutex_);
-  changed_.wait_for(lock, pause_, [this] { return isFinishing_; });
-  pause_ = std::min(pause_ * 2, std::chrono::milliseconds(kLongestPause));
-  return !isFinishing_;
-}
-
-int StreamSender::isInterrupted(void* sender) {
-  auto& self = *static_cast<StreamSender*>(sender);
-  std::lock_guard lock(self.mutex_);
-  return Clock::now() >= self.deadline_ ? 1 : 0;
+bool StreamSender::isPastEnd() {
+  std::lock_guard lock(mutex_);
+  return Clock::now() >= deadline_;
 }
 
 bool StreamSender::connect() {
-  avformat_alloc_output_context2(&stream_, nullptr, settings_.format(), settings_.url.c_str());
-  if (stream_ == nullptr) return false;
-  stream_->interrupt_callback = {&StreamSender::isInterrupted, this};
-  stream_->max_interleave_delta = kInterleaving;
-  stream_->flags |= AVFMT_FLAG_FLUSH_PACKETS;
-  for (const auto* codec : {parameters_.video.get(), parameters_.audio.get()}) {
-    AVStream* stream = avformat_new_stream(stream_, nullptr);
-    if (stream == nullptr || avcodec_parameters_copy(stream->codecpar, codec) < 0) return false;
-    stream->time_base = kMicroseconds;
-  }
-  AVDictionary* options = nullptr;
-  av_dict_set(&options, "rw_timeout", kNetworkTimeout, 0);
-  av_dict_set(&options, "flvflags", "no_duration_filesize", 0);
-  int result = avio_open2(&stream_->pb, settings_.url.c_str(), AVIO_FLAG_WRITE, &stream_->interrupt_callback, &options);
-  if (result >= 0) result = avformat_write_header(stream_, &options);
-  av_dict_free(&options);
-  if (result < 0) {
-    report_.error = errorText(result);
+  connection_ = std::make_unique<StreamConnection>(settings_, parameters_, [this] { return isPastEnd(); });
+  if (auto failure = connection_->open()) {
+    failure_ = std::move(*failure);
+    connection_.reset();
     return false;
   }
-  ++report_.connections;
-  pause_ = kFirstPause;
-  {
+  connectedAt_ = Clock::now();
+  if (++report_.connections > 1) {
     // What was cut with the former connection cannot be decoded from its middle.
     std::lock_guard lock(mutex_);
-    if (report_.connections > 1) dropBacklog();
+    dropBacklog();
   }
+  failure_ = {};
   report(State::Live);
   return true;
 }
 
-void StreamSender::disconnect(bool isOrderly) {
-  if (stream_ == nullptr) return;
-  if (isOrderly && report_.state == State::Live) av_write_trailer(stream_);
-  avio_closep(&stream_->pb);
-  avformat_free_context(stream_);
-  stream_ = nullptr;
+/// False where nothing more is to be tried; then there is a connection only if it works.
+bool StreamSender::waitBeforeRetry() {
+  std::unique_lock lock(mutex_);
+  if (isFinishing_) return false;
+  lock.unlock();
+  const std::chrono::seconds patience(settings_.reconnectTimeout);
+  const auto left = lastHeld_ + (hasHeld_ ? patience : std::min(patience, kLongestFirstTry)) - Clock::now();
+  if (left <= 0s || (failure_.isDefinite && !hasHeld_)) {
+    report(State::Failed);
+    return false;
+  }
+  report(report_.connections > 0 ? State::Reconnecting : State::Connecting);
+  lock.lock();
+  changed_.wait_for(lock, std::min<Clock::duration>(pause_, left), [this] { return isFinishing_; });
+  pause_ = std::min(pause_ * 2, kLongestPause);
+  return !isFinishing_;
 }
 
 /// False where the connection is lost, or all was sent that there will be.
@@ -176,35 +150,63 @@ bool StreamSender::sendNext() {
 
 bool StreamSender::write(Item item) {
   const bool isKey = item.isVideo && (item.packet->flags & AV_PKT_FLAG_KEY) != 0;
-  const int index = item.isVideo ? kVideo : kAudio;
-  item.packet->stream_index = index;
-  av_packet_rescale_ts(item.packet.get(), kMicroseconds, stream_->streams[index]->time_base);
-  const int result = av_interleaved_write_frame(stream_, item.packet.get());
-  if (result < 0) {
+  const auto stream = item.isVideo ? StreamConnection::kVideo : StreamConnection::kAudio;
+  if (auto failure = connection_->write(std::move(item.packet), stream)) {
+    failure_ = std::move(*failure);
+    connection_.reset();
     std::lock_guard lock(mutex_);
     if (item.isVideo) ++droppedFrames_;
-    report_.error = errorText(result);
     return false;
   }
-  lastLive_ = Clock::now();
-  if (!item.isVideo) return true;
-  ++report_.sentFrames;
-  latencySum_ += std::chrono::duration<double, std::milli>(lastLive_.time_since_epoch() - item.received).count();
-  ++latencyCount_;
+  noteSent(item);
   if (isKey) report(State::Live);
   return true;
 }
 
-void StreamSender::report(State state, const std::string& error) {
+void StreamSender::noteSent(const Item& item) {
+  const auto now = Clock::now();
+  if (now - connectedAt_ >= kHolding) {
+    hasHeld_ = true;
+    lastHeld_ = now;
+    pause_ = kFirstPause;
+  }
+  if (!item.isVideo) return;
+  ++report_.sentFrames;
+  latencySum_ += std::chrono::duration<double, std::milli>(now.time_since_epoch() - item.received).count();
+  ++latencyCount_;
+}
+
+void StreamSender::report(State state) {
+  const bool isNew = report_.state != state || report_.error != failure_.text;
   report_.state = state;
-  report_.error = error;
+  report_.error = failure_.text;
   if (latencyCount_ > 0) report_.latencyMilliseconds = latencySum_ / latencyCount_;
   latencySum_ = latencyCount_ = 0;
   {
     std::lock_guard lock(mutex_);
     report_.droppedFrames = droppedFrames_;
   }
+  if (isNew)
+    std::fprintf(stderr, "live-upload: %s, connection %llu, %llu pictures sent, %llu dropped%s%s\n", nameOf(state),
+                 static_cast<unsigned long long>(report_.connections),
+                 static_cast<unsigned long long>(report_.sentFrames),
+                 static_cast<unsigned long long>(report_.droppedFrames), failure_.text.empty() ? "" : ": ",
+                 failure_.text.c_str());
   reported_(report_);
+}
+
+const char* nameOf(StreamSender::State state) {
+  switch (state) {
+    case StreamSender::State::Connecting:
+      return "connecting";
+    case StreamSender::State::Live:
+      return "live";
+    case StreamSender::State::Reconnecting:
+      return "reconnecting";
+    case StreamSender::State::Failed:
+      break;
+  }
+  return "failed";
 }
 
 }  // namespace upload

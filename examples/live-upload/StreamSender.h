@@ -6,14 +6,12 @@
 #include <cstdint>
 #include <deque>
 #include <functional>
+#include <memory>
 #include <mutex>
 #include <string>
 #include <thread>
 
-#include "../common/AVHandles.h"
-#include "Settings.h"
-
-struct AVFormatContext;
+#include "StreamConnection.h"
 
 namespace upload {
 
@@ -32,12 +30,8 @@ class StreamSender {
     double latencyMilliseconds = 0;  ///< from `received` to the socket, mean since the last report
     std::string error;               ///< the last one
   };
-  struct Parameters {
-    CodecParameters video, audio;  ///< packets have times in microseconds
-  };
-
   /// `reported` comes on the sender's thread: at each change of state, and at each key frame sent.
-  StreamSender(Settings settings, Parameters parameters, std::function<void(const Report&)> reported);
+  StreamSender(Settings settings, StreamParameters parameters, std::function<void(const Report&)> reported);
   ~StreamSender();
   StreamSender(const StreamSender&) = delete;
   StreamSender& operator=(const StreamSender&) = delete;
@@ -61,15 +55,15 @@ class StreamSender {
   void dropBacklog();
   void run();
   [[nodiscard]] bool connect();
-  void disconnect(bool isOrderly);
   [[nodiscard]] bool waitBeforeRetry();
   [[nodiscard]] bool sendNext();
   [[nodiscard]] bool write(Item item);
-  void report(State state, const std::string& error = {});
-  static int isInterrupted(void* sender);
+  void noteSent(const Item& item);
+  void report(State state);
+  [[nodiscard]] bool isPastEnd();
 
   const Settings settings_;
-  const Parameters parameters_;
+  const StreamParameters parameters_;
   const std::function<void(const Report&)> reported_;
   std::atomic<bool> keyFrameWanted_ = false;
 
@@ -81,14 +75,19 @@ class StreamSender {
   uint64_t droppedFrames_ = 0;
 
   // The sender's thread only.
-  AVFormatContext* stream_ = nullptr;
+  std::unique_ptr<StreamConnection> connection_;  // nothing while there is none
+  StreamConnection::Failure failure_;             // the last one
   Report report_;
   double latencySum_ = 0;
   int latencyCount_ = 0;
+  bool hasHeld_ = false;  // any connection so far
   std::chrono::milliseconds pause_{250};
-  Clock::time_point lastLive_ = Clock::now();
+  Clock::time_point connectedAt_, lastHeld_ = Clock::now();
 
   std::thread thread_;  // last: it uses the rest
 };
+
+/// As the application is told it.
+const char* nameOf(StreamSender::State state);
 
 }  // namespace upload

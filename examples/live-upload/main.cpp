@@ -1,8 +1,9 @@
 // A broadcast extension in sample mode: sends what it is given to a streaming server, live.
 
+#include "LibraryLog.h"
 #include "LiveUpload.h"
 
 int main() {
-  av_log_set_level(AV_LOG_ERROR);
+  upload::LibraryLog::install();
   return quorvel::runExtension<upload::LiveUpload>();
 }

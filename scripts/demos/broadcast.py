@@ -1,7 +1,8 @@
 """Broadcasts reach a real streaming server: nginx, on loopback, with its RTMP and WebDAV modules.
 
-Three runs of the example application: its live stream, which a viewer reads back; its clips, put there as an HLS
-stream; and one whose extension is killed in the middle, after which the next broadcast must work.
+Four runs of the example application: its live stream, which a viewer reads back; one in whose middle the server goes away
+for a while; its clips, put there as an HLS stream; and one whose extension is killed in the middle, after which the next
+broadcast must work.
 
 usage: broadcast.py BUILD_DIRECTORY OUTPUT_DIRECTORY
 """
@@ -10,12 +11,12 @@ import os
 import re
 import shutil
 import signal
-import subprocess
 import sys
 import time
 
 ROOT = os.path.dirname(os.path.dirname(os.path.dirname(os.path.abspath(__file__))))
 sys.path.insert(0, os.path.join(ROOT, "scripts/stage"))
+from processes import children  # noqa: E402
 from stage import Stage  # noqa: E402
 from testsignal import frame_times, free_port, worst_distance  # noqa: E402
 
@@ -26,6 +27,7 @@ FRAME = 1 / 30
 WORST_SYNC = 0.06   # seconds
 CUT_MARGIN = 0.3    # a flash at the stream's ends may have lost its beep
 SECONDS = 8
+ABSENCE = 3         # seconds for which the server is away
 CLIP_SECONDS = 2
 
 NGINX = """
@@ -65,8 +67,25 @@ class Server:
         with open(configuration, "w") as file:
             file.write(NGINX.format(user="user root;" if os.geteuid() == 0 else "", rtmp=self.rtmp, http=self.http))
         program = shutil.which("nginx", path=os.environ["PATH"] + ":/usr/sbin") or sys.exit("demo: nginx is missing")
-        stage.start([program, "-p", self.directory + "/", "-c", configuration, "-e", "error.log"])
-        wait_until("nginx", lambda: os.path.exists(os.path.join(self.directory, "nginx.pid")))
+        self.stage = stage
+        self.command = [program, "-p", self.directory + "/", "-c", configuration, "-e", "error.log"]
+        self.start()
+
+    def start(self):
+        # It writes that file once it listens.
+        started = os.path.join(self.directory, "nginx.pid")
+        if os.path.exists(started):
+            os.remove(started)
+        self.master = self.stage.start(self.command)
+        wait_until("nginx", lambda: os.path.exists(started))
+
+    def crash(self):
+        """Its connections end with its processes, without a word."""
+        victims = [*children(self.master.pid), self.master.pid]
+        for victim in victims:
+            os.kill(victim, signal.SIGKILL)
+        self.stage.end(self.master)
+        return victims
 
 
 class Device(Stage):
@@ -101,6 +120,15 @@ def live_info(server, name):
     return {"url": url, "playbackURL": url, "keyFrameInterval": 1}
 
 
+def start_viewer(stage, url, file):
+    """Its stream ends when the broadcast does. `-copyts`: with the stream's own times."""
+    return stage.start(["ffmpeg", "-nostdin", "-v", "error", "-y", "-i", url, "-copyts", "-c", "copy", file], "stderr")
+
+
+def is_in_order(times):
+    return all(a < b for a, b in zip(times, times[1:]))
+
+
 def run_live(stage, server, output):
     info = live_info(server, "game")
     seen = os.path.join(output, "live.flv")
@@ -108,22 +136,51 @@ def run_live(stage, server, output):
     print("application: " + game.expect("started")[1])
     line = game.expect("broadcast url=")[1]
     print("application: " + line)
-    # Its stream ends when the broadcast does.
-    viewer = stage.start(["ffmpeg", "-nostdin", "-v", "error", "-y", "-i", line.split("url=")[1], "-c", "copy", seen],
-                         "stderr")
+    viewer = start_viewer(stage, line.split("url=")[1], seen)
     print("application: " + game.expect("stopped", seconds=SECONDS + 20)[1])
     told = service(game)
     stage.end(game)
     viewer.process.wait(20)
     times = frame_times(seen)
     flashes, distance = worst_distance(seen, CUT_MARGIN)
-    in_order = all(a < b for a, b in zip(times, times[1:]))
+    in_order = is_in_order(times)
     print(f"live: {len(times)} frames over {times[-1] - times[0]:.2f} s seen by the viewer, "
           f"{'in order' if in_order else 'NOT in order'}; lost {told['droppedFrames']} of {told['receivedFrames']}")
     print(f"live: latency {float(told['deliveryMilliseconds']):.1f} ms to the extension, "
           f"{float(told['latencyMilliseconds']):.1f} ms through it to the socket (means)")
     print(f"live: {len(flashes)} flashes, each with its beep within {distance * 1000:.0f} ms")
     return in_order and len(flashes) >= SECONDS // 2 - 1 and distance < WORST_SYNC
+
+
+def run_reconnect(stage, server, output):
+    """The server crashes and comes back while the broadcast runs; a viewer before and a viewer after."""
+    url = live_info(server, "again")["url"]
+    files = [os.path.join(output, name) for name in ("before.flv", "after.flv")]
+    game = play(stage, LIVE, live_info(server, "again"), f"record {2 * SECONDS + ABSENCE}; stop; quit")
+    game.expect("broadcast url=")
+    viewer = start_viewer(stage, url, files[0])
+    time.sleep(SECONDS)
+    print(f"the server is killed: {server.crash()}")
+    viewer.process.wait(20)
+    print("application: " + game.expect('state="reconnecting"')[1])
+    time.sleep(ABSENCE)
+    server.start()
+    mark = game.mark()
+    print("application: " + game.expect('connections="2"', mark)[1])
+    viewer = start_viewer(stage, url, files[1])
+    stopped = game.expect("stopped", seconds=2 * SECONDS + 20)[1]
+    print("application: " + stopped)
+    told = service(game)
+    stage.end(game)
+    viewer.process.wait(20)
+    before, after = map(frame_times, files)
+    flashes, distance = worst_distance(files[1], CUT_MARGIN)
+    in_order = is_in_order(before + after)
+    print(f"reconnect: {len(before)} frames, a gap of {after[0] - before[-1]:.2f} s, {len(after)} frames, "
+          f"{'in order' if in_order else 'NOT in order'}; {told['connections']} connections, "
+          f"dropped {told['droppedFrames']} of {told['receivedFrames']}")
+    print(f"reconnect: {len(flashes)} flashes after it, each with its beep within {distance * 1000:.0f} ms")
+    return "error=0" in stopped and in_order and len(flashes) >= 1 and distance < WORST_SYNC
 
 
 def run_clips(stage, server, output):
@@ -188,8 +245,8 @@ def main():
     os.makedirs(output)
     with Device(ROOT, build) as stage:
         server = Server(stage)
-        results = {"live": run_live(stage, server, output), "clips": run_clips(stage, server, output),
-                   "crash": run_crash(stage, server)}
+        results = {"live": run_live(stage, server, output), "reconnect": run_reconnect(stage, server, output),
+                   "clips": run_clips(stage, server, output), "crash": run_crash(stage, server)}
     for name, good in results.items():
         print(f"{name}: {'good' if good else 'NOT good'}")
     print("movie: " + os.path.join(output, "clips/game.m3u8"))

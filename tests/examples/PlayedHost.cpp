@@ -3,8 +3,9 @@
 //   played-host PROGRAM samples SECONDS KEY=VALUE...     a flash and a beep each second, 640x360 at 30 frames/s
 //   played-host PROGRAM clips FILE.mp4,FILE.mp4,... KEY=VALUE...
 //
-// Prints what the extension says. KEY=VALUE become the user information. With PAUSE=SECONDS, the stream pauses for a
-// second at that time.
+// Prints what the extension says. KEY=VALUE become the user information. With the environment's PAUSE=SECONDS,
+// the stream pauses for a second at that time; ORIENTATION=N is the EXIF orientation that the pictures come with.
+// SIGTERM ends a stream early, in order.
 
 #include <fcntl.h>
 #include <spawn.h>
@@ -13,6 +14,7 @@
 
 #include <cmath>
 #include <condition_variable>
+#include <csignal>
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
@@ -41,8 +43,15 @@ constexpr FrameLayout kLayout{640, 360, 640 * 4, PixelFormat::BGRX};
 constexpr int kFrameRate = 30;
 constexpr auto kFlash = 100ms;
 
+volatile std::sig_atomic_t isToEnd = 0;
+
 std::string textOf(const Value& value) {
   if (const auto* text = value.getIf<std::string>()) return *text;
+  if (value.getIf<Dictionary>() != nullptr) {
+    std::string texts;
+    for (const auto& [key, inner] : value.asDictionary()) texts += textOf(inner);
+    return texts;
+  }
   if (value.getIf<double>() != nullptr) return std::to_string(value.asDouble());
   return std::to_string(value.asInteger());
 }
@@ -168,10 +177,10 @@ Data timingOf(Time presentation) {
 /// A stream of pictures and sound in real time.
 class Film {
  public:
-  explicit Film(Door& door) : door_(door) {}
+  Film(Door& door, uint32_t orientation) : door_(door), orientation_(orientation) {}
   void play(Time duration, Time pauseAt) {
     start_ = now();
-    for (int64_t frame = 0; frame * Time(1s) / kFrameRate < duration; ++frame) {
+    for (int64_t frame = 0; isToEnd == 0 && frame * Time(1s) / kFrameRate < duration; ++frame) {
       const Time at = frame * Time(1s) / kFrameRate;
       if (pauseAt > Time(0) && at >= pauseAt) {
         pauseFor(1s);
@@ -198,7 +207,7 @@ class Film {
     const bool isFlash = at % 1s < kFlash;
     for (size_t i = 0; i < pixels.size(); ++i)
       pixels[i] = isFlash ? 0xff : static_cast<uint8_t>(i / 97 + static_cast<size_t>(number) * 3) & 0x3f;
-    send({{broadcastpayload::kVideoOrientation, 1u},
+    send({{broadcastpayload::kVideoOrientation, orientation_},
           {broadcastpayload::kSampleType, int64_t{1}},
           {broadcastpayload::kSharedFrame, QVSharedFrameObject(std::move(picture)).encodeForIPC()},
           {broadcastpayload::kTimingInfo, timingOf(start_ + at)}});
@@ -229,6 +238,7 @@ class Film {
   }
 
   Door& door_;
+  const uint32_t orientation_;
   Time start_{0}, pauses_{0};
   int64_t soundPosition_ = 0;
 };
@@ -246,7 +256,9 @@ void playSamples(IPCService& ipc, const std::shared_ptr<Calls>& calls, Door& req
   act(BroadcastAction::Started);
   const char* pause = std::getenv("PAUSE");
   const auto time = [](double value) { return std::chrono::duration_cast<Time>(std::chrono::duration<double>(value)); };
-  Film(door).play(time(seconds), time(pause ? std::atof(pause) : 0));
+  const char* orientation = std::getenv("ORIENTATION");
+  Film(door, orientation ? static_cast<uint32_t>(std::atoi(orientation)) : 1)
+      .play(time(seconds), time(pause ? std::atof(pause) : 0));
   act(BroadcastAction::Finished);
 }
 
@@ -276,6 +288,7 @@ int main(int argc, char** argv) {
     std::fprintf(stderr, "usage: %s PROGRAM samples SECONDS | clips FILES [KEY=VALUE...]\n", argv[0]);
     return 2;
   }
+  std::signal(SIGTERM, [](int) { isToEnd = 1; });
   std::setvbuf(stdout, nullptr, _IOLBF, 0);
   Dictionary userInfo;
   for (int i = 4; i < argc; ++i) {

@@ -1,11 +1,14 @@
 """The example upload extensions against real servers, with a played host: a live stream with a pause, read by ffmpeg as an
-RTMP server; and clips, put on an HTTP server that is out of order at first.
+RTMP server; one over SRT whose receiver goes away; streams that no server takes; and clips, put on an HTTP server that
+is out of order at first.
 
 usage: test_uploads.py PLAYED_HOST PLUGINS_DIRECTORY
 """
 import http.server
 import os
 import re
+import socket
+import ssl
 import subprocess
 import sys
 import tempfile
@@ -13,6 +16,7 @@ import threading
 
 ROOT = os.path.dirname(os.path.dirname(os.path.dirname(os.path.abspath(__file__))))
 sys.path.insert(0, os.path.join(ROOT, "scripts/stage"))
+from processes import Child  # noqa: E402
 from testsignal import frame_times, free_port, run, worst_distance  # noqa: E402
 
 
@@ -63,6 +67,102 @@ def test_live(host, plugins, directory):
     assert frame_times(received)[-1] < 7.6, "the pause is in the stream"
 
 
+def start_live(host, plugins, *info, **environment):
+    """A stream that goes on until it is told to end."""
+    program = os.path.join(plugins, "LiveUpload.plugin/bin/live-upload")
+    return Child([host, program, "samples", "100", *info], {**os.environ, **environment})
+
+
+def start_receiver(port, file):
+    """Keeps what comes, byte by byte."""
+    return Child(["ffmpeg", "-nostdin", "-v", "error", "-y", "-f", "data", "-i", f"srt://127.0.0.1:{port}?mode=listener",
+                  "-map", "0", "-c", "copy", "-f", "data", file], os.environ, "stderr")
+
+
+def await_frames(child, connection, count):
+    """Until `count` frames more than at first have gone over that connection."""
+    since, first = 0, None
+    while True:
+        line = child.expect(f'connections="{connection}"', since)
+        since = child.lines.index(line) + 1
+        sent = int(re.search(r'sentFrames="(\d+)"', line[1])[1])
+        first = sent if first is None else first
+        if sent >= first + count:
+            return
+
+
+def test_srt(host, plugins, directory):
+    """The receiver goes away and comes back. The pictures lie on their side."""
+    port = free_port()
+    before, after = (os.path.join(directory, name) for name in ("before.ts", "after.ts"))
+    receivers = [start_receiver(port, before)]
+    live = start_live(host, plugins, f"url=srt://127.0.0.1:{port}", "keyFrameInterval=1", ORIENTATION="6")
+    try:
+        await_frames(live, 1, 60)
+        receivers[0].stop()
+        live.expect('state="reconnecting"')
+        receivers.append(start_receiver(port, after))
+        await_frames(live, 2, 60)
+        live.process.terminate()
+        live.process.wait(30)
+        receivers[1].process.wait(30)
+    finally:
+        for child in (live, *receivers):
+            child.stop()
+    for _, line in live.lines:
+        print(line)
+    first, second = frame_times(before), frame_times(after)
+    seen, distance = worst_distance(after, 0.3)
+    print(f"{len(first)} frames, a gap of {second[0] - first[-1]:.2f} s, {len(second)} frames; flashes at {seen}, a beep is "
+          f"{distance:.3f} s away at the most")
+    assert live.process.returncode == 0
+    assert first[-1] < second[0] and all(a < b for a, b in zip(second, second[1:])), "times go back"
+    assert seen and distance < 0.06
+    # Nothing in it needs what was sent over the former connection.
+    errors = subprocess.run(["ffmpeg", "-v", "error", "-i", after, "-f", "null", "-"], capture_output=True, check=True,
+                            stdin=subprocess.DEVNULL, timeout=60).stderr
+    assert not errors, errors
+    size = run(["ffprobe", "-v", "error", "-select_streams", "v", "-show_entries", "stream=width,height", "-of", "default=nk=1:nw=1",
+                after]).split()
+    assert size[:2] == [b"360", b"640"], size
+
+
+def serve_untrusted(directory):
+    """A TLS server whose certificate nobody signed; its port."""
+    key, certificate = (os.path.join(directory, name) for name in ("key.pem", "certificate.pem"))
+    run(["openssl", "req", "-x509", "-newkey", "ec", "-pkeyopt", "ec_paramgen_curve:prime256v1", "-nodes", "-subj",
+         "/CN=localhost", "-keyout", key, "-out", certificate])
+    context = ssl.SSLContext(ssl.PROTOCOL_TLS_SERVER)
+    context.load_cert_chain(certificate, key)
+    server = socket.create_server(("127.0.0.1", 0))
+
+    def answer():
+        try:
+            context.wrap_socket(server.accept()[0], server_side=True)
+        except OSError:
+            pass  # it hangs up
+    threading.Thread(target=answer, daemon=True).start()
+    return server.getsockname()[1]
+
+
+def test_refusals(host, plugins, directory):
+    """Streams that no server takes end with a reason, some at once."""
+    for url, reason, is_tried_again in ((f"rtmp://127.0.0.1:{free_port()}/live/x", "Connection refused", True),
+                                        ("rtmp://127.0.0.1:99999/live/x", "uri", False),
+                                        (f"rtmps://localhost:{serve_untrusted(directory)}/live/x", "certificate", False)):
+        live = start_live(host, plugins, "url=" + url, "reconnectTimeout=1")
+        try:
+            said = live.expect("error code=")[1]
+            live.process.terminate()
+            live.process.wait(30)
+        finally:
+            live.stop()
+        print(said)
+        tries = sum('state="connecting"' in line for _, line in live.lines)
+        assert 'code="-5808"' in said and reason in said and (tries > 1) == is_tried_again, live.lines
+        assert live.process.returncode == 0
+
+
 def test_clips(host, plugins, directory):
     clips = []
     for index in (1, 2, 3):
@@ -97,6 +197,8 @@ def main():
     with tempfile.TemporaryDirectory(prefix="quorvel-uploads-") as directory:
         test_clips(host, plugins, directory)
         test_live(host, plugins, directory)
+        test_srt(host, plugins, directory)
+        test_refusals(host, plugins, directory)
 
 
 main()
