@@ -168,7 +168,7 @@ void QVCaptureManager::stopTap() {
 }
 
 void QVCaptureManager::closeTapQueue(AudioRecorderRecord& record) {
-  if (const int32_t status = record.queue->stopImmediately(); status != 0) {
+  if (const int32_t status = record.queue->stop(); status != 0) {
     QV_LOG_ERROR(logs::kCapture, "QVRecordingManager:stopAudioCapture:error: %i", status);
     return;
   }

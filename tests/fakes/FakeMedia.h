@@ -184,7 +184,7 @@ class FakeAppAudioTap final : public platform::AppAudioTapService {
       if (const auto call = state->listener) call();
       return service.status("start");
     }
-    int32_t stopImmediately() override {
+    int32_t stop() override {
       state->running = false;
       return service.status("stop");
     }
