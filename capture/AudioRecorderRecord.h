@@ -3,6 +3,7 @@
 #include <array>
 #include <cstdint>
 #include <memory>
+#include <optional>
 
 #include "platform/AppAudioTap.h"
 
@@ -22,6 +23,7 @@ struct AudioRecorderRecord {
   uint32_t bufferByteSize = 0;
   int64_t currentPacket = 0;  ///< packets received since the start
   bool isRunning = false;
+  std::optional<int32_t> stopStatus;  ///< once the queue was told to stop
 };
 
 /// The size of one tap buffer: `seconds` of audio, 57344 bytes at most.

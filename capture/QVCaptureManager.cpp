@@ -72,9 +72,13 @@ void QVCaptureManager::stopCaptureSession() {
   if (!session) return;
   session->setRunningObserver(nullptr);
   session->stopRunning();
+  // Its last samples are queued by now.
+  sessionSampleBufferQueue_.sync([] {});
 }
 
 void QVCaptureManager::stopAllCapture() {
+  // The tap's end is waited for together with the microphone's.
+  audioDispatchQueue_.async([this] { stopTap(); });
   stopCaptureSession();
   stopMicrophoneCapture();
   stopAppAudioCapture();

@@ -26,9 +26,9 @@ struct AudioRecorderRecord;
 /// Normal order: start the app-audio tap and, where there is a microphone, microphone capture; set
 /// `captureStartTime` at the first screen frame (app audio before it is dropped); `stopAllCapture`.
 ///
-/// Threading: thread-safe. Starts work asynchronously on the audio dispatch queue; stops wait for it
-/// and must not be called from it. Microphone and camera handlers are called on the capture sample
-/// queue, the app-audio handler on the audio dispatch queue.
+/// Threading: thread-safe. Starts work asynchronously on the audio dispatch queue; stops wait for it and for the
+/// capture sample queue, and must not be called from them. Microphone and camera handlers are called on the capture
+/// sample queue, the app-audio handler on the audio dispatch queue.
 class QVCaptureManager final : public platform::CaptureOutputDelegate {
  public:
   using OutputHandler = std::function<void(const platform::SampleBufferRef&)>;
@@ -52,6 +52,8 @@ class QVCaptureManager final : public platform::CaptureOutputDelegate {
                                         DidStartHandler didStartHandler);
   /// Like a start; the gap since the last app audio is filled before the first buffer.
   void resumeAppAudioCaptureForProcessID(int32_t processID, OutputHandler outputHandler);
+  /// What was played up to the call reaches the output handler first; so does in `stopAllCapture` what the
+  /// microphone heard.
   void stopAppAudioCapture();
   /// Stops every source, clears the handlers and the timing state.
   void stopAllCapture();
@@ -95,7 +97,8 @@ class QVCaptureManager final : public platform::CaptureOutputDelegate {
                        platform::MediaTime presentationTime, uint32_t packetCount);
   void handleIsRunningChange(const std::weak_ptr<AudioRecorderRecord>& record);
   void fillGapAfterResume();
-  void stopTap();
+  std::shared_ptr<AudioRecorderRecord> stopTap();
+  void forgetTap(const std::shared_ptr<AudioRecorderRecord>& record);
   static void closeTapQueue(AudioRecorderRecord& record);
 
   platform::Platform& platform_;

@@ -145,7 +145,7 @@ void QVCaptureManager::fillGapAfterResume() {
 void QVCaptureManager::handleIsRunningChange(const std::weak_ptr<AudioRecorderRecord>& record) {
   audioDispatchQueue_.async([this, record] {
     const auto strong = record.lock();
-    if (!strong || strong != audioRecorderQueue_ || !strong->isRunning) return;
+    if (!strong || strong != audioRecorderQueue_ || !strong->isRunning || strong->stopStatus) return;
     // Once per start.
     (void)strong->queue->removeIsRunningListener();
     if (const DidStartHandler handler = appTapDidStartHandler_.load()) handler();
@@ -153,26 +153,36 @@ void QVCaptureManager::handleIsRunningChange(const std::weak_ptr<AudioRecorderRe
 }
 
 void QVCaptureManager::stopAppAudioCapture() {
-  audioDispatchQueue_.sync([this] { stopTap(); });
+  std::shared_ptr<AudioRecorderRecord> record;
+  audioDispatchQueue_.sync([&] { record = stopTap(); });
+  // By now the work of the buffers that the stop handed over is queued.
+  audioDispatchQueue_.sync([&] { forgetTap(record); });
 }
 
-void QVCaptureManager::stopTap() {
-  if (!audioRecorderQueue_) return;
-  AudioRecorderRecord& record = *audioRecorderQueue_;
-  if (record.queue) {
-    if (record.isRunning) closeTapQueue(record);
-    (void)record.queue->removeIsRunningListener();
+std::shared_ptr<AudioRecorderRecord> QVCaptureManager::stopTap() {
+  const std::shared_ptr<AudioRecorderRecord> record = audioRecorderQueue_;
+  if (!record || !record->queue || !record->isRunning || record->stopStatus) return record;
+  record->stopStatus = record->queue->stop();
+  if (*record->stopStatus != 0) {
+    QV_LOG_ERROR(logs::kCapture, "QVRecordingManager:stopAudioCapture:error: %i", *record->stopStatus);
+  } else {
+    QV_LOG(logs::kCapture, "QVRecordingManager:stopAudioCapture: Audio Queue successfully stopped");
+  }
+  return record;
+}
+
+/// Not a tap that was started since.
+void QVCaptureManager::forgetTap(const std::shared_ptr<AudioRecorderRecord>& record) {
+  if (!record || record != audioRecorderQueue_) return;
+  if (record->queue) {
+    if (record->stopStatus == 0) closeTapQueue(*record);
+    (void)record->queue->removeIsRunningListener();
   }
   // A queue that refused to stop is disposed of with its record.
   audioRecorderQueue_.reset();
 }
 
 void QVCaptureManager::closeTapQueue(AudioRecorderRecord& record) {
-  if (const int32_t status = record.queue->stopImmediately(); status != 0) {
-    QV_LOG_ERROR(logs::kCapture, "QVRecordingManager:stopAudioCapture:error: %i", status);
-    return;
-  }
-  QV_LOG(logs::kCapture, "QVRecordingManager:stopAudioCapture: Audio Queue successfully stopped");
   record.isRunning = false;
   for (QueueBuffer*& buffer : record.buffers) {
     if (buffer == nullptr) continue;

@@ -20,11 +20,12 @@ struct QueueBuffer {
 /// Every operation answers a 32-bit status, 0 for success. A running queue takes enqueued buffers
 /// in turn, fills them and hands them to the input callback; while the process plays nothing it
 /// records silence, so audio time never stops. A buffer is handed over when it is full or, as long
-/// as most buffers are back in the queue, after about 20 ms of audio, so that little is lost at a
-/// stop. Audio that finds no buffer is dropped. The sample clock is the host clock's.
+/// as most buffers are back in the queue, after about 20 ms of audio, and at a stop. Audio that finds
+/// no buffer is dropped. The sample clock is the host clock's.
 ///
 /// Threading: operations from one thread at a time; callbacks come on the queue's own thread. `stop`
-/// and `dispose` wait for a callback in progress (unless called from one); none comes afterwards.
+/// and `dispose` wait for a callback in progress (unless called from one); none comes afterwards, so a
+/// callback must not wait for whoever stops the queue.
 /// An operation that the platform refuses leaves the queue usable for `dispose`; destruction
 /// disposes.
 class AppAudioTapQueue {
@@ -40,7 +41,9 @@ class AppAudioTapQueue {
   virtual int32_t removeIsRunningListener() = 0;
   /// The queue is running as soon as its clock runs, whether or not the process plays.
   virtual int32_t start() = 0;
-  virtual int32_t stopImmediately() = 0;
+  /// Hands over what was played up to the call, waiting 50 ms at most for what is still on its way; called
+  /// from a callback it only stops.
+  virtual int32_t stop() = 0;
   virtual int32_t freeBuffer(QueueBuffer* buffer) = 0;
   virtual int32_t dispose() = 0;
 };

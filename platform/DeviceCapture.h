@@ -51,6 +51,8 @@ class DeviceCaptureSession {
   virtual void addOutput(std::shared_ptr<CaptureOutput> output) = 0;
   virtual void removeOutput(const std::shared_ptr<CaptureOutput>& output) = 0;
   virtual void startRunning() = 0;
+  /// What was heard up to the call has then been queued for the delegate: waits 50 ms at most for what is
+  /// still on its way.
   virtual void stopRunning() = 0;
   [[nodiscard]] virtual bool isRunning() const = 0;
   /// Called after each change of `isRunning`. Nothing removes the observer.

@@ -12,6 +12,9 @@ using std::chrono::steady_clock;
 
 constexpr nanoseconds kTick = std::chrono::milliseconds(10);
 constexpr int64_t kNanosecondsPerSecond = 1'000'000'000;
+/// Ends of a run that are none in time.
+constexpr int64_t kOpenEnd = INT64_MAX;
+constexpr int64_t kNoRest = INT64_MIN;
 
 /// Both without overflow for centuries.
 int64_t framesIn(nanoseconds time, uint32_t rate) {
@@ -53,6 +56,8 @@ struct PCMPacer::Run {
       : format(f), source(std::move(s)), callbacks(std::move(c)), samples(size_t{f.sampleRate} / 100 * f.channels) {}
 
   PacedThread::TimePoint step();
+  void finish();
+  [[nodiscard]] bool isEnding() const { return end.load() != kOpenEnd; }
   void skipHoldUp(int64_t due);
   void renderBlock(int64_t frames);
 
@@ -64,7 +69,8 @@ struct PCMPacer::Run {
   int64_t ticks = 0;
   bool hasOpened = false;
   std::vector<int16_t> samples;  // one tick
-  std::atomic<bool> stopped = false;
+  /// Host time up to which a stop wants the sound, in nanoseconds.
+  std::atomic<int64_t> end = kOpenEnd;
 };
 
 PacedThread::TimePoint PCMPacer::Run::step() {
@@ -75,11 +81,20 @@ PacedThread::TimePoint PCMPacer::Run::step() {
   const nanoseconds elapsed = steady_clock::now().time_since_epoch() - origin;
   const int64_t due = framesIn(elapsed - source->latency(), format.sampleRate);
   skipHoldUp(due);
-  while (position < due && !stopped) {
-    renderBlock(std::min<int64_t>(due - position, format.sampleRate / 100));
-  }
+  while (position < due && !isEnding()) renderBlock(std::min<int64_t>(due - position, format.sampleRate / 100));
   ticks = elapsed / kTick + 1;
   return PacedThread::TimePoint(origin + ticks * kTick);
+}
+
+void PCMPacer::Run::finish() {
+  if (const int64_t time = end; hasOpened && time != kNoRest) {
+    source->awaitSound(static_cast<uint64_t>(time));
+    const int64_t due = framesIn(nanoseconds(time) - origin, format.sampleRate);
+    skipHoldUp(due);
+    while (position < due && end != kNoRest) renderBlock(std::min<int64_t>(due - position, format.sampleRate / 100));
+    if (end != kNoRest) callbacks.completed();
+  }
+  callbacks.closed();
 }
 
 void PCMPacer::Run::skipHoldUp(int64_t due) {
@@ -102,15 +117,25 @@ void PCMPacer::Run::renderBlock(int64_t frames) {
 
 PCMPacer::PCMPacer(PCMFormat format, std::unique_ptr<PCMSource> source, Callbacks callbacks)
     : run_(std::make_shared<Run>(format, std::move(source), std::move(callbacks))),
-      thread_([run = run_] { return run->step(); }, [run = run_] { run->callbacks.closed(); }) {}
+      thread_([run = run_] { return run->step(); }, [run = run_] { run->finish(); }) {}
 
-PCMPacer::~PCMPacer() { run_->stopped = true; }
+PCMPacer::~PCMPacer() { run_->end = kNoRest; }
 
 void PCMPacer::stop() {
-  run_->stopped = true;
+  if (thread_.isCurrent()) {
+    abandon();
+    return;
+  }
+  int64_t open = kOpenEnd;
+  run_->end.compare_exchange_strong(open, nanoseconds(steady_clock::now().time_since_epoch()).count());
   thread_.stop();
 }
 
-bool PCMPacer::isStopped() const { return run_->stopped; }
+void PCMPacer::abandon() {
+  run_->end = kNoRest;
+  thread_.stop();
+}
+
+bool PCMPacer::isStopped() const { return run_->isEnding(); }
 
 }  // namespace qv::platform

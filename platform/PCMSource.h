@@ -33,6 +33,9 @@ class PCMSource {
   virtual ~PCMSource() = default;
   /// How long after a moment its sound can be asked for.
   [[nodiscard]] virtual std::chrono::nanoseconds latency() const = 0;
+  /// For the end, which does not sit out the latency: waits until whatever sounds steadily has come in up to
+  /// `hostTime`, 50 ms at most. Called in the thread of `render`.
+  virtual void awaitSound(uint64_t /*hostTime*/) {}
   /// Fills in, in native byte order and interleaved, the frames from host time `hostTime` on (in
   /// nanoseconds), silence included. Calls continue one another, except after a long hold-up.
   virtual void render(uint64_t hostTime, std::span<int16_t> samples) = 0;
@@ -49,20 +52,23 @@ struct PCMBlock {
 /// Renders a source by the host clock, in blocks of at most 10 ms, until it is destroyed.
 ///
 /// The first frame is of the moment of construction. A thread that was held up renders what it
-/// missed, up to a second; of more it leaves out all but the last 100 ms.
+/// missed, up to a second; of more it leaves out all but the last 100 ms. A `stop` renders all up to the
+/// moment of the call; `abandon`, destruction and a stop from a callback leave out what was not rendered yet.
 ///
-/// Threading: `opened`, `sink` and `closed` are called on the pacer's thread; `stop` and destruction are
-/// those of a PacedThread.
+/// Threading: callbacks are called on the pacer's thread; `stop`, `abandon` and destruction are those of a
+/// PacedThread, and `stop` waits for the sound besides (see `PCMSource::awaitSound`).
 class PCMPacer {
  public:
   struct Callbacks {
     std::function<void()> opened;
     std::function<void(const PCMBlock&)> sink;
+    std::function<void()> completed;  ///< after the last block of a stop that rendered the rest
     std::function<void()> closed;
   };
   PCMPacer(PCMFormat format, std::unique_ptr<PCMSource> source, Callbacks callbacks);
   ~PCMPacer();
   void stop();
+  void abandon();
   [[nodiscard]] bool isStopped() const;
 
  private:

@@ -62,7 +62,7 @@ class SampleAssembler {
   explicit SampleAssembler(std::shared_ptr<MicrophoneOutput> output) : output_(std::move(output)) {}
 
   void take(const PCMBlock& block) {
-    if (!bytes_.empty() && block.sampleTime != nextSampleTime_) flush();
+    if (block.sampleTime != nextSampleTime_) flush();
     for (size_t offset = 0; offset < block.bytes.size();) {
       const size_t skipped = offset / kFormat.bytesPerFrame();
       if (bytes_.empty()) hostTime_ = block.hostTime + skipped * 1'000'000'000 / kFormat.sampleRate;
@@ -74,15 +74,16 @@ class SampleAssembler {
     }
     nextSampleTime_ = block.sampleTime + block.frames;
   }
-
- private:
+  /// Sends what is gathered, less than a whole sample.
   void flush() {
+    if (bytes_.empty()) return;
     const auto frames = static_cast<int64_t>(bytes_.size() / kFormat.bytesPerFrame());
     auto data = std::make_shared<DataBlock>(std::exchange(bytes_, {}));
     output_->send(SampleBuffer::makeAudio(std::move(data), format_, frames, mediaTimeFromHostTime(hostTime_)));
     bytes_.reserve(kBytesPerSample);
   }
 
+ private:
   const std::shared_ptr<MicrophoneOutput> output_;
   const AudioFormatDescriptionRef format_ =
       std::make_shared<AudioFormatDescription>(AudioFormatDescription{kFormat.description()});
@@ -171,6 +172,7 @@ class PacedCaptureSession final : public DeviceCaptureSession {
   /// Opens or closes the microphone as the session's parts ask for it.
   void update() {
     if (!running_ || !input_ || !output_) {
+      if (pacer_) pacer_->stop();
       pacer_.reset();
       return;
     }
@@ -178,8 +180,10 @@ class PacedCaptureSession final : public DeviceCaptureSession {
     auto source = microphone_.open(kFormat);
     if (!source) return;
     auto assembler = std::make_shared<SampleAssembler>(output_);
-    PCMPacer::Callbacks callbacks{
-        .opened = [] {}, .sink = [assembler](const PCMBlock& block) { assembler->take(block); }, .closed = [] {}};
+    PCMPacer::Callbacks callbacks{.opened = [] {},
+                                  .sink = [assembler](const PCMBlock& block) { assembler->take(block); },
+                                  .completed = [assembler] { assembler->flush(); },
+                                  .closed = [] {}};
     pacer_ = std::make_unique<PCMPacer>(kFormat, std::move(source), std::move(callbacks));
   }
 

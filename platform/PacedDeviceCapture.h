@@ -18,8 +18,8 @@ struct MicrophoneSource {
 /// Capture sessions with one microphone input and one audio output, over any source of sound.
 ///
 /// The microphone is open, and a thread runs, only while a running session has both. Samples are
-/// of 1024 frames. Removing an output waits for a callback in progress, unless called on the
-/// callback's queue.
+/// of 1024 frames, the last one before a stop of fewer. Removing an output waits for a callback in progress, unless
+/// called on the callback's queue.
 ///
 /// Threading: thread-safe. `open` is called in the thread that completes a session.
 class PacedDeviceCapture final : public DeviceCaptureService {

@@ -29,6 +29,8 @@ struct Tap {
   void setRunning(uint64_t ofRun, bool now);
   void setNotRunning();
   void take(uint64_t ofRun, const PCMBlock& block);
+  void handOverRest(uint64_t ofRun);
+  void handOverFront(std::unique_lock<std::mutex>& lock);
   bool fill(const PCMBlock& block, size_t& offset);
 
   const PCMFormat format;
@@ -94,13 +96,23 @@ void Tap::take(uint64_t ofRun, const PCMBlock& block) {
   while (offset < block.bytes.size()) {
     std::unique_lock lock(mutex);
     if (run != ofRun || !running || enqueued.empty()) return;
-    if (!fill(block, offset)) continue;
-    QueueBuffer* filled = enqueued.front();
-    enqueued.pop_front();
-    const AudioTimeStamp start = frontStart;
-    lock.unlock();
-    callback(filled, start, filled->byteSize / format.bytesPerFrame());
+    if (fill(block, offset)) handOverFront(lock);
   }
+}
+
+void Tap::handOverRest(uint64_t ofRun) {
+  std::unique_lock lock(mutex);
+  if (run != ofRun || !running || enqueued.empty() || enqueued.front()->byteSize == 0) return;
+  handOverFront(lock);
+}
+
+/// Releases the lock.
+void Tap::handOverFront(std::unique_lock<std::mutex>& lock) {
+  QueueBuffer* filled = enqueued.front();
+  enqueued.pop_front();
+  const AudioTimeStamp start = frontStart;
+  lock.unlock();
+  callback(filled, start, filled->byteSize / format.bytesPerFrame());
 }
 
 /// Threading: as AppAudioTapQueue.
@@ -137,7 +149,7 @@ class PacedTapQueue final : public AppAudioTapQueue {
     return 0;
   }
   int32_t start() override;
-  int32_t stopImmediately() override;
+  int32_t stop() override;
   int32_t freeBuffer(QueueBuffer* buffer) override;
   int32_t dispose() override;
 
@@ -149,6 +161,8 @@ class PacedTapQueue final : public AppAudioTapQueue {
     std::lock_guard lock(tap_->mutex);
     return pacer_;
   }
+
+  void end(void (PCMPacer::*how)(), PCMPacer& pacer);
 
   std::shared_ptr<PCMPacer> pacer_;  // stopped but kept after a stop from a callback
   int32_t process_ = 0;
@@ -202,23 +216,26 @@ int32_t PacedTapQueue::start() {
   const uint64_t run = tap_->beginRun();
   PCMPacer::Callbacks callbacks{.opened = [tap = tap_, run] { tap->setRunning(run, true); },
                                 .sink = [tap = tap_, run](const PCMBlock& block) { tap->take(run, block); },
+                                .completed = [tap = tap_, run] { tap->handOverRest(run); },
                                 .closed = [tap = tap_, run] { tap->setRunning(run, false); }};
   pacer_ = std::make_shared<PCMPacer>(tap_->format, std::move(source), std::move(callbacks));
   return 0;
 }
 
-int32_t PacedTapQueue::stopImmediately() {
-  const auto pacer = currentPacer();
-  if (!pacer) return 0;
-  pacer->stop();
+int32_t PacedTapQueue::stop() {
+  if (const auto pacer = currentPacer()) end(&PCMPacer::stop, *pacer);
+  return 0;
+}
+
+void PacedTapQueue::end(void (PCMPacer::*how)(), PCMPacer& pacer) {
+  (pacer.*how)();
   // The thread has said so already, unless this is a callback on it.
   tap_->setNotRunning();
-  return 0;
 }
 
 int32_t PacedTapQueue::dispose() {
   if (disposed_) return 0;
-  stopImmediately();
+  if (const auto current = currentPacer()) end(&PCMPacer::abandon, *current);
   disposed_ = true;
   std::shared_ptr<PCMPacer> pacer;
   std::lock_guard lock(tap_->mutex);

@@ -42,7 +42,7 @@ PacedThread::PacedThread(std::function<TimePoint()> step, std::function<void()> 
 
 PacedThread::~PacedThread() {
   stop();
-  if (thread_.get_id() == std::this_thread::get_id()) {
+  if (isCurrent()) {
     thread_.detach();
   } else {
     thread_.join();
@@ -53,7 +53,7 @@ void PacedThread::stop() {
   std::unique_lock lock(state_->mutex);
   state_->stopping = true;
   state_->changed.notify_all();
-  if (thread_.get_id() == std::this_thread::get_id()) return;
+  if (isCurrent()) return;
   state_->changed.wait(lock, [this] { return state_->ended; });
 }
 

@@ -26,6 +26,7 @@ class PacedThread {
   PacedThread& operator=(const PacedThread&) = delete;
 
   void stop();
+  [[nodiscard]] bool isCurrent() const { return thread_.get_id() == std::this_thread::get_id(); }
 
  private:
   struct State;

@@ -68,7 +68,9 @@ void QVRecordingSession::afterStart(uint64_t generation, const std::function<voi
 }
 
 void QVRecordingSession::pauseSession() {
-  if (paused_.exchange(true)) return;
+  if (paused_) return;
+  pauseTime_.store(Platform::current().clock->hostTime());
+  paused_ = true;
   QV_LOG(logs::kSession, "QVRecordingSession: pauseSession");
   stopAllCapture();
   if (hasBroadcastExtension()) _notifyExtensionOfAction(BroadcastAction::Paused, [] {});

@@ -189,6 +189,7 @@ class QVRecordingSession final : public platform::ScreenCaptureControllerDelegat
   [[nodiscard]] bool deliverVideo(const platform::SampleBufferRef& sample, platform::MediaTime unadjustedTime,
                                   uint64_t transformFlags);
   void updateDuartionWithSample(const platform::SampleBufferRef& sample);
+  [[nodiscard]] platform::SampleBufferRef soundBeforePause(const platform::SampleBufferRef& sample) const;
   void handleAppAudio(const platform::SampleBufferRef& sample);
   void routeAppAudio(const platform::SampleBufferRef& sample);
   void setupMicTap();
@@ -245,6 +246,8 @@ class QVRecordingSession final : public platform::ScreenCaptureControllerDelegat
   std::atomic<uint64_t> generation_{0};
   uint64_t reportedGeneration_ = 0;
   std::atomic<bool> paused_{false};
+  /// The host time at which the pause that lasts, or the last one, began.
+  platform::Guarded<platform::MediaTime> pauseTime_;
   std::atomic<bool> systemRecording_{false};
   std::atomic<bool> isBroadcasting_{false};
   std::atomic<bool> captureRecording_{false};

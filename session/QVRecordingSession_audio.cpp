@@ -17,11 +17,15 @@ void QVRecordingSession::updateDuartionWithSample(const SampleBufferRef& sample)
   }
 }
 
+/// Sound comes later than it was captured, so a pause leaves out only what was captured after it began.
+SampleBufferRef QVRecordingSession::soundBeforePause(const SampleBufferRef& sample) const {
+  return paused_ ? splitSound(sample, pauseTime_.load()).before : sample;
+}
+
 void QVRecordingSession::handleAppAudio(const SampleBufferRef& sample) {
   if (!sample) return;
   updateDuartionWithSample(sample);
-  if (paused_) return;
-  routeAppAudio(sample);
+  if (const SampleBufferRef heard = soundBeforePause(sample)) routeAppAudio(heard);
 }
 
 void QVRecordingSession::routeAppAudio(const SampleBufferRef& sample) {
@@ -51,9 +55,10 @@ void QVRecordingSession::setupMicTap() {
 void QVRecordingSession::handleMicrophone(const SampleBufferRef& sample) {
   if (!sample) return;
   updateDuartionWithSample(sample);
-  if (paused_) return;
+  const SampleBufferRef recorded = soundBeforePause(sample);
+  if (!recorded) return;
   // Muted, the track goes on with silence.
-  const SampleBufferRef heard = microphoneEnabled_ ? sample : platform::SampleBuffer::silencedCopy(sample);
+  const SampleBufferRef heard = microphoneEnabled_ ? recorded : platform::SampleBuffer::silencedCopy(recorded);
   if (broadcastProcessMode_ == BroadcastProcessMode::Samples) {
     _notifyExtensionOfAudioSampleBuffer(heard, SampleType::Microphone);
   } else if (captureRecording_) {

@@ -42,6 +42,26 @@ void MixTimeline::add(int64_t position, std::span<const int16_t> stereo) {
   }
 }
 
+void MixTimeline::reached(const void* key, int64_t end) {
+  std::lock_guard lock(mutex_);
+  ends_[key] = end;
+  moved_.notify_all();
+}
+
+void MixTimeline::forget(const void* key) {
+  std::lock_guard lock(mutex_);
+  ends_.erase(key);
+  moved_.notify_all();
+}
+
+void MixTimeline::await(uint64_t hostTime, std::chrono::nanoseconds stalled, std::chrono::nanoseconds limit) {
+  const int64_t wanted = frameAt(static_cast<int64_t>(hostTime));
+  const int64_t oldest = frameAt(static_cast<int64_t>(hostTime) - stalled.count());
+  const auto isComing = [&](const auto& stream) { return stream.second >= oldest && stream.second < wanted; };
+  std::unique_lock lock(mutex_);
+  moved_.wait_for(lock, limit, [&] { return std::none_of(ends_.begin(), ends_.end(), isComing); });
+}
+
 void MixTimeline::read(uint64_t hostTime, uint32_t channels, std::span<int16_t> samples) {
   std::lock_guard lock(mutex_);
   const auto frames = static_cast<int64_t>(samples.size() / channels);

@@ -12,6 +12,8 @@ PulseMicrophone::PulseMicrophone(const std::string& server, const PCMFormat& for
 
 std::chrono::nanoseconds PulseMicrophone::latency() const { return kPulseLatency; }
 
+void PulseMicrophone::awaitSound(uint64_t hostTime) { timeline_->await(hostTime, kPulseLatency, kPulsePatience); }
+
 void PulseMicrophone::render(uint64_t hostTime, std::span<int16_t> samples) {
   timeline_->read(hostTime, format_.channels, samples);
 }

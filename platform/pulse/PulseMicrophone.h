@@ -14,6 +14,7 @@ class PulseMicrophone final : public PCMSource {
  public:
   PulseMicrophone(const std::string& server, const PCMFormat& format);
   std::chrono::nanoseconds latency() const override;
+  void awaitSound(uint64_t hostTime) override;
   void render(uint64_t hostTime, std::span<int16_t> samples) override;
 
  private:

@@ -10,9 +10,12 @@
 
 namespace qv::platform {
 
-/// Sound is handed on this long after it was played: servers deliver it in fragments of 20 ms, with
-/// some delay when a stream begins (100 ms have been seen).
+/// While it goes on, sound is handed on this long after it was played: servers deliver it in fragments of
+/// 20 ms, with some delay when a stream begins (100 ms have been seen).
 inline constexpr std::chrono::milliseconds kPulseLatency{120};
+/// How long an end waits for sound: a stream that runs is a fragment behind at most. (A PulseAudio server's
+/// null output was seen to deliver commonly 12 ms before the sound is heard, on a busy machine up to 20 ms after.)
+inline constexpr std::chrono::milliseconds kPulsePatience{40};
 
 /// What a process and its descendants play, summed.
 ///
@@ -23,6 +26,7 @@ class PulseTapSource final : public PCMSource {
  public:
   PulseTapSource(const std::string& server, pid_t process, const PCMFormat& format);
   std::chrono::nanoseconds latency() const override { return kPulseLatency; }
+  void awaitSound(uint64_t hostTime) override { timeline_->await(hostTime, kPulseLatency, kPulsePatience); }
   void render(uint64_t hostTime, std::span<int16_t> samples) override;
 
  private:

@@ -35,6 +35,7 @@ PulseTrack::PulseTrack(pa_context* context, const Target& target, std::shared_pt
 }
 
 PulseTrack::~PulseTrack() {
+  timeline_->forget(this);
   if (stream_ == nullptr) return;
   pa_stream_set_state_callback(stream_, nullptr, nullptr);
   pa_stream_set_read_callback(stream_, nullptr, nullptr);
@@ -98,10 +99,11 @@ void PulseTrack::readAvailable() {
   for (;;) {
     const void* data = nullptr;
     size_t bytes = 0;
-    if (pa_stream_peek(stream_, &data, &bytes) < 0 || bytes == 0) return;
+    if (pa_stream_peek(stream_, &data, &bytes) < 0 || bytes == 0) break;
     place(data, bytes);
     pa_stream_drop(stream_);
   }
+  timeline_->reached(this, placed_);
 }
 
 /// `data` is null for a hole.

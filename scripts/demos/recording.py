@@ -20,9 +20,8 @@ ROOT = os.path.dirname(os.path.dirname(os.path.dirname(os.path.abspath(__file__)
 sys.path.insert(0, os.path.join(ROOT, "scripts/stage"))
 from testsignal import beeps, flashes  # noqa: E402
 
-# Sound reaches the daemon about an eighth of a second after it was played, so a cut (the pause, the stop) may
-# take the beep of a flash that it leaves; and a resume may come amid a flash.
-CUT_MARGIN = 0.3
+# A flash needs a few pictures and its beep a few milliseconds to be found; and a resume may come amid a flash.
+CUT_MARGIN = 0.05
 started = []
 
 

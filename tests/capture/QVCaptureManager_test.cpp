@@ -82,6 +82,28 @@ TEST_F(CaptureManagerTest, BufferOfAStoppedTapIsIgnored) {
   EXPECT_EQ(appAudio_.size(), before);
 }
 
+TEST_F(CaptureManagerTest, AStopDeliversWhatTheTapAndTheMicrophoneHandOverAtIt) {
+  bool started = false;
+  startTap([&] { started = true; });
+  manager_.startMicrophoneCaptureWithOutput(collect(microphone_), nullptr);
+  device_.run();
+  started = false;
+  manager_.setCaptureStartTime(MediaTime::make(1, 1));
+  const auto state = device_.tap.tap;
+  state->atStop = [&] {
+    ASSERT_TRUE(device_.tap.fill(300, 3 * kSecond, 300));
+    // A tap also tells that it runs no more.
+    if (state->listener) state->listener();
+  };
+  device_.deviceCapture.session->atStop = [&] { device_.deviceCapture.send(microphoneSample(3 * kSecond, 441)); };
+  manager_.stopAllCapture();
+  ASSERT_EQ(appAudio_.size(), 1u);
+  EXPECT_EQ(appAudio_[0]->numSamples(), 300);
+  EXPECT_EQ(microphone_.size(), 1u);
+  EXPECT_TRUE(state->disposed);
+  EXPECT_FALSE(started) << "it has not started again";
+}
+
 TEST_F(CaptureManagerTest, ResumeFillsTheGapOnce) {
   startTap();
   manager_.setCaptureStartTime(MediaTime::make(1, 1));

@@ -118,6 +118,52 @@ TEST_F(PipelineTest, AudioOfTheApplicationAndAMutedMicrophoneReachTheirTracks) {
   EXPECT_EQ(microphone[1]->data()->bytes()[0], 0);
 }
 
+/// A tap and a microphone hand over at their stop what was captured since their last buffer, here 100 ms that begin
+/// 50 ms before now, and whatever they captured while they were being stopped.
+TEST_F(PipelineTest, SoundOfBeforeAPauseOrAStopIsWrittenThoughItComesAfterwards) {
+  device_.deviceInfo.audioCaptureDevice = true;
+  client_.start({.microphone = true});
+  const auto play = [&](int64_t time, uint32_t frames) {
+    ASSERT_TRUE(device_.tap.fill(frames, static_cast<uint64_t>(time), frames));
+  };
+  const auto speak = [&](int64_t time, uint32_t frames) {
+    device_.deviceCapture.send(platform::SampleBuffer::makeAudio(
+        std::make_shared<platform::DataBlock>(std::vector<uint8_t>(size_t{frames} * 2, 9)),
+        captureManager_.createAudioFormatDescription(), frames,
+        platform::MediaTime::make(time, platform::kHostTimescale)));
+  };
+  const auto handOverAtStop = [&] {
+    const int64_t now = device_.clock.hostTime().value;
+    device_.tap.tap->atStop = [now, play] {
+      play(now - kSecond / 20, 4410);
+      play(now + kSecond / 20, 441);
+    };
+    device_.deviceCapture.session->atStop = [now, speak] {
+      speak(now - kSecond / 20, 4410);
+      speak(now + kSecond / 20, 441);
+    };
+  };
+  const auto framesWritten = [&](const auto& input) {
+    std::vector<int64_t> frames;
+    for (const auto& sample : input.samples) frames.push_back(sample->numSamples());
+    return frames;
+  };
+  frame(device_.clock.hostTime().value / (kSecond / 10));
+  handOverAtStop();
+  pause();
+  EXPECT_EQ(framesWritten(device_.movies.appAudio()), std::vector<int64_t>{2205});
+  EXPECT_EQ(framesWritten(device_.movies.microphone()), std::vector<int64_t>{2205});
+
+  device_.clock.advanceSeconds(2);
+  resume();
+  frame(device_.clock.hostTime().value / (kSecond / 10));
+  handOverAtStop();
+  client_.request("stopRecordingWithHandler");
+  // The writer itself ends the sound with the picture.
+  EXPECT_EQ(framesWritten(device_.movies.appAudio()), (std::vector<int64_t>{2205, 4410, 441}));
+  EXPECT_EQ(framesWritten(device_.movies.microphone()), (std::vector<int64_t>{2205, 4410, 441}));
+}
+
 TEST_F(PipelineTest, AnotherTappedProcessReplacesTheTap) {
   client_.start();
   frame(10);

@@ -52,8 +52,8 @@ def loud_tenths(samples, end):
 
 def ends_with_tone(path):
     samples = movie.sound(path)
-    # What was played in the last eighth of a second is not there yet when a recording stops.
-    return loud_tenths(samples, len(samples) / movie.RATE - 0.15) == 5
+    # An encoder fills its last frame up with silence.
+    return loud_tenths(samples, len(samples) / movie.RATE - 0.03) == 5
 
 
 def late_sound_server():

@@ -94,7 +94,10 @@ class FakeDeviceCapture final : public platform::DeviceCaptureService, public pl
     void addOutput(std::shared_ptr<platform::CaptureOutput>) override { ++outputs; }
     void removeOutput(const std::shared_ptr<platform::CaptureOutput>&) override { --outputs; }
     void startRunning() override { setRunning(true); }
-    void stopRunning() override { setRunning(false); }
+    void stopRunning() override {
+      if (atStop) atStop();
+      setRunning(false);
+    }
     bool isRunning() const override { return running; }
     void setRunningObserver(std::function<void()> to) override { observer = std::move(to); }
     void setRunning(bool to) {
@@ -104,6 +107,7 @@ class FakeDeviceCapture final : public platform::DeviceCaptureService, public pl
     int inputs = 0, outputs = 0;
     bool running = false;
     std::function<void()> observer;
+    std::function<void()> atStop;  ///< what it still has is delivered here
   };
 
   std::shared_ptr<platform::DeviceCaptureSession> createSession() override {
@@ -141,6 +145,7 @@ class FakeAppAudioTap final : public platform::AppAudioTapService {
     bool running = false, disposed = false;
     platform::AppAudioInputCallback callback;
     std::function<void()> listener;
+    std::function<void()> atStop;  ///< what it still has is handed over here
     std::vector<platform::QueueBuffer*> enqueued;
     std::vector<uint32_t> capacities;
     int freed = 0;
@@ -184,7 +189,8 @@ class FakeAppAudioTap final : public platform::AppAudioTapService {
       if (const auto call = state->listener) call();
       return service.status("start");
     }
-    int32_t stopImmediately() override {
+    int32_t stop() override {
+      if (state->atStop) state->atStop();
       state->running = false;
       return service.status("stop");
     }

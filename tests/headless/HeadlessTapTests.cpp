@@ -77,7 +77,7 @@ TEST_F(HeadlessTapTest, BeepsWithTheSecondOnTheHostClock) {
   const auto begin = static_cast<uint64_t>(systemClock().hostTime().value);
   ASSERT_EQ(0, queue_->start());
   const auto buffers = waitForBuffers(50);
-  ASSERT_EQ(0, queue_->stopImmediately());
+  ASSERT_EQ(0, queue_->stop());
   EXPECT_GE(buffers[0].hostTime, begin);
   double next = 0;
   size_t loud = 0;
@@ -135,6 +135,21 @@ TEST_F(HeadlessTapTest, DropsWhatFindsNoBufferAndKeepsTime) {
               (buffers[1].sampleTime - buffers[0].sampleTime) / 44100 * 1e9, 2);
 }
 
+TEST_F(HeadlessTapTest, AStopHandsOverAllUpToTheCall) {
+  makeQueue();
+  addBuffers(10, 57344);
+  ASSERT_EQ(0, queue_->start());
+  waitForBuffers(1);
+  const auto before = systemClock().hostTime().value;
+  ASSERT_EQ(0, queue_->stop());
+  const auto after = systemClock().hostTime().value;
+  const auto& last = taken_.back();
+  const auto end =
+      static_cast<int64_t>(last.hostTime) + static_cast<int64_t>(last.bytes.size() / 2) * 1'000'000'000 / 44100;
+  EXPECT_GE(end, before - 50'000) << "but for a frame";
+  EXPECT_LE(end, after);
+}
+
 TEST_F(HeadlessTapTest, ReportsRunningOnceForEachChange) {
   makeQueue();
   addBuffers(10, 57344);
@@ -148,7 +163,7 @@ TEST_F(HeadlessTapTest, ReportsRunningOnceForEachChange) {
   ASSERT_EQ(0, queue_->start());
   waitForBuffers(1);
   EXPECT_EQ(changes, 1);
-  ASSERT_EQ(0, queue_->stopImmediately());
+  ASSERT_EQ(0, queue_->stop());
   EXPECT_EQ(changes, 2);
   EXPECT_TRUE(sameThread) << "on the queue's own thread";
   ASSERT_EQ(0, queue_->start());
@@ -172,10 +187,10 @@ TEST_F(HeadlessTapTest, StopWaitsForACallbackOrComesFromOne) {
   for (int round = 0; round < 5; ++round) {
     ASSERT_EQ(0, queue_->start());
     waitForBuffers(count() + 1);
-    ASSERT_EQ(0, queue_->stopImmediately());
+    ASSERT_EQ(0, queue_->stop());
     ASSERT_FALSE(inside);
   }
-  onBuffer = [&] { EXPECT_EQ(0, queue_->stopImmediately()); };
+  onBuffer = [&] { EXPECT_EQ(0, queue_->stop()); };
   const size_t before = count();
   ASSERT_EQ(0, queue_->start());
   waitForBuffers(before + 1);

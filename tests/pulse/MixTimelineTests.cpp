@@ -1,5 +1,7 @@
 #include <gtest/gtest.h>
 
+#include <thread>
+
 #include "platform/Clock.h"
 #include "platform/pulse/MixTimeline.h"
 
@@ -42,6 +44,31 @@ TEST(MixTimeline, ForgetsWhatALongHoldUpSkipped) {
     timeline.read(static_cast<uint64_t>(now + second * 1'000'000'000), 1, mono);
     EXPECT_EQ(mono, std::vector<int16_t>(kRate)) << second;
   }
+}
+
+TEST(MixTimeline, AwaitsStreamsThatRunAndNoOthers) {
+  constexpr std::chrono::milliseconds kStalled(120);
+  constexpr std::chrono::hours kLong(1);
+  MixTimeline timeline(kRate);
+  const auto now = systemClock().hostTime().value + 10'000'000;
+  const int64_t frame = timeline.frameAt(now);
+  const int steady = 0, stalled = 0, gone = 0;
+  timeline.reached(&stalled, frame - kRate / 5);
+  timeline.reached(&gone, frame - 100);
+  timeline.reached(&steady, frame - 100);
+  std::vector<int16_t> mono(100);
+  std::thread reader([&] {
+    timeline.await(static_cast<uint64_t>(now), kStalled, kLong);
+    timeline.read(static_cast<uint64_t>(now), 1, mono);
+  });
+  timeline.forget(&gone);
+  timeline.reached(&steady, frame - 50);
+  timeline.add(frame, std::vector<int16_t>(200, 77));
+  timeline.reached(&steady, frame);
+  reader.join();
+  EXPECT_EQ(mono, std::vector<int16_t>(100, 77));
+  timeline.reached(&steady, frame - 50);
+  timeline.await(static_cast<uint64_t>(now), kStalled, std::chrono::milliseconds(1));  // not for ever
 }
 
 }  // namespace

@@ -122,6 +122,20 @@ uint64_t Capture::firstSound() {
   return 0;
 }
 
+uint64_t Capture::end() {
+  std::lock_guard lock(mutex_);
+  if (starts_.empty()) return 0;
+  const auto& [index, hostTime] = starts_.back();
+  return hostTime + (samples_.size() - index) * 1'000'000'000 / kRate;
+}
+
+std::vector<int16_t> Capture::from(uint64_t hostTime) {
+  const uint64_t last = end();
+  std::lock_guard lock(mutex_);
+  const size_t wanted = hostTime < last ? (last - hostTime) * kRate / 1'000'000'000 : 0;
+  return {samples_.end() - static_cast<ptrdiff_t>(std::min(wanted, samples_.size())), samples_.end()};
+}
+
 bool Capture::isContinuous() {
   std::lock_guard lock(mutex_);
   for (const auto& [index, hostTime] : starts_) {

@@ -46,6 +46,10 @@ class Capture {
   std::vector<int16_t> next(size_t frames);
   /// The host time of the first sample of more than a tenth of the players' amplitude; 0 without.
   uint64_t firstSound();
+  /// The host time at which what was captured so far ends; 0 before.
+  uint64_t end();
+  /// The samples from a host time on, or all where it began later.
+  std::vector<int16_t> from(uint64_t hostTime);
   [[nodiscard]] bool isContinuous();
 
  private:
