@@ -80,7 +80,8 @@ TEST_F(ArbitrationTest, ASystemRecordingFollowsTheFront) {
   system.start({.width = 1920, .height = 1080, .system = true});
   device_.run();
   EXPECT_EQ(device_.tap.tap->process, 100);
-  EXPECT_EQ(device_.movies.video().settings.at(platform::settings::kVideoWidth).asDouble(), 1080) << "never wider than tall";
+  EXPECT_EQ(device_.movies.video().settings.at(platform::settings::kVideoWidth).asDouble(), 1080)
+      << "never wider than tall";
   device_.applications.report(platform::kApplicationForeground, 200, true);
   device_.run();
   EXPECT_EQ(device_.tap.tap->process, 200);
