@@ -1,6 +1,6 @@
 #include "platform/Log.h"
+#include "platform/RawRecord.h"
 #include "session/QVRecordingSession.h"
-#include "session/RawRecord.h"
 
 namespace qv {
 

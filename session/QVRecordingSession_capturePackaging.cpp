@@ -1,5 +1,5 @@
+#include "platform/RawRecord.h"
 #include "session/QVRecordingSession.h"
-#include "session/RawRecord.h"
 
 namespace qv {
 

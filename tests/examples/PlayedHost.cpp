@@ -8,7 +8,6 @@
 // SIGTERM ends a stream early, in order.
 
 #include <fcntl.h>
-#include <spawn.h>
 #include <sys/wait.h>
 #include <unistd.h>
 
@@ -28,7 +27,9 @@
 #include "extensions/QVSharedFrameObject.h"
 #include "platform/Clock.h"
 #include "platform/Extensions.h"
+#include "platform/RawRecord.h"
 #include "platform/SampleBuffer.h"
+#include "platform/SpawnedProcess.h"
 #include "platform/sdbus/SdBusIPC.h"
 
 namespace {
@@ -146,32 +147,24 @@ class Door final : IPCListenerDelegate {
   const std::unique_ptr<IPCListener> listener_;
 };
 
-pid_t launch(const char* program, const Door& requests, const Door& auxiliary) {
-  posix_spawn_file_actions_t actions;
-  posix_spawn_file_actions_init(&actions);
-  // Out of the way of the numbers that they get.
-  posix_spawn_file_actions_adddup2(&actions, ::fcntl(requests.endpoint()->get(), F_DUPFD_CLOEXEC, 10), 3);
-  posix_spawn_file_actions_adddup2(&actions, ::fcntl(auxiliary.endpoint()->get(), F_DUPFD_CLOEXEC, 10), 4);
-  ::setenv(kExtensionRequestsEndpointVariable, "3", 1);
-  ::setenv(kExtensionAuxiliaryEndpointVariable, "4", 1);
-  char* const arguments[] = {const_cast<char*>(program), nullptr};
-  pid_t process = -1;
-  const int failure = ::posix_spawn(&process, program, &actions, nullptr, arguments, environ);
-  posix_spawn_file_actions_destroy(&actions);
-  if (failure == 0) return process;
-  std::fprintf(stderr, "%s: %s\n", program, std::strerror(failure));
+/// With this program's environment and standard error.
+SpawnedProcess launch(const char* program, const Door& requests, const Door& auxiliary) {
+  SpawnRequest request;
+  request.program = program;
+  for (char** entry = environ; *entry != nullptr; ++entry) request.environment.emplace_back(*entry);
+  request.environment.push_back(std::string(kExtensionRequestsEndpointVariable) + "=3");
+  request.environment.push_back(std::string(kExtensionAuxiliaryEndpointVariable) + "=4");
+  request.descriptors = {requests.endpoint(), auxiliary.endpoint()};
+  request.output.reset(::dup(STDERR_FILENO));
+  request.joinsErrors = true;
+  auto process = SpawnedProcess::start(std::move(request));
+  if (process) return std::move(*process);
+  std::fprintf(stderr, "%s\n", process.error().description().c_str());
   std::exit(1);
 }
 
-template <typename T>
-Data bytesOf(const T& record) {
-  Data bytes(sizeof(T));
-  std::memcpy(bytes.data(), &record, sizeof(T));
-  return bytes;
-}
-
 Data timingOf(Time presentation) {
-  return bytesOf(SampleTimingInfo{{}, mediaTimeFromHostTime(static_cast<uint64_t>(presentation.count())), {}});
+  return rawBytes(SampleTimingInfo{{}, mediaTimeFromHostTime(static_cast<uint64_t>(presentation.count())), {}});
 }
 
 /// A stream of pictures and sound in real time.
@@ -228,7 +221,7 @@ class Film {
         kRate, kAudioFormatLinearPCM, kAudioFormatFlagIsSignedInteger | kAudioFormatFlagIsPacked, 2, 1, 2, 1, 16, 0};
     send({{broadcastpayload::kSampleType, int64_t{2}},
           {broadcastpayload::kAudioBufferList, std::move(bytes)},
-          {broadcastpayload::kAudioFormatDescription, bytesOf(format)},
+          {broadcastpayload::kAudioFormatDescription, rawBytes(format)},
           {broadcastpayload::kTimingInfo, timingOf(start_ + pauses_ + soundTime())},
           {broadcastpayload::kNumSamples, int64_t{kRunOfSound}}});
     soundPosition_ += kRunOfSound;
@@ -297,7 +290,7 @@ int main(int argc, char** argv) {
   }
   const auto calls = std::make_shared<Calls>();
   SdBusIPCService ipc;
-  pid_t process = -1;
+  SpawnedProcess process;
   {
     Door requests(ipc, extensionRequestHostProtocol(), extensionRequestProtocol(), calls);
     Door auxiliary(ipc, extensionHostProtocol(), extensionVendorProtocol(), calls);
@@ -309,8 +302,7 @@ int main(int argc, char** argv) {
     }
     requests.connection().invalidate();
   }
-  int status = 0;
-  ::waitpid(process, &status, 0);
+  const int status = process.waitForEnd();
   std::printf("exit %d\n", WIFEXITED(status) ? WEXITSTATUS(status) : -WTERMSIG(status));
   return status == 0 ? 0 : 1;
 }

@@ -9,6 +9,7 @@
 #include "extensions/QVBroadcastConfiguration.h"
 #include "extensions/QVBroadcastProtocols.h"
 #include "extensions/QVSharedFrameObject.h"
+#include "platform/RawRecord.h"
 #include "platform/SampleBuffer.h"
 #include "platform/sdbus/SdBusIPC.h"
 #include "sdk/extension/ExtensionProcess.h"
@@ -36,15 +37,8 @@ T valueOf(std::future<T> future) {
   return future.get();
 }
 
-template <typename T>
-Data bytesOf(const T& record) {
-  Data bytes(sizeof(T));
-  std::memcpy(bytes.data(), &record, sizeof(T));
-  return bytes;
-}
-
 Data timingAt(int64_t milliseconds) {
-  return bytesOf(platform::SampleTimingInfo{MediaTime::invalid(), MediaTime::make(milliseconds, 1000), {}});
+  return rawBytes(platform::SampleTimingInfo{MediaTime::invalid(), MediaTime::make(milliseconds, 1000), {}});
 }
 
 /// A listener of the host's, with the one connection that came.
@@ -140,7 +134,7 @@ Dictionary audioPayload(int64_t numSamples) {
       44100, platform::kAudioFormatLinearPCM, platform::kAudioFormatFlagIsSignedInteger, 2, 1, 2, 1, 16, 0};
   return {{broadcastpayload::kSampleType, Value(int64_t{3})},
           {broadcastpayload::kAudioBufferList, Value(Data{1, 2, 3, 4})},
-          {broadcastpayload::kAudioFormatDescription, Value(bytesOf(format))},
+          {broadcastpayload::kAudioFormatDescription, Value(rawBytes(format))},
           {broadcastpayload::kTimingInfo, Value(timingAt(250))},
           {broadcastpayload::kNumSamples, Value(numSamples)}};
 }

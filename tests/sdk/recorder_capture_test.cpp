@@ -1,7 +1,7 @@
-#include <cstring>
 #include <future>
 
 #include "extensions/QVSharedFrameObject.h"
+#include "platform/RawRecord.h"
 #include "platform/SampleBuffer.h"
 #include "tests/sdk/RecorderFixture.h"
 
@@ -16,13 +16,6 @@ using platform::SampleTimingInfo;
 using platform::SharedFrame;
 using platform::Value;
 using namespace std::chrono_literals;
-
-template <typename T>
-Data bytesOf(const T& record) {
-  Data bytes(sizeof(T));
-  std::memcpy(bytes.data(), &record, sizeof(T));
-  return bytes;
-}
 
 const SampleTimingInfo kTiming{MediaTime::make(1, 60), MediaTime::make(5'000'000'000, platform::kHostTimescale),
                                MediaTime::invalid()};
@@ -50,7 +43,7 @@ class RecorderCapture : public RecorderFixture {
     auto future = returned->get_future();
     std::shared_ptr<void> hold(nullptr, [returned](void*) { returned->set_value(); });
     const QVSharedFrameObject object(SharedFrame::withAttachment(std::move(frame), std::move(hold)));
-    tellClient("captureHandlerWithSample", {object.encodeForIPC(), bytesOf(kTiming)});
+    tellClient("captureHandlerWithSample", {object.encodeForIPC(), rawBytes(kTiming)});
     return future;
   }
 };
@@ -99,7 +92,7 @@ TEST_F(RecorderCapture, AnApplicationThatDoesNotKeepUpLosesTheNewest) {
 TEST_F(RecorderCapture, AudioCarriesItsFormatAndSource) {
   for (const int64_t type : {2, 3})
     tellClient("captureHandlerWithAudioSample",
-               {Data{1, 2, 3, 4}, bytesOf(kFormat), int64_t{2}, type, bytesOf(kTiming)});
+               {Data{1, 2, 3, 4}, rawBytes(kFormat), int64_t{2}, type, rawBytes(kTiming)});
   run();
   ASSERT_EQ(samples_.size(), 2u);
   EXPECT_EQ(samples_[0].source, quorvel::AudioSample::Source::Application);
@@ -113,7 +106,7 @@ TEST_F(RecorderCapture, AudioCarriesItsFormatAndSource) {
 }
 
 TEST_F(RecorderCapture, MalformedSamplesAreDropped) {
-  const Data timing = bytesOf(kTiming), format = bytesOf(kFormat);
+  const Data timing = rawBytes(kTiming), format = rawBytes(kFormat);
   SampleTimingInfo timeless = kTiming;
   timeless.presentationTimeStamp = MediaTime::invalid();
   AudioStreamDescription encoded = kFormat;
@@ -127,9 +120,9 @@ TEST_F(RecorderCapture, MalformedSamplesAreDropped) {
       {Data{1, 2}, format, INT64_MAX, int64_t{2}, timing},
       {Data{1, 2}, Data(39), int64_t{1}, int64_t{2}, timing},
       {Data{1, 2}, format, int64_t{1}, int64_t{2}, Data(71)},
-      {Data{1, 2}, format, int64_t{1}, int64_t{2}, bytesOf(timeless)},
-      {Data{1, 2}, bytesOf(encoded), int64_t{1}, int64_t{2}, timing},
-      {Data{1, 2}, bytesOf(empty), int64_t{1}, int64_t{2}, timing},
+      {Data{1, 2}, format, int64_t{1}, int64_t{2}, rawBytes(timeless)},
+      {Data{1, 2}, rawBytes(encoded), int64_t{1}, int64_t{2}, timing},
+      {Data{1, 2}, rawBytes(empty), int64_t{1}, int64_t{2}, timing},
   };
   for (const auto& sound : sounds) tellClient("captureHandlerWithAudioSample", sound);
   const auto notAFrame = platform::shareFileDescriptor(platform::FileDescriptor(::dup(0)));

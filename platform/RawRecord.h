@@ -4,14 +4,14 @@
 
 #include "platform/Value.h"
 
-namespace qv {
+namespace qv::platform {
 
 /// The raw bytes of a record that crosses to another process of this device.
 template <typename Record>
-platform::Data rawBytes(const Record& record) {
-  platform::Data bytes(sizeof record);
+Data rawBytes(const Record& record) {
+  Data bytes(sizeof record);
   std::memcpy(bytes.data(), &record, sizeof record);
   return bytes;
 }
 
-}  // namespace qv
+}  // namespace qv::platform
