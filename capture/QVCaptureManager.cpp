@@ -1,11 +1,13 @@
 #include "capture/QVCaptureManager.h"
 
+#include <utility>
+
+#include "capture/AppAudioCapture.h"
 #include "platform/Log.h"
 
 namespace qv {
 
 using platform::AudioStreamDescription;
-using platform::MediaTime;
 namespace logs = platform::logs;
 
 namespace {
@@ -23,8 +25,6 @@ constexpr AudioStreamDescription kBasicDescription{44100.0,
                                                    16,
                                                    0};
 
-constexpr platform::AudioTimeStamp kInitialTimestamp{0.0, 0, 1.0, 0, {}, 0, 0};
-
 }  // namespace
 
 QVCaptureManager& QVCaptureManager::sharedManager() {
@@ -35,7 +35,6 @@ QVCaptureManager& QVCaptureManager::sharedManager() {
 QVCaptureManager::QVCaptureManager(platform::Platform& platform)
     : platform_(platform),
       audioBasicDescription_(kBasicDescription),
-      initialTimestamp_(kInitialTimestamp),
       audioDispatchQueue_("com.tarnwick.Quorvel.CaptureQueue", *platform.globalQueue),
       sessionSampleBufferQueue_("com.tarnwick.quorvel.capture.session", *platform.globalQueue) {
   platform::AudioSession& audioSession = platform_.deviceCapture->audioSession();
@@ -47,47 +46,51 @@ QVCaptureManager::QVCaptureManager(platform::Platform& platform)
 
 QVCaptureManager::~QVCaptureManager() {
   platform_.deviceCapture->audioSession().setInterruptionObserver(nullptr);
-  stopAllCapture();
+  setCaptureSessionVideoDataOutput(nullptr);
 }
 
 bool QVCaptureManager::hasAudioCaptureDevice() const { return platform_.deviceInfo->hasAudioCaptureDevice(); }
 
-void QVCaptureManager::startCaptureSession() {
-  QV_LOG(logs::kCapture, "QVCaptureManager: startCaptureSession");
-  if (sessionInProgress_.exchange(true)) return;
-  setCaptureSession(platform_.deviceCapture->createSession());
+bool QVCaptureManager::hasVideoCaptureDevice() const { return captureSessionVideoDataOutput_.load() != nullptr; }
+
+std::unique_ptr<AppAudioLease> QVCaptureManager::leaseAppAudio(OutputHandler outputHandler) {
+  return std::make_unique<AppAudioCapture>(platform_, *this, std::move(outputHandler));
 }
 
-void QVCaptureManager::setCaptureSession(std::shared_ptr<platform::DeviceCaptureSession> session) {
-  const auto former = captureSession_.load();
-  if (session == former) return;
-  if (former) former->setRunningObserver(nullptr);
-  captureSession_.store(std::move(session));
+std::unique_ptr<MicrophoneLease> QVCaptureManager::startMicrophoneCaptureWithOutput(OutputHandler outputHandler,
+                                                                                    DidStartHandler didStartHandler) {
+  auto micInterrupted = std::make_shared<MicInterrupted>(false);
+  microphones_.with([&](auto& microphones) {
+    std::erase_if(microphones, [](const auto& microphone) { return microphone.expired(); });
+    microphones.push_back(micInterrupted);
+  });
+  return std::make_unique<MicrophoneCapture>(platform_, *this, std::move(micInterrupted), std::move(outputHandler),
+                                             std::move(didStartHandler));
 }
 
-void QVCaptureManager::stopCaptureSession() {
-  QV_LOG(logs::kCapture, "QVCaptureManager: stopDeviceCaptureSessionWithFinishHandler");
-  if (!sessionInProgress_.exchange(false)) return;
-  const auto session = captureSession_.load();
-  if (!session) return;
-  session->setRunningObserver(nullptr);
-  session->stopRunning();
-  // Its last samples are queued by now.
-  sessionSampleBufferQueue_.sync([] {});
+void QVCaptureManager::handleAudioSessionInterruption(uint32_t type) {
+  if (type == static_cast<uint32_t>(platform::AudioSessionInterruption::Began)) {
+    QV_LOG(logs::kCapture, "QVCaptureManager: audio session interruption began");
+    microphones_.with([](auto& microphones) {
+      for (const auto& weak : microphones) {
+        if (const auto micInterrupted = weak.lock()) *micInterrupted = true;
+      }
+    });
+  } else if (type == static_cast<uint32_t>(platform::AudioSessionInterruption::Ended)) {
+    QV_LOG(logs::kCapture, "QVCaptureManager: audio session interruption ended");
+  }
 }
 
-void QVCaptureManager::stopAllCapture() {
-  // The tap's end is waited for together with the microphone's.
-  audioDispatchQueue_.async([this] { stopTap(); });
-  stopCaptureSession();
-  stopMicrophoneCapture();
-  stopAppAudioCapture();
-  cameraOutputHandler_.store(nullptr);
-  microphoneOutputHandler_.store(nullptr);
-  appAudioOutputHandler_.store(nullptr);
-  captureStartTime_.store(MediaTime::invalid());
-  lastAudioDate_.store(std::nullopt);
-  lastMicAudioDate_.store(std::nullopt);
+void QVCaptureManager::setCaptureSessionVideoDataOutput(std::shared_ptr<platform::VideoDataOutput> output) {
+  const auto former = captureSessionVideoDataOutput_.exchange(output);
+  if (former && former != output) former->setSampleDelegate(nullptr, nullptr);
+  if (output) output->setSampleDelegate(this, &sessionSampleBufferQueue_);
+}
+
+void QVCaptureManager::captureOutputDidOutputSampleBuffer(const platform::CaptureOutput& output,
+                                                          const platform::SampleBufferRef& sample) {
+  if (&output != captureSessionVideoDataOutput_.load().get()) return;
+  if (const OutputHandler handler = cameraOutputHandler_.load()) handler(sample);
 }
 
 }  // namespace qv

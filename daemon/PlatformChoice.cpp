@@ -13,13 +13,20 @@
 #include "platform/sdbus/LogindKeepAlive.h"
 #include "platform/sdbus/SdBusIPC.h"
 #include "platform/x11/X11Platform.h"
+#include "support/QVDiskSpace.h"
+#include "support/QVTemporaryFiles.h"
 
 namespace qv {
 
 namespace logs = platform::logs;
 
 struct PlatformChoice::Backends {
-  platform::LinuxPlatform linux{platform::deviceRootFromEnvironment(), platform::bundlePathFromEnvironment()};
+  platform::LinuxPlatform linux{
+      platform::deviceRootFromEnvironment(),
+      platform::bundlePathFromEnvironment(),
+      {kTempPath,
+       {.thresholds = {kMinimumFreeSpaceForRecording, kMinimumFreeSpaceWhileRecording, kCriticalFreeSpace},
+        .criticalFor = kCriticalFor}}};
   platform::SdBusIPCService ipc{linux.peerResolver()};
   platform::LinuxExtensionService extensions{
       ipc,

@@ -66,8 +66,8 @@ void QVBroadcastBook::loadBroadcastUploadExtensionWithBaseIdentifier(const std::
 
 void QVBroadcastBook::store(const SetupRequest& request, const ExtensionRecordRef& extension,
                             const QVBroadcastConfiguration& configuration) {
-  hostBundleIDtoExtensionInfoLookup_[request.hostBundleID] = {extension, processMode(*extension), request.userInfo,
-                                                              configuration, request.generation};
+  hostBundleIDtoExtensionInfoLookup_[request.hostBundleID] = {
+      {extension, processMode(*extension), request.userInfo, configuration}, request.before};
   currentExtensionAppImage_ = extension->icons.empty() ? Data() : extension->icons.front();
   currentExtensionDisplayName_ = extension->displayName;
   currentHostAppImage_ = _qvAppIconFromBundleID(request.hostBundleID);
@@ -75,13 +75,13 @@ void QVBroadcastBook::store(const SetupRequest& request, const ExtensionRecordRe
 
 const QVBroadcastInfo* QVBroadcastBook::infoForHostBundleID(const std::string& hostBundleID) const {
   const auto info = hostBundleIDtoExtensionInfoLookup_.find(hostBundleID);
-  return info == hostBundleIDtoExtensionInfoLookup_.end() ? nullptr : &info->second;
+  return info == hostBundleIDtoExtensionInfoLookup_.end() ? nullptr : &info->second.info;
 }
 
-void QVBroadcastBook::recordingEnded(const std::string& hostBundleID, uint64_t generation) {
-  const auto info = hostBundleIDtoExtensionInfoLookup_.find(hostBundleID);
-  if (info == hostBundleIDtoExtensionInfoLookup_.end() || info->second.generation > generation) return;
-  hostBundleIDtoExtensionInfoLookup_.erase(info);
+void QVBroadcastBook::recordingEnded(const std::shared_ptr<const QVRecording>& recording) {
+  const auto entry = hostBundleIDtoExtensionInfoLookup_.find(recording->settings().bundleID);
+  if (entry == hostBundleIDtoExtensionInfoLookup_.end() || entry->second.before.lock() == recording) return;
+  hostBundleIDtoExtensionInfoLookup_.erase(entry);
 }
 
 void QVBroadcastBook::getSystemBroadcastExtensionInfo(InfoHandler handler) {

@@ -6,22 +6,12 @@
 #include <optional>
 #include <string>
 
-#include "extensions/QVBroadcastConfiguration.h"
 #include "extensions/QVExtensions.h"
 #include "platform/Extensions.h"
 #include "platform/SerialQueue.h"
+#include "session/QVRecording.h"
 
 namespace qv {
-
-/// What was set up for the next broadcast of a host application.
-struct QVBroadcastInfo {
-  platform::ExtensionRecordRef extension;
-  BroadcastProcessMode extensionProcessMode = BroadcastProcessMode::MovieClips;
-  platform::Dictionary extensionUserInfo;
-  QVBroadcastConfiguration extensionConfiguration;
-  /// The first recording of the host's session that it is for: it survives the end of one that was running before.
-  uint64_t generation = 0;
-};
 
 /// The broadcasts that were set up, and what is shown of the current one. Memory only.
 ///
@@ -33,7 +23,8 @@ class QVBroadcastBook : public std::enable_shared_from_this<QVBroadcastBook> {
     std::string extensionBundleID;
     platform::Data configuration;
     platform::Dictionary userInfo;
-    uint64_t generation = 0;
+    /// What the host records at the moment, if anything: the set-up is for what comes after it, and survives its end.
+    std::weak_ptr<const QVRecording> before;
   };
   using SetupHandler = std::function<void(const std::optional<platform::Error>&)>;
   using InfoHandler = std::function<void(platform::Array, const std::optional<platform::Error>&)>;
@@ -44,8 +35,8 @@ class QVBroadcastBook : public std::enable_shared_from_this<QVBroadcastBook> {
   /// RECORDING_ERROR_INVALID_BROADCAST_SESSION, and nothing noted, where there is none or the configuration is none.
   void setupBroadcast(SetupRequest request, SetupHandler handler);
   [[nodiscard]] const QVBroadcastInfo* infoForHostBundleID(const std::string& hostBundleID) const;
-  /// The recording of this generation has ended.
-  void recordingEnded(const std::string& hostBundleID, uint64_t generation);
+  /// A recording of this host that had begun has ended: a set-up is for one recording.
+  void recordingEnded(const std::shared_ptr<const QVRecording>& recording);
   /// One dictionary for each installed upload extension: "displayName", "extBundleID", "extAppImgData" (PNG). An
   /// extension without name or icon lacks that key.
   void getSystemBroadcastExtensionInfo(InfoHandler handler);
@@ -63,7 +54,11 @@ class QVBroadcastBook : public std::enable_shared_from_this<QVBroadcastBook> {
              const QVBroadcastConfiguration& configuration);
 
   platform::SerialQueue& sequence_;
-  std::map<std::string, QVBroadcastInfo> hostBundleIDtoExtensionInfoLookup_;
+  struct Entry {
+    QVBroadcastInfo info;
+    std::weak_ptr<const QVRecording> before;
+  };
+  std::map<std::string, Entry> hostBundleIDtoExtensionInfoLookup_;
   platform::Data currentHostAppImage_;
   platform::Data currentExtensionAppImage_;
   std::string currentExtensionDisplayName_;

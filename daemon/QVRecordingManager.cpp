@@ -1,6 +1,7 @@
 #include "daemon/QVRecordingManager.h"
 
-#include "daemon/StartRequest.h"
+#include <utility>
+
 #include "daemon/client/QVDaemonProtocol.h"
 #include "extensions/QVExtensionHostContext.h"
 #include "platform/Log.h"
@@ -15,9 +16,7 @@ namespace logs = platform::logs;
 
 namespace {
 constexpr const char kPurgeServiceName[] = "com.tarnwick.quorveld-cache-delete";
-constexpr double kTimeToLive = 86400.0;  // seconds
-constexpr int32_t kUrgencyStopsRecording = 3;
-}  // namespace
+}
 
 std::shared_ptr<QVRecordingManager> QVRecordingManager::create(QVCaptureManager& captureManager) {
   std::shared_ptr<QVRecordingManager> manager(new QVRecordingManager(captureManager));
@@ -27,118 +26,89 @@ std::shared_ptr<QVRecordingManager> QVRecordingManager::create(QVCaptureManager&
 
 QVRecordingManager::QVRecordingManager(QVCaptureManager& captureManager)
     : platform_(platform::Platform::current()),
-      captureManager_(captureManager),
-      sequence_("com.tarnwick.quorveld.manager", *platform_.globalQueue) {
+      sequence_("com.tarnwick.quorveld.manager", *platform_.globalQueue),
+      context_(std::make_shared<RecordingContext>(sequence_, captureManager,
+                                                  std::make_shared<QVScreenSource>(*platform_.screenCapture), movies_)),
+      broadcasts_(std::make_shared<QVBroadcastBook>(sequence_)),
+      handover_(std::make_shared<MovieHandover>(platform_, sequence_, movies_)),
+      foreground_(std::make_shared<ForegroundFollower>(*platform_.applications, sequence_)),
+      layoutRule_(std::make_shared<DisplayLayoutRule>(
+          sequence_, [this] { endRecordingsOfApplications(_qvUserErrorForCode(errorcode::kContentResize)); })),
+      sessions_(std::make_shared<SessionRegistry>(context_)),
+      starts_(startServices()),
+      purge_(movies_, StorePurge::Recordings{
+                          [this] { return !sessions_->recordingSessions().empty(); },
+                          [this] {
+                            for (const Session& session : sessions_->recordingSessions()) {
+                              if (!session->recording()->writesMovies()) continue;
+                              session->recording()->fail(_qvUserErrorForCode(errorcode::kInsufficientStorage));
+                            }
+                          },
+                          [this] {
+                            for (const Session& session : sessions_->recordingSessions()) {
+                              stopRecordingSession(session,
+                                                   {.cause = _qvUserErrorForCode(errorcode::kInsufficientStorage),
+                                                    .movie = moviefate::remove()});
+                            }
+                          }}),
+      alerts_(*platform_.globalQueue) {
   _srSetupTempDirectory();
   _srSalvageUnfinishedMovies();
+  addRecordingRequests();
+  addApplicationRequests();
+  addBroadcastRequests();
   publicListener_ = platform_.ipc->createListener(kServiceName);
   publicListener_->setDelegate(this, sequence_);
   if (platform_.extensions) QVExtensionHostContext::registerWith(*platform_.extensions);
-  applicationStateMonitor_ = platform_.applications->createStateMonitor();
 }
 
-QVRecordingManager::~QVRecordingManager() {
-  if (!layoutMonitor_) return;
-  layoutMonitor_->removeObserver(this);
-  layoutMonitor_->invalidate();
+QVRecordingManager::~QVRecordingManager() = default;
+
+StartServices QVRecordingManager::startServices() {
+  return {platform_,
+          sequence_,
+          context_->captureManager,
+          *sessions_,
+          *foreground_,
+          *broadcasts_,
+          exemptions_,
+          [this] { stopCurrentRecordingSessionWithHandler(); },
+          [this](const Session& session) { interruptOtherRecordingSessionAgainstSession(session); },
+          [this](const Session& session) { checkAndPlaySystemRecordSound(session, true); },
+          [this](const Session& session) { recordingStarted(session); }};
 }
 
 std::optional<Error> QVRecordingManager::finishStartup() { return publicListener_->resume(); }
 
 void QVRecordingManager::setLayoutMonitor(std::shared_ptr<platform::DisplayLayoutMonitor> monitor) {
-  sequence_.sync([&] { layoutMonitor_ = std::move(monitor); });
+  sequence_.sync([&] { layoutRule_->setLayoutMonitor(std::move(monitor)); });
 }
 
 void QVRecordingManager::shutDown(std::function<void()> handler) {
   sequence_.async([self = shared_from_this(), handler = std::move(handler)] {
     // The handler runs when the last finish has let go of this.
     const std::shared_ptr<void> whenAllFinished(nullptr, [handler](void*) { handler(); });
-    for (const auto& [bundleID, session] : self->bundleIDToRecordingSessionLookup_) {
-      if (!session->isRecording()) continue;
-      self->finishRecording(session, 0, 0, [whenAllFinished](const auto&, const auto&) {});
+    for (const Session& session : self->sessions_->recordingSessions()) {
+      session->recording()->end({.handler = [whenAllFinished](const auto&, const auto&) {}});
     }
   });
 }
 
-std::shared_ptr<QVRecordingSession> QVRecordingManager::recordingSessionForBundleID(
-    const std::optional<std::string>& bundleID) {
-  QV_LOG(logs::kDaemon, "QVRecordingManager:recordingSessionForBundleID");
-  if (!bundleID) return nullptr;
-  const auto found = bundleIDToRecordingSessionLookup_.find(*bundleID);
-  if (found != bundleIDToRecordingSessionLookup_.end()) return found->second;
-  QV_LOG(logs::kDaemon, "no session, creating a new one");
-  auto session = std::make_shared<QVRecordingSession>(*bundleID, sequence_, captureManager_);
-  bundleIDToRecordingSessionLookup_.emplace(*bundleID, session);
-  return session;
-}
-
-void QVRecordingManager::removeSessionForBundleID(const std::string& bundleID) {
-  QV_LOG(logs::kDaemon, "QVRecordingManager:removeSessionForBundleID");
-  bundleIDToRecordingSessionLookup_.erase(bundleID);
-}
-
-std::optional<std::string> QVRecordingManager::getCallingConnectionBundleID() const {
-  return callingConnection_ ? callingConnection_->peer().bundleIdentifier : std::nullopt;
-}
-
-std::shared_ptr<QVRecordingSession> QVRecordingManager::getCallingConnectionRecordingSession() const {
-  const auto bundleID = getCallingConnectionBundleID();
-  if (!bundleID) return nullptr;
-  const auto found = bundleIDToRecordingSessionLookup_.find(*bundleID);
-  return found == bundleIDToRecordingSessionLookup_.end() ? nullptr : found->second;
-}
-
-void QVRecordingManager::beginTransaction() { platform_.keepAlive->beginTransaction(); }
-void QVRecordingManager::endTransaction() { platform_.keepAlive->endTransaction(); }
-
 void QVRecordingManager::registerPurgeableSpace() {
-  const auto answer = [weakSelf = weak_from_this()](const std::function<int64_t(QVRecordingManager&)>& work) {
+  const auto answer = [weakSelf = weak_from_this()](const std::function<int64_t(StorePurge&)>& work) {
     const auto self = weakSelf.lock();
-    return self ? self->sequence_.syncResult<int64_t>([&] { return work(*self); }) : int64_t{0};
+    return self ? self->sequence_.syncResult<int64_t>([&] { return work(self->purge_); }) : int64_t{0};
   };
   platform::PurgeableSpaceCallbacks callbacks;
-  callbacks.purgeable = [answer](int32_t) {
-    return answer([](QVRecordingManager& manager) { return manager.purgeableSpace(); });
-  };
+  callbacks.purgeable = [answer](int32_t) { return answer([](StorePurge& purge) { return purge.purgeableSpace(); }); };
   callbacks.purge = [answer](int64_t, int32_t urgency) {
-    return answer([urgency](QVRecordingManager& manager) { return manager.purge(urgency); });
+    return answer([urgency](StorePurge& purge) { return purge.purge(urgency); });
   };
   callbacks.cancel = [] {};
   callbacks.periodic = [answer](int64_t, int32_t) {
-    return answer([](QVRecordingManager& manager) { return manager.purgePeriodically(); });
+    return answer([](StorePurge& purge) { return purge.purgePeriodically(); });
   };
   platform_.purgeableSpace->registerCallbacks(kPurgeServiceName, std::move(callbacks));
-}
-
-int64_t QVRecordingManager::purgeableSpace() {
-  QV_LOG(logs::kDaemon, "QVRecordingManager: cache delete purgeable space callback");
-  std::optional<Error> error;
-  return _srSizeOfTempDir(&error);
-}
-
-int64_t QVRecordingManager::purge(int32_t urgency) {
-  QV_LOG(logs::kDaemon, "QVRecordingManager: cache delete purge callback");
-  Session found;
-  for (const auto& [bundleID, session] : bundleIDToRecordingSessionLookup_) {
-    if (session->isRecording()) found = session;
-  }
-  if (urgency >= kUrgencyStopsRecording) {
-    if (found && found->isRecording()) {
-      const uint64_t generation = found->generation();
-      stopRecordingSession(found, 0, 0, nullptr);
-      recordingSessionStoppedWithErrorMovieURL(found,
-                                               {generation, _qvUserErrorForCode(errorcode::kInsufficientStorage)});
-    }
-    return _srDeleteAllTempFiles();
-  }
-  // Only a recording that stopped while it was looked at leaves files that may go.
-  if (!found || found->isRecording()) return 0;
-  return _srDeleteFilesOlderThanTimeToLiveInSeconds(kTimeToLive);
-}
-
-int64_t QVRecordingManager::purgePeriodically() {
-  QV_LOG(logs::kDaemon, "QVRecordingManager: cache delete periodic callback");
-  return _srDeleteFilesOlderThanTimeToLiveInSeconds(kTimeToLive);
 }
 
 }  // namespace qv

@@ -26,7 +26,10 @@ bool QVRecordingManager::listenerShouldAcceptNewConnection(platform::IPCListener
     if (const auto self = weakSelf.lock()) self->connectionEnded(weakConnection, "connection INVALID");
   });
   connections_.emplace(connection, bundleID);
-  if (const Session session = recordingSessionForBundleID(bundleID)) adoptConnection(session, *bundleID, connection);
+  if (const Session session = sessions_->recordingSessionForBundleID(bundleID)) {
+    session->setDelegate(weak_from_this());
+    adoptConnection(session, *bundleID, connection);
+  }
   connection->resume();
   if (bundleID) exemptions_.expireAcknowledgementExemptionsForBundleID(*bundleID, platform_.clock->now());
   return true;
@@ -45,7 +48,7 @@ void QVRecordingManager::adoptConnection(const Session& session, const std::stri
     }
     proxy->setConnection(nullptr);
     // Nobody is left to be told how the former connection's start ended.
-    cancelPendingStart(bundleID);
+    starts_.cancelPendingStart(bundleID);
   }
   session->setClientProxy(std::make_shared<QVClientProxy>(bundleID, connection));
 }
@@ -64,18 +67,17 @@ void QVRecordingManager::applicationDisconnectedWithBundleID(const std::optional
                                                              const std::shared_ptr<IPCConnection>& connection) {
   QV_LOG(logs::kDaemon, "QVRecordingManager: applicationDisconnected");
   if (!bundleID) return;
-  const auto found = bundleIDToRecordingSessionLookup_.find(*bundleID);
-  if (found == bundleIDToRecordingSessionLookup_.end()) return;
-  const Session session = found->second;
+  const Session session = sessions_->find(bundleID);
+  if (!session) return;
   const auto proxy = session->clientProxy();
   if (proxy && proxy->connection() != connection) return;
-  cancelPendingStart(*bundleID);
+  starts_.cancelPendingStart(*bundleID);
   if (session->isSystemRecording() && session->isRecording()) {
     if (proxy) proxy->setConnection(nullptr);
     return;
   }
-  stopRecordingSession(session, 0, 0, nullptr);
-  removeSessionForBundleID(*bundleID);
+  stopRecordingSession(session, {.movie = moviefate::remove()});
+  sessions_->removeSessionForBundleID(*bundleID);
 }
 
 }  // namespace qv

@@ -1,150 +1,168 @@
+#include <utility>
+
 #include "daemon/QVRecordingManager.h"
-#include "daemon/RequestErrors.h"
 #include "platform/Log.h"
-#include "support/QVTemporaryFiles.h"
+#include "support/QVExtensions.h"
 #include "support/QuorvelErrors.h"
 
 namespace qv {
 
-using platform::Dictionary;
-using platform::IPCArguments;
+using platform::Error;
 using platform::IPCReply;
+using platform::URL;
 using platform::Value;
 namespace logs = platform::logs;
 
-const std::map<std::string_view, QVRecordingManager::RequestMember>& QVRecordingManager::requestMembers() {
-  using Manager = QVRecordingManager;
-  static const std::map<std::string_view, RequestMember> members{
-      {"startRecordingWindowLayerContextIDs", &Manager::startRecordingWindowLayerContextIDs},
-      {"setupBroadcastWithHostBundleID", &Manager::setupBroadcastWithHostBundleID},
-      {"getCurrentBroadcastImages", &Manager::getCurrentBroadcastImages},
-      {"getSystemBroadcastExtensionInfo", &Manager::getSystemBroadcastExtensionInfo},
-      {"stopRecordingWithHandler", &Manager::stopRecordingWithHandler},
-      {"stopRecordingWithStartClipDuration", &Manager::stopRecordingWithStartClipDuration},
-      {"saveVideoToCameraRoll", &Manager::saveVideoToCameraRoll},
-      {"pauseRecording", &Manager::pauseRecording},
-      {"resumeRecordingWithWindowLayerContextID", &Manager::resumeRecordingWithWindowLayerContextID},
-      {"setMicrophoneEnabled", &Manager::setMicrophoneEnabled},
-      {"updateProcessIDForAudioCaptureWithPID", &Manager::updateProcessIDForAudioCaptureWithPID},
-      {"discardRecordingWithHandler", &Manager::discardRecordingWithHandler},
-      {"clientDidBecomeActive", &Manager::clientDidBecomeActive},
-      {"clientDidResignActive", &Manager::clientDidResignActive},
-      {"synchronousGetCurrentState", &Manager::synchronousGetCurrentState},
-      {"setHasUserConsentForCamera", &Manager::setHasUserConsentForCamera},
-      {"setHasUserConsentForMicrophone", &Manager::setHasUserConsentForMicrophone},
-      {"setBroadcastURL", &Manager::setBroadcastURL},
-      {"setMicrophoneEnabledPersistent", &Manager::setMicrophoneEnabledPersistent},
-      {"reportCameraUsage", &Manager::reportCameraUsage},
-  };
-  return members;
-}
+namespace {
+
+Value encodeURL(const std::optional<URL>& url) { return Value(url ? url->absoluteString() : std::string()); }
+
+}  // namespace
 
 void QVRecordingManager::handleCall(const std::shared_ptr<platform::IPCConnection>& connection,
-                                    const platform::IPCOperation& operation, IPCArguments arguments, IPCReply reply) {
+                                    const platform::IPCOperation& operation, platform::IPCArguments arguments,
+                                    IPCReply reply) {
   sequence_.assertOnQueue();
-  const auto member = requestMembers().find(operation.member);
-  if (member == requestMembers().end()) {
-    reply.fail(requesterror::kNotSupported, operation.member);
+  requests_.serve(Caller{connection}, operation, arguments, reply);
+}
+
+void QVRecordingManager::addRecordingRequests() {
+  using request::Plain;
+  requests_.add<request::StartRecording>("startRecordingWindowLayerContextIDs",
+                                         [this](const Caller& caller, const auto& request, const IPCReply& reply) {
+                                           starts_.startRecordingWindowLayerContextIDs(caller, request, reply);
+                                         });
+  requests_.add<Plain>("stopRecordingWithHandler", [this](const Caller& caller, const Plain&, const IPCReply& reply) {
+    QV_LOG(logs::kDaemon, "QVRecordingManager: stopRecordingWithHandler:");
+    requestStop(caller, 0, 0, reply);
+  });
+  requests_.add<request::StopTrimmed>("stopRecordingWithStartClipDuration",
+                                      [this](const Caller& caller, const auto& request, const IPCReply& reply) {
+                                        requestStop(caller, request.startClipDuration, request.endClipDuration, reply);
+                                      });
+  requests_.add<request::SaveVideo>(
+      "saveVideoToCameraRoll", [this](const Caller& caller, const auto& request, const IPCReply& reply) {
+        handover_->saveVideoToCameraRoll(
+            caller.bundleID().value_or(std::string()), request.movieURL,
+            [reply](const std::optional<Error>& error) { reply({Value(platform::encodeError(error))}); });
+      });
+  requests_.add<Plain>(
+      "discardRecordingWithHandler",
+      [this](const Caller& caller, const Plain&, const IPCReply& reply) { discardRecording(caller, reply); });
+  requests_.add<Plain>("pauseRecording", [this](const Caller& caller, const Plain&, const IPCReply&) {
+    QV_LOG(logs::kDaemon, "QVRecordingManager:pauseRecording");
+    const Session session = sessions_->find(caller.bundleID());
+    if (session && session->isRecording())
+      session->recording()->whenAnswered([weakSelf = weak_from_this(), session] {
+        if (const auto self = weakSelf.lock()) self->pauseRecording(session);
+      });
+  });
+  requests_.add<request::Resume>(
+      "resumeRecordingWithWindowLayerContextID", [this](const Caller& caller, const auto& request, const IPCReply&) {
+        const Session session = sessions_->find(caller.bundleID());
+        if (!session || !session->isRecording()) return;
+        session->recording()->whenAnswered(
+            [this, caller, session, contextID = request.contextID] { resumeRecording(caller, session, contextID); });
+      });
+  requests_.add<request::Enable>(
+      "setMicrophoneEnabled", [this](const Caller& caller, const auto& request, const IPCReply&) {
+        QV_LOG(logs::kDaemon, "QVRecordingManager: setMicrophoneEnabled:%i", request.enabled ? 1 : 0);
+        const Session session = sessions_->find(caller.bundleID());
+        if (session && session->isRecording()) session->setMicrophoneEnabled(request.enabled);
+      });
+  requests_.add<request::UpdateProcessID>("updateProcessIDForAudioCaptureWithPID",
+                                          [this](const Caller& caller, const auto& request, const IPCReply&) {
+                                            updateProcessID(caller, request.processID);
+                                          });
+  requests_.add<request::ReportCameraUsage>("reportCameraUsage",
+                                            [this](const Caller& caller, const auto& request, const IPCReply&) {
+                                              const Session session = sessions_->find(caller.bundleID());
+                                              if (session && session->isRecording())
+                                                session->recording()->sessionReportCameraUsage(request.cameraPosition);
+                                            });
+}
+
+/// A stop that was sent together with its start comes after it: the start is answered first.
+void QVRecordingManager::requestStop(const Caller& caller, double startClipDuration, double endClipDuration,
+                                     const IPCReply& reply) {
+  QV_LOG(logs::kDaemon, "QVRecordingManager: stopRecordingWithStartTimeOffset:endTimeOffset:handler:");
+  const Session session = sessions_->find(caller.bundleID());
+  if (!session || !session->isRecording()) {
+    reply.fail(requesterror::kNotRecording, "nothing is being recorded for this application");
     return;
   }
-  callingConnection_ = connection;
-  (this->*member->second)(arguments, reply);
-  callingConnection_ = nullptr;
+  session->recording()->whenAnswered([weakSelf = weak_from_this(), session, startClipDuration, endClipDuration, reply] {
+    if (const auto self = weakSelf.lock()) self->stopForClient(session, startClipDuration, endClipDuration, reply);
+  });
 }
 
-void QVRecordingManager::pauseRecording(const IPCArguments&, const IPCReply&) {
-  QV_LOG(logs::kDaemon, "QVRecordingManager:pauseRecording");
-  const Session session = getCallingConnectionRecordingSession();
-  if (!session || session->isSystemRecording() || !session->isRecording() || session->isPaused()) return;
-  session->pauseSession();
-}
-
-void QVRecordingManager::resumeRecordingWithWindowLayerContextID(const IPCArguments& arguments, const IPCReply&) {
-  const Session session = getCallingConnectionRecordingSession();
-  if (!session) return;
-  const auto contextID = static_cast<uint32_t>(arguments[0].asInteger());
-  // A broadcast would be resumed by an alert; that alert presents nothing, so it stays paused.
-  if (session->isBroadcasting() && session->isRecording() && !session->isSystemRecording() && !didAcceptResume_) {
-    (void)showResumeBroadcastAlert(session, contextID);
+void QVRecordingManager::stopForClient(const Session& session, double startClipDuration, double endClipDuration,
+                                       const IPCReply& reply) {
+  if (!session->isRecording()) {
+    reply.fail(requesterror::kNotRecording, "the recording has ended already");
     return;
   }
-  didAcceptResume_ = false;
-  const bool matches = checkContextIDsMatch({contextID});
-  if (matches) QV_LOG(logs::kDaemon, "QVRecordingManager: resumeRecording");
-  if (session->isSystemRecording() || !session->isRecording() || !session->isPaused()) return;
-  if (matches) {
-    session->resumeSessionWithContextID(contextID);
-    return;
-  }
-  const auto stopped = [this, session, generation = session->generation()](const auto& movie, const auto&) {
-    const platform::Error mismatch = _qvUserErrorForCode(errorcode::kNoContextIDMatch);
-    recordingSessionStoppedWithErrorMovieURL(session, {generation, mismatch, movie});
-  };
-  stopRecordingSession(session, 0, 0, stopped);
+  stopRecordingSession(session, {.movie = moviefate::handTo(session->bundleID()),
+                                 .handler =
+                                     [reply](const std::optional<URL>& movie, const std::optional<Error>& error) {
+                                       reply({encodeURL(movie), Value(platform::encodeError(error))});
+                                     },
+                                 .startClipDuration = startClipDuration,
+                                 .endClipDuration = endClipDuration});
 }
 
-void QVRecordingManager::setMicrophoneEnabled(const IPCArguments& arguments, const IPCReply&) {
-  const bool enabled = arguments[0].asBool();
-  QV_LOG(logs::kDaemon, "QVRecordingManager: setMicrophoneEnabled:%i", enabled ? 1 : 0);
-  const Session session = getCallingConnectionRecordingSession();
-  if (session && session->isRecording()) session->setMicrophoneEnabled(enabled);
-}
-
-void QVRecordingManager::updateProcessIDForAudioCaptureWithPID(const IPCArguments& arguments, const IPCReply&) {
-  const auto processID = static_cast<int32_t>(arguments[0].asInteger());
-  QV_LOG(logs::kDaemon, "QVRecordingManager: updateProcessIDForAudioCaptureWithPID:%i", processID);
-  const Session session = getCallingConnectionRecordingSession();
-  if (session && session->isRecording()) session->updateProcessIDForAudioCaptureWithPID(processID);
-}
-
-void QVRecordingManager::synchronousGetCurrentState(const IPCArguments&, const IPCReply& reply) {
-  const Session session = getCallingConnectionRecordingSession();
+/// What the caller was handed last. While its recording is ending, that is not known yet.
+void QVRecordingManager::discardRecording(const Caller& caller, const IPCReply& reply) {
+  QV_LOG(logs::kDaemon, "QVRecordingManager: discardRecording");
+  const Session session = sessions_->find(caller.bundleID());
   if (!session) {
-    reply({Value(Dictionary{})});
+    reply.fail(requesterror::kNotRecording, "this caller has no recording session");
+  } else if (session->isRecording()) {
+    QV_LOG_ERROR(logs::kDaemon, "can't discard recording while recording is in progress");
+    reply.fail(requesterror::kRecording, "a recording is in progress");
+  } else {
+    sessions_->whenEnded(session->bundleID(), [handover = handover_, bundleID = session->bundleID(), reply] {
+      handover->discard(bundleID, [reply] { reply({}); });
+    });
+  }
+}
+
+void QVRecordingManager::pauseRecording(const Session& session) {
+  if (session->isSystemRecording() || !session->isRecording()) return;
+  session->recording()->pauseSession();
+}
+
+void QVRecordingManager::resumeRecording(const Caller& caller, const Session& session, uint32_t contextID) {
+  if (!session->isRecording()) return;
+  // A broadcast would be resumed by an alert; that alert presents nothing, so it stays paused.
+  if (session->isBroadcasting() && !session->isSystemRecording()) {
+    (void)SessionAlerts::showResumeBroadcastAlert(session, contextID);
     return;
   }
-  Dictionary state{
-      {"isRecording", Value(session->isRecording())},
-      {"isBroadcasting", Value(session->isBroadcasting())},
-      {"microphoneEnabled", Value(session->microphoneEnabled())},
-      {"isSystemRecording", Value(session->isSystemRecording())},
-      {"hasUserConsentForMicrophone", Value(session->hasUserConsentForMicrophone())},
-      {"hasUserConsentForCamera", Value(session->hasUserConsentForCamera())},
-      {"microphoneEnabledPersistent", Value(session->microphoneEnabledPersistent())},
-  };
-  if (session->broadcastURL()) state.emplace("broadcastURL", Value(*session->broadcastURL()));
-  reply({Value(std::move(state))});
-}
-
-void QVRecordingManager::setHasUserConsentForCamera(const IPCArguments& arguments, const IPCReply&) {
-  if (const Session session = getCallingConnectionRecordingSession()) {
-    session->setHasUserConsentForCamera(arguments[0].asBool());
+  const bool matches = starts_.checkContextIDsMatch(caller, {contextID});
+  if (matches) QV_LOG(logs::kDaemon, "QVRecordingManager: resumeRecording");
+  if (session->isSystemRecording() || !session->isPaused()) return;
+  if (matches) {
+    session->recording()->resumeSessionWithContextID(contextID);
+  } else {
+    stopRecordingSession(session, {.cause = _qvUserErrorForCode(errorcode::kNoContextIDMatch),
+                                   .movie = moviefate::handTo(session->bundleID())});
   }
 }
 
-void QVRecordingManager::setHasUserConsentForMicrophone(const IPCArguments& arguments, const IPCReply&) {
-  if (const Session session = getCallingConnectionRecordingSession()) {
-    session->setHasUserConsentForMicrophone(arguments[0].asBool());
+/// An application has its own processes recorded; those of others only the system.
+void QVRecordingManager::updateProcessID(const Caller& caller, int32_t processID) {
+  QV_LOG(logs::kDaemon, "QVRecordingManager: updateProcessIDForAudioCaptureWithPID:%i", processID);
+  const Session session = sessions_->find(caller.bundleID());
+  if (!session || !session->isRecording()) return;
+  if (processID >= 1 && !caller.isPrivileged()) {
+    const auto bundle = bundleWithPID(processID);
+    if (!bundle || !caller.is(bundle->bundleIdentifier())) {
+      QV_LOG_ERROR(logs::kDaemon, "the sound of process %i is not the caller's to record", processID);
+      return;
+    }
   }
-}
-
-void QVRecordingManager::setBroadcastURL(const IPCArguments& arguments, const IPCReply&) {
-  const Session session = getCallingConnectionRecordingSession();
-  if (!session) return;
-  const std::string url = arguments[0].asString();
-  session->setBroadcastURL(url.empty() ? std::nullopt : std::optional(url));
-}
-
-void QVRecordingManager::setMicrophoneEnabledPersistent(const IPCArguments& arguments, const IPCReply&) {
-  if (const Session session = getCallingConnectionRecordingSession()) {
-    session->setMicrophoneEnabledPersistent(arguments[0].asBool());
-  }
-}
-
-void QVRecordingManager::reportCameraUsage(const IPCArguments& arguments, const IPCReply&) {
-  if (const Session session = getCallingConnectionRecordingSession()) {
-    session->sessionReportCameraUsage(static_cast<int32_t>(arguments[0].asInteger()));
-  }
+  session->recording()->updateProcessIDForAudioCaptureWithPID(processID);
 }
 
 }  // namespace qv

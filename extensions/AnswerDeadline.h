@@ -12,14 +12,19 @@ namespace qv {
 /// How long another process may take for an answer that somebody waits for.
 inline constexpr std::chrono::seconds kExtensionPatience{10};
 
-/// A continuation that waits for another process. It runs once: at the answer, or at the deadline. Dropped, it does not
-/// run at all.
+/// A continuation that waits for another process. It runs once: at the answer, at the deadline, or where this is
+/// destroyed before.
 ///
-/// Threading: thread-safe. The continuation runs in the thread that answers, or on the global queue when it is late.
+/// Threading: thread-safe. The continuation runs in the thread that answers or destroys, or on the global queue when it
+/// is late.
 class AnswerDeadline : public std::enable_shared_from_this<AnswerDeadline> {
  public:
   using Continuation = std::function<void(bool isLate)>;
   static std::shared_ptr<AnswerDeadline> start(std::chrono::nanoseconds patience, Continuation continuation);
+  AnswerDeadline() = default;
+  ~AnswerDeadline() { resume(false); }
+  AnswerDeadline(const AnswerDeadline&) = delete;
+  AnswerDeadline& operator=(const AnswerDeadline&) = delete;
   void answer() { resume(false); }
 
  private:

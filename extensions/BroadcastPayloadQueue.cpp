@@ -7,14 +7,16 @@ namespace qv {
 
 using Kind = BroadcastPayload::Kind;
 
-void BroadcastPayloadQueue::push(Item item) {
+BroadcastPayloadQueue::Items BroadcastPayloadQueue::push(Item item) {
+  Items dropped;
   const Kind kind = item.payload.kind;
   items_.push_back(std::move(item));
   if (kind == Kind::Video) {
-    while (count(kind) > kMaximumFrames && dropOldest(kind)) ++droppedFrames_;
+    while (count(kind) > kMaximumFrames && dropOldest(kind, dropped)) ++droppedFrames_;
   } else if (kind != Kind::Control) {
-    while (seconds(kind) > kMaximumAudioSeconds && dropOldest(kind)) ++droppedAudio_;
+    while (seconds(kind) > kMaximumAudioSeconds && dropOldest(kind, dropped)) ++droppedAudio_;
   }
+  return dropped;
 }
 
 std::optional<BroadcastPayloadQueue::Item> BroadcastPayloadQueue::pop() {
@@ -24,10 +26,11 @@ std::optional<BroadcastPayloadQueue::Item> BroadcastPayloadQueue::pop() {
   return item;
 }
 
-bool BroadcastPayloadQueue::dropOldest(Kind kind) {
+bool BroadcastPayloadQueue::dropOldest(Kind kind, Items& dropped) {
   const auto oldest =
       std::find_if(items_.begin(), items_.end(), [kind](const Item& item) { return item.payload.kind == kind; });
   if (oldest == items_.end()) return false;
+  dropped.push_back(std::move(*oldest));
   items_.erase(oldest);
   return true;
 }

@@ -2,9 +2,10 @@
 
 #include <cstdint>
 #include <deque>
-#include <functional>
 #include <optional>
+#include <vector>
 
+#include "extensions/PayloadAnswer.h"
 #include "extensions/QVSharedFrameObject.h"
 #include "platform/Value.h"
 
@@ -29,22 +30,22 @@ struct BroadcastPayload {
 /// Threading: none of its own.
 class BroadcastPayloadQueue {
  public:
-  using Completion = std::function<void()>;
   struct Item {
     BroadcastPayload payload;
-    Completion completion;
+    PayloadAnswerRef answer;
   };
+  using Items = std::vector<Item>;
   static constexpr size_t kMaximumFrames = 8;
   static constexpr double kMaximumAudioSeconds = 2.0;
 
-  void push(Item item);
+  /// What had to make way: its answers are the caller's to give up.
+  [[nodiscard]] Items push(Item item);
   std::optional<Item> pop();
-  void clear() { items_.clear(); }
   [[nodiscard]] uint64_t droppedFrames() const { return droppedFrames_; }
   [[nodiscard]] uint64_t droppedAudio() const { return droppedAudio_; }
 
  private:
-  bool dropOldest(BroadcastPayload::Kind kind);
+  bool dropOldest(BroadcastPayload::Kind kind, Items& dropped);
   [[nodiscard]] size_t count(BroadcastPayload::Kind kind) const;
   [[nodiscard]] double seconds(BroadcastPayload::Kind kind) const;
 

@@ -1,6 +1,5 @@
 #include "extensions/QVBroadcastExtensionProxy.h"
 
-#include <csignal>
 #include <utility>
 
 #include "extensions/QVBroadcastProtocols.h"
@@ -21,9 +20,9 @@ QVBroadcastExtensionProxy::QVBroadcastExtensionProxy()
     : queue_("com.tarnwick.quorveld.BroadcastExtensionProxy", *Platform::current().globalQueue) {}
 
 std::shared_ptr<QVBroadcastExtensionProxy> QVBroadcastExtensionProxy::withBroadcastUploadExtension(
-    platform::ExtensionRecordRef broadcastUploadExtension) {
+    const platform::ExtensionRecordRef& broadcastUploadExtension) {
   std::shared_ptr<QVBroadcastExtensionProxy> proxy(new QVBroadcastExtensionProxy());
-  proxy->openListener(std::move(broadcastUploadExtension));
+  proxy->openListener(broadcastUploadExtension);
   return proxy;
 }
 
@@ -38,7 +37,7 @@ QVBroadcastExtensionProxy::withBroadcastUploadListenerEndpoint(const platform::L
 
 QVBroadcastExtensionProxy::~QVBroadcastExtensionProxy() { invalidateConnection(); }
 
-void QVBroadcastExtensionProxy::openListener(platform::ExtensionRecordRef extension) {
+void QVBroadcastExtensionProxy::openListener(const platform::ExtensionRecordRef& extension) {
   auto listener = Platform::current().ipc->createAnonymousListener();
   listener->setDelegate(this, queue_);
   if (const auto error = listener->resume()) {
@@ -47,19 +46,22 @@ void QVBroadcastExtensionProxy::openListener(platform::ExtensionRecordRef extens
   std::lock_guard lock(mutex_);
   listenerEndpoint_ = listener->endpoint();
   listener_ = std::move(listener);
-  broadcastUploadExtension_ = std::move(extension);
+  use_ = Platform::current().extensions->useExtension(extension);
 }
 
 void QVBroadcastExtensionProxy::setServiceInfoHandler(std::function<void(const Dictionary&)> handler) {
-  serviceInfoHandler_.store(std::move(handler));
+  serviceInfoHandler_.set(std::move(handler));
+  queue_.async(weak_from_this(), [](auto& self) { self.serviceInfoHandler_.tellWaiting(); });
 }
 
 void QVBroadcastExtensionProxy::setBroadcastURLHandler(std::function<void(const URL&)> handler) {
-  broadcastURLHandler_.store(std::move(handler));
+  broadcastURLHandler_.set(std::move(handler));
+  queue_.async(weak_from_this(), [](auto& self) { self.broadcastURLHandler_.tellWaiting(); });
 }
 
 void QVBroadcastExtensionProxy::setErrorHandler(std::function<void(const Error&)> handler) {
-  errorHandler_.store(std::move(handler));
+  errorHandler_.set(std::move(handler));
+  queue_.async(weak_from_this(), [](auto& self) { self.errorHandler_.tellWaiting(); });
 }
 
 bool QVBroadcastExtensionProxy::isCurrent(const WeakConnection& connection) {
@@ -68,101 +70,121 @@ bool QVBroadcastExtensionProxy::isCurrent(const WeakConnection& connection) {
   return strong && strong == connection_;
 }
 
-void QVBroadcastExtensionProxy::payloadAnswered(const WeakConnection& connection,
-                                                const BroadcastPayloadQueue::Completion& completion) {
+/// Nothing can be sent any more: what waits for an answer gets none.
+void QVBroadcastExtensionProxy::lost(const Error& error) {
+  Connection connection;
+  Payloads givenUp;
   {
-    const auto strong = connection.lock();
     std::lock_guard lock(mutex_);
-    if (!strong || connection_ != strong) return;
-    --inFlight_;
-    sendPending();
+    connection.swap(connection_);
+    std::swap(givenUp, payloads_);
   }
-  if (completion) completion();
+  tellError(error);
 }
 
-void QVBroadcastExtensionProxy::payloadFailed(const WeakConnection& connection, const Error& error) {
-  if (!isCurrent(connection)) return;
+/// To whoever waits for the link, else to who watches it; once.
+void QVBroadcastExtensionProxy::tellError(const Error& error) {
+  const auto waiting = handshake();
+  {
+    std::lock_guard lock(mutex_);
+    if (std::exchange(isErrorTold_, true)) return;
+  }
+  if (waiting && (waiting->fail(error) || !waiting->isReady())) return;
+  errorHandler_.tell(error);
+}
+
+void QVBroadcastExtensionProxy::payloadAnswered(const std::weak_ptr<PayloadAnswer>& answer) {
+  const auto answered = answer.lock();
+  if (!answered) return;
+  BroadcastPayloadQueue::Items unsendable;
+  {
+    std::lock_guard lock(mutex_);
+    if (payloads_.inFlight.erase(answered) == 0) return;
+    unsendable = sendPending();
+  }
+  answered->give(PayloadOutcome::Answered);
+}
+
+void QVBroadcastExtensionProxy::payloadFailed(const std::weak_ptr<PayloadAnswer>& answer, const Error& error) {
+  if (answer.expired()) return;
   QV_LOG_ERROR(logs::kExtensions, "error getting remote proxy to extension: %i", static_cast<int>(error.code));
-  reportLoss();
+  lost(_qvUserErrorForCode(errorcode::kInvalidBroadcastSession, Dictionary{}));
 }
 
-void QVBroadcastExtensionProxy::reportLoss() {
-  {
-    std::lock_guard lock(mutex_);
-    if (std::exchange(isLossReported_, true)) return;
-  }
-  if (const auto handler = errorHandler_.load()) {
-    handler(_qvUserErrorForCode(errorcode::kInvalidBroadcastSession, Dictionary{}));
-  }
-}
-
-void QVBroadcastExtensionProxy::processPayload(BroadcastPayload payload, BroadcastPayloadQueue::Completion completion) {
+void QVBroadcastExtensionProxy::processPayload(BroadcastPayload payload, PayloadAnswer::Handler completion) {
+  BroadcastPayloadQueue::Item item{std::move(payload), std::make_shared<PayloadAnswer>(std::move(completion))};
+  BroadcastPayloadQueue::Items dropped, unsendable;
   std::lock_guard lock(mutex_);
   if (!connection_) return;
-  pending_.push({std::move(payload), std::move(completion)});
-  logDrops();
-  sendPending();
+  dropped = payloads_.waiting.push(std::move(item));
+  logDrops(dropped, payloads_.waiting);
+  unsendable = sendPending();
 }
 
 /// Sending only queues the message, so it can be done with the mutex held: that keeps the order.
-void QVBroadcastExtensionProxy::sendPending() {
-  while (connection_ && inFlight_ < kMaximumInFlight) {
-    auto item = pending_.pop();
-    if (!item) return;
-    send(std::move(*item));
+BroadcastPayloadQueue::Items QVBroadcastExtensionProxy::sendPending() {
+  BroadcastPayloadQueue::Items unsendable;
+  while (connection_ && payloads_.inFlight.size() < kMaximumInFlight) {
+    auto item = payloads_.waiting.pop();
+    if (!item) break;
+    if (!send(*item)) unsendable.push_back(std::move(*item));
   }
+  return unsendable;
 }
 
-void QVBroadcastExtensionProxy::send(BroadcastPayloadQueue::Item item) {
+bool QVBroadcastExtensionProxy::send(BroadcastPayloadQueue::Item& item) {
   Dictionary& entries = item.payload.entries;
   if (item.payload.kind == BroadcastPayload::Kind::Video) {
     auto frame = item.payload.frame.encodeForIPC();
     // Out of descriptors: this frame is lost, the next one may have one.
-    if (frame.isNone()) return;
+    if (frame.isNone()) return false;
     entries.insert_or_assign(broadcastpayload::kSharedFrame, std::move(frame));
   }
-  ++inFlight_;
-  const WeakConnection weakConnection = connection_;
+  // The call knows the answer only weakly: given up, it is dead there.
+  const std::weak_ptr<PayloadAnswer> answer = *payloads_.inFlight.insert(std::move(item.answer)).first;
   connection_->call(
       "processPayload", {platform::Value(std::move(entries))},
-      [weakSelf = weak_from_this(), weakConnection, completion = std::move(item.completion)](const IPCArguments&) {
-        if (const auto self = weakSelf.lock()) self->payloadAnswered(weakConnection, completion);
+      [weakSelf = weak_from_this(), answer](const IPCArguments&) {
+        if (const auto self = weakSelf.lock()) self->payloadAnswered(answer);
       },
-      [weakSelf = weak_from_this(), weakConnection](const Error& error) {
-        if (const auto self = weakSelf.lock()) self->payloadFailed(weakConnection, error);
+      [weakSelf = weak_from_this(), answer](const Error& error) {
+        if (const auto self = weakSelf.lock()) self->payloadFailed(answer, error);
       });
+  return true;
 }
 
-/// Told as the number doubles, so that a slow extension does not fill the log.
-void QVBroadcastExtensionProxy::logDrops() {
-  const uint64_t drops = pending_.droppedFrames() + pending_.droppedAudio();
-  if (drops == 0 || drops < 2 * loggedDrops_) return;
-  loggedDrops_ = drops;
+void QVBroadcastExtensionProxy::logDrops(const BroadcastPayloadQueue::Items& dropped,
+                                         const BroadcastPayloadQueue& waiting) {
+  if (dropped.empty() || !drops_.count(dropped.size())) return;
   QV_LOG(logs::kExtensions, "the broadcast extension does not keep up: %llu frames and %llu runs of sound dropped",
-         static_cast<unsigned long long>(pending_.droppedFrames()),
-         static_cast<unsigned long long>(pending_.droppedAudio()));
+         static_cast<unsigned long long>(waiting.droppedFrames()),
+         static_cast<unsigned long long>(waiting.droppedAudio()));
 }
 
 void QVBroadcastExtensionProxy::invalidateConnection() {
   QV_LOG(logs::kExtensions, "invalidating connection with extension");
-  connectionReadyHandler_.store(nullptr);
-  handshake_.store(nullptr);
+  serviceInfoHandler_.close();
+  broadcastURLHandler_.close();
+  errorHandler_.close();
   Connection connection;
   std::unique_ptr<platform::IPCListener> listener;
-  platform::ExtensionRecordRef extension;
-  BroadcastPayloadQueue dropped;
+  std::shared_ptr<platform::ExtensionUse> use;
+  std::shared_ptr<LinkHandshake> handshake;
+  Payloads givenUp;
   {
     std::lock_guard lock(mutex_);
     connection.swap(connection_);
     listener.swap(listener_);
-    extension.swap(broadcastUploadExtension_);
-    std::swap(dropped, pending_);
-    isLossReported_ = true;
-    if (dropped.droppedFrames() + dropped.droppedAudio() > 0) {
-      QV_LOG(logs::kExtensions, "broadcast ended with %llu frames and %llu runs of sound dropped",
-             static_cast<unsigned long long>(dropped.droppedFrames()),
-             static_cast<unsigned long long>(dropped.droppedAudio()));
-    }
+    use.swap(use_);
+    handshake.swap(handshake_);
+    std::swap(givenUp, payloads_);
+    listenerEndpoint_ = {};
+    isErrorTold_ = true;
+  }
+  if (givenUp.waiting.droppedFrames() + givenUp.waiting.droppedAudio() > 0) {
+    QV_LOG(logs::kExtensions, "broadcast ended with %llu frames and %llu runs of sound dropped",
+           static_cast<unsigned long long>(givenUp.waiting.droppedFrames()),
+           static_cast<unsigned long long>(givenUp.waiting.droppedAudio()));
   }
   if (connection) {
     connection->setInvalidationHandler(nullptr);
@@ -170,7 +192,8 @@ void QVBroadcastExtensionProxy::invalidateConnection() {
     connection->invalidate();
   }
   if (listener) listener->invalidate();
-  if (extension) Platform::current().extensions->killExtension(extension, SIGKILL);
+  use.reset();
+  if (handshake) handshake->fail(_qvUserErrorForCode(errorcode::kInvalidBroadcastSession, Dictionary{}));
 }
 
 }  // namespace qv

@@ -38,17 +38,12 @@ class QVBroadcastExtensionProxy::ExportedObject final : public platform::IPCExpo
 
 void QVBroadcastExtensionProxy::establishConnectionWithHandler(ReadyHandler handler) {
   QV_LOG(logs::kExtensions, "establishing connection to extension");
-  connectionReadyHandler_.store(std::move(handler));
-  handshake_.store(AnswerDeadline::start(kExtensionPatience, [weakSelf = weak_from_this()](bool isLate) {
-    const auto self = weakSelf.lock();
-    if (!self || !isLate) return;
-    QV_LOG_ERROR(logs::kExtensions, "the extension did not connect and ping in time");
-    self->handshakeFailed(invalidBroadcastSession());
-  }));
-  platform::ExtensionRecordRef extension;
+  std::shared_ptr<LinkHandshake> current = LinkHandshake::start(std::move(handler)), former;
+  std::shared_ptr<platform::ExtensionUse> use;
   {
     std::lock_guard lock(mutex_);
-    extension = broadcastUploadExtension_;
+    former = std::exchange(handshake_, current);
+    use = use_;
   }
   platform::ExtensionRequestHandlers handlers;
   handlers.began = [weakSelf = weak_from_this()](ExtensionRequestID request, const std::optional<Error>& error) {
@@ -56,9 +51,10 @@ void QVBroadcastExtensionProxy::establishConnectionWithHandler(ReadyHandler hand
   };
   handlers.completed = [weakSelf = weak_from_this()](ExtensionRequestID, const auto& returned) {
     const auto self = weakSelf.lock();
-    if (self && !returned) self->handshakeFailed(returned.error());
+    if (self) self->handshakeFailed(returned ? invalidBroadcastSession() : returned.error());
   };
-  Platform::current().extensions->beginExtensionRequest(extension, {platform::ExtensionItem()}, std::move(handlers));
+  if (!use) return handshakeFailed(invalidBroadcastSession());
+  use->beginRequest({platform::ExtensionItem()}, std::move(handlers));
 }
 
 void QVBroadcastExtensionProxy::requestBegan(ExtensionRequestID request, const std::optional<Error>& error) {
@@ -91,12 +87,14 @@ void QVBroadcastExtensionProxy::handOverEndpoint(ExtensionRequestID request) {
       [](const IPCArguments&) { QV_LOG(logs::kExtensions, "Remote endpoint set."); }, fail);
 }
 
-/// Once the extension has pinged, what becomes of its request means nothing to the handshake.
+std::shared_ptr<LinkHandshake> QVBroadcastExtensionProxy::handshake() {
+  std::lock_guard lock(mutex_);
+  return handshake_;
+}
+
+/// Once the extension has pinged, what becomes of its request means nothing: the connection tells of its end.
 void QVBroadcastExtensionProxy::handshakeFailed(const Error& error) {
-  const auto handshake = handshake_.exchange(nullptr);
-  if (!handshake) return;
-  handshake->answer();
-  if (const auto handler = connectionReadyHandler_.exchange(nullptr)) handler(error);
+  if (const auto waiting = handshake()) waiting->fail(error);
 }
 
 /// Every connection is taken: only the launched extension knows the endpoint. A new one replaces the former.
@@ -116,15 +114,16 @@ void QVBroadcastExtensionProxy::takeConnection(const Connection& connection) {
     const auto self = weakSelf.lock();
     if (!self || !self->isCurrent(weakConnection)) return;
     QV_LOG(logs::kExtensions, "connection to broadcast extension invalidated");
-    self->reportLoss();
+    self->lost(invalidBroadcastSession());
   });
   connection->setInterruptionHandler(
       [] { QV_LOG(logs::kExtensions, "connection to broadcast extension interrupted"); });
   Connection former;
+  Payloads givenUp;
   {
     std::lock_guard lock(mutex_);
     former = std::exchange(connection_, connection);
-    inFlight_ = 0;
+    std::swap(givenUp, payloads_);
   }
   connection->resume();
 }
@@ -154,23 +153,22 @@ bool QVBroadcastExtensionProxy::mayCall() {
 
 void QVBroadcastExtensionProxy::ping() {
   QV_LOG(logs::kExtensions, "received ping from extension, notifying handler that connection is ready");
-  if (const auto handshake = handshake_.exchange(nullptr)) handshake->answer();
-  if (const auto handler = connectionReadyHandler_.load()) handler(std::nullopt);
+  if (const auto waiting = handshake()) waiting->succeed();
 }
 
 void QVBroadcastExtensionProxy::updateServiceInfo(const Dictionary& serviceInfo) {
   QV_LOG(logs::kExtensions, "received serviceInfo");
-  if (const auto handler = serviceInfoHandler_.load()) handler(serviceInfo);
+  serviceInfoHandler_.tell(serviceInfo);
 }
 
 void QVBroadcastExtensionProxy::updateBroadcastURL(const URL& broadcastURL) {
   QV_LOG(logs::kExtensions, "received broadcastURL");
-  if (const auto handler = broadcastURLHandler_.load()) handler(broadcastURL);
+  broadcastURLHandler_.tell(broadcastURL);
 }
 
 void QVBroadcastExtensionProxy::finishBroadcastWithError(const std::optional<Error>& error) {
   QV_LOG(logs::kExtensions, "received finish request from service due to error");
-  if (const auto handler = errorHandler_.load()) handler(error.value_or(invalidBroadcastSession()));
+  tellError(error.value_or(invalidBroadcastSession()));
 }
 
 }  // namespace qv

@@ -23,8 +23,9 @@ enum class BroadcastProcessMode : int64_t { MovieClips = 0, Samples = 1 };
 enum class BroadcastAction : int64_t { Started = 1, Paused = 2, Resumed = 3, Finished = 4 };
 
 /// Keys of the payloads of "processPayload". A payload has exactly the keys of its kind: an action (kActionType,
-/// kUserInfo), a video sample (kVideoOrientation, kSampleType, kSharedFrame, kTimingInfo), a run of audio (kSampleType,
-/// kAudioBufferList, kAudioFormatDescription, kTimingInfo, kNumSamples), the application in front (kFrontmostApp).
+/// kUserInfo), a video sample (kVideoOrientation, kSampleType, kSharedFrame, kTimingInfo, kPauses), a run of audio
+/// (kSampleType, kAudioBufferList, kAudioFormatDescription, kTimingInfo, kNumSamples, kPauses), the application in
+/// front (kFrontmostApp).
 namespace broadcastpayload {
 inline constexpr const char kActionType[] = "QVBroadcastProcessExtensionPayloadKeyActionType";
 inline constexpr const char kUserInfo[] = "QVBroadcastExtensionKeyExtensionUserInfo";
@@ -33,6 +34,9 @@ inline constexpr const char kVideoOrientation[] = "QVSampleBufferVideoOrientatio
 inline constexpr const char kSharedFrame[] = "QVBroadcastProcessExtensionPayloadKeySharedFrame";
 /// The raw 72-byte SampleTimingInfo.
 inline constexpr const char kTimingInfo[] = "QVBroadcastProcessExtensionPayloadKeyTimingInfo";
+/// The raw 24-byte MediaTime: the sum of the pauses before the sample. It is taken out of a picture's timing already,
+/// and still in that of sound.
+inline constexpr const char kPauses[] = "QVBroadcastProcessExtensionPayloadKeyPauses";
 inline constexpr const char kAudioBufferList[] = "QVBroadcastProcessExtensionPayloadKeyAudioBufferList";
 /// The raw 40-byte AudioStreamDescription.
 inline constexpr const char kAudioFormatDescription[] = "QVBroadcastProcessExtensionPayloadKeyAudioFormatDescription";

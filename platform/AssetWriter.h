@@ -26,14 +26,21 @@ inline constexpr const char kCompressionProperties[] = "CompressionProperties"; 
 inline constexpr const char kAverageBitRate[] = "AverageBitRate";                    ///< integer, bits per second
 inline constexpr const char kExpectedSourceFrameRate[] = "ExpectedSourceFrameRate";  ///< integer, 1/s
 inline constexpr const char kMaxKeyFrameInterval[] = "MaxKeyFrameInterval";          ///< integer, frames
-inline constexpr const char kProfileLevel[] = "ProfileLevel";                        ///< string, kProfileHighAutoLevel
+inline constexpr const char kProfileLevel[] = "ProfileLevel";                        ///< string, kProfile...
 inline constexpr const char kFormatID[] = "FormatID";                                ///< integer, four-character code
 inline constexpr const char kNumberOfChannels[] = "NumberOfChannels";                ///< integer
 inline constexpr const char kSampleRate[] = "SampleRate";                            ///< double, Hz
 inline constexpr const char kChannelLayout[] = "ChannelLayout";                      ///< data, 32 bytes
 inline constexpr const char kEncoderBitRate[] = "EncoderBitRate";                    ///< integer, bits per second
 inline constexpr const char kCodecH264[] = "H264";
+inline constexpr const char kProfileBaselineAutoLevel[] = "H264_Baseline_AutoLevel";
+inline constexpr const char kProfileMainAutoLevel[] = "H264_Main_AutoLevel";
 inline constexpr const char kProfileHighAutoLevel[] = "H264_High_AutoLevel";
+
+/// From 1 to these.
+inline constexpr int64_t kMaximumAverageBitRate = 200'000'000;
+inline constexpr int64_t kMaximumExpectedSourceFrameRate = 240;
+inline constexpr int64_t kMaximumKeyFrameInterval = 36'000;
 }  // namespace settings
 
 /// One track of a movie that is being written.
@@ -61,8 +68,9 @@ class WriterInput {
 /// `endSessionAtSourceTime`; `finishWriting`, once. Video is placed by its presentation time.
 /// Audio is placed by its capture time, through the same steps by which the video's presentation
 /// times differ from its capture times: so a rebase across a pause moves both. Audio captured before
-/// the session start or inside a pause is left out; a gap is silence. The last picture is shown
-/// until the end of the session, or one frame interval where none was set.
+/// the session start or inside a pause is left out; a gap is silence. Behind the last picture the last
+/// step holds. The last picture is shown until the end of the session; where none was set, until
+/// the end of the last sound, and for one frame interval at least.
 ///
 /// Threading: operations from one thread at a time; `finishWriting`'s completion comes on a
 /// thread of the writer's.
@@ -76,7 +84,8 @@ class AssetWriter {
   /// Creates the file. False, with `error`, where that fails or it was called before.
   virtual bool startWriting() = 0;
   virtual void startSessionAtSourceTime(MediaTime time) = 0;
-  /// The movie is to end after the frame of this presentation time.
+  /// The movie is to end at this presentation time: nothing goes beyond it, and what comes before it stays, also
+  /// sound behind the last picture. Only a picture of this very time is still shown, for one frame interval.
   virtual void endSessionAtSourceTime(MediaTime time) = 0;
   /// Completes the file on disk; afterwards status is Completed or Failed.
   virtual void finishWriting(std::function<void()> completion) = 0;
@@ -91,6 +100,7 @@ class AssetWriterService {
   /// An error where the URL is no file URL, its directory is missing or not writable, or the file
   /// exists already.
   virtual Result<std::unique_ptr<AssetWriter>> createAssetWriter(const URL& outputURL, const std::string& fileType) = 0;
+  /// Compression properties that the encoder does not know or cannot follow are logged and left out.
   virtual std::shared_ptr<WriterInput> createWriterInput(MediaType type, const Dictionary& outputSettings) = 0;
 };
 

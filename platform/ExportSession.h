@@ -55,6 +55,8 @@ class ExportSession {
 class ExportService {
  public:
   virtual ~ExportService() = default;
+  /// Reads the movie's head, and at its first use what exports need: blocks for as long as the disk takes, so not for
+  /// the daemon's sequence. `createExportSession` neither reads nor waits after it.
   virtual std::shared_ptr<MovieAsset> openMovie(const URL& url) = 0;
   virtual std::shared_ptr<ExportSession> createExportSession(std::shared_ptr<MovieAsset> asset,
                                                              ExportPreset preset) = 0;

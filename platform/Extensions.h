@@ -84,8 +84,27 @@ struct ExtensionRequestHandlers {
   std::function<void(ExtensionRequestID, const Result<std::vector<ExtensionItem>>&)> completed;
 };
 
-/// The installed extensions and their processes. An extension's process is launched at its first request, confined
-/// (see docs/broadcast-extensions.md), takes further requests while it lives, and is found dead by its pidfd.
+/// A use of an extension: a process of its own, that no other use shares, and the requests to it. The first request
+/// launches the process, confined (see docs/broadcast-extensions.md); further ones go to it while it lives, and the
+/// next after its death launches it anew.
+///
+/// The end of the use ends the process (SIGKILL): requests that are open end in an error, tokens are void. It does not
+/// wait for the death. So whoever hangs is ended with his own use, and a new use never meets a former one's process.
+///
+/// Threading: thread-safe. Handlers come on threads of the platform's, never within the call.
+class ExtensionUse {
+ public:
+  virtual ~ExtensionUse() = default;
+  virtual void beginRequest(std::vector<ExtensionItem> inputItems, ExtensionRequestHandlers handlers) = 0;
+  /// The right to read one file, once, for the process of this use and nobody else. A random text; what it names is
+  /// opened now, so that a later swap of the path changes nothing. Nothing where the file is no plain file.
+  /// Unused, it ends with the request that it was given to, with the use, or by `revokeSandboxToken`.
+  [[nodiscard]] virtual std::optional<std::string> issueSandboxToken(const std::string& tokenClass,
+                                                                     const std::string& path) = 0;
+  virtual void revokeSandboxToken(const std::string& token) = 0;
+};
+
+/// The installed extensions and their processes.
 ///
 /// Threading: thread-safe. Handlers come on threads of the platform's, never within the call.
 class ExtensionService {
@@ -98,21 +117,13 @@ class ExtensionService {
   /// Makes the host context of each process launched for an extension point.
   virtual void setHostContextClass(const std::string& extensionPointIdentifier,
                                    std::function<std::shared_ptr<ExtensionHostContext>()> make) = 0;
-  virtual void beginExtensionRequest(const ExtensionRecordRef& extension, std::vector<ExtensionItem> inputItems,
-                                     ExtensionRequestHandlers handlers) = 0;
+  /// Never nothing. An extension has at most 8 processes, those counted that still die: requests of a use beyond them
+  /// end in an error (EBUSY).
+  [[nodiscard]] virtual std::shared_ptr<ExtensionUse> useExtension(const ExtensionRecordRef& extension) = 0;
   /// Of the process that took the request; nothing once it is gone.
   [[nodiscard]] virtual std::shared_ptr<ExtensionHostContext> contextForRequest(ExtensionRequestID request) = 0;
   /// Its remote interface is the vendor's; nothing once it is gone.
   [[nodiscard]] virtual std::shared_ptr<IPCConnection> auxiliaryConnectionForRequest(ExtensionRequestID request) = 0;
-  /// Ends the extension's process, if it runs: every request that it had ends in an error.
-  virtual void killExtension(const ExtensionRecordRef& extension, int signal) = 0;
-  /// The right to read one file, once, for this extension's process and nobody else. A random text; what it names is
-  /// opened now, so that a later swap of the path changes nothing. Nothing where the file is no plain file.
-  /// Unused, it ends with the request that it was given to, with the process, or by `revokeSandboxToken`.
-  [[nodiscard]] virtual std::optional<std::string> issueSandboxToken(const std::string& tokenClass,
-                                                                     const std::string& path,
-                                                                     const ExtensionRecordRef& extension) = 0;
-  virtual void revokeSandboxToken(const std::string& token) = 0;
 };
 
 /// Between the daemon and an extension's process, by two connections that the process makes to the endpoints which it

@@ -3,16 +3,21 @@
 #include <sys/epoll.h>
 #include <sys/socket.h>
 
+#include <algorithm>
 #include <array>
 #include <cerrno>
-#include <map>
+#include <deque>
 #include <mutex>
 #include <thread>
+
+#include "platform/Log.h"
+#include "platform/RareLog.h"
 
 namespace qv::platform {
 namespace {
 
 struct Lease {
+  uint64_t number = 0;  ///< of its issue: descriptors are used again
   FileDescriptor end;
   SharedFrameRef frame;
 };
@@ -25,16 +30,21 @@ class LeaseWatcher {
   }
 
   std::optional<Error> add(FileDescriptor end, SharedFrameRef frame) {
-    const int fd = end.get();
+    Lease oldest;  // let go of without the lock
     std::lock_guard lock(mutex_);
-    leases_.emplace(fd, Lease{std::move(end), std::move(frame)});
     epoll_event event{};
     event.events = EPOLLRDHUP;
-    event.data.fd = fd;
-    if (::epoll_ctl(epoll_.get(), EPOLL_CTL_ADD, fd, &event) == 0) return std::nullopt;
-    const int failure = errno;
-    leases_.erase(fd);
-    return Error::posix(failure, "epoll_ctl");
+    event.data.u64 = ++last_;
+    if (::epoll_ctl(epoll_.get(), EPOLL_CTL_ADD, end.get(), &event) != 0) return Error::posix(errno, "epoll_ctl");
+    leases_.push_back({last_, std::move(end), std::move(frame)});
+    if (leases_.size() <= kMaximumSharedFrameLeases) return std::nullopt;
+    oldest = std::move(leases_.front());
+    leases_.pop_front();
+    if (const auto number = givenUp_.count()) {
+      QV_LOG_ERROR(logs::kPlatform, "%llu frames were taken from who does not give them back",
+                   static_cast<unsigned long long>(*number));
+    }
+    return std::nullopt;
   }
 
   size_t count() {
@@ -47,22 +57,25 @@ class LeaseWatcher {
     std::array<epoll_event, 16> events{};
     for (;;) {
       const int ready = ::epoll_wait(epoll_.get(), events.data(), static_cast<int>(events.size()), -1);
-      for (int i = 0; i < ready; ++i) end(events[static_cast<size_t>(i)].data.fd);
+      for (int i = 0; i < ready; ++i) end(events[static_cast<size_t>(i)].data.u64);
     }
   }
 
-  void end(int fd) {
+  void end(uint64_t number) {
     Lease ended;
     std::lock_guard lock(mutex_);
-    if (const auto it = leases_.find(fd); it != leases_.end()) {
-      ended = std::move(it->second);
-      leases_.erase(it);
-    }
+    const auto it =
+        std::find_if(leases_.begin(), leases_.end(), [&](const Lease& lease) { return lease.number == number; });
+    if (it == leases_.end()) return;
+    ended = std::move(*it);
+    leases_.erase(it);
   }
 
   FileDescriptor epoll_;
+  RareLog givenUp_;
   std::mutex mutex_;
-  std::map<int, Lease> leases_;
+  uint64_t last_ = 0;
+  std::deque<Lease> leases_;  ///< the oldest first; few
 };
 
 LeaseWatcher& watcher() {

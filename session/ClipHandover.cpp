@@ -6,7 +6,6 @@
 #include "extensions/QVExtensions.h"
 #include "platform/Log.h"
 #include "platform/Platform.h"
-#include "support/QVTemporaryFiles.h"
 
 namespace qv {
 
@@ -23,20 +22,19 @@ namespace logs = platform::logs;
 namespace {
 constexpr const char kReadTokenClass[] = "com.tarnwick.quorveld.read-only";
 
-void removeClip(const URL& clip) {
-  _srRemoveFile(clip,
-                [](const std::optional<Error>&) { QV_LOG(logs::kSession, "extension finished, clean up movie clip"); });
+void removeClip(MovieClaim& clip) {
+  clip.remove([](const std::optional<Error>&) { QV_LOG(logs::kSession, "extension finished, clean up movie clip"); });
 }
 }  // namespace
 
-ClipHandover::ClipHandover(platform::ExtensionRecordRef extension, Dictionary userInfo, ClipHandoverEvents events)
-    : extension_(std::move(extension)),
-      userInfo_(std::move(userInfo)),
+ClipHandover::ClipHandover(const platform::ExtensionRecordRef& extension, Dictionary userInfo,
+                           ClipHandoverEvents events)
+    : userInfo_(std::move(userInfo)),
       events_(std::move(events)),
-      use_(ExtensionUse::of(extension_)) {}
+      use_(Platform::current().extensions->useExtension(extension)) {}
 
 /// Files are finished by several writers at once, so a later clip may be complete before an earlier one.
-void ClipHandover::clipCompleted(int64_t number, std::optional<URL> clip, bool finished, std::function<void()> handed) {
+void ClipHandover::clipCompleted(int64_t number, ClipFile clip, bool finished, std::function<void()> handed) {
   std::unique_lock lock(mutex_);
   completed_[number] = {std::move(clip), finished, std::move(handed)};
   if (std::exchange(isHanding_, true)) return;
@@ -44,7 +42,7 @@ void ClipHandover::clipCompleted(int64_t number, std::optional<URL> clip, bool f
     const Completed ready = std::move(next->second);
     completed_.erase(next);
     lock.unlock();
-    if (ready.clip) _notifyBroadcastExtensionOfCompletedMovieWithURL(*ready.clip, ready.finished);
+    if (ready.clip) _notifyBroadcastExtensionOfCompletedMovieWithURL(ready.clip, ready.finished);
     if (ready.finished) awaitLastRequests();
     if (ready.handed) ready.handed();
     lock.lock();
@@ -52,19 +50,20 @@ void ClipHandover::clipCompleted(int64_t number, std::optional<URL> clip, bool f
   isHanding_ = false;
 }
 
-void ClipHandover::_notifyBroadcastExtensionOfCompletedMovieWithURL(const URL& clip, bool finished) {
+void ClipHandover::_notifyBroadcastExtensionOfCompletedMovieWithURL(const ClipFile& clip, bool finished) {
   QV_LOG(logs::kSession, "QVRecordingSession: notifyBroadcastExtensionOfCompletedMovieWithURL:");
+  std::shared_ptr<platform::ExtensionUse> use;
   {
     std::lock_guard lock(mutex_);
     if (outstanding_ >= kMaximumOutstanding && !finished) {
       QV_LOG_ERROR(logs::kSession, "the broadcast extension is too far behind, a clip is left out");
-      _srRemoveFile(clip, nullptr);
+      clip->remove(nullptr);
       return;
     }
     ++outstanding_;
+    use = use_;
   }
-  platform::ExtensionService& extensions = *Platform::current().extensions;
-  const auto token = extensions.issueSandboxToken(kReadTokenClass, clip.path(), extension_);
+  const auto token = use->issueSandboxToken(kReadTokenClass, clip->path());
   if (!token) {
     QV_LOG_ERROR(logs::kSession, "sb token is null!");
     std::lock_guard lock(mutex_);
@@ -72,14 +71,16 @@ void ClipHandover::_notifyBroadcastExtensionOfCompletedMovieWithURL(const URL& c
     return;
   }
   platform::ExtensionRequestHandlers handlers;
-  handlers.began = [self = shared_from_this(), clip, token](ExtensionRequestID, const auto& error) {
-    self->requestBegan(clip, *token, error);
+  handlers.began = [self = shared_from_this(), clip, token, weakUse = std::weak_ptr(use)](ExtensionRequestID,
+                                                                                          const auto& error) {
+    if (const auto living = error ? weakUse.lock() : nullptr) living->revokeSandboxToken(*token);
+    self->requestBegan(clip, error);
   };
   handlers.completed = [self = shared_from_this(), clip](ExtensionRequestID, const auto& items) {
     self->requestCompleted(clip, items);
   };
   QV_LOG(logs::kSession, "begining extension request");
-  extensions.beginExtensionRequest(extension_, itemsForClip(clip, *token, finished), std::move(handlers));
+  use->beginRequest(itemsForClip(clip->url(), *token, finished), std::move(handlers));
 }
 
 std::vector<ExtensionItem> ClipHandover::itemsForClip(const URL& clip, const std::string& token, bool finished) const {
@@ -89,16 +90,15 @@ std::vector<ExtensionItem> ClipHandover::itemsForClip(const URL& clip, const std
           itemWithTitle(broadcastitem::kMovieClipURL, Value(clip.absoluteString()))};
 }
 
-void ClipHandover::requestBegan(const URL& clip, const std::string& token, const std::optional<Error>& error) {
+void ClipHandover::requestBegan(const ClipFile& clip, const std::optional<Error>& error) {
   QV_LOG(logs::kSession, "finished extension request with items with error code: %i)",
          error ? static_cast<int>(error->code) : 0);
   if (!error) return;
-  Platform::current().extensions->revokeSandboxToken(token);
   requestEnded(clip);
   events_.extensionFailed();
 }
 
-void ClipHandover::requestCompleted(const URL& clip, const Result<std::vector<ExtensionItem>>& items) {
+void ClipHandover::requestCompleted(const ClipFile& clip, const Result<std::vector<ExtensionItem>>& items) {
   if (items) {
     for (const ExtensionItem& item : items.value()) loadReturnedItem(item);
   } else {
@@ -108,8 +108,8 @@ void ClipHandover::requestCompleted(const URL& clip, const Result<std::vector<Ex
   requestEnded(clip);
 }
 
-void ClipHandover::requestEnded(const URL& clip) {
-  removeClip(clip);
+void ClipHandover::requestEnded(const ClipFile& clip) {
+  removeClip(*clip);
   std::unique_lock lock(mutex_);
   if (--outstanding_ > 0 || !isFinished_) return;
   const auto last = std::exchange(lastRequests_, nullptr);
@@ -141,8 +141,9 @@ void ClipHandover::awaitLastRequests() {
   // It holds this until the extension is let go, whatever becomes of the session.
   auto deadline = AnswerDeadline::start(kLastClipsPatience, [self = shared_from_this()](bool isLate) {
     if (isLate) QV_LOG_ERROR(logs::kSession, "the broadcast extension did not finish its last clips in time");
+    std::shared_ptr<platform::ExtensionUse> ended;
     std::lock_guard releaseLock(self->mutex_);
-    self->use_.reset();
+    ended.swap(self->use_);
   });
   if (outstanding_ > 0) {
     lastRequests_ = std::move(deadline);

@@ -8,9 +8,9 @@
 #include <string>
 
 #include "extensions/AnswerDeadline.h"
-#include "extensions/ExtensionUse.h"
 #include "extensions/QVBroadcastConfiguration.h"
 #include "platform/Extensions.h"
+#include "support/QVTemporaryMovies.h"
 
 namespace qv {
 
@@ -35,28 +35,28 @@ class ClipHandover : public std::enable_shared_from_this<ClipHandover> {
   /// For what is left to be sent after the end of the broadcast.
   static constexpr std::chrono::seconds kLastClipsPatience{120};
 
-  ClipHandover(platform::ExtensionRecordRef extension, platform::Dictionary userInfo, ClipHandoverEvents events);
+  ClipHandover(const platform::ExtensionRecordRef& extension, platform::Dictionary userInfo, ClipHandoverEvents events);
 
   /// The clip of this number, from 1, is complete; nothing where it came to no movie. `handed` (may be empty) runs when
   /// it and all before it were handed over.
-  void clipCompleted(int64_t number, std::optional<platform::URL> clip, bool finished, std::function<void()> handed);
+  void clipCompleted(int64_t number, std::shared_ptr<MovieClaim> clip, bool finished, std::function<void()> handed);
 
  private:
   struct Completed {
-    std::optional<platform::URL> clip;
+    std::shared_ptr<MovieClaim> clip;
     bool finished = false;
     std::function<void()> handed;
   };
-  void _notifyBroadcastExtensionOfCompletedMovieWithURL(const platform::URL& clip, bool finished);
+  using ClipFile = std::shared_ptr<MovieClaim>;
+  void _notifyBroadcastExtensionOfCompletedMovieWithURL(const ClipFile& clip, bool finished);
   [[nodiscard]] std::vector<platform::ExtensionItem> itemsForClip(const platform::URL& clip, const std::string& token,
                                                                   bool finished) const;
-  void requestBegan(const platform::URL& clip, const std::string& token, const std::optional<platform::Error>& error);
-  void requestCompleted(const platform::URL& clip, const platform::Result<std::vector<platform::ExtensionItem>>& items);
-  void requestEnded(const platform::URL& clip);
+  void requestBegan(const ClipFile& clip, const std::optional<platform::Error>& error);
+  void requestCompleted(const ClipFile& clip, const platform::Result<std::vector<platform::ExtensionItem>>& items);
+  void requestEnded(const ClipFile& clip);
   void loadReturnedItem(const platform::ExtensionItem& item);
   void awaitLastRequests();
 
-  const platform::ExtensionRecordRef extension_;
   const platform::Dictionary userInfo_;
   const ClipHandoverEvents events_;
 
@@ -67,7 +67,8 @@ class ClipHandover : public std::enable_shared_from_this<ClipHandover> {
   size_t outstanding_ = 0;
   bool isFinished_ = false;
   std::shared_ptr<AnswerDeadline> lastRequests_;
-  std::shared_ptr<ExtensionUse> use_;
+  /// Its end ends the extension's process.
+  std::shared_ptr<platform::ExtensionUse> use_;
 };
 
 }  // namespace qv

@@ -16,8 +16,6 @@ using platform::Platform;
 using platform::URL;
 namespace logs = platform::logs;
 
-constexpr const char kTempPath[] = "/private/var/mobile/Library/Quorvel/";
-
 FileSystem& disk() { return *Platform::current().fileSystem; }
 
 int code(const Error& error) { return static_cast<int>(error.code); }
@@ -30,9 +28,6 @@ int truncated(double seconds) {
   return static_cast<int>(std::fmin(std::fmax(seconds, kLowest), kHighest));
 }
 
-/// Doubles the separator, which the disk reads as one.
-std::string entryPath(const std::string& name) { return _srTempPath() + "/" + name; }
-
 void reportAgeingFailure(const Error& error) {
   QV_LOG_ERROR(logs::kSupport, "error in _qvRemoveFile_srDeleteFilesOlderThanTimeToLiveInSeconds, error code: %i",
                code(error));
@@ -40,7 +35,7 @@ void reportAgeingFailure(const Error& error) {
 }
 
 /// Removes one entry if its time has come; the bytes that this freed.
-int64_t ageOut(const std::string& path, double timeToLive) {
+int64_t ageOut(const std::string& path, double timeToLive, const RemovalRight& mayRemove) {
   const bool removeAll = timeToLive == 0.0;
   const auto attributes = disk().attributesOfItem(path);
   if (!attributes) {
@@ -51,6 +46,8 @@ int64_t ageOut(const std::string& path, double timeToLive) {
     const double age = now - attributes.value().modificationDate.secondsSince1970;
     if (!removeAll && !(age > timeToLive)) return 0;
   }
+  const std::shared_ptr<void> right = mayRemove ? mayRemove(path) : nullptr;
+  if (mayRemove && !right) return 0;
   QV_LOG(logs::kSupport, "deleting old file");
   if (const auto error = disk().removeItem(path)) {
     reportAgeingFailure(*error);
@@ -74,13 +71,15 @@ void deleteFilesWithPrefix(const std::string& prefix) {
   }
   for (const std::string& name : names.value()) {
     if (!Platform::current().localization->beginsWithFolded(name, prefix)) continue;
-    if (const auto error = disk().removeItem(entryPath(name))) report(*error);
+    if (const auto error = disk().removeItem(pathInStore(name))) report(*error);
   }
 }
 
 }  // namespace
 
 std::string _srTempPath() { return platform::pathUnderDeviceRoot(kTempPath); }
+
+std::string pathInStore(const std::string& name) { return _srTempPath() + name; }
 
 void _srSetupTempDirectory() {
   QV_LOG(logs::kSupport, "_srSetupTempDirectory");
@@ -101,7 +100,7 @@ int64_t _srSizeOfTempDir(std::optional<Error>* error) {
   return 0;
 }
 
-int64_t _srDeleteFilesOlderThanTimeToLiveInSeconds(double timeToLive) {
+int64_t _srDeleteFilesOlderThanTimeToLiveInSeconds(double timeToLive, const RemovalRight& mayRemove) {
   QV_LOG(logs::kSupport, "_srDeleteFilesOlderThanTimeToLiveInSeconds: %i", truncated(timeToLive));
   auto names = disk().contentsOfDirectory(_srTempPath());
   if (!names) {
@@ -109,11 +108,13 @@ int64_t _srDeleteFilesOlderThanTimeToLiveInSeconds(double timeToLive) {
     return 0;
   }
   int64_t freed = 0;
-  for (const std::string& name : names.value()) freed += ageOut(entryPath(name), timeToLive);
+  for (const std::string& name : names.value()) freed += ageOut(pathInStore(name), timeToLive, mayRemove);
   return freed;
 }
 
-int64_t _srDeleteAllTempFiles() { return _srDeleteFilesOlderThanTimeToLiveInSeconds(0.0); }
+int64_t _srDeleteAllTempFiles(const RemovalRight& mayRemove) {
+  return _srDeleteFilesOlderThanTimeToLiveInSeconds(0.0, mayRemove);
+}
 
 void _srRemoveFile(const URL& file, FileCompletion completion) {
   Platform::current().backgroundQueue->post([path = file.path(), completion = std::move(completion)] {
@@ -142,17 +143,5 @@ std::optional<platform::Date> _srGetCreationDateForFile(const URL& file) {
   const auto attributes = disk().attributesOfItem(file.path());
   return attributes ? std::optional(attributes.value().creationDate) : std::nullopt;
 }
-
-uint64_t _srDeviceFreeDiskSpace() {
-  const auto bytes = disk().freeSizeOfFileSystem(_srTempPath());
-  return bytes ? bytes.value() : 0;
-}
-
-bool _srDeviceHasSufficientFreeSpaceToContinueRecording() {
-  const auto bytes = disk().freeSizeOfFileSystem(_srTempPath());
-  return !bytes || bytes.value() >= kMinimumFreeSpaceWhileRecording;
-}
-
-bool _srDeviceHasSufficientFreeSpaceForRecording() { return _srDeviceFreeDiskSpace() > kMinimumFreeSpaceForRecording; }
 
 }  // namespace qv

@@ -2,11 +2,13 @@
 
 #include <cstdint>
 #include <functional>
+#include <memory>
 #include <optional>
 #include <string>
 
 #include "platform/Error.h"
 #include "platform/Value.h"
+#include "support/QVDiskSpace.h"
 
 /// The temporary file store: one private directory, in which every movie is written before it is
 /// handed on, and from which it is removed when it has been handed on or has grown old. The store
@@ -23,14 +25,17 @@ namespace qv {
 /// Takes what went wrong, or nothing.
 using FileCompletion = std::function<void(const std::optional<platform::Error>&)>;
 
-/// A recording starts only with more free bytes than this (decimal).
-inline constexpr uint64_t kMinimumFreeSpaceForRecording = 100'000'000;
-/// A movie recording ends when fewer bytes than this are free (decimal): room for what its file still has to take
-/// (32 MiB may wait for a slow disk, and the index of an hour has 4 MB), and for the rest of the device.
-inline constexpr uint64_t kMinimumFreeSpaceWhileRecording = 50'000'000;
+/// The store's directory, without the device root; ends with "/".
+inline constexpr const char kTempPath[] = "/private/var/mobile/Library/Quorvel/";
+
+/// Asked with an entry's path right before the entry would be removed. Nothing leaves the entry alone; anything else is
+/// held until its removal is over.
+using RemovalRight = std::function<std::shared_ptr<void>(const std::string& path)>;
 
 /// The store's directory, under the device root; ends with "/".
 [[nodiscard]] std::string _srTempPath();
+/// The path of the entry of this name.
+[[nodiscard]] std::string pathInStore(const std::string& name);
 /// Makes the directory unless something stands there. Its parents are made by the packaging. A
 /// failure is logged, and the daemon goes on without the directory.
 void _srSetupTempDirectory();
@@ -40,9 +45,10 @@ int64_t _srSizeOfTempDir(std::optional<platform::Error>* error);
 
 /// Removes every entry that is strictly older than `timeToLive` seconds, or every entry at all when
 /// that is exactly 0, and returns the sizes of those removed, in bytes. An entry whose age cannot
-/// be read stays unless all must go. Failures are logged and the walk goes on.
-int64_t _srDeleteFilesOlderThanTimeToLiveInSeconds(double timeToLive);
-int64_t _srDeleteAllTempFiles();
+/// be read stays unless all must go, and so does one for which there is no right (every entry may go where `mayRemove`
+/// is empty). Failures are logged and the walk goes on.
+int64_t _srDeleteFilesOlderThanTimeToLiveInSeconds(double timeToLive, const RemovalRight& mayRemove = {});
+int64_t _srDeleteAllTempFiles(const RemovalRight& mayRemove = {});
 
 /// Removes one file later on, on the background queue, where `completion` (may be empty) is
 /// called. It is no failure that nothing is there.
@@ -56,10 +62,5 @@ void _srDeleteFilesWithPrefix(const std::string& prefix);
 
 /// Nothing where the attributes cannot be read.
 [[nodiscard]] std::optional<platform::Date> _srGetCreationDateForFile(const platform::URL& file);
-/// Bytes free on the file system that holds the store; 0 where that cannot be read.
-[[nodiscard]] uint64_t _srDeviceFreeDiskSpace();
-[[nodiscard]] bool _srDeviceHasSufficientFreeSpaceForRecording();
-/// True also where the free space cannot be read: a recording is not given up for that.
-[[nodiscard]] bool _srDeviceHasSufficientFreeSpaceToContinueRecording();
 
 }  // namespace qv

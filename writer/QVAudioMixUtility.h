@@ -1,23 +1,28 @@
 #pragma once
 
 #include <functional>
+#include <memory>
 #include <optional>
 
 #include "platform/Error.h"
 #include "platform/Value.h"
+#include "support/QVTemporaryMovies.h"
 
 namespace qv {
 
 /// Makes a copy of a movie in which its audio tracks are mixed into one, each at its unchanged
 /// level. The movie itself is never changed.
 ///
-/// Threading: thread-safe. Handlers are called on a thread of the export's, or at once in the
-/// calling thread for a missing movie.
+/// Threading: thread-safe. The movie is opened on the global queue; handlers are called on a thread of the export's, or
+/// at once in the calling thread for a missing movie.
 class QVAudioMixUtility {
  public:
-  using Handler = std::function<void(const std::optional<platform::URL>&, const std::optional<platform::Error>&)>;
-  static void mixAudioForMovie(const std::optional<platform::URL>& movie, Handler handler);
-  /// A new file of the temporary store, named by the current second.
+  /// Takes the mixed movie, of which there is a file, or what went wrong; then nothing is left of it.
+  using Handler = std::function<void(std::shared_ptr<MovieClaim> mixed, const std::optional<platform::Error>&)>;
+  static void mixAudioForMovie(const std::shared_ptr<QVTemporaryMovies>& movies,
+                               const std::optional<platform::URL>& movie, Handler handler);
+  /// A file of the temporary store, named by the current second. Two mixes within a second ask for the same, and the
+  /// later one's is numbered when it is claimed.
   static platform::URL tempFileURL();
 };
 

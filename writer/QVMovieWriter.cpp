@@ -1,7 +1,5 @@
 #include "writer/QVMovieWriter.h"
 
-#include <algorithm>
-
 #include "platform/Log.h"
 #include "support/QVTemporaryFiles.h"
 
@@ -68,6 +66,12 @@ AssetWriterStatus QVMovieWriter::status() const {
   return assetWriter_ ? assetWriter_->status() : AssetWriterStatus::Unknown;
 }
 
+void QVMovieWriter::noteFailure(const std::optional<platform::Error>& error) {
+  failure_.with([&](auto& failure) {
+    if (!failure) failure = error;
+  });
+}
+
 void QVMovieWriter::dispatchedFinishWritingWithHandler(FinishHandler handler) {
   if (isFinishingWriting_) return;
   isFinishingWriting_ = true;
@@ -90,6 +94,7 @@ void QVMovieWriter::finishNotWriting(const FinishHandler& handler) {
   if (assetWriter_) {
     QV_LOG(logs::kWriter, "not writing, returning video url set on assetwriter (most likely nil)");
     const auto error = assetWriter_->error();
+    noteFailure(error);
     QV_LOG_ERROR(logs::kWriter, "asset writer error = %i", error ? static_cast<int>(error->code) : 0);
     url = assetWriter_->outputURL();
   }
@@ -97,22 +102,16 @@ void QVMovieWriter::finishNotWriting(const FinishHandler& handler) {
   didProcessFirstSample_ = false;
 }
 
-/// The file shows the picture of the time that ends it for one frame more.
-MediaTime QVMovieWriter::lastPictureTime() const {
-  const MediaTime end = endTime_.load();
-  if (!end.isValid()) return end;
-  const MediaTime last = video_.lastPresentationTime.load();
-  return std::max(last, end - MediaTime::make(1, expectedFrameRate()));
-}
-
 void QVMovieWriter::finishFile(FinishHandler handler) {
   MediaTime end = trimVideoPresentationTime_.exchange(MediaTime::invalid());
-  if (!end.isValid()) end = lastPictureTime();
+  if (!end.isValid()) end = endTime_.load();
   if (end.isValid()) assetWriter_->endSessionAtSourceTime(end);
   assetWriter_->finishWriting([self = shared_from_this(), handler = std::move(handler)]() mutable {
     // Goes on on the writer's queue, so that the last reference never ends on the file's own thread.
     auto& queue = self->movieWriterQueue_;
     queue.async([self = std::move(self), handler = std::move(handler)] {
+      self->isSound_ = self->status() == AssetWriterStatus::Completed;
+      if (!self->isSound_) self->noteFailure(self->assetWriter_->error());
       if (handler) handler(self->assetWriter_->outputURL());
       self->didProcessFirstSample_ = false;
     });

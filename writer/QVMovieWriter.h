@@ -1,5 +1,6 @@
 #pragma once
 
+#include <atomic>
 #include <functional>
 #include <memory>
 #include <optional>
@@ -43,22 +44,29 @@ class QVMovieWriter : public std::enable_shared_from_this<QVMovieWriter> {
   /// The same without removing a file, and waited for.
   void setupAssetWriter();
   /// False when the sample had to start the file and that failed, or the file has failed since:
-  /// the recording is then over. The same when the disk is nearly full; what was written can then be finished.
-  /// True in every other case, also for a dropped sample.
+  /// the recording is then over. True in every other case, also for a dropped sample.
   bool appendVideoSampleBuffer(const platform::SampleBufferRef& sample, const platform::AffineTransform& transform);
   void appendAudio1SampleBuffer(const platform::SampleBufferRef& sample);
   void appendAudio2SampleBuffer(const platform::SampleBufferRef& sample);
   /// The handler gets the movie's URL, or nothing when no video sample was ever written. A second
-  /// finish is ignored, its handler not called.
+  /// finish is ignored, its handler not called. The URL says nothing of the outcome: `isSound` does.
   void finishWritingWithHandler(FinishHandler handler);
+  /// From the finish handler on: whether the movie is complete on disk. One that is not may be missing, or hold what
+  /// was written before the failure.
+  [[nodiscard]] bool isSound() const { return isSound_.load(); }
+  /// The first thing that went wrong with the file (e.g. ENOSPC of the posix domain), from the time at which an append
+  /// or the finish met it, or the set-up when that failed.
+  [[nodiscard]] std::optional<platform::Error> failure() const { return failure_.load(); }
   /// The movie is to end at the last frame written so far, unless the recording resumes.
   void notifyRecordingMayBeStopped();
   void notifyRecordingResumed();
-  /// The movie is to end at this presentation time, whatever is written: its last picture lasts until then, so
-  /// that another movie that begins there continues it without a gap.
+  /// The movie is to end at this presentation time: its last picture lasts until then, sound that was captured before
+  /// is kept, nothing goes beyond. So another movie that begins there continues it without a gap. Before the finish; an
+  /// announced stop comes first. Without it the movie ends with its last sample.
   void endAtSourceTime(platform::MediaTime time) { endTime_.store(time); }
   /// Makes a copy of a finished movie without its first and last seconds (rounded to whole seconds).
-  /// The handler gets the copy's URL, or nothing when the export failed or was cancelled.
+  /// The handler gets the copy's URL, or nothing when the export failed, was cancelled or left no file. Several may run
+  /// at once, and none needs the writer any more once it was asked for.
   void trimMovieWithURL(platform::URL movie, double startClipDuration, double endClipDuration,
                         platform::URL outputFileURL, FinishHandler handler);
 
@@ -85,12 +93,9 @@ class QVMovieWriter : public std::enable_shared_from_this<QVMovieWriter> {
   void createInputs();
   [[nodiscard]] platform::Dictionary compressionProperties() const;
   [[nodiscard]] int64_t bitRate() const;
-  /// Pictures per second that the encoder is told of.
-  [[nodiscard]] int32_t expectedFrameRate() const;
-  [[nodiscard]] platform::MediaTime lastPictureTime() const;
   bool appendFirstVideoSample(const platform::SampleBufferRef& sample, const platform::AffineTransform& transform);
   bool ensureWriting(const platform::AffineTransform& transform);
-  [[nodiscard]] bool diskHasRoom(platform::MediaTime time);
+  void noteFailure(const std::optional<platform::Error>& error);
   void drainVideo();
   void appendAudio(Track& track, int number, const platform::SampleBufferRef& sample);
   void drainAudio(Track& track, int number);
@@ -104,6 +109,8 @@ class QVMovieWriter : public std::enable_shared_from_this<QVMovieWriter> {
   bool systemRecording_ = false;
   platform::Guarded<platform::MediaTime> trimVideoPresentationTime_;
   platform::Guarded<platform::MediaTime> endTime_;
+  platform::Guarded<std::optional<platform::Error>> failure_;
+  std::atomic<bool> isSound_{false};
 
   // Writer queue only.
   std::unique_ptr<platform::AssetWriter> assetWriter_;
@@ -114,7 +121,6 @@ class QVMovieWriter : public std::enable_shared_from_this<QVMovieWriter> {
   bool didStartSession_ = false;
   bool didProcessFirstSample_ = false;
   bool isFinishingWriting_ = false;
-  platform::MediaTime lastDiskCheck_ = platform::MediaTime::invalid();
 };
 
 }  // namespace qv

@@ -1,5 +1,4 @@
 #include "platform/Log.h"
-#include "support/QVTemporaryFiles.h"
 #include "writer/QVMovieWriter.h"
 
 namespace qv {
@@ -20,7 +19,6 @@ bool QVMovieWriter::dispatchedAppendVideoSampleBuffer(const SampleBufferRef& sam
   if (status() != AssetWriterStatus::Writing || !didProcessFirstSample_) {
     return appendFirstVideoSample(sample, transform);
   }
-  if (!diskHasRoom(sample->presentationTime())) return false;
   if (!video_.queue.enqueue(sample)) {
     QV_LOG_ERROR(logs::kWriter, "ERROR Enqueing the Sample Video Buffer");
     return true;
@@ -32,10 +30,12 @@ bool QVMovieWriter::dispatchedAppendVideoSampleBuffer(const SampleBufferRef& sam
 /// Starts the file once. A file that has started before and does not write any more has failed.
 bool QVMovieWriter::ensureWriting(const platform::AffineTransform& transform) {
   if (!didStartWriting_) {
+    didStartWriting_ = true;
     video_.input->setTransform(transform);
-    didStartWriting_ = assetWriter_->startWriting();
+    (void)assetWriter_->startWriting();  // the status tells
   }
-  if (didStartWriting_ && status() == AssetWriterStatus::Writing) return true;
+  if (status() == AssetWriterStatus::Writing) return true;
+  noteFailure(assetWriter_->error());
   QV_LOG_ERROR(logs::kWriter, "ERROR starting asset writer");
   return false;
 }
@@ -52,15 +52,6 @@ bool QVMovieWriter::appendFirstVideoSample(const SampleBufferRef& sample, const 
   (void)video_.input->append(sample);
   didProcessFirstSample_ = true;
   return true;
-}
-
-/// Looks once for each second of the movie: as often as anything is written.
-bool QVMovieWriter::diskHasRoom(MediaTime time) {
-  if (lastDiskCheck_.isValid() && time - lastDiskCheck_ < MediaTime::make(1, 1)) return true;
-  lastDiskCheck_ = time;
-  if (_srDeviceHasSufficientFreeSpaceToContinueRecording()) return true;
-  QV_LOG_ERROR(logs::kWriter, "insufficient disk space to go on recording");
-  return false;
 }
 
 void QVMovieWriter::drainVideo() {

@@ -1,4 +1,4 @@
-#include <cmath>
+#include <algorithm>
 
 #include "platform/Log.h"
 #include "writer/QVMovieWriter.h"
@@ -14,13 +14,6 @@ namespace settings = platform::settings;
 
 namespace {
 
-constexpr const char kPreferenceDomain[] = "com.tarnwick.quorveld";
-constexpr double kLargeSide = 1920.0;
-constexpr int64_t kTabletBitRate = 7'000'000;
-constexpr int64_t kLargeBitRate = 5'000'000;
-constexpr int64_t kDefaultBitRate = 3'000'000;
-constexpr int32_t kDefaultFrameRate = 60;
-constexpr int64_t kMaximumFrameRate = 240;
 constexpr double kMaximumSide = 16384.0;
 
 /// Truncated to an integer and, when odd, one more: H.264 with 4:2:0 chroma wants even sides.
@@ -48,40 +41,6 @@ Dictionary audioSettings() {
 
 }  // namespace
 
-int64_t QVMovieWriter::bitRate() const {
-  const Value override = Platform::current().preferences->valueForKey(kPreferenceDomain, "QVBitRateOverride");
-  if (override.isNumber() && override.asInteger() > 0) return override.asInteger();
-  if (!override.isNone()) QV_LOG_ERROR(logs::kWriter, "QVBitRateOverride is no positive number, ignored");
-  if (Platform::current().deviceInfo->userInterfaceIdiom() == platform::UserInterfaceIdiom::Tablet) {
-    return kTabletBitRate;
-  }
-  return windowSize_.width >= kLargeSide || windowSize_.height >= kLargeSide ? kLargeBitRate : kDefaultBitRate;
-}
-
-int32_t QVMovieWriter::expectedFrameRate() const {
-  if (!broadcastConfig_) return kDefaultFrameRate;
-  const int64_t rate =
-      platform::valueForKey(broadcastConfig_->videoCompressionProperties, settings::kExpectedSourceFrameRate)
-          .asInteger(kDefaultFrameRate);
-  return rate >= 1 && rate <= kMaximumFrameRate ? static_cast<int32_t>(rate) : kDefaultFrameRate;
-}
-
-Dictionary QVMovieWriter::compressionProperties() const {
-  const int64_t rate = bitRate();
-  QV_LOG(logs::kWriter, "bit rate set to %ld", static_cast<long>(rate));
-  Dictionary properties{{settings::kExpectedSourceFrameRate, Value(kDefaultFrameRate)},
-                        {settings::kProfileLevel, Value(settings::kProfileHighAutoLevel)},
-                        {settings::kAverageBitRate, Value(rate)},
-                        {settings::kMaxKeyFrameInterval, Value(int32_t{60})}};
-  if (broadcastConfig_ && !broadcastConfig_->videoCompressionProperties.empty()) {
-    QV_LOG(logs::kWriter, "using custom video compression properties");
-    for (const auto& [key, value] : broadcastConfig_->videoCompressionProperties) {
-      properties.insert_or_assign(key, value);
-    }
-  }
-  return properties;
-}
-
 void QVMovieWriter::createInputs() {
   platform::AssetWriterService& service = *Platform::current().assetWriter;
   const Dictionary videoSettings{{settings::kVideoCodec, Value(settings::kCodecH264)},
@@ -107,6 +66,7 @@ void QVMovieWriter::dispatchedSetupAssetWriter() {
   }
   auto created = Platform::current().assetWriter->createAssetWriter(outputURL(), platform::kFileTypeMPEG4);
   if (!created) {
+    noteFailure(created.error());
     QV_LOG_ERROR(logs::kWriter, "QVMovieWriter: setupAssetWriter error: %i", static_cast<int>(created.error().code));
     return;
   }

@@ -1,3 +1,5 @@
+#include <cerrno>
+
 #include "platform/Log.h"
 #include "support/QVTemporaryFiles.h"
 #include "writer/QVMovieWriter.h"
@@ -15,23 +17,38 @@ namespace {
 /// Clip durations count in whole seconds, rounded, halves away from zero.
 constexpr int32_t kClipTimescale = 1;
 
-void reportTrim(const platform::ExportSession& exportSession, const QVMovieWriter::FinishHandler& handler) {
+/// Nothing where there is a file with something in it.
+std::optional<platform::Error> checkFile(const URL& url) {
+  const auto attributes = Platform::current().fileSystem->attributesOfItem(url.path());
+  if (!attributes) return attributes.error();
+  if (attributes.value().size > 0 && !attributes.value().isDirectory) return std::nullopt;
+  _srRemoveFile(url, {});
+  return platform::Error::posix(ENODATA, url.path());
+}
+
+void reportTrimFailure(const std::optional<platform::Error>& error) {
+  QV_LOG_ERROR(logs::kWriter, "QVMovieWriter: Export Trim Video Failed, due to error: %i",
+               error ? static_cast<int>(error->code) : 0);
+}
+
+/// Whether there is a trimmed movie, told in the log.
+bool succeeded(const platform::ExportSession& exportSession) {
   switch (exportSession.status()) {
-    case ExportStatus::Failed: {
-      const auto error = exportSession.error();
-      QV_LOG_ERROR(logs::kWriter, "QVMovieWriter: Export Trim Video Failed, due to error: %i",
-                   error ? static_cast<int>(error->code) : 0);
-      handler(std::nullopt);
-      return;
-    }
+    case ExportStatus::Failed:
+      reportTrimFailure(exportSession.error());
+      return false;
     case ExportStatus::Cancelled:
       QV_LOG(logs::kWriter, "QVMovieWriter: Export Trim Video Cancelled");
-      handler(std::nullopt);
-      return;
+      return false;
     default:
-      QV_LOG(logs::kWriter, "QVMovieWriter: Export Trim succeeded");
-      handler(exportSession.outputURL());
+      break;
   }
+  if (const auto error = checkFile(exportSession.outputURL())) {
+    reportTrimFailure(error);
+    return false;
+  }
+  QV_LOG(logs::kWriter, "QVMovieWriter: Export Trim succeeded");
+  return true;
 }
 
 }  // namespace
@@ -46,19 +63,21 @@ void QVMovieWriter::trimMovieWithURL(URL movie, double startClipDuration, double
 
 void QVMovieWriter::dispatchedTrimMovieWithURL(const URL& movie, double startClipDuration, double endClipDuration,
                                                const URL& outputFileURL, FinishHandler handler) {
-  _srRemoveFile(outputFileURL, [movie, startClipDuration, endClipDuration, outputFileURL,
-                                handler = std::move(handler)](const auto&) {
-    platform::ExportService& service = *Platform::current().exportService;
-    auto asset = service.openMovie(movie);
-    const MediaTime movieDuration = asset ? asset->duration() : MediaTime::zero();
-    auto exportSession = service.createExportSession(asset, platform::ExportPreset::PassThrough);
-    exportSession->setOutputURL(outputFileURL);
-    exportSession->setOutputFileType(platform::kFileTypeMPEG4);
-    const MediaTime start = MediaTime::fromSeconds(startClipDuration, kClipTimescale);
-    const MediaTime end = MediaTime::fromSeconds(endClipDuration, kClipTimescale);
-    exportSession->setTimeRange({start, (movieDuration - end) - start});
-    exportSession->exportAsynchronously([exportSession, handler] { reportTrim(*exportSession, handler); });
-  });
+  _srRemoveFile(outputFileURL,
+                [movie, startClipDuration, endClipDuration, outputFileURL, handler = std::move(handler)](const auto&) {
+                  platform::ExportService& service = *Platform::current().exportService;
+                  auto asset = service.openMovie(movie);
+                  const MediaTime movieDuration = asset ? asset->duration() : MediaTime::zero();
+                  auto exportSession = service.createExportSession(asset, platform::ExportPreset::PassThrough);
+                  exportSession->setOutputURL(outputFileURL);
+                  exportSession->setOutputFileType(platform::kFileTypeMPEG4);
+                  const MediaTime start = MediaTime::fromSeconds(startClipDuration, kClipTimescale);
+                  const MediaTime end = MediaTime::fromSeconds(endClipDuration, kClipTimescale);
+                  exportSession->setTimeRange({start, (movieDuration - end) - start});
+                  exportSession->exportAsynchronously([exportSession, handler] {
+                    handler(succeeded(*exportSession) ? std::optional(exportSession->outputURL()) : std::nullopt);
+                  });
+                });
 }
 
 }  // namespace qv

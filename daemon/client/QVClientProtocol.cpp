@@ -16,6 +16,7 @@ const platform::IPCInterface& clientProtocol() {
            std::nullopt,
            {},
            true},
+          {"captureTimelineDidChange", {"ay"}, {"pauses"}, std::nullopt, {}},
           {"recordingLockInterrupted", {"a{sv}"}, {"error"}, std::nullopt, {}},
           {"recordingTimerDidUpdate", {"s"}, {"time"}, std::nullopt, {}},
     }

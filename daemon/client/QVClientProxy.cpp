@@ -11,12 +11,16 @@ namespace logs = platform::logs;
 QVClientProxy::QVClientProxy(std::string bundleIdentifier, const std::shared_ptr<platform::IPCConnection>& connection)
     : bundleIdentifier_(std::move(bundleIdentifier)), connection_(connection) {}
 
-void QVClientProxy::send(const char* member, platform::IPCArguments arguments, const char* failureLine) {
+void QVClientProxy::send(const char* member, platform::IPCArguments arguments, const char* failureLine,
+                         const std::shared_ptr<platform::RareLog>& failures) {
   const auto target = connection();
   if (!target) return;
-  target->call(member, std::move(arguments), nullptr, [failureLine](const platform::Error& error) {
+  target->call(member, std::move(arguments), nullptr, [failureLine, failures](const platform::Error& error) {
+    const auto number = failures ? failures->count() : std::optional<uint64_t>(1);
+    if (!number) return;
     std::string line = failureLine;
     line.replace(line.find("%d"), 2, std::to_string(static_cast<int>(error.code)));
+    if (*number > 1) line += " (" + std::to_string(*number) + " times)";
     QV_LOG_ERROR(logs::kDaemon, "%s", line.c_str());
   });
 }
@@ -50,7 +54,7 @@ void QVClientProxy::updateBroadcastURL(const platform::URL& broadcastURL) {
 void QVClientProxy::captureHandlerWithSample(const QVSharedFrameObject& sample, Data timingData) {
   QV_LOG_DEBUG(logs::kDaemon, "QVClientProxy:captureHandlerWithSample:");
   send("captureHandlerWithSample", {sample.encodeForIPC(), Value(std::move(timingData))},
-       "QVClientProxy:captureHandlerWithSample: error getting remote proxy: %d");
+       "QVClientProxy:captureHandlerWithSample: error getting remote proxy: %d", lostFrames_);
 }
 
 void QVClientProxy::captureHandlerWithAudioSample(Data sample, Data absdData, int64_t itemCount, int64_t bufferType,
@@ -59,7 +63,13 @@ void QVClientProxy::captureHandlerWithAudioSample(Data sample, Data absdData, in
   send("captureHandlerWithAudioSample",
        {Value(std::move(sample)), Value(std::move(absdData)), Value(itemCount), Value(bufferType),
         Value(std::move(timingData))},
-       "QVClientProxy:captureHandlerWithAudioSample: error getting remote proxy: %d");
+       "QVClientProxy:captureHandlerWithAudioSample: error getting remote proxy: %d", lostSound_);
+}
+
+void QVClientProxy::captureTimelineDidChange(Data pauses) {
+  QV_LOG(logs::kDaemon, "QVClientProxy:captureTimelineDidChange:");
+  send("captureTimelineDidChange", {Value(std::move(pauses))},
+       "QVClientProxy:captureTimelineDidChange: error getting remote proxy: %d");
 }
 
 void QVClientProxy::recordingLockInterrupted(const platform::Error& error) {

@@ -7,12 +7,13 @@
 #include "extensions/QVSharedFrameObject.h"
 #include "platform/Guarded.h"
 #include "platform/IPC.h"
+#include "platform/RareLog.h"
 
 namespace qv {
 
 /// What a session may know of its client: turns each callback into a one-way message over the
 /// client's connection. It holds that connection but does not own it; without one, messages go
-/// nowhere. Nothing is retried, and failures are only logged.
+/// nowhere. Nothing is retried, and failures are only logged: those of samples as their number doubles.
 ///
 /// Threading: thread-safe; called from the manager sequence and from capture threads.
 class QVClientProxy {
@@ -34,13 +35,22 @@ class QVClientProxy {
   /// `absdData`: one raw AudioStreamDescription, 40 bytes. `bufferType`: 2 app audio, 3 microphone.
   void captureHandlerWithAudioSample(platform::Data sample, platform::Data absdData, int64_t itemCount,
                                      int64_t bufferType, platform::Data timingData);
+  /// `pauses`: one raw MediaTime, 24 bytes: the sum of the pauses before the samples that follow. To be sent from the
+  /// thread that sends them, before the first sample of each capture and before the first with another sum: it is never
+  /// dropped, and messages keep their order.
+  void captureTimelineDidChange(platform::Data pauses);
   void recordingLockInterrupted(const platform::Error& error);
   void recordingTimerDidUpdate(const std::string& time);
 
  private:
-  void send(const char* member, platform::IPCArguments arguments, const char* failureLine);
+  /// `failures` (may be nothing) counts those of a member that is sent all the time.
+  void send(const char* member, platform::IPCArguments arguments, const char* failureLine,
+            const std::shared_ptr<platform::RareLog>& failures = nullptr);
 
   const std::string bundleIdentifier_;
+  /// Failures come back later than this may live.
+  const std::shared_ptr<platform::RareLog> lostFrames_ = std::make_shared<platform::RareLog>();
+  const std::shared_ptr<platform::RareLog> lostSound_ = std::make_shared<platform::RareLog>();
   platform::Guarded<std::weak_ptr<platform::IPCConnection>> connection_;
 };
 

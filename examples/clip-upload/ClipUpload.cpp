@@ -59,8 +59,6 @@ ClipUpload::~ClipUpload() { end(); }
 
 void ClipUpload::processClip(quorvel::Clip clip, quorvel::ClipCompletion done) {
   const int index = indexOf(clip.name);
-  // A broadcast that broke off had no last clip; the next one counts from 1 again.
-  if (show_ && index != 0 && index <= show_->lastIndex) end();
   const bool isFirst = !show_;
   if (isFirst) show_ = std::make_unique<Show>(clip.userInfo);
   show_->lastIndex = index != 0 ? index : show_->lastIndex + 1;

@@ -12,7 +12,7 @@
 namespace upload {
 
 /// Puts each clip on an HTTP server as a segment of an HLS stream, and the playlist after it. The last clip ends the
-/// playlist; so does a broadcast that broke off, when the next begins or the process ends.
+/// playlist; so does the end of the process in a broadcast that breaks off.
 ///
 /// User information: "url", the directory to put files into (http or https); "name", of the playlist; "clipDuration",
 /// seconds; "authorization", that header's value.

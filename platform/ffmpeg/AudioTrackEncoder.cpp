@@ -4,6 +4,7 @@
 #include <cmath>
 
 #include "platform/Log.h"
+#include "platform/mp4/MovieTrack.h"
 
 namespace qv::platform::ffmpeg {
 namespace {
@@ -55,7 +56,8 @@ std::optional<Error> AudioTrackEncoder::place(const Held& held, const RecordingT
     return static_cast<int64_t>(std::clamp(frame, 0.0, static_cast<double>(held.sound.count())));
   };
   const double outputRate = encoder_->sampleRate();
-  const double limit = (static_cast<double>(timeline.movieHorizon()) / kNanoseconds + kMaximumLead) * outputRate;
+  const auto horizon = static_cast<double>(std::max(timeline.movieHorizon(), movieEnd_));
+  const double limit = (horizon / kNanoseconds + kMaximumLead) * outputRate;
   for (size_t i = 0; i < timeline.segments().size(); ++i) {
     const auto& segment = timeline.segments()[i];
     if (segment.end <= held.captureTime || segment.start >= held.endTime()) continue;
@@ -118,15 +120,25 @@ std::optional<Error> AudioTrackEncoder::encodeConverted(std::vector<mp4::Encoded
   return error;
 }
 
-std::optional<Error> AudioTrackEncoder::finish(const RecordingTimeline& timeline, int64_t movieEnd,
-                                               std::vector<mp4::EncodedSample>& out) {
+std::optional<Error> AudioTrackEncoder::placeRest(const RecordingTimeline& timeline, int64_t movieEnd,
+                                                  std::vector<mp4::EncodedSample>& out) {
+  movieEnd_ = movieEnd;
   for (const Held& held : held_) {
     if (auto error = place(held, timeline, out)) return error;
   }
   held_.clear();
-  if (auto error = endRun(out)) return error;
+  heldDuration_ = 0;
+  return endRun(out);
+}
+
+int64_t AudioTrackEncoder::endTick() const {
+  return static_cast<int64_t>(
+      std::llround(static_cast<double>(encoder_->framesTaken()) * mp4::kMovieTimescale / encoder_->sampleRate()));
+}
+
+std::optional<Error> AudioTrackEncoder::finish(int64_t movieEnd, std::vector<mp4::EncodedSample>& out) {
   if (encoder_->framesTaken() == 0) return std::nullopt;
-  const auto end = std::llround(static_cast<double>(movieEnd) / kNanoseconds * encoder_->sampleRate());
+  const auto end = std::llround(static_cast<double>(movieEnd) / mp4::kMovieTimescale * encoder_->sampleRate());
   if (end > encoder_->framesTaken()) {
     if (auto error = encoder_->appendSilence(end - encoder_->framesTaken(), out)) return error;
   }

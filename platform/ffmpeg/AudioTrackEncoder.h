@@ -30,9 +30,14 @@ class AudioTrackEncoder {
   void enqueue(const SampleBuffer& sample);
   /// Encodes what has a settled place by now.
   std::optional<Error> advance(const RecordingTimeline& timeline, std::vector<mp4::EncodedSample>& out);
-  /// Encodes the rest, and silence until `movieEnd` (nanoseconds) where the track has any sound.
-  std::optional<Error> finish(const RecordingTimeline& timeline, int64_t movieEnd,
-                              std::vector<mp4::EncodedSample>& out);
+  /// Encodes the rest; no more is enqueued. `movieEnd` (nanoseconds; 0 where it is not known) is no mistake for a time
+  /// of sound, however far behind the last picture it lies.
+  std::optional<Error> placeRest(const RecordingTimeline& timeline, int64_t movieEnd,
+                                 std::vector<mp4::EncodedSample>& out);
+  /// Where the sound so far ends, in mp4::kMovieTimescale.
+  [[nodiscard]] int64_t endTick() const;
+  /// After `placeRest`: silence until `movieEnd` (mp4::kMovieTimescale) where the track has any sound.
+  std::optional<Error> finish(int64_t movieEnd, std::vector<mp4::EncodedSample>& out);
 
  private:
   struct Held {
@@ -57,6 +62,7 @@ class AudioTrackEncoder {
   bool hasRun_ = false;
   double runEnd_ = 0;  ///< where the next sound of the run belongs, in frames of the movie
   double runRate_ = 0;
+  int64_t movieEnd_ = 0;  ///< nanoseconds
 };
 
 }  // namespace qv::platform::ffmpeg

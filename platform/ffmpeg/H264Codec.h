@@ -25,7 +25,7 @@ struct H264Codec {
   bool oneNodeEach = false;
   /// Its rate can be changed while it runs.
   bool canChangeRate = false;
-  /// Fills in the rest of a context that has size, rate, times and colours already. Gives an empty
+  /// Fills in the rest of a context that has size, rate, profile, times and colours already. Gives an empty
   /// function where the encoder takes the planes as they are.
   std::function<Result<FrameUpload>(AVCodecContext& context, const std::string& node)> setUp;
 };

@@ -68,8 +68,7 @@ void MovieEncoder::check(const std::optional<Error>& error) {
 void MovieEncoder::endWith(const Error& error) {
   if (recorder_) {
     isFileEnded_ = true;
-    const mp4::MovieEnd end = movieEnd(std::nullopt);
-    finishTracks(end);
+    const mp4::MovieEnd end = finishTracks(std::nullopt);
     std::promise<void> ended;
     recorder_->finish(end, [&ended](const std::optional<Error>&) { ended.set_value(); });
     ended.get_future().wait();
@@ -129,6 +128,7 @@ std::optional<Error> MovieEncoder::handlePicture(size_t track, const SampleBuffe
   if (tick <= lastTick_.value_or(-1) || tick - lastTick_.value_or(0) > kLongestGap) return std::nullopt;
   if (lastTick_) lastInterval_ = tick - *lastTick_;
   lastTick_ = tick;
+  if (!firstTick_) firstTick_ = tick;
   ++pictures_;
   VideoEncoder& encoder = *tracks_[track].video;
   if (!recorder_ && encoder.liesAcross(*sample.image())) encoder.turnPictures();
@@ -149,39 +149,59 @@ void MovieEncoder::advanceAudio() {
 }
 
 void MovieEncoder::write(size_t track, std::vector<mp4::EncodedSample>& samples) {
+  if (state_->status() != AssetWriterStatus::Writing) return;  // the file may be whole by now
   for (mp4::EncodedSample& sample : samples) recorder_->append(track, std::move(sample));
 }
 
-mp4::MovieEnd MovieEncoder::movieEnd(const std::optional<MediaTime>& endTime) const {
+std::optional<int64_t> MovieEncoder::endTick(const std::optional<MediaTime>& endTime) const {
+  if (!endTime || !endTime->isNumeric() || !firstTick_) return std::nullopt;
+  const int64_t tick = tickOf(*endTime);
+  if (tick - *lastTick_ <= kLongestGap) return std::max(tick, *firstTick_);
+  QV_LOG_ERROR(logs::kMovie, "the end of the movie lies hours behind its last picture, ignored");
+  return std::nullopt;
+}
+
+mp4::MovieEnd MovieEncoder::movieEnd(std::optional<int64_t> endTick) const {
   mp4::MovieEnd end;
   if (!lastTick_) return end;
-  if (endTime && endTime->isNumeric()) {
-    end.lastPicture = std::max<int64_t>(0, tickOf(*endTime));
-    end.duration = static_cast<uint64_t>(*end.lastPicture + expectedInterval_);
-  } else {
-    const bool isRegular = lastInterval_ >= kShortestInterval && lastInterval_ <= kLongestInterval;
-    end.duration = static_cast<uint64_t>(*lastTick_ + (isRegular ? lastInterval_ : expectedInterval_));
-  }
+  if (endTick) return {endTick, static_cast<uint64_t>(*endTick), static_cast<uint64_t>(expectedInterval_)};
+  const bool isRegular = lastInterval_ >= kShortestInterval && lastInterval_ <= kLongestInterval;
+  int64_t last = *lastTick_ + (isRegular ? lastInterval_ : expectedInterval_);
+  for (const Track& track : tracks_) last = std::max(last, track.audio ? track.audio->endTick() : 0);
+  end.duration = static_cast<uint64_t>(last);
   return end;
 }
 
-void MovieEncoder::finishTracks(const mp4::MovieEnd& end) {
-  const auto movieNanoseconds = static_cast<int64_t>(static_cast<__int128>(end.duration.value_or(0)) *
-                                                     kNanosecondsPerSecond / mp4::kMovieTimescale);
+void MovieEncoder::placeRestOfSound(std::optional<int64_t> endTick) {
+  const auto nanoseconds =
+      static_cast<int64_t>(static_cast<__int128>(endTick.value_or(0)) * kNanosecondsPerSecond / mp4::kMovieTimescale);
+  for (size_t i = 0; i < tracks_.size() && state_->status() == AssetWriterStatus::Writing; ++i) {
+    if (!tracks_[i].audio) continue;
+    std::vector<mp4::EncodedSample> samples;
+    check(tracks_[i].audio->placeRest(timeline_, nanoseconds, samples));
+    write(i, samples);
+  }
+}
+
+mp4::MovieEnd MovieEncoder::finishTracks(const std::optional<MediaTime>& endTime) {
+  const auto tick = endTick(endTime);
+  placeRestOfSound(tick);
+  const mp4::MovieEnd end = movieEnd(tick);
+  const auto soundEnd = static_cast<int64_t>(end.duration.value_or(0) + end.lastPictureShown);
   for (size_t i = 0; i < tracks_.size() && state_->status() == AssetWriterStatus::Writing; ++i) {
     std::vector<mp4::EncodedSample> samples;
     if (tracks_[i].video && pictures_ > 0) check(tracks_[i].video->flush(samples));
-    if (tracks_[i].audio) check(tracks_[i].audio->finish(timeline_, movieNanoseconds, samples));
+    if (tracks_[i].audio) check(tracks_[i].audio->finish(soundEnd, samples));
     write(i, samples);
   }
   QV_LOG(logs::kMovie, "movie finished: %" PRIu64 " pictures, %" PRIu64 " dropped", pictures_,
          state_->droppedPictures());
+  return end;
 }
 
 void MovieEncoder::finish(SessionFinish request) {
-  const mp4::MovieEnd end = movieEnd(request.endTime);
   if (state_->status() == AssetWriterStatus::Writing) beginFile();
-  if (!isFileEnded_) finishTracks(end);
+  const mp4::MovieEnd end = isFileEnded_ ? mp4::MovieEnd() : finishTracks(request.endTime);
   // Moved all the way: the last reference to whatever it holds must not end on a thread of the writer's.
   auto complete = [state = state_, completion = std::move(request.completion)](std::optional<Error> error) mutable {
     error ? state->fail(*error) : state->complete();

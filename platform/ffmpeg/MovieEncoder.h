@@ -48,8 +48,11 @@ class MovieEncoder {
   void observe(MediaTime captureTime, MediaTime presentationTime);
   void advanceAudio();
   void finish(SessionFinish request);
-  void finishTracks(const mp4::MovieEnd& end);
-  [[nodiscard]] mp4::MovieEnd movieEnd(const std::optional<MediaTime>& endTime) const;
+  mp4::MovieEnd finishTracks(const std::optional<MediaTime>& endTime);
+  void placeRestOfSound(std::optional<int64_t> endTick);
+  /// In mp4::kMovieTimescale; nothing where the movie is to end with its last sample.
+  [[nodiscard]] std::optional<int64_t> endTick(const std::optional<MediaTime>& endTime) const;
+  [[nodiscard]] mp4::MovieEnd movieEnd(std::optional<int64_t> endTick) const;
   [[nodiscard]] int64_t tickOf(MediaTime presentationTime) const;
   void check(const std::optional<Error>& error);
   /// The movie up to here is finished and kept.
@@ -62,6 +65,7 @@ class MovieEncoder {
   std::unique_ptr<mp4::MovieRecorder> recorder_;
   RecordingTimeline timeline_;
   std::optional<MediaTime> sessionStart_;
+  std::optional<int64_t> firstTick_;  ///< of a picture, as the next
   std::optional<int64_t> lastTick_;
   int64_t lastInterval_ = 0;
   int64_t expectedInterval_ = mp4::kMovieTimescale / 60;

@@ -6,7 +6,6 @@ namespace {
 
 Result<FrameUpload> setUp(AVCodecContext& context, const std::string&) {
   context.pix_fmt = AV_PIX_FMT_NV12;  // what these devices have in common
-  context.profile = FF_PROFILE_H264_HIGH;
   return FrameUpload([frames = SemiPlanarFrames()](const AVFrame& planar) mutable { return frames.copy(planar); });
 }
 

@@ -51,7 +51,6 @@ Result<Frame> toSurface(const AVFrame& semiPlanar, AVBufferRef* surfaces) {
 
 Result<FrameUpload> setUp(AVCodecContext& context, const std::string& node) {
   context.pix_fmt = AV_PIX_FMT_VAAPI;
-  context.profile = FF_PROFILE_H264_HIGH;
   if (auto error = makeSurfaces(context, node)) return *error;
   return FrameUpload(
       [frames = SemiPlanarFrames(), surfaces = context.hw_frames_ctx](const AVFrame& planar) mutable -> Result<Frame> {

@@ -25,6 +25,18 @@ constexpr AffineTransform kQuarterTurnClockwise{0, 1, -1, 0, 0, 0};
 int64_t maximumRate(const VideoSettings& settings) { return settings.bitRate * 3 / 2; }
 int rateBuffer(const VideoSettings& settings) { return static_cast<int>(settings.bitRate * 2); }
 
+int libraryProfile(H264Profile profile) {
+  switch (profile) {
+    case H264Profile::Baseline:
+      return FF_PROFILE_H264_CONSTRAINED_BASELINE;
+    case H264Profile::Main:
+      return FF_PROFILE_H264_MAIN;
+    case H264Profile::High:
+      break;
+  }
+  return FF_PROFILE_H264_HIGH;
+}
+
 CodecContext makeContext(const AVCodec* codec, const VideoSettings& settings) {
   CodecContext context(avcodec_alloc_context3(codec));
   context->width = settings.width;
@@ -37,6 +49,7 @@ CodecContext makeContext(const AVCodec* codec, const VideoSettings& settings) {
   context->rc_buffer_size = rateBuffer(settings);
   context->gop_size = settings.keyFrameInterval;
   context->max_b_frames = 0;
+  context->profile = libraryProfile(settings.profile);
   context->flags |= AV_CODEC_FLAG_GLOBAL_HEADER;
   const mp4::ColorDescription color;
   context->color_primaries = static_cast<AVColorPrimaries>(color.primaries);

@@ -13,7 +13,7 @@
 
 namespace qv::platform::ffmpeg {
 
-/// Encodes pictures to H.264 High in the order in which they come, without reordering.
+/// Encodes pictures to H.264 in the order in which they come, without reordering.
 ///
 /// A screen that stands still (pictures come by the heartbeat alone) is held to a small rate where the encoder
 /// can change it: its key frames would otherwise cost a megabit a second to show nothing new.

@@ -6,6 +6,8 @@
 
 namespace qv::platform::ffmpeg {
 
+enum class H264Profile { Baseline, Main, High };
+
 /// What a video input's output settings ask for, within what the encoder can do.
 struct VideoSettings {
   int width = 0;  ///< even
@@ -13,8 +15,10 @@ struct VideoSettings {
   int64_t bitRate = 0;  ///< bits per second
   int frameRate = 60;
   int keyFrameInterval = 60;  ///< frames
+  H264Profile profile = H264Profile::High;
 };
-/// Compression properties under other keys are logged and ignored.
+/// Says in the log what it cannot follow: properties under other keys, in one line, unknown profiles, and levels, since
+/// a level follows from size and rate.
 VideoSettings parseVideoSettings(const Dictionary& outputSettings);
 
 struct AudioSettings {

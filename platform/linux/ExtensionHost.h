@@ -1,18 +1,20 @@
 #pragma once
 
+#include <atomic>
 #include <functional>
 #include <map>
 #include <memory>
-#include <optional>
+#include <set>
 #include <string>
 
 #include "platform/Extensions.h"
 #include "platform/Guarded.h"
 #include "platform/Timer.h"
 #include "platform/linux/ExtensionLaunch.h"
-#include "platform/linux/SandboxTokenBook.h"
 
 namespace qv::platform {
+
+class ExtensionProcesses;
 
 /// What the processes of all extensions share. The services are borrowed and outlive it.
 ///
@@ -29,9 +31,10 @@ struct ExtensionHost {
   TimerService& timers;
   Executor& executor;
   const ExtensionLaunchOptions options;
-  SandboxTokenBook tokens{};
   Guarded<std::map<std::string, MakeContext>> contextClasses{};  ///< by extension point
   Guarded<std::map<ExtensionRequestID, Place>> places{};         ///< of the requests that were begun
+  Guarded<std::set<std::shared_ptr<ExtensionProcesses>>> uses{};
+  std::atomic<ExtensionRequestID> lastRequest{0};
 };
 
 }  // namespace qv::platform

@@ -50,16 +50,19 @@ class ExtensionProcess::RequestsObject final : public IPCExportedObject {
 };
 
 std::shared_ptr<ExtensionProcess> ExtensionProcess::create(std::shared_ptr<ExtensionHost> host,
+                                                           std::shared_ptr<SandboxTokenBook> tokens,
                                                            std::shared_ptr<SerialQueue> queue,
                                                            ExtensionRecordRef extension,
                                                            std::function<void(ExtensionProcess*)> didEnd) {
-  return std::shared_ptr<ExtensionProcess>(
-      new ExtensionProcess(std::move(host), std::move(queue), std::move(extension), std::move(didEnd)));
+  return std::shared_ptr<ExtensionProcess>(new ExtensionProcess(std::move(host), std::move(tokens), std::move(queue),
+                                                                std::move(extension), std::move(didEnd)));
 }
 
-ExtensionProcess::ExtensionProcess(std::shared_ptr<ExtensionHost> host, std::shared_ptr<SerialQueue> queue,
-                                   ExtensionRecordRef extension, std::function<void(ExtensionProcess*)> didEnd)
+ExtensionProcess::ExtensionProcess(std::shared_ptr<ExtensionHost> host, std::shared_ptr<SandboxTokenBook> tokens,
+                                   std::shared_ptr<SerialQueue> queue, ExtensionRecordRef extension,
+                                   std::function<void(ExtensionProcess*)> didEnd)
     : host_(std::move(host)),
+      tokens_(std::move(tokens)),
       queue_(std::move(queue)),
       extension_(std::move(extension)),
       didEnd_(std::move(didEnd)),
@@ -144,7 +147,7 @@ void ExtensionProcess::adoptAuxiliary(const std::shared_ptr<IPCConnection>& conn
 
 void ExtensionProcess::begin(ExtensionRequestID request, std::vector<ExtensionItem> items,
                              ExtensionRequestHandlers handlers) {
-  host_->tokens.giveToRequest(items, extension_->identifier, request);
+  tokens_->giveToRequest(items, request);
   Request& entry = requests_[request];
   entry.items = std::move(items);
   entry.handlers = std::move(handlers);
@@ -210,20 +213,20 @@ void ExtensionProcess::didPassDeadline(ExtensionRequestID request) {
 }
 
 void ExtensionProcess::openFile(const std::string& token, const IPCReply& reply) {
-  if (auto file = host_->tokens.take(token, extension_->identifier)) return reply({Value(std::move(file))});
+  if (auto file = tokens_->take(token)) return reply({Value(std::move(file))});
   logOddity("a token that is not its own to use");
   reply.fail(kNoSuchFileErrorName, "no file for this token");
 }
 
-void ExtensionProcess::sendSignal(int signal) {
-  if (process_ && !status_) process_->sendSignal(signal);
-  if (signal == SIGKILL && process_) isEnding_ = true;
+void ExtensionProcess::terminate() {
+  isEnding_ = true;
+  if (process_ && !status_) process_->sendSignal(SIGKILL);
 }
 
 void ExtensionProcess::kill(const std::string& why) {
   if (std::exchange(wasKilled_, true) || status_) return;
   QV_LOG_ERROR(logs::kExtensions, "extension %s is killed: %s", extension_->identifier.c_str(), why.c_str());
-  sendSignal(SIGKILL);
+  terminate();
 }
 
 /// An orderly exit shows here first, too.

@@ -10,6 +10,7 @@
 #include "platform/SerialQueue.h"
 #include "platform/linux/ExtensionHost.h"
 #include "platform/linux/LaunchedProcess.h"
+#include "platform/linux/SandboxTokenBook.h"
 
 namespace qv::platform {
 
@@ -23,14 +24,17 @@ namespace qv::platform {
 /// Threading: `queue` only, other than where it says so. Handlers of requests come on a queue of their own.
 class ExtensionProcess final : public IPCListenerDelegate, public std::enable_shared_from_this<ExtensionProcess> {
  public:
+  /// `tokens` are those of its use.
   static std::shared_ptr<ExtensionProcess> create(std::shared_ptr<ExtensionHost> host,
+                                                  std::shared_ptr<SandboxTokenBook> tokens,
                                                   std::shared_ptr<SerialQueue> queue, ExtensionRecordRef extension,
                                                   std::function<void(ExtensionProcess*)> didEnd);
   ~ExtensionProcess() override;
 
   /// Launches with the first one.
   void begin(ExtensionRequestID request, std::vector<ExtensionItem> items, ExtensionRequestHandlers handlers);
-  void sendSignal(int signal);
+  /// SIGKILL: every request that it has ends in an error, once it is dead.
+  void terminate();
   /// Whether it takes no more requests: it was killed, closes its connections, or has ended.
   [[nodiscard]] bool isEnding() const { return isEnding_; }
 
@@ -49,8 +53,9 @@ class ExtensionProcess final : public IPCListenerDelegate, public std::enable_sh
     std::optional<Outcome> outcome;  ///< that came before the request was answered
   };
 
-  ExtensionProcess(std::shared_ptr<ExtensionHost> host, std::shared_ptr<SerialQueue> queue,
-                   ExtensionRecordRef extension, std::function<void(ExtensionProcess*)> didEnd);
+  ExtensionProcess(std::shared_ptr<ExtensionHost> host, std::shared_ptr<SandboxTokenBook> tokens,
+                   std::shared_ptr<SerialQueue> queue, ExtensionRecordRef extension,
+                   std::function<void(ExtensionProcess*)> didEnd);
   std::optional<Error> launch();
   Result<ListenerEndpoint> listen(std::unique_ptr<IPCListener>& listener);
   [[nodiscard]] bool isOurProcess(const IPCConnection& connection) const;
@@ -72,6 +77,7 @@ class ExtensionProcess final : public IPCListenerDelegate, public std::enable_sh
   void logOddity(const std::string& what);
 
   const std::shared_ptr<ExtensionHost> host_;
+  const std::shared_ptr<SandboxTokenBook> tokens_;
   const std::shared_ptr<SerialQueue> queue_;
   const ExtensionRecordRef extension_;
   std::function<void(ExtensionProcess*)> didEnd_;

@@ -46,7 +46,7 @@ void ExtensionProcess::completeRequest(ExtensionRequestID request, const Value& 
 void ExtensionProcess::end(ExtensionRequestID request, Outcome outcome) {
   auto entry = requests_.extract(request);
   if (entry.empty()) return;
-  host_->tokens.endRequest(request);
+  tokens_->endRequest(request);
   auto& handlers = entry.mapped().handlers;
   if (entry.mapped().stage != Stage::Begun) {
     if (!handlers.began) return;

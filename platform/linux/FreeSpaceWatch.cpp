@@ -13,27 +13,23 @@ constexpr uint64_t kFastestLoss = 50'000;  // bytes in a millisecond
 constexpr std::chrono::milliseconds kSoonest{1000};
 constexpr std::chrono::milliseconds kLatest{60'000};
 
-/// The range of each urgency begins below these.
-constexpr uint64_t kThresholds[] = {UINT64_MAX, freespace::kLow, freespace::kVeryLow, freespace::kCritical};
-constexpr int32_t kHighestUrgency = 3;
-
 }  // namespace
 
-int32_t urgencyOfFreeSpace(uint64_t freeBytes) {
+int32_t FreeSpaceLimits::urgencyOf(uint64_t freeBytes) const {
   int32_t urgency = 0;
-  while (urgency < kHighestUrgency && freeBytes < kThresholds[urgency + 1]) ++urgency;
+  while (urgency < highestUrgency() && freeBytes < thresholdOf(urgency + 1)) ++urgency;
   return urgency;
 }
 
-std::chrono::milliseconds nextLookAtFreeSpace(uint64_t freeBytes) {
-  const int32_t next = std::min(urgencyOfFreeSpace(freeBytes) + 1, kHighestUrgency);
-  const uint64_t left = freeBytes > kThresholds[next] ? freeBytes - kThresholds[next] : 0;
+std::chrono::milliseconds FreeSpaceLimits::nextLook(uint64_t freeBytes) const {
+  const uint64_t threshold = thresholdOf(std::min(urgencyOf(freeBytes) + 1, highestUrgency()));
+  const uint64_t left = freeBytes > threshold ? freeBytes - threshold : 0;
   const uint64_t time = std::min(left / kFastestLoss, static_cast<uint64_t>(kLatest.count()));
   return std::max(kSoonest, std::chrono::milliseconds(time));
 }
 
-FreeSpaceWatch::FreeSpaceWatch(TimerService& timers, Executor& executor, FreeSpace freeSpace)
-    : state_(std::make_shared<State>(timers, executor, std::move(freeSpace))) {}
+FreeSpaceWatch::FreeSpaceWatch(TimerService& timers, Executor& executor, FreeSpaceLimits limits, FreeSpace freeSpace)
+    : state_(std::make_shared<State>(timers, executor, std::move(limits), std::move(freeSpace))) {}
 
 void FreeSpaceWatch::registerCallbacks(const std::string& serviceName, PurgeableSpaceCallbacks callbacks) {
   auto timer = state_->timers.every(std::chrono::hours(24), [weak = state_->weak_from_this(), serviceName] {
@@ -74,15 +70,15 @@ void FreeSpaceWatch::State::look() {
   if (freeBytes) requestSpace(*freeBytes);
   std::lock_guard lock(mutex);
   if (!isActive) return;
-  const bool mustBeConfirmed = isCritical && urgency < kHighestUrgency;
-  lookSoon(mustBeConfirmed ? freespace::kCriticalFor : freeBytes ? nextLookAtFreeSpace(*freeBytes) : kLatest);
+  const bool mustBeConfirmed = isCritical && urgency < limits.highestUrgency();
+  lookSoon(mustBeConfirmed ? limits.criticalFor : freeBytes ? limits.nextLook(*freeBytes) : kLatest);
 }
 
 /// With the mutex held.
 int32_t FreeSpaceWatch::State::urgencyNow(uint64_t freeBytes) {
-  const int32_t now = urgencyOfFreeSpace(freeBytes);
-  const bool wasCritical = std::exchange(isCritical, now == kHighestUrgency);
-  return isCritical && isActive && !wasCritical ? kHighestUrgency - 1 : now;
+  const int32_t now = limits.urgencyOf(freeBytes);
+  const bool wasCritical = std::exchange(isCritical, now == limits.highestUrgency());
+  return isCritical && isActive && !wasCritical ? now - 1 : now;
 }
 
 void FreeSpaceWatch::State::requestSpace(uint64_t freeBytes) {
@@ -95,7 +91,7 @@ void FreeSpaceWatch::State::requestSpace(uint64_t freeBytes) {
     if (now <= before) return;
     asked = services;
   }
-  const auto amount = static_cast<int64_t>(kThresholds[now] - freeBytes);
+  const auto amount = static_cast<int64_t>(limits.thresholdOf(now) - freeBytes);
   for (const auto& [name, callbacks] : asked) {
     if (!callbacks->purge) continue;
     QV_LOG(logs::kPlatform, "%llu bytes are free: %s is asked for space, urgency %d",

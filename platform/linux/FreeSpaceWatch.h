@@ -1,5 +1,6 @@
 #pragma once
 
+#include <array>
 #include <chrono>
 #include <cstdint>
 #include <functional>
@@ -15,24 +16,23 @@
 
 namespace qv::platform {
 
-/// How much free space makes a request for space how urgent. Bytes, decimal.
-namespace freespace {
-/// Urgency 1: a recording would not start any more.
-inline constexpr uint64_t kLow = 100'000'000;
-/// Urgency 2.
-inline constexpr uint64_t kVeryLow = 50'000'000;
-/// Urgency 3: the rest is for the system. Whoever is asked gives up all that it can, a running recording
-/// included.
-inline constexpr uint64_t kCritical = 16'000'000;
-/// For so long the space must be critical: a recording that ends by itself can keep its movie.
-inline constexpr std::chrono::seconds kCriticalFor{5};
-}  // namespace freespace
+/// Which free space makes a request for space how urgent.
+struct FreeSpaceLimits {
+  /// Of the urgencies 1, 2 and 3: bytes, each fewer than the one before. Space below a threshold has its urgency.
+  std::array<uint64_t, 3> thresholds{};
+  /// For so long the space must be below the last threshold before the highest urgency is asked for while the watch is
+  /// active; till then it is the urgency before.
+  std::chrono::seconds criticalFor{0};
 
-/// 0 where there is space enough.
-[[nodiscard]] int32_t urgencyOfFreeSpace(uint64_t freeBytes);
-/// When to look again: sooner the nearer the next threshold is, so that a disk which loses 50 MB a
-/// second is seen in time; 1 s at least, 60 s at most.
-[[nodiscard]] std::chrono::milliseconds nextLookAtFreeSpace(uint64_t freeBytes);
+  /// 0 where there is space enough.
+  [[nodiscard]] int32_t urgencyOf(uint64_t freeBytes) const;
+  [[nodiscard]] int32_t highestUrgency() const { return static_cast<int32_t>(thresholds.size()); }
+  /// Below it the space has this urgency (1 or more).
+  [[nodiscard]] uint64_t thresholdOf(int32_t urgency) const { return thresholds.at(static_cast<size_t>(urgency - 1)); }
+  /// When to look again: sooner the nearer the next threshold is, so that a disk which loses 50 MB a second is seen in
+  /// time; 1 s at least, 60 s at most.
+  [[nodiscard]] std::chrono::milliseconds nextLook(uint64_t freeBytes) const;
+};
 
 /// Asks the registered services for space before the disk is full, and once a day for what has become
 /// old.
@@ -48,15 +48,18 @@ class FreeSpaceWatch final : public PurgeableSpaceService {
  public:
   /// Bytes free where the services' files are; nothing where that cannot be read. Called on the executor.
   using FreeSpace = std::function<std::optional<uint64_t>()>;
-  FreeSpaceWatch(TimerService& timers, Executor& executor, FreeSpace freeSpace);
+  FreeSpaceWatch(TimerService& timers, Executor& executor, FreeSpaceLimits limits, FreeSpace freeSpace);
   /// Replaces an earlier registration of the same name.
   void registerCallbacks(const std::string& serviceName, PurgeableSpaceCallbacks callbacks) override;
   void setActive(bool isActive);
 
  private:
   struct State : std::enable_shared_from_this<State> {
-    State(TimerService& timersToUse, Executor& executorToUse, FreeSpace function)
-        : timers(timersToUse), executor(executorToUse), freeSpace(std::move(function)) {}
+    State(TimerService& timersToUse, Executor& executorToUse, FreeSpaceLimits limitsToUse, FreeSpace function)
+        : timers(timersToUse),
+          executor(executorToUse),
+          limits(std::move(limitsToUse)),
+          freeSpace(std::move(function)) {}
     void lookSoon(std::chrono::milliseconds delay);
     void look();
     void requestSpace(uint64_t freeBytes);
@@ -65,6 +68,7 @@ class FreeSpaceWatch final : public PurgeableSpaceService {
 
     TimerService& timers;
     Executor& executor;
+    const FreeSpaceLimits limits;
     const FreeSpace freeSpace;
     std::mutex mutex;
     // Guarded by mutex:

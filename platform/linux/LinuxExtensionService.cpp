@@ -1,16 +1,14 @@
 #include "platform/linux/LinuxExtensionService.h"
 
-#include <cerrno>
 #include <set>
 #include <utility>
 
 #include "platform/Log.h"
 #include "platform/linux/ExtensionManifest.h"
+#include "platform/linux/LinuxExtensionUse.h"
 
 namespace qv::platform {
 namespace {
-
-constexpr const char kReadOnlyTokenClass[] = "com.tarnwick.quorveld.read-only";
 
 std::vector<ExtensionRecordRef> findExtensions(LinuxBundleService& bundles, const Value& point) {
   std::vector<ExtensionRecordRef> extensions;
@@ -39,8 +37,8 @@ LinuxExtensionService::LinuxExtensionService(IPCService& ipc, LinuxBundleService
       host_(new ExtensionHost{.ipc = ipc, .timers = timers, .executor = executor, .options = std::move(options)}) {}
 
 LinuxExtensionService::~LinuxExtensionService() {
-  for (const auto& [identifier, processes] : processes_) {
-    processes->queue->sync([&] { processes->all.clear(); });
+  for (const auto& processes : host_->uses.exchange({})) {
+    processes->queue->sync([&] { processes->endAtOnce(); });
   }
 }
 
@@ -59,41 +57,8 @@ void LinuxExtensionService::setHostContextClass(const std::string& extensionPoin
   host_->contextClasses.with([&](auto& classes) { classes[extensionPointIdentifier] = std::move(make); });
 }
 
-std::shared_ptr<LinuxExtensionService::Processes> LinuxExtensionService::processesOf(const std::string& identifier) {
-  std::lock_guard lock(mutex_);
-  auto& processes = processes_[identifier];
-  if (!processes) processes = std::make_shared<Processes>(host_->executor);
-  return processes;
-}
-
-ExtensionProcess& LinuxExtensionService::processForRequests(const std::shared_ptr<ExtensionHost>& host,
-                                                            const std::shared_ptr<Processes>& processes,
-                                                            const ExtensionRecordRef& extension) {
-  auto& all = processes->all;
-  if (all.empty() || all.back()->isEnding()) {
-    all.push_back(ExtensionProcess::create(
-        host, processes->queue, extension, [weak = std::weak_ptr(processes)](ExtensionProcess* ended) {
-          // Not within its own call.
-          if (const auto strong = weak.lock()) {
-            strong->queue->async(weak, [ended](Processes& of) {
-              std::erase_if(of.all, [&](const auto& process) { return process.get() == ended; });
-            });
-          }
-        }));
-  }
-  return *all.back();
-}
-
-void LinuxExtensionService::beginExtensionRequest(const ExtensionRecordRef& extension,
-                                                  std::vector<ExtensionItem> inputItems,
-                                                  ExtensionRequestHandlers handlers) {
-  const ExtensionRequestID request = ++lastRequest_;
-  const auto processes = processesOf(extension->identifier);
-  processes->queue->async(
-      std::weak_ptr(processes), [host = host_, weak = std::weak_ptr(processes), extension, request,
-                                 items = std::move(inputItems), handlers = std::move(handlers)](Processes&) mutable {
-        processForRequests(host, weak.lock(), extension).begin(request, std::move(items), std::move(handlers));
-      });
+std::shared_ptr<ExtensionUse> LinuxExtensionService::useExtension(const ExtensionRecordRef& extension) {
+  return std::make_shared<LinuxExtensionUse>(host_, extension);
 }
 
 std::shared_ptr<ExtensionHostContext> LinuxExtensionService::contextForRequest(ExtensionRequestID request) {
@@ -109,21 +74,5 @@ std::shared_ptr<IPCConnection> LinuxExtensionService::auxiliaryConnectionForRequ
     return it == places.end() ? nullptr : it->second.auxiliary;
   });
 }
-
-void LinuxExtensionService::killExtension(const ExtensionRecordRef& extension, int signal) {
-  const auto processes = processesOf(extension->identifier);
-  processes->queue->async(std::weak_ptr(processes), [signal](Processes& of) {
-    if (!of.all.empty()) of.all.back()->sendSignal(signal);
-  });
-}
-
-std::optional<std::string> LinuxExtensionService::issueSandboxToken(const std::string& tokenClass,
-                                                                    const std::string& path,
-                                                                    const ExtensionRecordRef& extension) {
-  if (tokenClass != kReadOnlyTokenClass) return std::nullopt;
-  return host_->tokens.issue(path, extension->identifier);
-}
-
-void LinuxExtensionService::revokeSandboxToken(const std::string& token) { host_->tokens.revoke(token); }
 
 }  // namespace qv::platform

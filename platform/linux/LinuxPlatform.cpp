@@ -8,9 +8,6 @@
 namespace qv::platform {
 namespace {
 
-/// The temporary store, whose disk is watched.
-constexpr const char kStore[] = "/private/var/mobile/Library/Quorvel";
-
 std::string environment(const char* name) {
   const char* value = std::getenv(name);
   return value ? value : "";
@@ -25,14 +22,16 @@ bool isRunning(const SharedFileDescriptor& process) {
 
 }  // namespace
 
-LinuxPlatform::LinuxPlatform(std::string deviceRoot, const std::string& bundlePath)
+LinuxPlatform::LinuxPlatform(std::string deviceRoot, const std::string& bundlePath, WatchedSpace watchedSpace)
     : deviceRoot_(std::move(deviceRoot)),
+      watchedPath_(deviceRoot_ + watchedSpace.path),
       preferences_(deviceRoot_),
       localization_(preferences_),
       bundles_(deviceRoot_, bundlePath, localization_),
       deviceInfo_(deviceRoot_),
       entitlements_(deviceRoot_),
-      purgeableSpace_(systemTimers(), globalBackgroundQueue(), [this] { return freeSpaceOfStore(); }),
+      purgeableSpace_(systemTimers(), globalBackgroundQueue(), std::move(watchedSpace.limits),
+                      [this] { return watchedFreeSpace(); }),
       photoLibrary_(deviceRoot_, globalQueue()),
       metrics_(deviceRoot_, systemClock()),
       reachability_(globalQueue()) {}
@@ -50,8 +49,8 @@ void LinuxPlatform::addTo(Platform& platform) {
   platform.reachability = &reachability_;
 }
 
-std::optional<uint64_t> LinuxPlatform::freeSpaceOfStore() {
-  const auto bytes = fileSystem_.freeSizeOfFileSystem(deviceRoot_ + kStore);
+std::optional<uint64_t> LinuxPlatform::watchedFreeSpace() {
+  const auto bytes = fileSystem_.freeSizeOfFileSystem(watchedPath_);
   return bytes ? std::optional(bytes.value()) : std::nullopt;
 }
 

@@ -19,9 +19,15 @@
 
 namespace qv::platform {
 
+/// Which disk is watched, and for what.
+struct WatchedSpace {
+  std::string path;  ///< of a directory on it, without the device root
+  FreeSpaceLimits limits;
+};
+
 /// The services that need nothing but Linux and files, for one device root. Making it reads nothing.
 ///
-///   LinuxPlatform linux(deviceRootFromEnvironment(), bundlePathFromEnvironment());
+///   LinuxPlatform linux(deviceRootFromEnvironment(), bundlePathFromEnvironment(), watchedSpace);
 ///   Platform platform;
 ///   linux.addTo(platform);
 ///   sdbus.setPeerResolver(linux.peerResolver());
@@ -31,7 +37,7 @@ namespace qv::platform {
 class LinuxPlatform {
  public:
   /// `deviceRoot` as in Platform; `bundlePath` as in LinuxBundleService.
-  LinuxPlatform(std::string deviceRoot, const std::string& bundlePath);
+  LinuxPlatform(std::string deviceRoot, const std::string& bundlePath, WatchedSpace watchedSpace);
   LinuxPlatform(const LinuxPlatform&) = delete;
   LinuxPlatform& operator=(const LinuxPlatform&) = delete;
 
@@ -44,14 +50,15 @@ class LinuxPlatform {
   /// What the extension service searches.
   [[nodiscard]] LinuxBundleService& bundles() { return bundles_; }
 
-  /// While files of the temporary store grow, the free space around them is watched.
+  /// While files grow on the disk, its free space is watched.
   void watchFreeSpace(bool isOn) { purgeableSpace_.setActive(isOn); }
 
  private:
-  [[nodiscard]] std::optional<uint64_t> freeSpaceOfStore();
+  [[nodiscard]] std::optional<uint64_t> watchedFreeSpace();
   void resolve(IPCPeer& peer);
 
   const std::string deviceRoot_;
+  const std::string watchedPath_;  ///< complete
   PosixFileSystem fileSystem_;
   JSONPreferenceStore preferences_;
   ICULocalization localization_;

@@ -4,7 +4,6 @@
 #include <sys/random.h>
 #include <sys/stat.h>
 
-#include <algorithm>
 #include <array>
 #include <utility>
 
@@ -13,7 +12,7 @@
 namespace qv::platform {
 namespace {
 
-constexpr std::ptrdiff_t kMaximumTokens = 256;  // of one extension
+constexpr size_t kMaximumTokens = 256;
 
 std::optional<std::string> randomText() {
   std::array<uint8_t, 32> bytes{};
@@ -35,37 +34,35 @@ FileDescriptor openPlainFile(const std::string& path) {
 
 }  // namespace
 
-std::optional<std::string> SandboxTokenBook::issue(const std::string& path, const std::string& extension) {
+std::optional<std::string> SandboxTokenBook::issue(const std::string& path) {
   FileDescriptor file = openPlainFile(path);
   auto token = randomText();
   if (!file.isValid() || !token) return std::nullopt;
   const bool isKept = entries_.with([&](auto& entries) {
-    const auto isSame = [&](const auto& entry) { return entry.second.extension == extension; };
-    if (std::count_if(entries.begin(), entries.end(), isSame) >= kMaximumTokens) return false;
-    return entries.emplace(*token, Entry{extension, shareFileDescriptor(std::move(file))}).second;
+    return entries.size() < kMaximumTokens &&
+           entries.emplace(*token, Entry{shareFileDescriptor(std::move(file))}).second;
   });
   if (isKept) return token;
-  QV_LOG_ERROR(logs::kExtensions, "extension %s has too many files to read", extension.c_str());
+  QV_LOG_ERROR(logs::kExtensions, "an extension has too many files to read");
   return std::nullopt;
 }
 
-void SandboxTokenBook::giveToRequest(const std::vector<ExtensionItem>& items, const std::string& extension,
-                                     ExtensionRequestID request) {
+void SandboxTokenBook::giveToRequest(const std::vector<ExtensionItem>& items, ExtensionRequestID request) {
   entries_.with([&](auto& entries) {
     for (const ExtensionItem& item : items) {
       for (const ItemProvider& attachment : item.attachments) {
         const auto* text = attachment.value.getIf<std::string>();
         const auto it = text != nullptr ? entries.find(*text) : entries.end();
-        if (it != entries.end() && it->second.extension == extension) it->second.request = request;
+        if (it != entries.end()) it->second.request = request;
       }
     }
   });
 }
 
-SharedFileDescriptor SandboxTokenBook::take(const std::string& token, const std::string& extension) {
+SharedFileDescriptor SandboxTokenBook::take(const std::string& token) {
   return entries_.with([&](auto& entries) -> SharedFileDescriptor {
     const auto it = entries.find(token);
-    if (it == entries.end() || it->second.extension != extension) return nullptr;
+    if (it == entries.end()) return nullptr;
     const auto file = std::move(it->second.file);
     entries.erase(it);
     return file;

@@ -81,8 +81,16 @@ void MovieWriter::adopt(uint64_t placeholderOffset, uint64_t size, std::vector<T
   index_ = std::move(index);
 }
 
+bool MovieWriter::endsWithPictureAt(std::optional<int64_t> time) const {
+  for (size_t i = 0; i < tracks_.size(); ++i) {
+    if (tracks_[i].kind != MovieTrack::Kind::Video || index_[i].isEmpty()) continue;
+    if (index_[i].lastDecodeTime() == time) return true;
+  }
+  return false;
+}
+
 uint64_t MovieWriter::movieDuration(const MovieEnd& end) const {
-  if (end.duration) return *end.duration;
+  if (end.duration) return *end.duration + (endsWithPictureAt(end.lastPicture) ? end.lastPictureShown : 0);
   uint64_t longest = 0;
   for (size_t i = 0; i < tracks_.size(); ++i) {
     if (index_[i].isEmpty()) continue;

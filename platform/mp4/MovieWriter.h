@@ -28,6 +28,8 @@ struct MovieEnd {
   std::optional<int64_t> lastPicture;
   /// The movie's length in kMovieTimescale. Without it, until the end of the last picture.
   std::optional<uint64_t> duration;
+  /// Added to the length where there is a picture of just the time `lastPicture`, which would not be seen otherwise.
+  uint64_t lastPictureShown = 0;
 };
 
 /// Writes one movie file, so that whatever was written before a crash can be played.
@@ -66,6 +68,7 @@ class MovieWriter {
  private:
   std::optional<Error> appendBytes(std::span<const uint8_t> bytes);
   std::vector<uint8_t> buildHeader(const MovieEnd& end);
+  [[nodiscard]] bool endsWithPictureAt(std::optional<int64_t> time) const;
   std::optional<Error> syncFile();
 
   std::unique_ptr<MovieFile> file_;

@@ -4,6 +4,7 @@
 
 #include "sdk/client/Errors.h"
 #include "sdk/client/WireValues.h"
+#include "sdk/common/SampleCoding.h"
 
 namespace qv::client {
 
@@ -101,6 +102,8 @@ void RecorderSession::tellActive(bool active, DaemonLink::FailureHandler onFailu
 }
 
 void RecorderSession::connected() {
+  pauses_ = {};
+  sound_ = {};
   if (active_) link_->send(activationMember(*active_), {}, [](const quorvel::Error&) {});
   tell(events_.connected);
 }
@@ -126,22 +129,31 @@ void RecorderSession::daemonStopped(StopResult result) {
   tell(events_.stopped, std::move(result));
 }
 
+void RecorderSession::receiveFrame(const IPCArguments& arguments) {
+  auto frame = events_.videoFrame ? videoFrameFromWire(arguments) : std::nullopt;
+  if (!frame) return;
+  gate_->postSample(CallbackGate::SampleKind::Video,
+                    [event = events_.videoFrame, frame = std::move(*frame)]() mutable { event(std::move(frame)); });
+}
+
+void RecorderSession::receiveSound(const IPCArguments& arguments) {
+  auto sample = events_.audioSample ? audioSampleFromWire(arguments) : std::nullopt;
+  if (!sample || !sound_.place(*sample, pauses_)) return;
+  gate_->postSample(CallbackGate::SampleKind::Audio,
+                    [event = events_.audioSample, sample = std::move(*sample)]() mutable { event(std::move(sample)); });
+}
+
 void RecorderSession::receive(std::string_view member, const IPCArguments& arguments) {
   const platform::Value none;
   const auto at = [&](size_t index) -> const platform::Value& {
     return index < arguments.size() ? arguments[index] : none;
   };
   if (member == "captureHandlerWithSample") {
-    auto frame = events_.videoFrame ? videoFrameFromWire(arguments) : std::nullopt;
-    if (!frame) return;
-    gate_->postSample(CallbackGate::SampleKind::Video,
-                      [event = events_.videoFrame, frame = std::move(*frame)]() mutable { event(std::move(frame)); });
+    receiveFrame(arguments);
   } else if (member == "captureHandlerWithAudioSample") {
-    auto sample = events_.audioSample ? audioSampleFromWire(arguments) : std::nullopt;
-    if (!sample) return;
-    gate_->postSample(
-        CallbackGate::SampleKind::Audio,
-        [event = events_.audioSample, sample = std::move(*sample)]() mutable { event(std::move(sample)); });
+    receiveSound(arguments);
+  } else if (member == "captureTimelineDidChange") {
+    pauses_ = sdk::sampleTimeFromWire(at(0).asData()).value_or(pauses_);
   } else if (member == "stopRecordingWithError") {
     daemonStopped({errorFromWire(at(0)), at(1).asString()});
   } else if (member == "updateScreenRecordingState") {

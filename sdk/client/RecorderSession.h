@@ -9,6 +9,7 @@
 
 #include "sdk/client/CallbackGate.h"
 #include "sdk/client/DaemonLink.h"
+#include "sdk/common/SoundTimeline.h"
 
 namespace qv::client {
 
@@ -39,6 +40,8 @@ class RecorderSession : public std::enable_shared_from_this<RecorderSession> {
   RecorderSession(std::shared_ptr<CallbackGate> gate, quorvel::Events events);
   void connected();
   void lost();
+  void receiveFrame(const platform::IPCArguments& arguments);
+  void receiveSound(const platform::IPCArguments& arguments);
   void daemonStopped(quorvel::StopResult result);
   /// Whether this tells the end of a recording in whose place another of ours already goes on.
   bool isWordOfReplaced(const quorvel::StopResult& result);
@@ -53,6 +56,8 @@ class RecorderSession : public std::enable_shared_from_this<RecorderSession> {
   /// Own recordings that a later start of ours has ended; the daemon's word of it is still to come.
   std::deque<uint64_t> replaced_;
   std::optional<bool> active_;
+  quorvel::SampleTime pauses_{0};  // before the captured samples that come now
+  sdk::SoundTimeline sound_;
 };
 
 }  // namespace qv::client

@@ -56,6 +56,11 @@ std::optional<quorvel::VideoFrame> videoFrameFromWire(const platform::Value& fra
                              .surface = surface};
 }
 
+std::optional<SampleTime> sampleTimeFromWire(const Data& time) {
+  const auto record = recordFromBytes<MediaTime>(time);
+  return record ? sampleTime(*record) : std::nullopt;
+}
+
 std::optional<quorvel::AudioSample> audioSampleFromWire(const WireAudioSample& sample) {
   const auto description = recordFromBytes<platform::AudioStreamDescription>(sample.format);
   const auto timing = recordFromBytes<SampleTimingInfo>(sample.timing);

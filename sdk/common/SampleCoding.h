@@ -17,6 +17,10 @@ inline constexpr int64_t kVideoSample = 1, kApplicationAudioSample = 2, kMicroph
 /// read-only, and given back with the frame's last copy.
 std::optional<quorvel::VideoFrame> videoFrameFromWire(const platform::Value& frame, const platform::Data& timing);
 
+/// Of the raw bytes of a media time.
+std::optional<quorvel::SampleTime> sampleTimeFromWire(const platform::Data& time);
+
+/// The sample's presentation time is still that of its capture (SoundTimeline).
 struct WireAudioSample {
   const platform::Data& bytes;
   const platform::Data& format;  ///< raw AudioStreamDescription

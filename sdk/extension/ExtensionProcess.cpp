@@ -70,15 +70,13 @@ ExtensionProcess::Endpoints ExtensionProcess::inheritedEndpoints() {
           inheritedEndpoint(platform::kExtensionAuxiliaryEndpointVariable)};
 }
 
-std::shared_ptr<ExtensionProcess> ExtensionProcess::create(platform::IPCService& ipc, Factory make,
-                                                           platform::Clock& clock) {
-  return std::shared_ptr<ExtensionProcess>(new ExtensionProcess(ipc, std::move(make), clock));
+std::shared_ptr<ExtensionProcess> ExtensionProcess::create(platform::IPCService& ipc, Factory make) {
+  return std::shared_ptr<ExtensionProcess>(new ExtensionProcess(ipc, std::move(make)));
 }
 
-ExtensionProcess::ExtensionProcess(platform::IPCService& ipc, Factory make, platform::Clock& clock)
+ExtensionProcess::ExtensionProcess(platform::IPCService& ipc, Factory make)
     : ipc_(ipc),
       make_(std::move(make)),
-      clock_(clock),
       queue_(std::make_shared<platform::SerialQueue>("com.tarnwick.quorvel.extension")) {}
 
 std::optional<platform::Error> ExtensionProcess::start(const Endpoints& endpoints) {
@@ -153,12 +151,9 @@ void ExtensionProcess::setEndpoint(const platform::Value& endpoint, const IPCRep
   if (!connection) return reply.fail(kRefusedErrorName, connection.error().description());
   // A second broadcast in the same process takes the place of the first.
   if (broadcast_) std::exchange(broadcast_, nullptr)->close();
-  broadcast_ = SampleLink::open(
-      *connection, *make, *queue_,
-      [weak = weak_from_this()] {
-        if (const auto self = weak.lock()) self->broadcast_.reset();
-      },
-      clock_);
+  broadcast_ = SampleLink::open(*connection, *make, *queue_, [weak = weak_from_this()] {
+    if (const auto self = weak.lock()) self->broadcast_.reset();
+  });
   reply({});
   broadcast_->ping();
 }

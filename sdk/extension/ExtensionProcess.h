@@ -4,7 +4,6 @@
 #include <memory>
 #include <variant>
 
-#include "platform/Clock.h"
 #include "platform/Extensions.h"
 #include "sdk/extension/ClipRequests.h"
 #include "sdk/extension/SampleLink.h"
@@ -26,8 +25,7 @@ class ExtensionProcess : public std::enable_shared_from_this<ExtensionProcess> {
   static Endpoints inheritedEndpoints();
 
   /// `ipc` must outlive the object and everything queued for it.
-  static std::shared_ptr<ExtensionProcess> create(platform::IPCService& ipc, Factory make,
-                                                  platform::Clock& clock = platform::systemClock());
+  static std::shared_ptr<ExtensionProcess> create(platform::IPCService& ipc, Factory make);
   /// Connects to the host; an error where it is not there.
   [[nodiscard]] std::optional<platform::Error> start(const Endpoints& endpoints);
   /// Waits until the host's connection is gone.
@@ -38,14 +36,13 @@ class ExtensionProcess : public std::enable_shared_from_this<ExtensionProcess> {
  private:
   class Requests;
   class Vendor;
-  ExtensionProcess(platform::IPCService& ipc, Factory make, platform::Clock& clock);
+  ExtensionProcess(platform::IPCService& ipc, Factory make);
   void beginRequest(platform::ExtensionRequestID request, const std::vector<platform::ExtensionItem>& items);
   void setEndpoint(const platform::Value& endpoint, const platform::IPCReply& reply);
   [[nodiscard]] ClipRequests::Host clipHost();
 
   platform::IPCService& ipc_;
   const Factory make_;
-  platform::Clock& clock_;
   const std::shared_ptr<platform::SerialQueue> queue_;
   std::promise<void> hostGone_;
   // On the queue from here on.

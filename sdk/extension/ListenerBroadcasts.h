@@ -3,7 +3,6 @@
 #include <memory>
 #include <set>
 
-#include "platform/Clock.h"
 #include "platform/IPC.h"
 #include "sdk/extension/SampleLink.h"
 
@@ -16,19 +15,17 @@ class ListenerBroadcasts final : public quorvel::BroadcastListener, private plat
  public:
   /// Nothing where no listener can be made.
   static std::unique_ptr<ListenerBroadcasts> create(std::unique_ptr<platform::IPCService> ipc,
-                                                    quorvel::SampleExtensionFactory make, platform::Clock& clock);
+                                                    quorvel::SampleExtensionFactory make);
   ~ListenerBroadcasts() override;
   [[nodiscard]] int endpoint() const override { return endpoint_.rendezvous()->get(); }
 
  private:
-  ListenerBroadcasts(std::unique_ptr<platform::IPCService> ipc, quorvel::SampleExtensionFactory make,
-                     platform::Clock& clock);
+  ListenerBroadcasts(std::unique_ptr<platform::IPCService> ipc, quorvel::SampleExtensionFactory make);
   bool listenerShouldAcceptNewConnection(platform::IPCListener& listener,
                                          const std::shared_ptr<platform::IPCConnection>& connection) override;
 
   const std::unique_ptr<platform::IPCService> ipc_;
   const quorvel::SampleExtensionFactory make_;
-  platform::Clock& clock_;
   platform::SerialQueue queue_{"com.tarnwick.quorvel.extension"};
   const std::unique_ptr<platform::IPCListener> listener_;
   const platform::ListenerEndpoint endpoint_;

@@ -39,11 +39,10 @@ class SampleLink::Payloads final : public platform::IPCExportedObject {
 
 std::shared_ptr<SampleLink> SampleLink::open(std::shared_ptr<platform::IPCConnection> connection,
                                              const quorvel::SampleExtensionFactory& make, platform::SerialQueue& queue,
-                                             std::function<void()> ended, platform::Clock& clock) {
+                                             std::function<void()> ended) {
   queue.assertOnQueue();
-  std::shared_ptr<SampleLink> link(new SampleLink(std::move(connection), clock));
+  std::shared_ptr<SampleLink> link(new SampleLink(std::move(connection)));
   link->ended_ = std::move(ended);
-  link->extension_ = make(*link);
   const auto& link_connection = link->connection_;
   link_connection->setTargetQueue(queue);
   link_connection->setExportedInterface(broadcastExtensionProtocol(), std::make_shared<Payloads>(link));
@@ -51,18 +50,13 @@ std::shared_ptr<SampleLink> SampleLink::open(std::shared_ptr<platform::IPCConnec
   link_connection->setInvalidationHandler([weak = std::weak_ptr(link)] {
     if (const auto self = weak.lock()) self->end();
   });
+  // It may speak at once: a call before `resume` waits for the connection.
+  link->extension_ = make(*link);
   link_connection->resume();
   return link;
 }
 
-SampleLink::SampleLink(std::shared_ptr<platform::IPCConnection> connection, platform::Clock& clock)
-    : connection_(std::move(connection)), clock_(clock) {}
-
 SampleLink::~SampleLink() = default;
-
-quorvel::SampleTime SampleLink::now() const {
-  return quorvel::SampleTime(clock_.hostTime().valueAt(platform::kHostTimescale));
-}
 
 void SampleLink::end() {
   if (!std::exchange(extension_, nullptr)) return;
@@ -98,10 +92,8 @@ void SampleLink::performAction(int64_t action, const Dictionary& payload) {
     case BroadcastAction::Started:
       return extension_->started(sdk::fromWire(valueForKey(payload, broadcastpayload::kUserInfo).asDictionary()));
     case BroadcastAction::Paused:
-      timeline_.paused(now());
       return extension_->paused();
     case BroadcastAction::Resumed:
-      timeline_.resumed(now());
       return extension_->resumed();
     case BroadcastAction::Finished:
       return extension_->finished();
@@ -113,7 +105,6 @@ bool SampleLink::processVideo(const Dictionary& payload) {
   auto frame = sdk::videoFrameFromWire(valueForKey(payload, broadcastpayload::kSharedFrame),
                                        valueForKey(payload, broadcastpayload::kTimingInfo).asData());
   if (!frame) return false;
-  timeline_.notePicture(frame->presentationTime, now());
   const int64_t code = valueForKey(payload, broadcastpayload::kVideoOrientation).asInteger(1);
   const bool isKnown = code >= 1 && code <= 8;
   extension_->processVideo(std::move(*frame), isKnown ? quorvel::Orientation(code) : quorvel::Orientation::Up);
@@ -124,17 +115,16 @@ bool SampleLink::processAudio(const Dictionary& payload) {
   const Value bytes = valueForKey(payload, broadcastpayload::kAudioBufferList);
   const Value format = valueForKey(payload, broadcastpayload::kAudioFormatDescription);
   const Value timing = valueForKey(payload, broadcastpayload::kTimingInfo);
+  const Value* sum = find(payload, broadcastpayload::kPauses);
+  const auto pauses = sum ? sdk::sampleTimeFromWire(sum->asData()) : quorvel::SampleTime(0);
   auto sample =
       sdk::audioSampleFromWire({.bytes = bytes.asData(),
                                 .format = format.asData(),
                                 .numSamples = valueForKey(payload, broadcastpayload::kNumSamples).asInteger(-1),
                                 .sampleType = valueForKey(payload, broadcastpayload::kSampleType).asInteger(),
                                 .timing = timing.asData()});
-  if (!sample) return false;
-  const auto placed = timeline_.place(sample->presentationTime);
-  if (!placed) return true;
-  sample->presentationTime = *placed;
-  extension_->processAudio(std::move(*sample));
+  if (!sample || !pauses) return false;
+  if (timeline_.place(*sample, *pauses)) extension_->processAudio(std::move(*sample));
   return true;
 }
 

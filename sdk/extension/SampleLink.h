@@ -3,9 +3,8 @@
 #include <functional>
 #include <memory>
 
-#include "platform/Clock.h"
 #include "platform/IPC.h"
-#include "sdk/extension/PauseTimeline.h"
+#include "sdk/common/SoundTimeline.h"
 #include "sdk/extension/quorvel/BroadcastExtension.h"
 
 namespace qv::extension {
@@ -18,11 +17,12 @@ namespace qv::extension {
 /// Threading: payloads and the author's object on the queue that `open` is given; what the author tells, on any.
 class SampleLink final : public quorvel::Broadcast, public std::enable_shared_from_this<SampleLink> {
  public:
-  /// Takes the broadcast of a connection that was not resumed yet. `ended` is called on `queue`, once, when the
+  /// Takes the broadcast of a connection that was not resumed yet. What the author's object says while it is being made
+  /// is sent first, when the connection stands. `ended` is called on `queue`, once, when the
   /// connection has ended and the author's object is gone. To be called on `queue`.
   static std::shared_ptr<SampleLink> open(std::shared_ptr<platform::IPCConnection> connection,
                                           const quorvel::SampleExtensionFactory& make, platform::SerialQueue& queue,
-                                          std::function<void()> ended, platform::Clock& clock);
+                                          std::function<void()> ended);
   ~SampleLink() override;
 
   /// Tells the daemon that this end is ready.
@@ -36,18 +36,16 @@ class SampleLink final : public quorvel::Broadcast, public std::enable_shared_fr
 
  private:
   class Payloads;
-  SampleLink(std::shared_ptr<platform::IPCConnection> connection, platform::Clock& clock);
+  explicit SampleLink(std::shared_ptr<platform::IPCConnection> connection) : connection_(std::move(connection)) {}
   void processPayload(const platform::Dictionary& payload);
   void performAction(int64_t action, const platform::Dictionary& payload);
   [[nodiscard]] bool processVideo(const platform::Dictionary& payload);
   [[nodiscard]] bool processAudio(const platform::Dictionary& payload);
   void end();
-  [[nodiscard]] quorvel::SampleTime now() const;
 
   const std::shared_ptr<platform::IPCConnection> connection_;
-  platform::Clock& clock_;
   std::function<void()> ended_;
-  PauseTimeline timeline_;
+  sdk::SoundTimeline timeline_;
   std::unique_ptr<quorvel::SampleExtension> extension_;  // none once the link has ended
 };
 

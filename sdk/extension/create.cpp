@@ -44,8 +44,7 @@ int runSampleExtension(SampleExtensionFactory make) { return run(std::move(make)
 int runClipExtension(ClipExtensionFactory make) { return run(std::move(make)); }
 
 std::unique_ptr<BroadcastListener> BroadcastListener::create(SampleExtensionFactory make) {
-  return qv::extension::ListenerBroadcasts::create(std::make_unique<qv::platform::SdBusIPCService>(), std::move(make),
-                                                   qv::platform::systemClock());
+  return qv::extension::ListenerBroadcasts::create(std::make_unique<qv::platform::SdBusIPCService>(), std::move(make));
 }
 
 }  // namespace quorvel

@@ -1,8 +1,11 @@
 #include "tests/daemon/DaemonTest.h"
 
+#include <algorithm>
+
 namespace qv {
 
-TestClient::TestClient(fakes::FakeDevice& device, std::string bundleID, pid_t pid, platform::Dictionary entitlements)
+TestClient::TestClient(fakes::FakeDevice& device, std::string bundleID, pid_t pid, platform::Dictionary entitlements,
+                       bool waits)
     : device_(device), bundleID_(std::move(bundleID)), pid_(pid) {
   platform::IPCPeer peer;
   peer.processIdentifier = pid;
@@ -16,19 +19,22 @@ TestClient::TestClient(fakes::FakeDevice& device, std::string bundleID, pid_t pi
   connection_->setInvalidationHandler([seen = seen_] { seen->ended = true; });
   connection_->setInterruptionHandler([seen = seen_] { seen->ended = true; });
   connection_->resume();
-  device.run();
+  if (waits) device.run();
 }
 
-void TestClient::post(const char* member, platform::IPCArguments arguments) {
+TestClient::Slot TestClient::post(const char* member, platform::IPCArguments arguments) {
   seen_->answer.reset();
+  const auto slot = std::make_shared<std::optional<Answer>>();
+  const auto take = [seen = seen_, slot](Answer answer) { *slot = seen->answer = std::move(answer); };
   connection_->call(
       member, std::move(arguments),
-      [seen = seen_](const platform::IPCArguments& values) {
-        seen->answer = Answer{values, std::nullopt};
+      [take](const platform::IPCArguments& values) {
+        take({values, std::nullopt});
       },
-      [seen = seen_](const platform::Error& error) {
-        seen->answer = Answer{{}, error};
+      [take](const platform::Error& error) {
+        take({{}, error});
       });
+  return slot;
 }
 
 void TestClient::send(const char* member, platform::IPCArguments arguments) {
@@ -41,13 +47,13 @@ std::optional<TestClient::Answer> TestClient::request(const char* member, platfo
   return seen_->answer;
 }
 
-void TestClient::postStart(const StartOptions& o) {
+TestClient::Slot TestClient::postStart(const StartOptions& o) {
   using platform::Value;
   platform::Array contexts;
   for (const uint32_t context : o.contexts) contexts.emplace_back(context);
-  post("startRecordingWindowLayerContextIDs",
-       {Value(contexts), Value(platform::Array{Value(o.width), Value(o.height)}), Value(o.microphone), Value(o.camera),
-        Value(o.broadcast), Value(o.system), Value(o.capture), Value(platform::Array{})});
+  return post("startRecordingWindowLayerContextIDs",
+              {Value(contexts), Value(platform::Array{Value(o.width), Value(o.height)}), Value(o.microphone),
+               Value(o.camera), Value(o.broadcast), Value(o.system), Value(o.capture), Value(platform::Array{})});
 }
 
 std::optional<TestClient::Answer> TestClient::start(const StartOptions& o) {
@@ -61,14 +67,21 @@ void TestClient::disconnect() {
   device_.run();
 }
 
-std::vector<int64_t> TestClient::takeEnds() {
-  std::vector<int64_t> codes;
+std::optional<TestClient::End> TestClient::takeEnd() {
   while (object_->callCount() > 0) {
     const auto call = object_->takeCall();
     if (call.member != "stopRecordingWithError") continue;
     const auto error = platform::decodeError(call.arguments[0].asDictionary());
-    codes.push_back(error ? error->code : 0);
-    lastMovie_ = call.arguments[1].asString();
+    return End{error ? error->code : 0, call.arguments[1].asString()};
+  }
+  return std::nullopt;
+}
+
+std::vector<int64_t> TestClient::takeEnds() {
+  std::vector<int64_t> codes;
+  while (const auto end = takeEnd()) {
+    codes.push_back(end->code);
+    lastMovie_ = end->movie;
   }
   return codes;
 }
@@ -85,7 +98,6 @@ DaemonTest::DaemonTest() {
 
 DaemonTest::~DaemonTest() {
   manager_.reset();
-  captureManager_.stopAllCapture();
   device_.run();
 }
 
@@ -99,6 +111,13 @@ void DaemonTest::install(const std::string& name, const std::string& bundleID, p
 TestClient DaemonTest::game() { return {device_, "com.example.game", 100}; }
 TestClient DaemonTest::chat() { return {device_, "com.example.chat", 200}; }
 
+TestClient DaemonTest::namesake() {
+  install("Game Again", "com.example.namesake", 150);
+  device_.bundles.addApplication("Game Again", "com.example.namesake")->info[platform::bundleinfo::kDisplayName] =
+      platform::Value("Game");
+  return {device_, "com.example.namesake", 150};
+}
+
 TestClient DaemonTest::systemUI() {
   install("System", "com.example.system", 300);
   return {device_, "com.example.system", 300, {{"com.tarnwick.private.quorvel", platform::Value(true)}}};
@@ -109,8 +128,23 @@ void DaemonTest::suppressAlert() {
 }
 
 void DaemonTest::sendFrame(int64_t nanoseconds, uint64_t flags) {
-  device_.screen.last().sendAt(nanoseconds, flags);
+  const auto& all = device_.screen.controllers;
+  const auto running = std::find_if(all.rbegin(), all.rend(), [](const auto* each) { return each->running; });
+  if (running != all.rend()) (*running)->sendAt(nanoseconds, flags);
   device_.run();
+}
+
+std::string DaemonTest::contentAt(const std::string& url) {
+  const auto content = device_.disk.readFile(platform::URL(url).path());
+  return content ? content.value() : std::string();
+}
+
+bool DaemonTest::areSourcesOff() {
+  const auto runs = [](const auto& source) { return source->running; };
+  const auto& session = device_.deviceCapture.session;
+  return std::none_of(device_.screen.controllers.begin(), device_.screen.controllers.end(), runs) &&
+         std::none_of(device_.tap.taps.begin(), device_.tap.taps.end(), runs) && !(session && session->running) &&
+         device_.screen.mode == platform::DisplayCloneMode::Off;
 }
 
 }  // namespace qv

@@ -17,7 +17,9 @@ inline constexpr int64_t kSecond = 1'000'000'000;
 /// What an application sees of the daemon.
 class TestClient {
  public:
-  TestClient(fakes::FakeDevice& device, std::string bundleID, pid_t pid, platform::Dictionary entitlements = {});
+  /// Unless it `waits` the daemon has not seen it yet.
+  TestClient(fakes::FakeDevice& device, std::string bundleID, pid_t pid, platform::Dictionary entitlements = {},
+             bool waits = true);
 
   struct Answer {
     platform::IPCArguments values;
@@ -36,11 +38,19 @@ class TestClient {
     bool microphone = false, camera = false, broadcast = false, system = false, capture = false;
   };
 
+  /// The answer of one request, when it has come.
+  using Slot = std::shared_ptr<std::optional<Answer>>;
+  /// One end-of-recording message; code 0 for none.
+  struct End {
+    int64_t code = 0;
+    std::string movie;
+  };
+
   void send(const char* member, platform::IPCArguments arguments = {});
   /// Like `send`, but nothing has run yet.
-  void post(const char* member, platform::IPCArguments arguments = {});
+  Slot post(const char* member, platform::IPCArguments arguments = {});
   std::optional<Answer> request(const char* member, platform::IPCArguments arguments = {});
-  void postStart(const StartOptions& o);
+  Slot postStart(const StartOptions& o);
   std::optional<Answer> start(const StartOptions& o);
   std::optional<Answer> start() { return start(StartOptions{}); }
   std::optional<Answer> stop() { return request("stopRecordingWithHandler"); }
@@ -48,6 +58,8 @@ class TestClient {
   bool isRecording() { return valueForKey(state(), "isRecording").asBool(); }
   void disconnect();
   void leave() { connection_->invalidate(); }
+  /// Takes the oldest end-of-recording message.
+  std::optional<End> takeEnd();
   /// The codes of the end-of-recording messages so far; 0 for none. Takes them.
   std::vector<int64_t> takeEnds();
   [[nodiscard]] const std::string& lastMovie() const { return lastMovie_; }
@@ -70,7 +82,8 @@ class TestClient {
   const std::shared_ptr<Seen> seen_ = std::make_shared<Seen>();
 };
 
-/// The daemon on a device of fakes, with two applications installed and in front.
+/// The daemon on a device of fakes, with two applications installed and in front. (daemon_random_test drives it at
+/// random: QUORVEL_RANDOM_SECONDS=600 for longer, QUORVEL_RANDOM_SEED=n for one run again, both by the environment.)
 class DaemonTest : public testing::Test {
  protected:
   DaemonTest();
@@ -79,10 +92,16 @@ class DaemonTest : public testing::Test {
   void install(const std::string& name, const std::string& bundleID, pid_t pid);
   TestClient game();
   TestClient chat();
+  /// Another application that is called "Game".
+  TestClient namesake();
   TestClient systemUI();
   /// Consent is not what this test is about.
   void suppressAlert();
+  /// By the newest screen capture that runs, if any does.
   void sendFrame(int64_t nanoseconds, uint64_t flags = 0);
+  /// What a file holds; nothing where there is none.
+  std::string contentAt(const std::string& url);
+  bool areSourcesOff();
   int openTransactions() { return device_.keepAlive.count; }
 
   fakes::FakeDevice device_;

@@ -142,16 +142,18 @@ TEST_F(ArbitrationTest, ADeviceThatInterruptsKeepsTheSystemRecordingInThePhotoLi
 
 TEST_F(ArbitrationTest, TheDisplayLayoutRuleEndsApplicationRecordings) {
   struct Monitor final : platform::DisplayLayoutMonitor {
-    void addObserver(std::weak_ptr<platform::DisplayLayoutObserver>) override {}
-    void removeObserver(const platform::DisplayLayoutObserver*) override {}
+    void addObserver(std::weak_ptr<platform::DisplayLayoutObserver> to) override { observer = std::move(to); }
+    void removeObserver(const platform::DisplayLayoutObserver*) override { observer.reset(); }
     void invalidate() override {}
+    std::weak_ptr<platform::DisplayLayoutObserver> observer;
   };
   const auto monitor = std::make_shared<Monitor>();
+  manager_->setLayoutMonitor(monitor);
   auto client = game();
   const auto layout = [&](std::vector<int64_t> levels) {
     platform::DisplayLayout shown;
     for (const int64_t level : levels) shown.elements.push_back({"e", level});
-    manager_->layoutMonitorDidUpdateDisplayLayout(*monitor, shown);
+    if (const auto to = monitor->observer.lock()) to->layoutMonitorDidUpdateDisplayLayout(*monitor, shown);
     device_.run();
   };
   client.start();
@@ -162,7 +164,6 @@ TEST_F(ArbitrationTest, TheDisplayLayoutRuleEndsApplicationRecordings) {
   layout({0});
   EXPECT_EQ(client.takeEnds(), std::vector<int64_t>{errorcode::kContentResize});
   EXPECT_TRUE(client.lastMovie().ends_with("Game.mp4"));
-  device_.disk.addFile(platform::URL(client.lastMovie()).path(), "movie");
   EXPECT_EQ(client.request("saveVideoToCameraRoll", {Value(client.lastMovie())})->code(), 0);
   EXPECT_EQ(openTransactions(), 0);
 }

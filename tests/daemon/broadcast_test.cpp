@@ -1,5 +1,6 @@
 #include <cmath>
 
+#include "extensions/AnswerDeadline.h"
 #include "extensions/QVBroadcastProtocols.h"
 #include "platform/KeyedArchive.h"
 #include "tests/daemon/DaemonTest.h"
@@ -153,15 +154,15 @@ TEST_F(BroadcastTest, SamplesReachTheExtensionBetweenStartedAndFinished) {
   EXPECT_EQ(client_.object().takeCall().member, "updateBroadcastURL");
 
   const auto& payloads = extension_.received;
-  ASSERT_EQ(payloads.size(), 5u);
+  ASSERT_EQ(payloads.size(), 5u) << "the sound of another application is not the caller's to record";
   EXPECT_EQ(payloads[0].at(broadcastpayload::kUserInfo), Value(Dictionary{{"key", Value("stream")}}));
-  EXPECT_EQ(payloads[1].size(), 4u);
-  EXPECT_TRUE(QVSharedFrameObject::decodeFromIPC(payloads[1].at(broadcastpayload::kSharedFrame)).sharedFrame());
-  EXPECT_EQ(payloads[1].at(broadcastpayload::kTimingInfo).asData().size(), 72u);
+  EXPECT_EQ(payloads[1], (Dictionary{{broadcastpayload::kFrontmostApp, Value("com.example.game")}}));
   EXPECT_EQ(payloads[2].size(), 5u);
-  EXPECT_EQ(payloads[2].at(broadcastpayload::kNumSamples).asInteger(), 4410);
-  EXPECT_EQ(payloads[2].at(broadcastpayload::kAudioFormatDescription).asData().size(), 40u);
-  EXPECT_EQ(payloads[3], (Dictionary{{broadcastpayload::kFrontmostApp, Value("com.example.chat")}}));
+  EXPECT_TRUE(QVSharedFrameObject::decodeFromIPC(payloads[2].at(broadcastpayload::kSharedFrame)).sharedFrame());
+  EXPECT_EQ(payloads[2].at(broadcastpayload::kTimingInfo).asData().size(), 72u);
+  EXPECT_EQ(payloads[3].size(), 6u);
+  EXPECT_EQ(payloads[3].at(broadcastpayload::kNumSamples).asInteger(), 4410);
+  EXPECT_EQ(payloads[3].at(broadcastpayload::kAudioFormatDescription).asData().size(), 40u);
   EXPECT_EQ(actions(), (std::vector<int64_t>{1, 4}));
   EXPECT_EQ(device_.extensions.killed.size(), 1u);
   EXPECT_TRUE(device_.movies.movies.empty());
@@ -192,7 +193,7 @@ TEST_F(BroadcastTest, AnExtensionThatGoesEndsItsBroadcastOnly) {
   EXPECT_EQ(openTransactions(), 0);
 }
 
-TEST_F(BroadcastTest, AStartWhoseExtensionNeverConnectsAsksForARecordingInstead) {
+TEST_F(BroadcastTest, AStartWhoseExtensionNeverConnectsIsAnsweredSo) {
   installSampleExtension();
   setUp();
   client_.send("startRecordingWindowLayerContextIDs", startArguments());
@@ -201,15 +202,12 @@ TEST_F(BroadcastTest, AStartWhoseExtensionNeverConnectsAsksForARecordingInstead)
   EXPECT_TRUE(other.state().size() > 0) << "the manager serves others meanwhile";
   device_.timers.advance(kExtensionPatience);
   device_.run();
-  ASSERT_EQ(device_.alerts.shown.size(), 1u) << "nobody was asked about a recording yet";
-  device_.alerts.answer(platform::UserAlertAnswer::Default);
-  device_.run();
   ASSERT_TRUE(client_.answer());
-  EXPECT_EQ(client_.answer()->code(), 0);
-  EXPECT_FALSE(valueForKey(client_.state(), "isBroadcasting").asBool());
+  EXPECT_EQ(client_.answer()->code(), errorcode::kInvalidBroadcastSession);
+  EXPECT_TRUE(device_.alerts.shown.empty()) << "nobody asked for a recording";
+  EXPECT_TRUE(device_.movies.movies.empty());
   EXPECT_EQ(device_.extensions.killed.size(), 1u);
-  EXPECT_EQ(device_.movies.movies.size(), 1u);
-  EXPECT_EQ(openTransactions(), 1);
+  EXPECT_EQ(openTransactions(), 0);
 }
 
 TEST_F(BroadcastTest, AClientThatLeavesWhileTheExtensionIsLaunchedLeavesNothing) {
@@ -217,10 +215,6 @@ TEST_F(BroadcastTest, AClientThatLeavesWhileTheExtensionIsLaunchedLeavesNothing)
   setUp();
   client_.send("startRecordingWindowLayerContextIDs", startArguments());
   client_.disconnect();
-  extension_.connect();
-  device_.run();
-  extension_.call("ping");
-  device_.run();
   EXPECT_EQ(openTransactions(), 0);
   EXPECT_EQ(device_.extensions.killed.size(), 1u);
   EXPECT_TRUE(device_.screen.controllers.empty());
@@ -243,7 +237,7 @@ TEST_F(BroadcastTest, ClipsFollowOneAnotherWithoutAGap) {
   const auto& lastSound = first.inputs[1]->samples.back();
   EXPECT_EQ((lastSound->presentationTime() + lastSound->duration()).seconds(), 12.9);
   EXPECT_EQ(second.inputs[1]->times().front(), 129 * kSecond / 10);
-  EXPECT_NEAR(first.sessionEnd.seconds(), 12.9 - 1.0 / 60, 1e-6);
+  EXPECT_EQ(first.sessionEnd.seconds(), 12.9);
   ASSERT_GE(device_.extensions.requests.size(), 1u);
   EXPECT_EQ(finishFlag(0), "0");
   EXPECT_TRUE(clipPath(0).ends_with("_1.mp4")) << clipPath(0);

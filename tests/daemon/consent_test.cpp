@@ -34,6 +34,7 @@ TEST_F(ConsentTest, TwoButtonsRecordOrDecline) {
 }
 
 TEST_F(ConsentTest, ThreeButtonsKeepOrDropTheMicrophone) {
+  device_.deviceInfo.audioCaptureDevice = true;
   auto client = game();
   const TestClient::StartOptions withMicrophone{.microphone = true};
   EXPECT_EQ(startAnswering(client, withMicrophone, UserAlertAnswer::Default).code(), errorcode::kUserDeclined);

@@ -1,3 +1,5 @@
+#include "session/MovieNames.h"
+#include "session/VideoSize.h"
 #include "tests/daemon/DaemonTest.h"
 
 namespace qv {
@@ -9,37 +11,30 @@ using platform::Value;
 class LifecycleTest : public DaemonTest {
  protected:
   LifecycleTest() { suppressAlert(); }
-  std::shared_ptr<QVRecordingSession> session() {
-    return std::make_shared<QVRecordingSession>("com.example.game", queue_, captureManager_);
-  }
-  platform::SerialQueue queue_{"test", device_.executor};
 };
 
 TEST_F(LifecycleTest, SizesAreClampedByDeviceAndPreference) {
-  const auto subject = session();
-  EXPECT_EQ(subject->_maximumSizeWithSize({3840, 2160}), (Size{1920, 1080}));
-  EXPECT_EQ(subject->_maximumSizeWithSize({1080, 2400}), (Size{864, 1920}));
-  EXPECT_EQ(subject->_maximumSizeWithSize({1000, 800}), (Size{1000, 800}));
+  EXPECT_EQ(_maximumSizeWithSize({3840, 2160}), (Size{1920, 1080}));
+  EXPECT_EQ(_maximumSizeWithSize({1080, 2400}), (Size{864, 1920}));
+  EXPECT_EQ(_maximumSizeWithSize({1000, 800}), (Size{1000, 800}));
   device_.deviceInfo.idiom = platform::UserInterfaceIdiom::Tablet;
   device_.deviceInfo.integers["ChipID"] = 0x8960;
-  EXPECT_EQ(subject->_maximumSizeWithSize({2048, 1536}), (Size{1600, 1200}));
+  EXPECT_EQ(_maximumSizeWithSize({2048, 1536}), (Size{1600, 1200}));
   device_.preferences.set("com.tarnwick.quorveld", "QVFullResCapture", Value(true));
-  EXPECT_EQ(subject->_maximumSizeWithSize({3840, 2160}), (Size{3840, 2160}));
+  EXPECT_EQ(_maximumSizeWithSize({3840, 2160}), (Size{3840, 2160}));
 }
 
 TEST_F(LifecycleTest, FileNamesHoldWhateverAnAppIsCalled) {
   const auto name = [&](const std::string& displayName) {
     device_.bundles.addApplication("Game", "com.example.game")->info[platform::bundleinfo::kDisplayName] =
         Value(displayName);
-    return session()->outputPath().substr(std::string(fakes::kStore).size() + 2);
+    return applicationMoviePath("com.example.game").substr(std::string(fakes::kStore).size() + 1);
   };
   EXPECT_EQ(name("Comet Run"), "Comet Run.mp4");
   EXPECT_EQ(name("../../etc/cron"), "_.:..:etc:cron.mp4");
   EXPECT_EQ(name(""), "com.example.game.mp4");
   EXPECT_LE(name(std::string(400, 'x')).size(), 255u);
-  const auto system = session();
-  system->setSystemRecording(true);
-  const std::string path = system->outputPath();
+  const std::string path = screenMoviePath();
   EXPECT_NE(path.find("/ScreenRecording_"), std::string::npos);
   EXPECT_EQ(path.find(':'), std::string::npos);
 }
@@ -115,22 +110,6 @@ TEST_F(LifecycleTest, ARefusedFrameEndsTheRecording) {
   EXPECT_EQ(client.takeEnds(), std::vector<int64_t>{errorcode::kFailedToSave});
   const auto& payload = device_.metrics.messages.back().payload;
   EXPECT_EQ(valueForKey(payload, "EndReason").asInteger(), errorcode::kFailedToSave);
-  EXPECT_EQ(openTransactions(), 0);
-}
-
-TEST_F(LifecycleTest, ANearlyFullDiskEndsTheRecordingAndItsMovieIsKept) {
-  auto client = game();
-  client.start();
-  device_.disk.setFreeSize(50'000'000);
-  for (int64_t half = 2; half < 8; ++half) sendFrame(half * kSecond / 2);
-  device_.disk.failOn(fakes::FakeFileSystem::Operation::FreeSize, fakes::kStore, EIO);  // unknown is not full
-  sendFrame(5 * kSecond);
-  EXPECT_TRUE(client.isRecording());
-  device_.disk.failOn(fakes::FakeFileSystem::Operation::FreeSize, fakes::kStore, 0);
-  device_.disk.setFreeSize(49'999'999);
-  sendFrame(6 * kSecond);
-  EXPECT_EQ(client.takeEnds(), std::vector<int64_t>{errorcode::kFailedToSave});
-  EXPECT_EQ(device_.movies.last().status, platform::AssetWriterStatus::Completed);
   EXPECT_EQ(openTransactions(), 0);
 }
 

@@ -20,7 +20,7 @@ TEST_F(RequestsTest, RecordsFromStartToMovie) {
   sendFrame(10 * kSecond);
   const auto stopped = client.stop();
   EXPECT_EQ(stopped->code(1), 0);
-  EXPECT_EQ(platform::URL(stopped->values[0].asString()).path(), std::string(fakes::kStore) + "//Game.mp4");
+  EXPECT_EQ(platform::URL(stopped->values[0].asString()).path(), std::string(fakes::kStore) + "/Game.mp4");
   EXPECT_EQ(openTransactions(), 0);
   EXPECT_FALSE(client.isRecording());
   EXPECT_EQ(device_.metrics.messages.size(), 1u);

@@ -23,7 +23,9 @@ struct Actor {
 class Race : public DaemonTest {
  public:
   using Script = std::vector<std::string_view>;
-  Race(Script ofGame, Script ofChat) : actors_{{{game(), false, ofGame}, {chat(), true, ofChat}}} {}
+  Race(Script ofGame, Script ofChat) : actors_{{{game(), false, ofGame}, {chat(), true, ofChat}}} {
+    device_.deviceInfo.audioCaptureDevice = true;
+  }
   void TestBody() override {}
 
   /// Runs the scripts merged in this order, and after each step so many pieces of the daemon's work (-1: all).
@@ -74,7 +76,7 @@ class Race : public DaemonTest {
   void expectOneRecordingAtMost() {
     int recording = 0;
     for (const Actor& actor : actors_) {
-      recording += manager_->recordingSessionForBundleID(actor.client.bundleID())->isRecording() ? 1 : 0;
+      recording += manager_->sessions().recordingSessionForBundleID(actor.client.bundleID())->isRecording() ? 1 : 0;
     }
     EXPECT_LE(recording, 1);
     EXPECT_EQ(openTransactions(), recording);
@@ -157,7 +159,7 @@ TEST_F(ClientDeathTest, BeforeTheAnswerToItsStartEndsARecordingUnlessItIsTheSyst
   suppressAlert();
   const auto startUntilItRecords = [this](TestClient& client, bool system) {
     client.postStart({.system = system});
-    while (!manager_->recordingSessionForBundleID(client.bundleID())->isRecording()) {
+    while (!manager_->sessions().recordingSessionForBundleID(client.bundleID())->isRecording()) {
       ASSERT_TRUE(device_.executor.runOne());
     }
   };

@@ -9,10 +9,11 @@ using platform::Value;
 
 /// A monitor that says who observes it.
 struct FakeLayoutMonitor final : platform::DisplayLayoutMonitor {
-  void addObserver(std::weak_ptr<platform::DisplayLayoutObserver>) override { isObserved = true; }
-  void removeObserver(const platform::DisplayLayoutObserver*) override { isObserved = false; }
-  void invalidate() override { isObserved = false; }
-  bool isObserved = false;
+  void addObserver(std::weak_ptr<platform::DisplayLayoutObserver> to) override { observer = std::move(to); }
+  void removeObserver(const platform::DisplayLayoutObserver*) override { observer.reset(); }
+  void invalidate() override { observer.reset(); }
+  [[nodiscard]] bool isObserved() const { return !observer.expired(); }
+  std::weak_ptr<platform::DisplayLayoutObserver> observer;
 };
 
 /// Every way in which a recording starts or does not, with every way in which it ends.
@@ -27,7 +28,7 @@ class TransactionsTest : public DaemonTest {
   void showLayout(const std::vector<int64_t>& levels) {
     platform::DisplayLayout layout;
     for (const int64_t level : levels) layout.elements.push_back({"e", level});
-    manager_->layoutMonitorDidUpdateDisplayLayout(*monitor_, layout);
+    if (const auto to = monitor_->observer.lock()) to->layoutMonitorDidUpdateDisplayLayout(*monitor_, layout);
   }
   static const std::vector<Case>& refusals();
   static const std::vector<Case>& ends();
@@ -131,7 +132,7 @@ TEST_F(TransactionsTest, ARefusedStartLeavesNoneOpen) {
     refusal.run(*this, client);
     device_.run();
     EXPECT_EQ(openTransactions(), 0) << refusal.name;
-    EXPECT_FALSE(monitor_->isObserved) << refusal.name;
+    EXPECT_FALSE(monitor_->isObserved()) << refusal.name;
   }
 }
 
@@ -145,12 +146,12 @@ TEST_F(TransactionsTest, EveryEndOfARecordingClosesItsOwn) {
         const int begun = device_.keepAlive.begun;
         EXPECT_EQ(client.start({.capture = capture})->code(), 0) << name;
         EXPECT_EQ(openTransactions(), 1) << name;
-        EXPECT_TRUE(monitor_->isObserved) << name;
+        EXPECT_TRUE(monitor_->isObserved()) << name;
         if (hasFrame) sendFrame(kSecond);
         end.run(*this, client);
         device_.run();
         EXPECT_EQ(openTransactions(), 0) << name;
-        EXPECT_FALSE(monitor_->isObserved) << name;
+        EXPECT_FALSE(monitor_->isObserved()) << name;
         EXPECT_GT(device_.keepAlive.begun, begun);
       }
     }
@@ -161,7 +162,7 @@ TEST_F(TransactionsTest, ALongSleepEndsASystemRecordingAShortOneDoesNot) {
   const auto handlers = handlersOfDeviceSleep(manager_);
   auto system = systemUI();
   system.start({.width = 1920, .height = 1080, .system = true});
-  EXPECT_FALSE(monitor_->isObserved) << "the whole screen may be divided as it likes";
+  EXPECT_FALSE(monitor_->isObserved()) << "the whole screen may be divided as it likes";
   sendFrame(kSecond);
   const auto sleep = [&](std::chrono::seconds time) {
     auto hold = std::make_shared<int>();

@@ -188,6 +188,7 @@ class Film {
  private:
   static Time now() { return std::chrono::steady_clock::now().time_since_epoch(); }
   [[nodiscard]] Time soundTime() const { return Time(1s) * soundPosition_ / kRate; }
+  [[nodiscard]] Data pauses() const { return rawBytes(mediaTimeFromHostTime(static_cast<uint64_t>(pauses_.count()))); }
   void pauseFor(Time duration) {
     door_.callAndWait("processPayload", {Dictionary{{broadcastpayload::kActionType, int64_t{2}}}});
     std::this_thread::sleep_for(duration);
@@ -203,7 +204,8 @@ class Film {
     send({{broadcastpayload::kVideoOrientation, orientation_},
           {broadcastpayload::kSampleType, int64_t{1}},
           {broadcastpayload::kSharedFrame, QVSharedFrameObject(std::move(picture)).encodeForIPC()},
-          {broadcastpayload::kTimingInfo, timingOf(start_ + at)}});
+          {broadcastpayload::kTimingInfo, timingOf(start_ + at)},
+          {broadcastpayload::kPauses, pauses()}});
   }
   /// Its times go on through a pause, as a device's do.
   void sendSound() {
@@ -223,7 +225,8 @@ class Film {
           {broadcastpayload::kAudioBufferList, std::move(bytes)},
           {broadcastpayload::kAudioFormatDescription, rawBytes(format)},
           {broadcastpayload::kTimingInfo, timingOf(start_ + pauses_ + soundTime())},
-          {broadcastpayload::kNumSamples, int64_t{kRunOfSound}}});
+          {broadcastpayload::kNumSamples, int64_t{kRunOfSound}},
+          {broadcastpayload::kPauses, pauses()}});
     soundPosition_ += kRunOfSound;
   }
   void send(Dictionary payload) {

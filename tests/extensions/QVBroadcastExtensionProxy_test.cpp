@@ -46,7 +46,9 @@ class ProxyTest : public testing::Test {
     payload.entries = {{"number", Value(number)}};
     payload.duration = seconds;
     if (kind == Kind::Video) payload.frame.setSharedFrame(fakes::makeFrame(number)->image()->sharedFrame());
-    proxy_->processPayload(std::move(payload), [this] { ++completed_; });
+    proxy_->processPayload(std::move(payload), [this](PayloadOutcome outcome) {
+      ++(outcome == PayloadOutcome::Answered ? completed_ : givenUp_);
+    });
   }
   std::vector<int64_t> received() {
     std::vector<int64_t> numbers;
@@ -60,7 +62,7 @@ class ProxyTest : public testing::Test {
   const platform::ExtensionRecordRef record_ = device_.extensions.install("a.b.upload", broadcastpoint::kUpload);
   std::shared_ptr<QVBroadcastExtensionProxy> proxy_ = QVBroadcastExtensionProxy::withBroadcastUploadExtension(record_);
   std::string told_;
-  int completed_ = 0;
+  int completed_ = 0, givenUp_ = 0;
 };
 
 TEST_F(ProxyTest, IsReadyAtEachPingAndServesTheExtensionsCalls) {
@@ -78,11 +80,97 @@ TEST_F(ProxyTest, IsReadyAtEachPingAndServesTheExtensionsCalls) {
   device_.timers.advance(kExtensionPatience);
   device_.run();
   EXPECT_EQ(told(), "ready ready info1 https://live error7 ");
+  extension_.call("finishBroadcastWithError", {Value(platform::encodeError(platform::Error{"d", 8, {}}))});
+  extension_.connection->invalidate();
+  device_.run();
+  EXPECT_EQ(told(), "") << "its end is told once";
 
   proxy_->invalidateConnection();
   device_.run();
   EXPECT_EQ(told(), "") << "an end by this side is no loss";
   EXPECT_EQ(device_.extensions.killed, std::vector<std::string>{"a.b.upload"});
+}
+
+TEST_F(ProxyTest, AnExtensionThatEndsBeforeItsPingAnswersTheWaiterAtOnce) {
+  const std::vector<std::pair<const char*, std::function<void()>>> ends = {
+      {"error7 ",
+       [&] {
+         extension_.call("finishBroadcastWithError", {Value(platform::encodeError(platform::Error{"d", 7, {}}))});
+       }},
+      {"error-5808 ", [&] { extension_.connection->invalidate(); }},
+      {"error104 ",
+       [&] {
+         device_.extensions.complete(device_.extensions.requests.size() - 1, platform::Error::posix(104, "died"));
+       }},
+      {"error-5808 ",
+       [&] {
+         device_.extensions.complete(device_.extensions.requests.size() - 1, std::vector<platform::ExtensionItem>{});
+       }},
+      {"error-5808 ", [&] { proxy_->invalidateConnection(); }},
+      {"error-5808 ", [&] { proxy_.reset(); }},
+  };
+  for (const auto& [expected, end] : ends) {
+    proxy_ = QVBroadcastExtensionProxy::withBroadcastUploadExtension(record_);
+    watch();
+    proxy_->establishConnectionWithHandler(
+        [this](const auto& error) { told_ += error ? "error" + std::to_string(error->code) + " " : "ready "; });
+    device_.run();
+    extension_.connect();
+    device_.run();
+    told_.clear();
+    end();
+    device_.run();
+    EXPECT_EQ(told(), expected) << "and no error handler";
+    extension_.call("ping");
+    extension_.connection->invalidate();
+    device_.run();
+    device_.timers.advance(kExtensionPatience);
+    device_.run();
+    EXPECT_EQ(told(), "") << "once";
+  }
+}
+
+TEST_F(ProxyTest, EveryPayloadGetsItsOutcomeOnce) {
+  send(Kind::Control, 1);
+  EXPECT_EQ(std::exchange(givenUp_, 0), 1) << "not connected";
+  connect();
+  extension_.answers = false;
+  for (int64_t i = 0; i < 7; ++i) send(Kind::Control, i);  // four of them in flight
+  device_.run();
+  std::exchange(extension_.unanswered, {}).front()({});
+  device_.run();
+  EXPECT_EQ(completed_, 1);
+  proxy_->invalidateConnection();
+  EXPECT_EQ(completed_ + givenUp_, 7) << "when it returns";
+  device_.run();
+  EXPECT_EQ(completed_, 1);
+  EXPECT_EQ(std::exchange(givenUp_, 0), 6);
+  EXPECT_EQ(device_.extensions.killed.size(), 1u);
+
+  proxy_ = QVBroadcastExtensionProxy::withBroadcastUploadExtension(record_);
+  connect();
+  for (int64_t i = 0; i < 7; ++i) send(Kind::Control, i);
+  device_.run();
+  extension_.connection->invalidate();
+  device_.run();
+  EXPECT_EQ(givenUp_, 7) << "lost";
+  extension_.unanswered.clear();
+}
+
+TEST_F(ProxyTest, LinksToOneExtensionDoNotMeet) {
+  connect();
+  const auto second = QVBroadcastExtensionProxy::withBroadcastUploadExtension(record_);
+  second->establishConnectionWithHandler([this](const auto& error) { told_ += error ? "failed " : "second ready "; });
+  device_.run();
+  const auto first = std::exchange(proxy_, nullptr);
+  first->invalidateConnection();
+  EXPECT_EQ(device_.extensions.killed.size(), 1u) << "its own process";
+  extension_.connect();
+  device_.run();
+  ping();
+  EXPECT_EQ(told(), "second ready ");
+  second->invalidateConnection();
+  EXPECT_EQ(device_.extensions.killed.size(), 2u);
 }
 
 TEST_F(ProxyTest, EveryHandshakeThatFailsEndsInOneError) {
@@ -108,7 +196,6 @@ TEST_F(ProxyTest, EveryHandshakeThatFailsEndsInOneError) {
 }
 
 TEST_F(ProxyTest, ASlowExtensionLosesTheOldestFramesFirstAndNoAction) {
-  send(Kind::Control, 0);
   connect();
   extension_.answers = false;
   for (int64_t i = 1; i <= 4; ++i) send(Kind::Control, i);  // in flight
@@ -118,7 +205,7 @@ TEST_F(ProxyTest, ASlowExtensionLosesTheOldestFramesFirstAndNoAction) {
   }
   send(Kind::Control, 5);
   device_.run();
-  EXPECT_EQ(received(), (std::vector<int64_t>{1, 2, 3, 4})) << "what came before the connection is lost";
+  EXPECT_EQ(received(), (std::vector<int64_t>{1, 2, 3, 4}));
   EXPECT_EQ(platform::outstandingSharedFrameLeases(), 0u) << "no lease for what only waits";
 
   extension_.answers = true;
@@ -129,11 +216,12 @@ TEST_F(ProxyTest, ASlowExtensionLosesTheOldestFramesFirstAndNoAction) {
   EXPECT_EQ(std::count_if(all.begin(), all.end(), [](int64_t n) { return n >= 100 && n < 104; }), 0);
   EXPECT_EQ(all.back(), 5);
   EXPECT_EQ(completed_, 25);
+  EXPECT_EQ(givenUp_, 4);
   EXPECT_TRUE(device_.log.countContaining("4 frames and 0 runs of sound dropped") > 0);
 
   BroadcastPayloadQueue queue;
-  for (int i = 0; i < 30; ++i) queue.push({{Kind::AppAudio, {}, {}, 0.1}, nullptr});
-  for (int i = 0; i < 5; ++i) queue.push({{Kind::Microphone, {}, {}, 0.1}, nullptr});
+  for (int i = 0; i < 30; ++i) (void)queue.push({{Kind::AppAudio, {}, {}, 0.1}, nullptr});
+  for (int i = 0; i < 5; ++i) (void)queue.push({{Kind::Microphone, {}, {}, 0.1}, nullptr});
   EXPECT_NEAR(static_cast<double>(queue.droppedAudio()), 10, 1) << "2 s of each are kept";
 }
 
@@ -152,6 +240,17 @@ TEST_F(ProxyTest, ALossIsToldOnceAndAFloodIsNotPassedOn) {
   device_.run();
   EXPECT_EQ(told(), "error-5808 ");
   EXPECT_EQ(completed_, 0);
+  EXPECT_EQ(givenUp_, 3);
+}
+
+/// A picture that stands still is sent again every 0.45 s.
+TEST_F(ProxyTest, AReceiverThatKeepsEveryLeaseDoesNotUseUpDescriptors) {
+  const size_t before = platform::outstandingSharedFrameLeases();
+  const QVSharedFrameObject picture(fakes::makeFrame(1)->image()->sharedFrame());
+  std::vector<Value> kept;
+  for (int i = 0; i < 100; ++i) kept.push_back(picture.encodeForIPC());
+  EXPECT_LE(platform::outstandingSharedFrameLeases() - before, platform::kMaximumSharedFrameLeases);
+  EXPECT_FALSE(kept.back().isNone());
 }
 
 TEST_F(ProxyTest, ConnectsToAnExtensionThatListensAlready) {
@@ -170,7 +269,12 @@ TEST_F(ProxyTest, ConnectsToAnExtensionThatListensAlready) {
   EXPECT_EQ(listener->resume(), std::nullopt);
   const auto endpoint = listener->endpoint();
   proxy_ = *QVBroadcastExtensionProxy::withBroadcastUploadListenerEndpoint(endpoint);
+  device_.run();
+  extension_.call("updateBroadcastURL", {Value("early")});
+  device_.run();
   watch();
+  device_.run();
+  EXPECT_EQ(told(), "early ") << "what came before somebody listened";
   send(Kind::Control, 1);
   device_.run();
   EXPECT_EQ(received(), std::vector<int64_t>{1});

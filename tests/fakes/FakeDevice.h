@@ -43,13 +43,13 @@ struct FakeDevice {
   FakeScreenCapture screen;
   FakeDeviceCapture deviceCapture;
   FakeAppAudioTap tap;
-  FakeAssetWriterService movies;
-  FakeExportService exports;
+  FakeFileSystem disk;
+  FakeAssetWriterService movies{disk, clock};
+  FakeExportService exports{disk, clock};
   FakeMovieSalvage salvage;
   FakeApplications applications;
   FakeUserAlerts alerts;
   FakeSounds sounds;
-  FakeFileSystem disk;
   FakeBundleService bundles;
   FakeLocalization localization;
   FakePreferences preferences;

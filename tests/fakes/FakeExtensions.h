@@ -1,6 +1,7 @@
 #pragma once
 
 #include <algorithm>
+#include <cerrno>
 #include <map>
 #include <memory>
 #include <string>
@@ -13,7 +14,8 @@
 
 namespace qv::fakes {
 
-/// Installed extensions and the requests that they got; the test is the extension.
+/// Installed extensions and the requests that they got; the test is the extension. `killed` has the extension of each
+/// use that ended.
 ///
 /// Threading: for a test in one thread.
 class FakeExtensionService final : public platform::ExtensionService {
@@ -22,6 +24,7 @@ class FakeExtensionService final : public platform::ExtensionService {
     platform::ExtensionRecordRef extension;
     std::vector<platform::ExtensionItem> items;
     platform::ExtensionRequestHandlers handlers;
+    bool isOpen = true;
     [[nodiscard]] platform::Value value(const std::string& title) const {
       for (const auto& item : items) {
         if (item.attributedTitle == title) return item.attachments.at(0).value;
@@ -47,11 +50,8 @@ class FakeExtensionService final : public platform::ExtensionService {
                            std::function<std::shared_ptr<platform::ExtensionHostContext>()> make) override {
     hostContexts[point] = std::move(make);
   }
-  void beginExtensionRequest(const platform::ExtensionRecordRef& extension, std::vector<platform::ExtensionItem> items,
-                             platform::ExtensionRequestHandlers handlers) override {
-    requests.push_back({extension, std::move(items), std::move(handlers)});
-    const auto id = requests.size();
-    executor_.post([began = requests.back().handlers.began, id, error = launchError] { began(id, error); });
+  std::shared_ptr<platform::ExtensionUse> useExtension(const platform::ExtensionRecordRef& extension) override {
+    return std::make_shared<Use>(*this, extension);
   }
   std::shared_ptr<platform::ExtensionHostContext> contextForRequest(platform::ExtensionRequestID) override {
     return nullptr;
@@ -59,18 +59,9 @@ class FakeExtensionService final : public platform::ExtensionService {
   std::shared_ptr<platform::IPCConnection> auxiliaryConnectionForRequest(platform::ExtensionRequestID) override {
     return vendor;
   }
-  void killExtension(const platform::ExtensionRecordRef& extension, int) override {
-    killed.push_back(extension->identifier);
-  }
-  std::optional<std::string> issueSandboxToken(const std::string& tokenClass, const std::string& path,
-                                               const platform::ExtensionRecordRef&) override {
-    if (refusesTokens) return std::nullopt;
-    return tokenClass + " for " + path;
-  }
-  void revokeSandboxToken(const std::string& token) override { revoked.push_back(token); }
-
-  /// Ends a request, counted from 0.
+  /// Ends a request, counted from 0. One that has ended already stays so.
   void complete(size_t index, platform::Result<std::vector<platform::ExtensionItem>> returned) {
+    if (!std::exchange(requests.at(index).isOpen, false)) return;
     executor_.post(
         [completed = requests.at(index).handlers.completed, index, returned] { completed(index + 1, returned); });
   }
@@ -95,6 +86,38 @@ class FakeExtensionService final : public platform::ExtensionService {
   bool refusesTokens = false;
 
  private:
+  /// Its end ends its requests, as the death of the process does.
+  class Use final : public platform::ExtensionUse {
+   public:
+    Use(FakeExtensionService& service, platform::ExtensionRecordRef extension)
+        : service_(service), extension_(std::move(extension)) {}
+    ~Use() override {
+      service_.killed.push_back(extension_->identifier);
+      for (const size_t index : requests_) service_.complete(index, platform::Error::posix(ECONNRESET, "killed"));
+    }
+    Use(const Use&) = delete;
+    Use& operator=(const Use&) = delete;
+    void beginRequest(std::vector<platform::ExtensionItem> items,
+                      platform::ExtensionRequestHandlers handlers) override {
+      const bool isLaunched = !service_.launchError;
+      if (isLaunched) requests_.push_back(service_.requests.size());
+      service_.requests.push_back({extension_, std::move(items), std::move(handlers), isLaunched});
+      const auto id = service_.requests.size();
+      service_.executor_.post(
+          [began = service_.requests.back().handlers.began, id, error = service_.launchError] { began(id, error); });
+    }
+    std::optional<std::string> issueSandboxToken(const std::string& tokenClass, const std::string& path) override {
+      if (service_.refusesTokens) return std::nullopt;
+      return tokenClass + " for " + path;
+    }
+    void revokeSandboxToken(const std::string& token) override { service_.revoked.push_back(token); }
+
+   private:
+    FakeExtensionService& service_;
+    const platform::ExtensionRecordRef extension_;
+    std::vector<size_t> requests_;
+  };
+
   platform::Executor& executor_;
 };
 

@@ -14,6 +14,8 @@
 #include "platform/DeviceCapture.h"
 #include "platform/ExportSession.h"
 #include "platform/ScreenCapture.h"
+#include "tests/fakes/FakeClock.h"
+#include "tests/fakes/FakeFileSystem.h"
 
 namespace qv::fakes {
 
@@ -186,7 +188,7 @@ class FakeAppAudioTap final : public platform::AppAudioTapService {
     }
     int32_t start() override {
       state->running = true;
-      if (const auto call = state->listener) call();
+      if (const auto call = state->listener; call && !service.startsLate) call();
       return service.status("start");
     }
     int32_t stop() override {
@@ -249,11 +251,14 @@ class FakeAppAudioTap final : public platform::AppAudioTapService {
   std::map<std::string, int32_t> failures;
   std::optional<platform::AudioStreamDescription> reportedFormat;
   uint32_t packetSize = 0;
+  bool startsLate = false;  ///< the test tells when a tap runs, by its listener
 };
 
-/// Records what a movie would hold.
+/// Records what a movie would hold. With its first sample a movie gets a file, whose content is the movie's number
+/// ("movie 3"): a test that finds a file so knows whose it is. As on a disk, no writer takes a path where a file is.
 class FakeAssetWriterService final : public platform::AssetWriterService {
  public:
+  FakeAssetWriterService(FakeFileSystem& disk, const FakeClock& clock) : disk_(disk), clock_(clock) {}
   void prepareForWriting() override {}
   struct Input final : platform::WriterInput {
     void setTransform(const platform::AffineTransform& to) override { transform = to; }
@@ -277,6 +282,7 @@ class FakeAssetWriterService final : public platform::AssetWriterService {
   /// What became of one writer; outlives it.
   struct Movie {
     platform::URL url;
+    std::string content;
     platform::AssetWriterStatus status = platform::AssetWriterStatus::Unknown;
     std::vector<std::shared_ptr<Input>> inputs;  // video, app audio, microphone
     int starts = 0;
@@ -286,7 +292,7 @@ class FakeAssetWriterService final : public platform::AssetWriterService {
     bool startFails = false;
   };
   struct Writer final : platform::AssetWriter {
-    explicit Writer(std::shared_ptr<Movie> to) : movie(std::move(to)) {}
+    Writer(FakeAssetWriterService& fake, std::shared_ptr<Movie> to) : service(fake), movie(std::move(to)) {}
     platform::AssetWriterStatus status() const override { return movie->status; }
     std::optional<platform::Error> error() const override { return std::nullopt; }
     const platform::URL& outputURL() const override { return movie->url; }
@@ -295,8 +301,10 @@ class FakeAssetWriterService final : public platform::AssetWriterService {
     }
     bool startWriting() override {
       ++movie->starts;
-      movie->status = movie->startFails ? platform::AssetWriterStatus::Failed : platform::AssetWriterStatus::Writing;
-      return !movie->startFails;
+      const bool starts = !movie->startFails && !service.disk_.itemExists(movie->url.path());
+      movie->status = starts ? platform::AssetWriterStatus::Writing : platform::AssetWriterStatus::Failed;
+      if (starts) service.write(*movie);
+      return starts;
     }
     void startSessionAtSourceTime(platform::MediaTime time) override { movie->sessionStarts.push_back(time); }
     void endSessionAtSourceTime(platform::MediaTime time) override { movie->sessionEnd = time; }
@@ -305,21 +313,26 @@ class FakeAssetWriterService final : public platform::AssetWriterService {
       if (movie->status == platform::AssetWriterStatus::Writing) finish();
     }
     void finish() {
+      // A file that was removed meanwhile does not come back.
+      if (service.disk_.itemExists(movie->url.path())) service.write(*movie);
       movie->status = platform::AssetWriterStatus::Completed;
       const auto done = std::exchange(movie->completion, nullptr);
       done();
     }
+    FakeAssetWriterService& service;
     const std::shared_ptr<Movie> movie;
   };
 
   platform::Result<std::unique_ptr<platform::AssetWriter>> createAssetWriter(const platform::URL& url,
                                                                              const std::string&) override {
     if (createFails) return platform::Error::posix(EACCES);
+    if (disk_.itemExists(url.path())) return platform::Error::posix(EEXIST);
     auto movie = std::make_shared<Movie>();
     movie->url = url;
+    movie->content = "movie " + std::to_string(movies.size());
     movie->startFails = startFails;
     movies.push_back(movie);
-    std::unique_ptr<platform::AssetWriter> writer = std::make_unique<Writer>(movie);
+    std::unique_ptr<platform::AssetWriter> writer = std::make_unique<Writer>(*this, movie);
     return writer;
   }
   std::shared_ptr<platform::WriterInput> createWriterInput(platform::MediaType type,
@@ -336,41 +349,70 @@ class FakeAssetWriterService final : public platform::AssetWriterService {
 
   std::vector<std::shared_ptr<Movie>> movies;
   bool createFails = false, startFails = false;
+
+ private:
+  void write(const Movie& movie) { disk_.addFile(movie.url.path(), movie.content, clock_.now()); }
+
+  FakeFileSystem& disk_;
+  const FakeClock& clock_;
 };
 
-/// Exports end at once as the test says.
+/// Exports end as the test says, at once or, while `holds`, when it says. One that succeeds copies its movie's file, if
+/// there is one; it fails where a file is in its way, as on a disk.
 class FakeExportService final : public platform::ExportService {
  public:
+  FakeExportService(FakeFileSystem& disk, const FakeClock& clock) : disk_(disk), clock_(clock) {}
   struct Asset final : platform::MovieAsset {
     platform::MediaTime duration() const override { return length; }
     std::vector<int32_t> audioTrackIDs() const override { return {2, 3}; }
     platform::MediaTime length;
+    platform::URL movie;
   };
   struct Session final : platform::ExportSession {
     void setOutputURL(const platform::URL& to) override { output = to; }
     void setOutputFileType(const std::string&) override {}
     void setTimeRange(const platform::MediaTimeRange& to) override { range = to; }
     void setAudioMix(std::vector<platform::AudioMixInputParameters> to) override { mix = std::move(to); }
-    void exportAsynchronously(std::function<void()> completion) override { completion(); }
+    void exportAsynchronously(std::function<void()> completion) override {
+      // The source is read, and the file is begun, long before the end.
+      const auto read = service->disk_.readFile(source.path());
+      if (service->disk_.itemExists(output.path())) result = platform::ExportStatus::Failed;
+      if (read && result == platform::ExportStatus::Completed) {
+        content = read.value();
+        service->disk_.addFile(output.path(), content, service->clock_.now());
+      }
+      whenEnded = std::move(completion);
+      if (!service->holds) end();
+    }
+    /// Ends one that was held back.
+    void end() {
+      if (const auto completion = std::exchange(whenEnded, nullptr)) completion();
+    }
     void cancel() override {}
     double progress() const override { return 1; }
     platform::ExportStatus status() const override { return result; }
     std::optional<platform::Error> error() const override { return std::nullopt; }
     const platform::URL& outputURL() const override { return output; }
-    platform::URL output;
+    FakeExportService* service = nullptr;
+    platform::URL source, output;
+    std::string content;
+    std::function<void()> whenEnded;  ///< while it is held back
     platform::MediaTimeRange range;
     std::vector<platform::AudioMixInputParameters> mix;
     platform::ExportPreset preset = platform::ExportPreset::PassThrough;
     platform::ExportStatus result = platform::ExportStatus::Completed;
   };
-  std::shared_ptr<platform::MovieAsset> openMovie(const platform::URL&) override {
+  std::shared_ptr<platform::MovieAsset> openMovie(const platform::URL& movie) override {
     auto asset = std::make_shared<Asset>();
+    asset->movie = movie;
     asset->length = duration;
     return asset;
   }
-  std::shared_ptr<platform::ExportSession> createExportSession(std::shared_ptr<platform::MovieAsset>,
+  std::shared_ptr<platform::ExportSession> createExportSession(std::shared_ptr<platform::MovieAsset> asset,
                                                                platform::ExportPreset preset) override {
     auto session = std::make_shared<Session>();
+    session->service = this;
+    session->source = std::static_pointer_cast<Asset>(asset)->movie;
     session->preset = preset;
     session->result = result;
     sessions.push_back(session);
@@ -379,6 +421,11 @@ class FakeExportService final : public platform::ExportService {
   platform::MediaTime duration = platform::MediaTime::make(95, 1);
   platform::ExportStatus result = platform::ExportStatus::Completed;
   std::vector<std::shared_ptr<Session>> sessions;
+  bool holds = false;
+
+ private:
+  FakeFileSystem& disk_;
+  const FakeClock& clock_;
 };
 
 }  // namespace qv::fakes

@@ -1,14 +1,17 @@
 #pragma once
 
+#include <deque>
 #include <functional>
 #include <map>
 #include <memory>
 #include <optional>
 #include <string>
+#include <utility>
 #include <vector>
 
 #include "platform/Applications.h"
 #include "platform/IPC.h"
+#include "platform/Platform.h"
 #include "platform/Sounds.h"
 #include "platform/SystemServices.h"
 #include "platform/UserAlert.h"
@@ -110,15 +113,37 @@ class FakePurgeableSpace final : public platform::PurgeableSpaceService {
   platform::PurgeableSpaceCallbacks callbacks;
 };
 
+/// Answers at once or, while `holds`, when the test says. It reads the file when it answers, as a copy that takes long
+/// still does.
 class FakePhotoLibrary final : public platform::PhotoLibrary {
  public:
-  void createAsset(const platform::URL& file, platform::PhotoResourceType,
-                   std::function<void(const std::optional<platform::Error>&)> completion) override {
+  using Completion = std::function<void(const std::optional<platform::Error>&)>;
+  void createAsset(const platform::URL& file, platform::PhotoResourceType, Completion completion) override {
     stored.push_back(file);
+    held.push_back({file, std::move(completion)});
+    if (!holds) answer();
+  }
+  /// Answers the oldest request that is held back.
+  void answer() {
+    const auto [file, completion] = std::move(held.front());
+    held.pop_front();
+    const auto content = platform::Platform::current().fileSystem->readFile(file.path());
+    if (!failure && content) contents.push_back(content.value());
     completion(failure);
   }
-  std::vector<platform::URL> stored;
+  /// The completion of the oldest is never called.
+  void drop() { held.pop_front(); }
+
+  std::vector<platform::URL> stored;  ///< or refused
+  std::vector<std::string> contents;  ///< of what was stored and there
   std::optional<platform::Error> failure;
+  bool holds = false;
+
+  struct Request {
+    platform::URL file;
+    Completion completion;
+  };
+  std::deque<Request> held;
 };
 
 class FakeMetrics final : public platform::MetricsReporter {

@@ -115,11 +115,15 @@ Dictionary audioSettings() {
 }
 
 RecordingUnderTest::RecordingUnderTest(AssetWriterService& service, const std::string& path, uint32_t width,
-                                       uint32_t height, const AffineTransform& transform) {
+                                       uint32_t height, const AffineTransform& transform)
+    : RecordingUnderTest(service, path, videoSettings(width, height), transform) {}
+
+RecordingUnderTest::RecordingUnderTest(AssetWriterService& service, const std::string& path,
+                                       const Dictionary& videoSettings, const AffineTransform& transform) {
   auto created = service.createAssetWriter(URL::fileURL(path), kFileTypeMPEG4);
   EXPECT_TRUE(created.hasValue()) << (created ? "" : created.error().description());
   writer_ = std::move(created.value());
-  inputs_[0] = service.createWriterInput(MediaType::Video, videoSettings(width, height));
+  inputs_[0] = service.createWriterInput(MediaType::Video, videoSettings);
   inputs_[1] = service.createWriterInput(MediaType::Audio, audioSettings());
   inputs_[2] = service.createWriterInput(MediaType::Audio, audioSettings());
   inputs_[0]->setTransform(transform);

@@ -41,6 +41,8 @@ class RecordingUnderTest {
  public:
   RecordingUnderTest(AssetWriterService& service, const std::string& path, uint32_t width = 320, uint32_t height = 180,
                      const AffineTransform& transform = {});
+  RecordingUnderTest(AssetWriterService& service, const std::string& path, const Dictionary& videoSettings,
+                     const AffineTransform& transform = {});
   /// Waits for room, so that no picture is dropped.
   void appendPicture(const SampleBufferRef& sample);
   void appendSound(int track, const SampleBufferRef& sample);

@@ -41,7 +41,7 @@ class FreeSpaceWatchTest : public testing::Test {
   uint64_t free_ = 10'000'000'000;
   int looks_ = 0, periodic_ = 0;
   std::vector<Request> requests_;
-  FreeSpaceWatch watch_{timers_, executor_, [this] {
+  FreeSpaceWatch watch_{timers_, executor_, FreeSpaceLimits{{100'000'000, 50'000'000, 16'000'000}, 5s}, [this] {
                           ++looks_;
                           return std::optional(free_);
                         }};

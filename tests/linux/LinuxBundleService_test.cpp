@@ -52,6 +52,44 @@ TEST_F(LinuxBundleServiceTest, FindsByIdentifierInTheRoots) {
   EXPECT_TRUE(bundles_.bundleWithIdentifier("com.example.fake")) << "a new installation is seen at once";
 }
 
+TEST_F(LinuxBundleServiceTest, WhatIsKnownFollowsEveryChange) {
+  const auto nameOf = [&](const char* identifier) {
+    const BundleRef bundle = bundles_.bundleWithIdentifier(identifier);
+    return bundle ? bundle->path().substr(root_.path().size()) : "none";
+  };
+  install("/Applications/Chess", "com.example.chess");
+  EXPECT_EQ(nameOf("com.example.chess"), "/Applications/Chess");
+  EXPECT_EQ(nameOf("com.example.chess.upload"), "none");
+  install("/Applications/Chess/PlugIns/Upload", "com.example.chess.upload");
+  EXPECT_EQ(nameOf("com.example.chess.upload"), "/Applications/Chess/PlugIns/Upload");
+  install("/Applications/Chess", "com.example.go");
+  EXPECT_EQ(nameOf("com.example.chess"), "none") << "written anew in place";
+  EXPECT_EQ(nameOf("com.example.go"), "/Applications/Chess");
+  std::filesystem::rename(root_.path("/Applications/Chess"), root_.path("/Applications/Go"));
+  EXPECT_EQ(nameOf("com.example.go"), "/Applications/Go");
+  EXPECT_EQ(nameOf("com.example.chess.upload"), "/Applications/Go/PlugIns/Upload");
+  std::filesystem::remove(root_.path("/Applications/Go/Info.json"));
+  EXPECT_EQ(nameOf("com.example.go"), "none");
+  EXPECT_EQ(nameOf("com.example.chess.upload"), "/Applications/Go/PlugIns/Upload") << "in a plain directory now";
+  std::filesystem::remove_all(root_.path("/Applications"));
+  EXPECT_EQ(nameOf("com.example.chess.upload"), "none");
+  EXPECT_TRUE(bundles_.installedBundles().empty());
+}
+
+TEST_F(LinuxBundleServiceTest, NoBundleHidesAnother) {
+  install("/Applications/A", "com.example.a");
+  install("/Applications/A/Data/Inner", "com.example.inner");
+  for (int i = 0; i < 1010; ++i)
+    std::filesystem::create_directories(root_.path("/Applications/B/" + std::to_string(i)));
+  install("/Applications/C", "com.example.c");
+  install("/Applications/C/PlugIns/Upload", "com.example.c.upload");
+  EXPECT_TRUE(bundles_.bundleWithIdentifier("com.example.c.upload"));
+  EXPECT_FALSE(bundles_.bundleWithIdentifier("com.example.inner")) << "not where plug-ins are";
+  EXPECT_EQ(bundles_.installedBundles().size(), 3u);
+  EXPECT_GT(log_.countContaining("too many directories"), 0u) << "in B";
+  EXPECT_LT(log_.countContaining("too many directories"), 10u);
+}
+
 TEST_F(LinuxBundleServiceTest, TheNearestBundleInsideARootEncloses) {
   install("/Applications/Chess", "com.example.chess");
   install("/Applications/Chess/PlugIns/Upload", "com.example.chess.upload");

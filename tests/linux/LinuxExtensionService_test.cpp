@@ -65,21 +65,26 @@ class LinuxExtensionServiceTest : public ::testing::Test {
     return found.next();
   }
   std::shared_ptr<Flow> begin(const std::string& command, const std::string& argument = {}) {
-    return beginOn(extension_ ? extension_ : extension_ = find().at(0), command, argument);
+    return beginOn(use(), command, argument);
   }
-  std::shared_ptr<Flow> beginOn(const ExtensionRecordRef& extension, const std::string& command,
-                                const std::string& argument) {
+  ExtensionUse& use() {
+    if (!extension_) extension_ = find().at(0);
+    if (!use_) use_ = service_.useExtension(extension_);
+    return *use_;
+  }
+  static std::shared_ptr<Flow> beginOn(ExtensionUse& use, const std::string& command,
+                                       const std::string& argument = {}) {
     const auto flow = std::make_shared<Flow>();
-    service_.beginExtensionRequest(extension, {{command, {{kGenericDataType, Value(argument)}}}},
-                                   {.began =
-                                        [flow](auto id, const auto& error) {
-                                          flow->began.add({id, error ? error->code : 0});
-                                        },
-                                    .completed =
-                                        [flow](auto, const auto& items) {
-                                          flow->completed.add(items ? items.value().at(0).attributedTitle
-                                                                    : "error " + std::to_string(items.error().code));
-                                        }});
+    use.beginRequest({{command, {{kGenericDataType, Value(argument)}}}},
+                     {.began =
+                          [flow](auto id, const auto& error) {
+                            flow->began.add({id, error ? error->code : 0});
+                          },
+                      .completed =
+                          [flow](auto, const auto& items) {
+                            flow->completed.add(items ? items.value().at(0).attributedTitle
+                                                      : "error " + std::to_string(items.error().code));
+                          }});
     return flow;
   }
   std::string run(const std::string& command, const std::string& argument = {}) {
@@ -98,6 +103,7 @@ class LinuxExtensionServiceTest : public ::testing::Test {
   fakes::ManualTimers timers_;
   ExtensionRecordRef extension_;
   LinuxExtensionService service_;
+  std::shared_ptr<ExtensionUse> use_;
 };
 
 TEST_F(LinuxExtensionServiceTest, FindsWhatIsInstalledAndLeavesOutWhatIsBroken) {
@@ -153,7 +159,7 @@ TEST_F(LinuxExtensionServiceTest, LosesOnlyTheRequestsOfAProcessThatDies) {
 
   const auto second = begin("hold");
   EXPECT_GT(second->began.next().first, id) << "a new process";
-  service_.killExtension(extension_, SIGKILL);
+  use_.reset();
   EXPECT_EQ(run("echo", "third process"), "third process");
   EXPECT_EQ(second->completed.next(), failure(ECONNRESET));
 }
@@ -169,8 +175,27 @@ TEST_F(LinuxExtensionServiceTest, GivesUpOnAnExtensionThatDoesNotAnswer) {
   EXPECT_EQ(run("echo", "again"), "again");
 
   std::filesystem::remove(root_.path(kUploadBundle + "/bin/up"));
-  service_.killExtension(extension_, SIGKILL);
+  use_.reset();
   EXPECT_EQ(begin("echo")->began.next().second, ENOEXEC);
+}
+
+TEST_F(LinuxExtensionServiceTest, UsesOfOneExtensionDoNotMeet) {
+  const auto first = begin("hold");
+  const auto other = service_.useExtension(extension_);
+  const auto second = beginOn(*other, "hold");
+  EXPECT_EQ(first->began.next().second, 0);
+  EXPECT_EQ(second->began.next().second, 0);
+  const auto hanging = begin("hang");
+  EXPECT_EQ(first->completed.next(), "hanging");
+  use_.reset();
+  EXPECT_EQ(run("echo", "at once"), "at once") << "not by the process that hangs, or dies";
+  EXPECT_EQ(hanging->began.next().second, ECONNRESET);
+  EXPECT_EQ(beginOn(*other, "release")->completed.next(), "ok");
+  EXPECT_EQ(second->completed.next(), "released");
+
+  std::vector<std::shared_ptr<ExtensionUse>> uses;
+  for (int i = 0; i < 8; ++i) uses.push_back(service_.useExtension(extension_));
+  EXPECT_EQ(beginOn(*uses.back(), "echo")->began.next().second, EBUSY);
 }
 
 /// The same rules hold for both ways of confinement.
@@ -208,26 +233,26 @@ TEST_P(ConfinementTest, ReachesItsContainerTheNetworkAndNothingElse) {
 TEST_P(ConfinementTest, OpensOneFileByItsTokenOnce) {
   if (GetParam() && ::geteuid() != 0) GTEST_SKIP() << "another user takes root";
   install("/System/Applications/Other", "com.example.other");
-  const auto extensions = find();
-  extension_ = extensions.at(0);
+  const auto other = service_.useExtension(find().at(1));
   const std::string clip = root_.write("/private/var/mobile/Library/Quorvel/clip.mp4", "frames");
   std::filesystem::create_symlink(clip, clip + ".link");
-  EXPECT_FALSE(service_.issueSandboxToken(kReadOnly, clip + ".link", extension_));
-  EXPECT_FALSE(service_.issueSandboxToken(kReadOnly, root_.path("/private"), extension_));
-  EXPECT_FALSE(service_.issueSandboxToken("another.class", clip, extension_));
+  EXPECT_FALSE(use().issueSandboxToken(kReadOnly, clip + ".link"));
+  EXPECT_FALSE(use().issueSandboxToken(kReadOnly, root_.path("/private")));
+  EXPECT_FALSE(use().issueSandboxToken("another.class", clip));
 
-  const auto token = service_.issueSandboxToken(kReadOnly, clip, extension_).value();
-  const auto foreign = beginOn(extensions.at(1), "open token", token);
-  EXPECT_EQ(foreign->completed.next(), kNoSuchFileErrorName) << "another extension's";
+  const auto token = use().issueSandboxToken(kReadOnly, clip).value();
+  EXPECT_EQ(beginOn(*other, "open token", token)->completed.next(), kNoSuchFileErrorName) << "another extension's";
+  const auto same = service_.useExtension(extension_);
+  EXPECT_EQ(beginOn(*same, "open token", token)->completed.next(), kNoSuchFileErrorName) << "another broadcast's";
   root_.write("/private/var/mobile/Library/Quorvel/other", "swapped");
   std::filesystem::rename(root_.path("/private/var/mobile/Library/Quorvel/other"), clip);
   EXPECT_EQ(run("open token", token), "frames");
   EXPECT_EQ(run("open token", token), kNoSuchFileErrorName) << "used";
 
-  const auto revoked = service_.issueSandboxToken(kReadOnly, clip, extension_).value();
-  service_.revokeSandboxToken(revoked);
+  const auto revoked = use().issueSandboxToken(kReadOnly, clip).value();
+  use().revokeSandboxToken(revoked);
   EXPECT_EQ(run("open token", revoked), kNoSuchFileErrorName);
-  const auto unused = service_.issueSandboxToken(kReadOnly, clip, extension_).value();
+  const auto unused = use().issueSandboxToken(kReadOnly, clip).value();
   EXPECT_EQ(run("echo", unused), unused);
   EXPECT_EQ(run("open token", unused), kNoSuchFileErrorName) << "ended with its request";
 }

@@ -13,6 +13,8 @@
 namespace qv::platform {
 namespace {
 
+const WatchedSpace kNoWatch{"/", {}};
+
 IPCPeer thisProcess() {
   IPCPeer peer;
   peer.processIdentifier = ::getpid();
@@ -26,7 +28,7 @@ TEST(LinuxPlatformTest, ErrorsSpeakTheUsersLanguageOnARealDisk) {
   std::filesystem::create_directories(framework.parent_path());
   std::filesystem::copy(QV_FRAMEWORK_DIR, framework, std::filesystem::copy_options::recursive);
   root.write("/private/var/mobile/Library/Preferences/com.tarnwick.quorveld.json", R"({"Languages": ["de-CH"]})");
-  LinuxPlatform linux_(root.path(), "");
+  LinuxPlatform linux_(root.path(), "", kNoWatch);
   Platform platform;
   linux_.addTo(platform);
   Platform::install(&platform);
@@ -47,7 +49,7 @@ TEST(LinuxPlatformTest, PeersAreKnownByTheBundleAroundTheirExecutable) {
   TemporaryRoot other;
   std::filesystem::copy_file(other.write("/Info.json", R"({"CFBundleIdentifier": "com.example.test"})"), info);
 
-  LinuxPlatform linux_(root.path(), directory.parent_path());
+  LinuxPlatform linux_(root.path(), directory.parent_path(), kNoWatch);
   IPCPeer peer = thisProcess();
   linux_.peerResolver()(peer);
   EXPECT_EQ(peer.bundleIdentifier, "com.example.test");
@@ -60,7 +62,7 @@ TEST(LinuxPlatformTest, PeersAreKnownByTheBundleAroundTheirExecutable) {
   std::filesystem::remove(info);
 
   IPCPeer outside = thisProcess();
-  LinuxPlatform(root.path(), "").peerResolver()(outside);
+  LinuxPlatform(root.path(), "", kNoWatch).peerResolver()(outside);
   EXPECT_EQ(outside.bundleIdentifier, std::nullopt);
   EXPECT_TRUE(outside.entitlements.empty());
 }

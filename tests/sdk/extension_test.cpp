@@ -307,8 +307,7 @@ TEST_F(ExtensionLibrary, OverlappingClipsKeepTheirOrderAndTheirAnswers) {
 
 TEST_F(ExtensionLibrary, AListenerTakesBroadcastsWithoutALaunch) {
   Diary diary;
-  auto listener = ListenerBroadcasts::create(std::make_unique<platform::SdBusIPCService>(), authorWith(diary),
-                                             platform::systemClock());
+  auto listener = ListenerBroadcasts::create(std::make_unique<platform::SdBusIPCService>(), authorWith(diary));
   ASSERT_TRUE(listener);
   platform::FileDescriptor endpoint(::dup(listener->endpoint()));
   auto connection = ipc_.connect(platform::ListenerEndpoint(platform::shareFileDescriptor(std::move(endpoint))));
@@ -325,23 +324,47 @@ TEST_F(ExtensionLibrary, AListenerTakesBroadcastsWithoutALaunch) {
   valueOf(diary.gone.get_future());
 }
 
-TEST(PauseTimeline, PutsSoundWhereThePicturesOfItsTimeAre) {
-  PauseTimeline timeline;
-  EXPECT_EQ(timeline.place(900ms), 900ms) << "before any picture";
-  timeline.notePicture(1000ms, 1007ms);
-  timeline.notePicture(1033ms, 1037ms);  // 4 ms on the way at the least
-  timeline.paused(1050ms);
-  timeline.resumed(3050ms);
-  EXPECT_EQ(timeline.place(3100ms), 1087ms) << "until a picture tells better";
-  timeline.notePicture(1033ms, 3070ms);  // captured 3061 or so
-  timeline.notePicture(1066ms, 3098ms);  // captured 3094: the pause was 2028 ms
-  EXPECT_EQ(timeline.place(3128ms), 1100ms);
-  EXPECT_EQ(timeline.place(1040ms), 1040ms) << "captured before the pause, delivered after it";
-  EXPECT_EQ(timeline.place(2000ms), std::nullopt) << "within the pause";
-  timeline.paused(3200ms);
-  timeline.resumed(4200ms);
-  timeline.notePicture(1100ms, 4132ms + 28ms + 4ms);
-  EXPECT_EQ(timeline.place(4200ms), 1140ms);
+/// Speaks while it is made, and gives up there.
+class Hasty final : public quorvel::SampleExtension {
+ public:
+  explicit Hasty(quorvel::Broadcast& broadcast) {
+    broadcast.updateServiceInfo({{"state", {std::string("no")}}});
+    broadcast.updateBroadcastURL("https://x");
+    broadcast.finishBroadcastWithError({-7, "", "no server", "d"});
+  }
+  void started(quorvel::Dictionary) override {}
+  void finished() override {}
+  void processVideo(quorvel::VideoFrame, quorvel::Orientation) override {}
+  void processAudio(quorvel::AudioSample) override {}
+};
+
+TEST_F(ExtensionLibrary, WhatIsSaidInAConstructorArrivesFirstAndInOrder) {
+  launch(quorvel::SampleExtensionFactory([](quorvel::Broadcast& to) { return std::make_unique<Hasty>(to); }));
+  Accepting daemon(ipc_, broadcastDaemonProtocol(), broadcastExtensionProtocol());
+  ASSERT_TRUE(auxiliary_.call("setEndpoint", {daemon.endpoint().rendezvous()}));
+  for (const char* member : {"updateServiceInfo", "updateBroadcastURL", "finishBroadcastWithError", "ping"}) {
+    EXPECT_EQ(daemon.calls->takeCall().member, member);
+  }
+}
+
+TEST_F(ExtensionLibrary, ThePausesOfAPayloadAreTakenOutOfTheTimeOfItsSound) {
+  Diary diary;
+  launch(authorWith(diary));
+  Accepting daemon(ipc_, broadcastDaemonProtocol(), broadcastExtensionProtocol());
+  ASSERT_TRUE(auxiliary_.call("setEndpoint", {daemon.endpoint().rendezvous()}));
+  const auto timeWith = [&](const Data& pauses) {
+    Dictionary payload = audioPayload(2);
+    payload[broadcastpayload::kPauses] = pauses;
+    diary.sound.reset();
+    EXPECT_TRUE(daemon.call("processPayload", {std::move(payload)}));
+    return diary.sound ? diary.sound->presentationTime : -1ms;
+  };
+  EXPECT_EQ(timeWith(rawBytes(MediaTime::make(200, 1000))), 50ms);
+  EXPECT_EQ(timeWith(rawBytes(MediaTime::make(150, 1000))), 100ms);
+  EXPECT_EQ(timeWith(rawBytes(MediaTime::make(300, 1000))), -1ms) << "longer than time itself";
+  EXPECT_EQ(timeWith(Data(23)), -1ms) << "malformed";
+  daemon.connection().invalidate();
+  valueOf(diary.gone.get_future());
 }
 
 }  // namespace

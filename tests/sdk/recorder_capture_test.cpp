@@ -105,6 +105,58 @@ TEST_F(RecorderCapture, AudioCarriesItsFormatAndSource) {
   EXPECT_EQ(samples_[0].presentationTime, 5s);
 }
 
+TEST_F(RecorderCapture, SoundLiesOnTheTimelineOfThePictures) {
+  const auto sendSound = [&](int64_t capturedMilliseconds, int64_t frames, int64_t type = 2) {
+    Data bytes(static_cast<size_t>(frames) * 2);
+    for (size_t i = 0; i < bytes.size(); ++i) bytes[i] = static_cast<uint8_t>(i / 2);
+    AudioStreamDescription format = kFormat;
+    format.sampleRate = 1000;
+    SampleTimingInfo timing = kTiming;
+    timing.presentationTimeStamp = MediaTime::make(capturedMilliseconds, 1000);
+    tellClient("captureHandlerWithAudioSample", {bytes, rawBytes(format), frames, type, rawBytes(timing)});
+    run();
+  };
+  const auto tellPauses = [&](int64_t milliseconds) {
+    tellClient("captureTimelineDidChange", {rawBytes(MediaTime::make(milliseconds, 1000))});
+  };
+  sendSound(1000, 100);
+  sendSound(1100, 100);                                // up to the pause; the last picture was that of 1150
+  tellClient("captureTimelineDidChange", {Data(23)});  // nonsense changes nothing
+  tellPauses(3000);
+  sendSound(4160, 20);   // before the end of what was given
+  sendSound(4180, 100);  // its first 20 are
+  sendSound(4280, 100);
+  sendSound(4190, 10, 3);  // the microphone has an end of its own
+  tellPauses(10'000);
+  sendSound(11'500, 100);  // after a gap
+  ASSERT_EQ(samples_.size(), 6u);
+  EXPECT_EQ(samples_[1].presentationTime, 1100ms);
+  EXPECT_EQ(samples_[2].presentationTime, 1200ms);
+  EXPECT_EQ(samples_[2].frameCount, 80);
+  EXPECT_EQ(samples_[2].bytes.size(), 160u);
+  EXPECT_EQ(samples_[2].bytes.front(), 20);
+  EXPECT_EQ(samples_[3].presentationTime, 1280ms);
+  EXPECT_EQ(samples_[3].frameCount, 100);
+  EXPECT_EQ(samples_[4].presentationTime, 1190ms);
+  EXPECT_EQ(samples_[5].presentationTime, 1500ms);
+
+  samples_.clear();
+  tellPauses(0);
+  sendSound(61'000, 10);
+  tellPauses(60'000);
+  sendSound(61'600, 10);  // far before what lay wrongly
+  sendSound(1000, 10);    // captured before its pauses were over
+  ASSERT_EQ(samples_.size(), 2u);
+  EXPECT_EQ(samples_[1].presentationTime, 1600ms);
+
+  tellPauses(60'000);
+  killDaemon();
+  startDaemon();
+  startRecording();
+  sendSound(70'000, 10);
+  EXPECT_EQ(samples_.back().presentationTime, 70s) << "another daemon tells its own";
+}
+
 TEST_F(RecorderCapture, MalformedSamplesAreDropped) {
   const Data timing = rawBytes(kTiming), format = rawBytes(kFormat);
   SampleTimingInfo timeless = kTiming;

@@ -8,6 +8,7 @@
 #include "daemon/client/QVClientProtocol.h"
 #include "daemon/client/QVDaemonProtocol.h"
 #include "extensions/QVSharedFrameObject.h"
+#include "platform/RawRecord.h"
 #include "platform/SampleBuffer.h"
 #include "platform/sdbus/SdBusIPC.h"
 #include "sdk/client/quorvel/Recorder.h"
@@ -140,6 +141,36 @@ TEST_F(RecorderSocket, RecordsCapturesAndStops) {
   ASSERT_TRUE(result->error) << "the daemon let the call go unanswered";
   EXPECT_EQ(result->error->code, quorvel::kErrorUnknown);
   EXPECT_NE(result->error->text.find("NoReply"), std::string::npos) << result->error->text;
+}
+
+/// Samples may be dropped, what tells their timeline may not, and neither overtakes the other.
+TEST_F(RecorderSocket, EachSampleIsPlacedByTheTimelineToldBeforeIt) {
+  constexpr int kSamples = 200;
+  startDaemon();
+  std::vector<quorvel::SampleTime> times;
+  Awaited<bool> isComplete;
+  quorvel::RecorderOptions options;
+  options.executor = [](const std::function<void()>& work) { work(); };
+  options.events.audioSample = [&](const quorvel::AudioSample& sample) {
+    times.push_back(sample.presentationTime);
+    if (times.size() == kSamples) isComplete.set(true);
+  };
+  recorder_ = quorvel::Recorder::create(std::move(options));
+  startRecording();
+  const platform::AudioStreamDescription format{
+      1000, platform::kAudioFormatLinearPCM, platform::kAudioFormatFlagIsSignedInteger, 2, 1, 2, 1, 16, 0};
+  const auto connection = daemonEnd();
+  for (int64_t i = 0; i < kSamples; ++i) {
+    // Captured every 11 ms, 10 of which are a pause; 1 ms long.
+    platform::SampleTimingInfo timing{};
+    timing.presentationTimeStamp = platform::MediaTime::make(11 * i, 1000);
+    connection->call("captureTimelineDidChange", {platform::rawBytes(platform::MediaTime::make(10 * i, 1000))}, {}, {});
+    connection->call(
+        "captureHandlerWithAudioSample",
+        {platform::Data{1, 2}, platform::rawBytes(format), int64_t{1}, int64_t{2}, platform::rawBytes(timing)}, {}, {});
+  }
+  ASSERT_TRUE(isComplete.take());
+  for (int i = 0; i < kSamples; ++i) EXPECT_EQ(times[static_cast<size_t>(i)], i * 1ms);
 }
 
 TEST_F(RecorderSocket, ADeadDaemonIsToldOnceAndFoundAgain) {

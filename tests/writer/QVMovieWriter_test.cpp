@@ -1,5 +1,8 @@
 #include "writer/QVMovieWriter.h"
 
+#include <cerrno>
+#include <cmath>
+
 #include "support/QuorvelErrors.h"
 #include "tests/fakes/FakeDevice.h"
 #include "writer/QVAudioMixUtility.h"
@@ -60,7 +63,7 @@ TEST_F(MovieWriterTest, EncoderSettingsFollowSizeDevicePreferenceAndConfiguratio
   };
   for (const Case& c : {Case{{1280, 720}, 3000000, 1280, 720}, Case{{1920, 1080}, 5000000, 1920, 1080},
                         Case{{1080, 1920}, 5000000, 1080, 1920}, Case{{1919.9, 1080}, 3000000, 1920, 1080},
-                        Case{{1001.5, 563.7}, 3000000, 1002, 564}}) {
+                        Case{{1001.5, 563.7}, 3000000, 1002, 564}, Case{{1, 1}, 3000000, 2, 2}}) {
     started(c.size);
     EXPECT_EQ(bitRate(), c.rate);
     const Dictionary& video = device_.movies.video().settings;
@@ -79,6 +82,46 @@ TEST_F(MovieWriterTest, EncoderSettingsFollowSizeDevicePreferenceAndConfiguratio
   EXPECT_EQ(bitRate(), 900000);
   EXPECT_EQ(valueForKey(compression(), settings::kMaxKeyFrameInterval).asInteger(), 60);
   EXPECT_TRUE(device_.movies.appAudio().realTime);
+}
+
+TEST_F(MovieWriterTest, TakesOnlyABitRateAsOverride) {
+  for (const Value& usable : {Value(int32_t{12000000}), Value(uint64_t{12000000}), Value(12000000.0)}) {
+    device_.preferences.set("com.tarnwick.quorveld", "QVBitRateOverride", usable);
+    started();
+    EXPECT_EQ(bitRate(), 12000000);
+  }
+  EXPECT_EQ(device_.log.countContaining("QVBitRateOverride"), 0u);
+  const std::vector<Value> unusable{Value(true),        Value(1e30), Value(1.5),  Value(std::nan("")),
+                                    Value(int64_t{-5}), Value(0.0),  Value("12"), Value(UINT64_MAX)};
+  for (const Value& value : unusable) {
+    device_.preferences.set("com.tarnwick.quorveld", "QVBitRateOverride", value);
+    started();
+    EXPECT_EQ(bitRate(), 3000000);
+  }
+  EXPECT_EQ(device_.log.count("QVBitRateOverride is no usable bit rate, ignored"), unusable.size());
+}
+
+TEST_F(MovieWriterTest, HandsOnOnlyUsableCompressionProperties) {
+  const auto with = [&](const Dictionary& custom) {
+    started({1280, 720}, QVBroadcastConfiguration{5, custom});
+    return compression();
+  };
+  started();
+  const Dictionary defaults = compression();
+  const Dictionary unusable{{settings::kAverageBitRate, Value(int64_t{-1})},
+                            {settings::kExpectedSourceFrameRate, Value(int32_t{0})},
+                            {settings::kMaxKeyFrameInterval, Value(1e12)},
+                            {settings::kProfileLevel, Value(int32_t{100})}};
+  EXPECT_EQ(with(unusable), defaults);
+  for (const auto& [key, value] : unusable) {
+    EXPECT_EQ(device_.log.count("compression property " + key + " has no usable value, ignored"), 1u);
+  }
+  const Dictionary usable = with({{settings::kMaxKeyFrameInterval, Value(30.0)},
+                                  {settings::kProfileLevel, Value(settings::kProfileMainAutoLevel)},
+                                  {"Quality", Value(0.5)}});
+  EXPECT_EQ(valueForKey(usable, settings::kMaxKeyFrameInterval), Value(int64_t{30}));
+  EXPECT_EQ(valueForKey(usable, settings::kProfileLevel), Value(settings::kProfileMainAutoLevel));
+  EXPECT_EQ(valueForKey(usable, "Quality"), Value(0.5));  // for the encoder to know
 }
 
 TEST_F(MovieWriterTest, TimelineStartsAtTheFirstFrameAndTimesRise) {
@@ -131,6 +174,8 @@ TEST_F(MovieWriterTest, FailuresAnswerWithoutAMovie) {
   device_.movies.startFails = true;
   auto writer = started();
   EXPECT_FALSE(append(*writer, 100));
+  EXPECT_FALSE(append(*writer, 200));
+  EXPECT_EQ(device_.movies.last().starts, 1);
   EXPECT_TRUE(device_.log.contains("ERROR starting asset writer"));
   EXPECT_EQ(finish(writer), "no movie");
 
@@ -159,6 +204,66 @@ TEST_F(MovieWriterTest, AnAnnouncedStopEndsTheMovieThereUnlessItResumes) {
   EXPECT_FALSE(device_.movies.last().sessionEnd.isValid());
 }
 
+TEST_F(MovieWriterTest, AStopEndsTheMovieAtItsTimeUnlessAnAnnouncedOneCameBefore) {
+  const MediaTime stop = MediaTime::make(430, platform::kHostTimescale);
+  auto writer = started();
+  append(*writer, 100);
+  writer->endAtSourceTime(stop);
+  finish(writer);
+  EXPECT_EQ(device_.movies.last().sessionEnd, stop);
+  writer = started();
+  append(*writer, 100);
+  append(*writer, 200);
+  writer->notifyRecordingMayBeStopped();
+  append(*writer, 300);
+  writer->endAtSourceTime(stop);
+  finish(writer);
+  EXPECT_EQ(device_.movies.last().sessionEnd, MediaTime::make(200, platform::kHostTimescale));
+}
+
+TEST_F(MovieWriterTest, TellsWhetherTheMovieIsSoundAndWhatFailed) {
+  auto writer = started();
+  append(*writer, 100);
+  EXPECT_FALSE(writer->isSound());
+  finish(writer);
+  EXPECT_TRUE(writer->isSound());
+  EXPECT_EQ(writer->failure(), std::nullopt);
+
+  writer = started();
+  append(*writer, 100);
+  device_.movies.last().status = AssetWriterStatus::Failed;
+  EXPECT_EQ(finish(writer), std::string(fakes::kStore) + "/Game.mp4");
+  EXPECT_FALSE(writer->isSound());
+
+  device_.movies.createFails = true;
+  writer = started();
+  ASSERT_TRUE(writer->failure().has_value());
+  EXPECT_EQ(writer->failure()->code, EACCES);
+  finish(writer);
+  EXPECT_FALSE(writer->isSound());
+}
+
+/// Each trim stands for itself: another one runs, and nobody holds the writer any more.
+TEST_F(MovieWriterTest, TrimsAtOnceWithoutTheirWriter) {
+  auto writer = started();
+  const std::weak_ptr<QVMovieWriter> living = writer;
+  device_.disk.addFile("/m.mp4", "movie");
+  device_.exports.holds = true;
+  std::vector<std::string> trimmed;
+  for (const char* path : {"/a.mp4", "/b.mp4"}) {
+    writer->trimMovieWithURL(URL::fileURL("/m.mp4"), 1, 1, URL::fileURL(path),
+                             [&](const auto& url) { trimmed.push_back(url->path()); });
+  }
+  EXPECT_TRUE(device_.exports.sessions.empty());  // no movie is opened on the caller's thread
+  writer.reset();
+  device_.run();
+  EXPECT_TRUE(living.expired());
+  ASSERT_EQ(device_.exports.sessions.size(), 2u);
+  device_.exports.sessions[1]->end();
+  device_.exports.sessions[0]->end();
+  EXPECT_EQ(trimmed, (std::vector<std::string>{"/b.mp4", "/a.mp4"}));
+}
+
 TEST_F(MovieWriterTest, TrimCutsWholeSecondsAndReportsFailure) {
   const auto writer = started();
   const URL movie = URL::fileURL("/m.mp4");
@@ -167,33 +272,90 @@ TEST_F(MovieWriterTest, TrimCutsWholeSecondsAndReportsFailure) {
     writer->trimMovieWithURL(movie, start, end, URL::fileURL("/t.mp4"), [&](const auto& url) { trimmed = url; });
     device_.run();
   };
+  device_.disk.addFile("/m.mp4", "movie");
   trim(2.4, 2.6);
   EXPECT_EQ(trimmed, URL::fileURL("/t.mp4"));
   EXPECT_EQ(device_.exports.sessions.back()->range.start, MediaTime::make(2, 1));
   EXPECT_EQ(device_.exports.sessions.back()->range.duration, MediaTime::make(90, 1));
+  // A success is believed where there is a movie.
+  device_.disk.addFile("/m.mp4", "");
+  trim(1, 1);
+  EXPECT_EQ(trimmed, std::nullopt);
+  EXPECT_FALSE(device_.disk.itemExists("/t.mp4"));
+  trimmed = movie;
+  (void)device_.disk.removeItem("/m.mp4");
+  trim(1, 1);
+  EXPECT_EQ(trimmed, std::nullopt);
+  EXPECT_EQ(device_.log.count("QVMovieWriter: Export Trim Video Failed, due to error: " + std::to_string(ENOENT)), 1u);
+  EXPECT_EQ(device_.log.count("QVMovieWriter: Export Trim succeeded"), 1u);
+  device_.disk.addFile("/m.mp4", "movie");
+  trimmed = movie;
   device_.exports.result = platform::ExportStatus::Failed;
   trim(1, 1);
   EXPECT_EQ(trimmed, std::nullopt);
 }
 
-TEST_F(MovieWriterTest, MixNamesEveryTrackAndMapsItsErrors) {
-  std::optional<URL> mixed;
-  std::optional<platform::Error> error;
-  const auto mix = [&](const std::optional<URL>& movie) {
-    QVAudioMixUtility::mixAudioForMovie(movie, [&](const auto& url, const auto& failure) {
-      mixed = url;
+class MixTest : public testing::Test {
+ protected:
+  struct Mix {
+    std::shared_ptr<MovieClaim> movie;
+    std::optional<platform::Error> error;
+  };
+  Mix mix(const std::optional<URL>& movie) {
+    Mix answer;
+    QVAudioMixUtility::mixAudioForMovie(movies_, movie, [&](const auto& mixed, const auto& error) {
+      answer = {mixed, error};
+    });
+    device_.run();
+    return answer;
+  }
+  [[nodiscard]] std::vector<std::string> store() { return device_.disk.contentsOfDirectory(fakes::kStore).value(); }
+
+  fakes::FakeDevice device_;
+  const std::shared_ptr<QVTemporaryMovies> movies_ = QVTemporaryMovies::create();
+  const URL movie_ = URL::fileURL(pathInStore("Game.mp4"));
+};
+
+TEST_F(MixTest, EveryTrackGoesIntoAMixOfItsOwnWhichItsClaimOwns) {
+  device_.disk.addFile(movie_.path(), "game");
+  device_.clock.setNow({1700000000.9});
+  const Mix first = mix(movie_);
+  EXPECT_EQ(device_.exports.sessions.back()->mix.size(), 2u);
+  ASSERT_TRUE(first.movie);
+  EXPECT_EQ(first.movie->path(), std::string(fakes::kStore) + "/QVQuorvel_Final1700000000.mp4");
+  const Mix second = mix(movie_);
+  ASSERT_TRUE(second.movie);
+  EXPECT_EQ(second.movie->path(), std::string(fakes::kStore) + "/QVQuorvel_Final1700000000 2.mp4");
+  EXPECT_EQ(movies_->deleteAllTempFiles(), 4) << "the movie, but neither mix";
+  EXPECT_TRUE(first.movie->hasFile() && second.movie->hasFile());
+}
+
+TEST_F(MixTest, TheMovieIsNotOpenedInTheCallersThread) {
+  device_.disk.addFile(movie_.path(), "game");
+  QVAudioMixUtility::mixAudioForMovie(movies_, movie_, [](const auto&, const auto&) {});
+  EXPECT_TRUE(device_.exports.sessions.empty());
+  device_.run();
+  EXPECT_EQ(device_.exports.sessions.size(), 1u);
+}
+
+TEST_F(MixTest, WhatFailsLeavesNothing) {
+  EXPECT_EQ(mix(std::nullopt).error->code, errorcode::kMixingFailure);
+  EXPECT_EQ(mix(movie_).error->code, errorcode::kFailedToSave) << "a success without a file";
+  device_.disk.addFile(movie_.path(), "game");
+  device_.exports.holds = true;
+  for (const auto status : {platform::ExportStatus::Cancelled, platform::ExportStatus::Failed}) {
+    std::optional<platform::Error> error;
+    QVAudioMixUtility::mixAudioForMovie(movies_, movie_, [&](const auto& mixed, const auto& failure) {
+      EXPECT_FALSE(mixed);
       error = failure;
     });
-  };
-  device_.clock.setNow({1700000000.9});
-  mix(URL::fileURL("/m.mp4"));
-  EXPECT_TRUE(mixed->path().ends_with("/QVQuorvel_Final1700000000.mp4"));
-  EXPECT_EQ(device_.exports.sessions.back()->mix.size(), 2u);
-  mix(std::nullopt);
-  EXPECT_EQ(error->code, errorcode::kMixingFailure);
-  device_.exports.result = platform::ExportStatus::Cancelled;
-  mix(URL::fileURL("/m.mp4"));
-  EXPECT_EQ(error->code, errorcode::kFailedToSave);
+    device_.run();
+    device_.exports.sessions.back()->result = status;
+    device_.exports.sessions.back()->end();
+    device_.run();
+    EXPECT_EQ(error->code, errorcode::kFailedToSave);
+    EXPECT_EQ(store(), std::vector<std::string>{"Game.mp4"}) << "half a mix was left";
+  }
 }
 
 }  // namespace

@@ -1,5 +1,6 @@
 #include "platform/linux/launcher/AnotherUser.h"
 
+#include <dirent.h>
 #include <fcntl.h>
 #include <grp.h>
 #include <linux/capability.h>
@@ -13,6 +14,8 @@
 #include <cerrno>
 #include <cstdint>
 #include <filesystem>
+#include <memory>
+#include <string_view>
 #include <system_error>
 
 namespace qv::platform::launcher {
@@ -33,11 +36,37 @@ uint32_t hashOf(const std::string& text) {
   return hash;
 }
 
+struct CloseDirectory {
+  void operator()(DIR* directory) const { ::closedir(directory); }
+};
+
+/// Another process of the extension may be changing what lies here meanwhile: nothing is reached but through open
+/// directories, no link is followed, and what is gone is gone.
+void giveEntriesTo(int directory, uid_t user) {
+  const std::unique_ptr<DIR, CloseDirectory> entries(::fdopendir(directory));
+  if (!entries) {
+    ::close(directory);
+    return;
+  }
+  while (const dirent* entry = ::readdir(entries.get())) {
+    const std::string_view name = entry->d_name;
+    struct stat info {};
+    if (name == "." || name == ".." || ::fstatat(directory, entry->d_name, &info, AT_SYMLINK_NOFOLLOW) != 0) continue;
+    // A second name of a file may be of one elsewhere.
+    if (!S_ISDIR(info.st_mode) && info.st_nlink > 1) continue;
+    // What it cannot have it cannot write; nothing else depends on it.
+    if (info.st_uid != user && ::fchownat(directory, entry->d_name, user, user, AT_SYMLINK_NOFOLLOW) != 0) continue;
+    if (!S_ISDIR(info.st_mode)) continue;
+    const int inner = ::openat(directory, entry->d_name, O_RDONLY | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC);
+    if (inner >= 0) giveEntriesTo(inner, user);
+  }
+}
+
 void giveTo(const std::string& directory, uid_t user) {
   check(::lchown(directory.c_str(), user, user), directory);
-  for (const auto& entry : std::filesystem::recursive_directory_iterator(directory)) {
-    check(::lchown(entry.path().c_str(), user, user), entry.path());
-  }
+  const int opened = ::open(directory.c_str(), O_RDONLY | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC);
+  check(opened, directory);
+  giveEntriesTo(opened, user);
 }
 
 void hideAllBut(const std::string& container, const std::string& dataDirectory) {

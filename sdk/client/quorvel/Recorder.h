@@ -111,8 +111,10 @@ struct Events {
   std::function<void(bool recording)> recordingStateChanged = {};
   std::function<void(Dictionary)> broadcastServiceInfoChanged = {};
   std::function<void(std::string url)> broadcastURLChanged = {};
-  /// Of a capture. A pause is taken out of the times of video, not of those of audio: after each pause the two lie
-  /// apart by the pause's length.
+  /// Of a capture. The times of pictures and of sound lie on one timeline: CLOCK_MONOTONIC at their capture, less the
+  /// pauses so far, to the nanosecond. A pause takes away what lies between the last picture before it and the first
+  /// one after it, so the first picture after a pause has the time of the last one before. Sound that would then
+  /// overlap what was given already (by half a second at the most) is cut off: the times of each source only grow.
   std::function<void(VideoFrame)> videoFrame = {};
   std::function<void(AudioSample)> audioSample = {};
   std::function<void(Error)> recordingLockInterrupted = {};

@@ -43,8 +43,8 @@ inline constexpr const char kErrorDomain[] = "com.tarnwick.Quorvel.QVRecordingEr
 
 struct Error {
   int64_t code = kErrorUnknown;
-  std::string key;   ///< its name, e.g. "RECORDING_ERROR_USER_DECLINED"
-  std::string text;  ///< for the user, in the user's language where it comes from the daemon
+  std::string key = {};   ///< its name, e.g. "RECORDING_ERROR_USER_DECLINED"
+  std::string text = {};  ///< for the user, in the user's language where it comes from the daemon
   std::string domain = kErrorDomain;
 };
 

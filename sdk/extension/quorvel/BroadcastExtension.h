@@ -38,7 +38,8 @@ enum class Orientation : uint32_t {
 // Sample mode -----------------------------------------------------------------------------------------
 
 /// What an extension in sample mode may tell the application and the daemon. Nothing is answered, and nothing is sent
-/// any more once the daemon has gone.
+/// any more once the daemon has gone. It may be used from the constructor of the extension's object on: what is said
+/// there arrives first, in its order, and `finishBroadcastWithError` there ends the broadcast before it has begun.
 ///
 /// Threading: thread-safe, for as long as the extension's object lives.
 class QUORVEL_API Broadcast {
@@ -57,15 +58,18 @@ class QUORVEL_API Broadcast {
 
 /// An extension that is sent every sample: the manifest names "QVBroadcastProcessModeSampleBuffer".
 ///
-/// One object for each broadcast: made before its first call, destroyed when the connection has ended. The destructor
+/// One object for each broadcast, in a process of its own where the daemon launched it: made before its first call,
+/// destroyed when the connection has ended. The destructor
 /// is the place to close what `finished` did not get to, since a daemon that goes away calls nothing.
 ///
 /// A call that returns late holds the others up. The daemon keeps a few samples (8 pictures, 2 s of sound), then drops
 /// the oldest pictures: so hand work that takes more than a few milliseconds to a thread of your own, and let go of
 /// frames soon (see VideoFrame): there are 8 of them.
 ///
-/// All times lie on one timeline, CLOCK_MONOTONIC less the pauses so far. The daemon takes pauses out of the times of
-/// pictures; the library does so for sound, to within a few milliseconds, from how late pictures come in.
+/// The times of pictures and of sound lie on one timeline: CLOCK_MONOTONIC at their capture, less the pauses so far, to
+/// the nanosecond. A pause takes away what lies between the last picture before it and the first one after it, so the
+/// first picture after a pause has the time of the last one before. Sound that would then overlap what was given
+/// already (by half a second at the most) is cut off: the times of each source only grow.
 ///
 /// Threading: all calls come one at a time on one thread of the library, the destructor's too.
 class QUORVEL_API SampleExtension {
@@ -80,7 +84,8 @@ class QUORVEL_API SampleExtension {
   virtual void finished() = 0;
   virtual void processVideo(VideoFrame frame, Orientation orientation) = 0;
   virtual void processAudio(AudioSample sample) = 0;
-  /// At the start of the broadcast, the bundle identifier of the application in front.
+  /// Once for a broadcast, the bundle identifier of the application in front: right after `started`, before any sample;
+  /// where no application is in front then, with the first that comes to the front.
   virtual void frontmostApplication(std::string /*bundleID*/) {}
 };
 using SampleExtensionFactory = std::function<std::unique_ptr<SampleExtension>(Broadcast&)>;
@@ -108,7 +113,7 @@ struct ClipResult {
 using ClipCompletion = std::function<void(ClipResult)>;
 
 /// An extension that is sent clips: the manifest names no process mode. One object for the life of the process, which
-/// may see several broadcasts.
+/// takes one broadcast; it sees a later part of one only where a former process of the broadcast has died.
 ///
 /// Threading: as of SampleExtension.
 class QUORVEL_API ClipExtension {

@@ -1,0 +1,141 @@
+#include "daemon/MovieHandover.h"
+
+#include <utility>
+
+#include "platform/Log.h"
+#include "support/QuorvelErrors.h"
+#include "writer/QVAudioMixUtility.h"
+
+namespace qv {
+
+using platform::Error;
+using platform::URL;
+namespace logs = platform::logs;
+
+namespace {
+
+constexpr const char kSave[] = "saveVideoToCameraRoll";
+constexpr const char kStopByOtherStart[] = "stopCurrentRecordingSession";
+
+void logResult(const char* operation, const std::optional<Error>& error) {
+  if (error) {
+    QV_LOG_ERROR(logs::kDaemon, "QVRecordingManager:%s: Video saved to camera roll failed", operation);
+  } else {
+    QV_LOG(logs::kDaemon, "QVRecordingManager:%s: Video saved to camera roll successful", operation);
+  }
+}
+
+void logRemoval(const std::optional<Error>& error) {
+  if (error) QV_LOG_ERROR(logs::kDaemon, "error removing file with code: %i", static_cast<int>(error->code));
+}
+
+}  // namespace
+
+/// One movie on its way into the photo library. Touched on the sequence only; dropped with it, the movie is its
+/// application's as before.
+struct MovieHandover::Storing {
+  const char* operation;  ///< what the log calls it
+  std::shared_ptr<MovieSave> save;
+  KeptHandler handler;
+  std::shared_ptr<MovieClaim> mixed;  ///< where mixing worked
+};
+
+MovieHandover::MovieHandover(platform::Platform& platform, platform::SerialQueue& sequence,
+                             std::shared_ptr<QVTemporaryMovies> movies)
+    : photoLibrary_(*platform.photoLibrary),
+      sequence_("com.tarnwick.quorveld.handover", sequence),
+      movies_(std::move(movies)) {}
+
+void MovieHandover::saveVideoToCameraRoll(const std::string& bundleID, const URL& movie, Handler handler) {
+  auto save = movies_->beginSave(bundleID, movie);
+  if (!save) {
+    QV_LOG_ERROR(logs::kDaemon, "a movie that was not handed to the caller is not saved");
+    handler(_qvUserErrorForCode(errorcode::kFailedToSave));
+    return;
+  }
+  mixAndStore(std::make_shared<Storing>(
+      Storing{kSave, std::move(save),
+              [handler = std::move(handler)](const auto&, const auto& error) { handler(error); }, nullptr}));
+}
+
+void MovieHandover::storeSystemRecording(const std::shared_ptr<MovieClaim>& movie, const std::string& bundleID,
+                                         KeptHandler handler) {
+  if (auto save = handAndSave(movie, bundleID)) {
+    store(std::make_shared<Storing>(Storing{kStopByOtherStart, std::move(save), std::move(handler), nullptr}));
+    return;
+  }
+  const Error error = _qvUserErrorForCode(errorcode::kFailedToSave);
+  logResult(kStopByOtherStart, error);
+  handler(std::nullopt, error);
+}
+
+void MovieHandover::saveInterrupted(const std::shared_ptr<MovieClaim>& movie, const std::string& bundleID,
+                                    KeptHandler handler) {
+  const KeptHandler logged = [handler = std::move(handler)](const auto& kept, const auto& error) {
+    if (error) QV_LOG_ERROR(logs::kDaemon, "error saving file with code: %i", static_cast<int>(error->code));
+    if (handler) handler(kept, error);
+  };
+  if (auto save = handAndSave(movie, bundleID)) {
+    mixAndStore(std::make_shared<Storing>(Storing{kSave, std::move(save), logged, nullptr}));
+  } else {
+    logged(std::nullopt, _qvUserErrorForCode(errorcode::kFailedToSave));
+  }
+}
+
+std::shared_ptr<MovieSave> MovieHandover::handAndSave(const std::shared_ptr<MovieClaim>& movie,
+                                                      const std::string& bundleID) {
+  if (!movie || !movie->hasFile()) return nullptr;
+  movie->handTo(bundleID);
+  return movies_->beginSave(bundleID, movie->url());
+}
+
+void MovieHandover::discard(const std::string& bundleID, std::function<void()> handler) {
+  movies_->discardLast(bundleID, [weak = weak_from_this(), handler = std::move(handler)](const auto& error) {
+    logRemoval(error);
+    onSequence(weak, [handler](MovieHandover&) { handler(); });
+  });
+}
+
+void MovieHandover::mixAndStore(const std::shared_ptr<Storing>& storing) {
+  QVAudioMixUtility::mixAudioForMovie(movies_, storing->save->movie(),
+                                      [weak = weak_from_this(), storing](const auto& mixed, const auto& error) {
+                                        if (error) QV_LOG_ERROR(logs::kDaemon, "Error Mixing video Audio tracks");
+                                        QV_LOG(logs::kDaemon, "QVRecordingManager: saveVideoToCameraRoll:");
+                                        onSequence(weak, [storing, mixed](MovieHandover& self) {
+                                          storing->mixed = mixed;
+                                          self.store(storing);
+                                        });
+                                      });
+}
+
+void MovieHandover::store(const std::shared_ptr<Storing>& storing) {
+  photoLibrary_.createAsset(
+      storing->mixed ? storing->mixed->url() : storing->save->movie(), platform::PhotoResourceType::Video,
+      [weak = weak_from_this(), storing](const std::optional<Error>& error) {
+        logResult(storing->operation, error);
+        onSequence(weak, [storing, error](MovieHandover& self) { self.libraryAnswered(storing, error); });
+      });
+}
+
+/// The movie's right ends before anybody is told, so that a refused movie can be saved again at once.
+void MovieHandover::libraryAnswered(const std::shared_ptr<Storing>& storing, const std::optional<Error>& error) {
+  const auto kept = error ? std::optional(storing->save->movie()) : std::nullopt;
+  if (!error) storing->save->succeeded(nullptr);
+  storing->save = nullptr;
+  if (!storing->mixed) {
+    storing->handler(kept, error);
+    return;
+  }
+  storing->mixed->remove([weak = weak_from_this(), storing, kept, error](const std::optional<Error>& removalError) {
+    logRemoval(removalError);
+    onSequence(weak, [storing, kept, answer = error ? error : removalError](MovieHandover&) {
+      storing->handler(kept, answer);
+    });
+  });
+}
+
+void MovieHandover::onSequence(const std::weak_ptr<MovieHandover>& weakSelf, Work work) {
+  if (const auto self = weakSelf.lock()) self->sequence_.async(weakSelf, std::move(work));
+}
+
+}  // namespace qv

@@ -1,0 +1,95 @@
+#include <utility>
+
+#include "daemon/QVRecordingManager.h"
+#include "platform/Log.h"
+#include "support/QuorvelErrors.h"
+
+namespace qv {
+
+using platform::Error;
+using platform::URL;
+namespace logs = platform::logs;
+
+/// The stop that somebody asked for: a client, its leaving, or another start.
+void QVRecordingManager::stopRecordingSession(const Session& session, RecordingEnd end) {
+  // A session remembers what its last recording was, so one that does not record makes no sound when its client goes.
+  if (session->isRecording()) checkAndPlaySystemRecordSound(session, false);
+  QV_LOG(logs::kDaemon, "QVRecordingManager: stopRecordingSession:handler:");
+  broadcasts_->clearPresentation();
+  if (!session->isRecording()) return;
+  if (!end.handler) QV_LOG(logs::kDaemon, "recording stopped without handler!");
+  session->recording()->end(std::move(end));
+}
+
+/// The movie of an application goes; that of a system recording goes to the photo library, or stays its client's where
+/// the library refuses it.
+void QVRecordingManager::stopCurrentRecordingSessionWithHandler() {
+  QV_LOG(logs::kDaemon, "QVRecordingManager:stopCurrentRecordingSession:");
+  for (const Session& session : sessions_->recordingSessions()) {
+    RecordingEnd end{.cause = _qvUserErrorForCode(errorcode::kInterrupted), .movie = moviefate::remove()};
+    if (session->isSystemRecording()) {
+      end.movie = [handover = handover_, bundleID = session->bundleID()](std::shared_ptr<MovieClaim> movie, auto done) {
+        handover->storeSystemRecording(std::move(movie), bundleID,
+                                       [done](const std::optional<URL>& kept, const auto&) { done(kept); });
+      };
+    }
+    stopRecordingSession(session, std::move(end));
+  }
+}
+
+void QVRecordingManager::interruptOtherRecordingSessionAgainstSession(const Session& session) {
+  QV_LOG(logs::kDaemon, "QVRecordingManager:interruptRecordingSessions");
+  for (const Session& other : sessions_->recordingSessions()) {
+    if (other == session) continue;
+    QV_LOG(logs::kDaemon, "interrupted session");
+    other->recording()->end(
+        {.cause = _qvUserErrorForCode(errorcode::kInterrupted), .movie = moviefate::handTo(other->bundleID())});
+  }
+}
+
+void QVRecordingManager::endRecordingsOfApplications(const Error& cause) {
+  for (const Session& session : sessions_->recordingSessions()) {
+    if (session->isSystemRecording()) continue;
+    session->recording()->end({.cause = cause, .movie = moviefate::handTo(session->bundleID())});
+  }
+}
+
+void QVRecordingManager::recordingStarted(const Session& session) {
+  if (!session->isRecording()) return;
+  if (session->isSystemRecording()) {
+    foreground_->follow(session->recording());
+  } else {
+    foreground_->stopFollowing();
+    layoutRule_->observe();
+  }
+}
+
+void QVRecordingManager::recordingSessionWillStop(const Session&, const std::shared_ptr<QVRecording>& recording) {
+  if (recording->settings().systemRecording) foreground_->stopFollowing(*recording);
+  layoutRule_->ignore();
+}
+
+void QVRecordingManager::recordingSessionStoppedWithError(const Session& session, const std::optional<Error>& error,
+                                                          const std::optional<URL>& movie) {
+  QV_LOG(logs::kDaemon, "QVRecordingManager:recordingSessionStoppedWithError:movieURL:");
+  alerts_.alertUserOfEnd(session, error);
+  // Told again when the application is in front and records anew: then it can be expected to listen.
+  if (movie && error && error->code == errorcode::kInterrupted) session->setInterruptedMovieURL(movie);
+  if (const auto proxy = session->clientProxy()) proxy->stopRecordingWithError(error, movie);
+}
+
+void QVRecordingManager::recordingSessionDidStop(const Session&, const std::shared_ptr<QVRecording>& recording) {
+  QV_LOG(logs::kDaemon, "QVRecordingManager:resetStatesForSession:");
+  starts_.recordingEnded(*recording);
+  if (recording->wasStarted()) broadcasts_->recordingEnded(recording);
+}
+
+void QVRecordingManager::broadcastSessionDidUpdateServiceInfo(const Session& session,
+                                                              const platform::Dictionary& serviceInfo) {
+  QV_LOG(logs::kDaemon, "QVRecordingManager:broadcastSessionDidUpdateServiceInfo:");
+  if (const auto proxy = session->clientProxy()) proxy->updateBroadcastServiceInfo(serviceInfo);
+}
+
+void QVRecordingManager::broadcastSessionDidUpdateDuration(QVRecordingSession&, double) {}
+
+}  // namespace qv

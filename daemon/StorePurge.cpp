@@ -1,0 +1,43 @@
+#include "daemon/StorePurge.h"
+
+#include "platform/Log.h"
+#include "support/QVDiskSpace.h"
+#include "support/QVTemporaryFiles.h"
+
+namespace qv {
+
+namespace logs = platform::logs;
+
+namespace {
+constexpr double kTimeToLive = 86400.0;  // seconds
+constexpr int32_t kUrgencyEndsMovies = 2;
+constexpr int32_t kUrgencyTakesAll = 3;
+}  // namespace
+
+int64_t StorePurge::purgeableSpace() {
+  QV_LOG(logs::kDaemon, "QVRecordingManager: cache delete purgeable space callback");
+  std::optional<platform::Error> error;
+  return _srSizeOfTempDir(&error);
+}
+
+int64_t StorePurge::purge(int32_t urgency) {
+  QV_LOG(logs::kDaemon, "QVRecordingManager: cache delete purge callback");
+  if (urgency >= kUrgencyTakesAll) {
+    recordings_.endAndRemove();
+    return movies_->deleteAllTempFiles();
+  }
+  const bool wasRecording = recordings_.isAnyRecording();
+  if (urgency >= kUrgencyEndsMovies && !_srDeviceHasSufficientFreeSpaceToContinueRecording()) {
+    recordings_.endKeepingMovies();
+  }
+  // Only a recording that stopped while it was looked at leaves files that may go.
+  if (!wasRecording || recordings_.isAnyRecording()) return 0;
+  return movies_->deleteFilesOlderThanTimeToLiveInSeconds(kTimeToLive);
+}
+
+int64_t StorePurge::purgePeriodically() {
+  QV_LOG(logs::kDaemon, "QVRecordingManager: cache delete periodic callback");
+  return movies_->deleteFilesOlderThanTimeToLiveInSeconds(kTimeToLive);
+}
+
+}  // namespace qv

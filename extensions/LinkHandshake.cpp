@@ -1,0 +1,40 @@
+#include "extensions/LinkHandshake.h"
+
+#include "platform/Log.h"
+#include "support/QuorvelErrors.h"
+
+namespace qv {
+namespace {
+
+platform::Error invalidBroadcastSession() {
+  return _qvUserErrorForCode(errorcode::kInvalidBroadcastSession, platform::Dictionary{});
+}
+
+}  // namespace
+
+std::shared_ptr<LinkHandshake> LinkHandshake::start(Handler handler) {
+  auto handshake = std::make_shared<LinkHandshake>(std::move(handler));
+  handshake->deadline_ = AnswerDeadline::start(kExtensionPatience, [weak = std::weak_ptr(handshake)](bool isLate) {
+    const auto self = weak.lock();
+    if (!isLate || !self || !self->fail(invalidBroadcastSession())) return;
+    QV_LOG_ERROR(platform::logs::kExtensions, "the extension did not connect and ping in time");
+  });
+  return handshake;
+}
+
+LinkHandshake::~LinkHandshake() { fail(invalidBroadcastSession()); }
+
+void LinkHandshake::succeed() {
+  Stage stage = Stage::Waiting;
+  if (!stage_.compare_exchange_strong(stage, Stage::Ready) && stage == Stage::Failed) return;
+  if (handler_) handler_(std::nullopt);
+}
+
+bool LinkHandshake::fail(const platform::Error& error) {
+  Stage stage = Stage::Waiting;
+  if (!stage_.compare_exchange_strong(stage, Stage::Failed)) return false;
+  if (handler_) handler_(error);
+  return true;
+}
+
+}  // namespace qv

@@ -1,0 +1,24 @@
+#pragma once
+
+#include "extensions/QVBroadcastConfiguration.h"
+#include "extensions/QVBroadcastProtocols.h"
+#include "platform/Extensions.h"
+
+namespace qv {
+
+/// What a broadcast was set up with.
+struct QVBroadcastInfo {
+  platform::ExtensionRecordRef extension;
+  BroadcastProcessMode extensionProcessMode = BroadcastProcessMode::MovieClips;
+  platform::Dictionary extensionUserInfo;
+  QVBroadcastConfiguration extensionConfiguration;
+};
+
+/// The broadcast of one recording.
+struct BroadcastPlan {
+  QVBroadcastInfo info;
+  /// Of an extension that runs already; else it is launched.
+  platform::ListenerEndpoint listenerEndpoint;
+};
+
+}  // namespace qv

@@ -1,0 +1,94 @@
+#include "session/ClipsOutput.h"
+
+#include <utility>
+
+#include "platform/Log.h"
+#include "session/MovieNames.h"
+#include "session/PictureTransform.h"
+#include "support/QuorvelErrors.h"
+
+namespace qv {
+
+using platform::URL;
+namespace logs = platform::logs;
+
+namespace {
+
+void finishClip(const std::shared_ptr<ClipHandover>& handover, const Clip& clip, bool finished,
+                std::function<void()> handed) {
+  clip.writer->finishWritingWithHandler(
+      [handover, clip, finished, handed = std::move(handed)](const std::optional<URL>& url) {
+        QV_LOG(logs::kSession, "QVRecordingSession: finishWritingWithHandler");
+        handover->clipCompleted(clip.number, url && clip.file->hasFile() ? clip.file : nullptr, finished, handed);
+      });
+}
+
+}  // namespace
+
+ClipsOutput::ClipsOutput(std::shared_ptr<QVTemporaryMovies> movies, Clips clips, QVBroadcastInfo info,
+                         OutputEvents events)
+    : movies_(std::move(movies)),
+      clips_(std::move(clips)),
+      info_(std::move(info)),
+      events_(std::move(events)),
+      configuration_(info_.extensionConfiguration) {}
+
+void ClipsOutput::start(ReadyHandler handler) {
+  ClipHandoverEvents events;
+  events.configurationReceived = [weak = weak_from_this()](const QVBroadcastConfiguration& configuration) {
+    if (const auto self = weak.lock()) self->configurationReceived(configuration);
+  };
+  events.serviceInfoReceived = events_.serviceInfoReceived;
+  events.extensionFailed = [failed = events_.failed] {
+    failed(_qvUserErrorForCode(errorcode::kInvalidBroadcastSession));
+  };
+  handover_ = std::make_shared<ClipHandover>(info_.extension, info_.extensionUserInfo, std::move(events));
+  cutter_ = std::make_shared<ClipCutter>(
+      [this](int64_t number) { return makeClip(number, clips_.windowSize); },
+      [handover = handover_](const Clip& clip) { finishClip(handover, clip, false, nullptr); });
+  cutter_->setConfiguration(configuration_.load());
+  const Clip first = makeClip(1, clips_.size);
+  cutter_->begin(first);
+  first.writer->startWritingHandler([handler = std::move(handler)] { handler(std::nullopt); });
+}
+
+Clip ClipsOutput::makeClip(int64_t number, platform::Size size) {
+  auto file = movies_->claimNew(clipPath(clips_.bundleID, number));
+  auto writer = std::make_shared<QVMovieWriter>(size, file->path());
+  writer->setBroadcastConfig(configuration_.load());
+  writer->setSystemRecording(clips_.systemRecording);
+  return {number, std::move(file), std::move(writer)};
+}
+
+void ClipsOutput::configurationReceived(const QVBroadcastConfiguration& configuration) {
+  configuration_.store(configuration);
+  cutter_->setConfiguration(configuration);
+}
+
+bool ClipsOutput::appendVideo(const PlacedPicture& picture) {
+  const auto transform = clips_.systemRecording ? _affineTransformFromVellTransformFlags(picture.transformFlags)
+                                                : platform::AffineTransform::identity();
+  return cutter_->appendVideo(picture.sample, transform);
+}
+
+void ClipsOutput::appendAppAudio(const PlacedSound& sound) {
+  cutter_->_processAudioSampleBufferForMP4ClipHandler(sound.sample);
+}
+
+void ClipsOutput::appendMicrophone(const PlacedSound& sound) { cutter_->appendMicrophone(sound.sample); }
+
+void ClipsOutput::pause() {
+  if (cutter_) cutter_->pause();
+}
+
+void ClipsOutput::finish(platform::MediaTime endTime, FinishHandler handler) {
+  const auto last = cutter_ ? cutter_->end() : std::nullopt;
+  if (!last) {
+    handler({});
+    return;
+  }
+  if (endTime.isValid()) last->writer->endAtSourceTime(endTime);
+  finishClip(handover_, *last, true, [handler = std::move(handler)] { handler({}); });
+}
+
+}  // namespace qv

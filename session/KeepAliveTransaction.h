@@ -1,0 +1,23 @@
+#pragma once
+
+#include "platform/IPC.h"
+
+namespace qv {
+
+/// One keep-alive transaction: open as long as this lives.
+///
+/// Threading: thread-safe.
+class KeepAliveTransaction {
+ public:
+  explicit KeepAliveTransaction(platform::KeepAliveService& service) : service_(service) {
+    service_.beginTransaction();
+  }
+  ~KeepAliveTransaction() { service_.endTransaction(); }
+  KeepAliveTransaction(const KeepAliveTransaction&) = delete;
+  KeepAliveTransaction& operator=(const KeepAliveTransaction&) = delete;
+
+ private:
+  platform::KeepAliveService& service_;
+};
+
+}  // namespace qv

@@ -1,0 +1,116 @@
+#include "session/QVRecording.h"
+
+#include <utility>
+
+#include "platform/Log.h"
+#include "platform/Platform.h"
+
+namespace qv {
+
+using platform::Error;
+using platform::Platform;
+namespace logs = platform::logs;
+
+QVRecording::QVRecording(std::shared_ptr<RecordingContext> context, RecordingSettings settings, StartAnswer answer,
+                         std::weak_ptr<QVRecordingObserver> observer)
+    : context_(std::move(context)),
+      settings_(std::move(settings)),
+      observer_(std::move(observer)),
+      microphoneEnabled_(settings_.microphoneEnabled),
+      answer_(std::move(answer)),
+      contextIDs_(settings_.contextIDs) {
+  QV_LOG(logs::kDaemon, "starting...");
+  transaction_.emplace(*Platform::current().keepAlive);
+}
+
+QVRecording::~QVRecording() = default;
+
+QVRecording::State QVRecording::state() const {
+  std::lock_guard lock(shouldStopLock_);
+  return state_;
+}
+
+bool QVRecording::microphoneEnabled() const {
+  std::lock_guard lock(shouldStopLock_);
+  return microphoneEnabled_;
+}
+
+int32_t QVRecording::frontmostPIDForAudioTap() const {
+  std::lock_guard lock(shouldStopLock_);
+  return frontmostPIDForAudioTap_;
+}
+
+void QVRecording::prepare(std::function<void()> handler) {
+  output_->prepare([weakSelf = weak_from_this(), handler = std::move(handler)](const std::optional<Error>& error) {
+    const auto self = weakSelf.lock();
+    if (!self) return;
+    self->context_->sequence.async([self, handler, error] {
+      if (error) self->end({.cause = error});
+      if (self->isRecording()) handler();
+    });
+  });
+}
+
+void QVRecording::startSessionWithHandler(int32_t processID, std::function<void()> handler) {
+  if (!isRecording()) return;
+  QV_LOG(logs::kSession, "QVRecordingSession: startSession");
+  reportingAgent_ = std::make_unique<QVReportingAgent>(_serviceNameForReporting());
+  {
+    std::lock_guard lock(shouldStopLock_);
+    frontmostPIDForAudioTap_ = processID;
+  }
+  output_->start([weakSelf = weak_from_this(), handler = std::move(handler)](const std::optional<Error>& error) {
+    const auto self = weakSelf.lock();
+    if (self) self->context_->sequence.async([self, error, handler] { self->outputStarted(error, handler); });
+  });
+}
+
+void QVRecording::outputStarted(const std::optional<Error>& error, const std::function<void()>& handler) {
+  if (error) end({.cause = error});
+  if (!isRecording()) return;
+  updateBundleIdForFirstForegroundApp();
+  _resumeOrStartSession();
+  handler();
+}
+
+void QVRecording::answerStarted(RecordedInputs inputs) {
+  answer_.started(inputs);
+  for (const auto& work : std::exchange(whenAnswered_, {})) work();
+}
+
+void QVRecording::whenAnswered(std::function<void()> work) {
+  if (answer_.isGiven()) {
+    work();
+  } else {
+    whenAnswered_.push_back(std::move(work));
+  }
+}
+
+void QVRecording::pauseSession() {
+  std::unique_ptr<RecordingSources> sources;
+  {
+    std::lock_guard lock(shouldStopLock_);
+    if (state_ != State::Running) return;
+    state_ = State::Paused;
+    // A pause that no picture has closed goes on.
+    if (!timing_.isInPause()) stoppedAt_ = Platform::current().clock->hostTime();
+    sources = std::move(sources_);
+  }
+  QV_LOG(logs::kSession, "QVRecordingSession: pauseSession");
+  stopAllCapture(std::move(sources));
+  output_->pause();
+}
+
+void QVRecording::resumeSessionWithContextID(uint32_t contextID) {
+  if (state() != State::Paused) return;
+  QV_LOG(logs::kSession, "QVRecordingSession: resumeSessionWithContextID:");
+  contextIDs_ = {contextID};
+  output_->resume();
+  _resumeOrStartSession();
+}
+
+void QVRecording::sessionReportCameraUsage(int32_t cameraPosition) {
+  if (reportingAgent_) reportingAgent_->setCameraUsed(cameraPosition);
+}
+
+}  // namespace qv

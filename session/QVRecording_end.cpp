@@ -1,0 +1,172 @@
+#include <utility>
+
+#include "platform/Log.h"
+#include "platform/Platform.h"
+#include "session/MovieNames.h"
+#include "session/QVRecording.h"
+#include "support/QuorvelErrors.h"
+#include "writer/QVMovieWriter.h"
+
+namespace qv {
+
+using platform::Error;
+using platform::Platform;
+using platform::URL;
+namespace logs = platform::logs;
+
+namespace {
+constexpr const char kSystemRecording[] = "SystemRecording";
+constexpr const char kInAppRecording[] = "InAppRecording";
+}  // namespace
+
+bool QVRecording::end(RecordingEnd end) {
+  {
+    std::lock_guard lock(shouldStopLock_);
+    if (state_ >= State::Ending) return false;
+    if (state_ == State::Running && !timing_.isInPause()) stoppedAt_ = Platform::current().clock->hostTime();
+    state_ = State::Ending;
+    end_ = std::move(end);
+    // Whoever is to be told stays until the end is complete.
+    endObserver_ = observer_.lock();
+  }
+  context_->sequence.async([self = shared_from_this()] { self->beginEnd(); });
+  return true;
+}
+
+void QVRecording::fail(const Error& error) {
+  const bool isDiskFull = error.domain == kQVRecordingErrorDomain && error.code == errorcode::kInsufficientStorage;
+  end({.cause = error, .movie = isDiskFull ? moviefate::handTo(settings_.bundleID) : moviefate::keep()});
+}
+
+void QVRecording::beginEnd() {
+  if (endObserver_) endObserver_->recordingWillEnd(shared_from_this());
+  QV_LOG(logs::kSession, "QVRecordingSession: stop");
+  std::unique_ptr<RecordingSources> sources;
+  platform::MediaTime endTime;
+  {
+    std::lock_guard lock(shouldStopLock_);
+    sources = std::move(sources_);
+    endTime = timing_.endTime(stoppedAt_);
+  }
+  stopAllCapture(std::move(sources));
+  if (!reportingAgent_) {
+    completeEnd(std::nullopt, std::nullopt);
+    return;
+  }
+  reportSummaryEvent();
+  QV_LOG(logs::kSession, "QVRecordingSession: finishSessionWithHandler");
+  output_->finish(endTime, [self = shared_from_this()](const OutputResult& result) {
+    self->context_->sequence.async([self, result] { self->outputFinished(result); });
+  });
+}
+
+/// A client that does not know yet that it records cannot ask for the movie.
+void QVRecording::outputFinished(const OutputResult& result) {
+  if (!answer_.isGiven()) end_.movie = moviefate::remove();
+  // A stop that says success means a whole movie. What there is stays in the store, and is mended at the next start.
+  if (end_.handler && result.movie && !result.isSound) {
+    QV_LOG_ERROR(logs::kSession, "the movie could not be completed");
+    completeEnd(std::nullopt, _qvUserErrorForCode(errorcode::kFailedToSave));
+    return;
+  }
+  if (!result.movie) {
+    completeEnd(std::nullopt,
+                output_->makesMovie() ? std::optional(_qvUserErrorForCode(errorcode::kFailedToSave)) : std::nullopt);
+  } else if (end_.startClipDuration > 0 && end_.endClipDuration > 0) {
+    trimMovie(result.movie);
+  } else {
+    disposeOfMovie(result.movie);
+  }
+}
+
+/// The untrimmed movie goes when the trimmed one is known to be there.
+void QVRecording::trimMovie(const std::shared_ptr<MovieClaim>& movie) {
+  QV_LOG(logs::kSession, "trimming");
+  const auto trimmed = context_->movies->claimTrimmed(trimmedOutputPath(settings_.bundleID), settings_.bundleID);
+  auto writer = std::make_shared<QVMovieWriter>(settings_.windowSize, movie->path());
+  writer->trimMovieWithURL(
+      movie->url(), end_.startClipDuration, end_.endClipDuration, trimmed->url(),
+      [self = shared_from_this(), movie, trimmed](const std::optional<URL>& url) {
+        self->context_->sequence.async([self, movie, trimmed, isTrimmed = url && trimmed->hasFile()] {
+          if (isTrimmed) {
+            QV_LOG(logs::kSession, "finished trimming");
+            movie->remove(nullptr);
+          } else {
+            QV_LOG_ERROR(logs::kSession, "trimming failed, handing on the untrimmed movie");
+            trimmed->remove(nullptr);
+          }
+          self->disposeOfMovie(isTrimmed ? trimmed : movie);
+        });
+      });
+}
+
+void QVRecording::disposeOfMovie(std::shared_ptr<MovieClaim> movie) {
+  const auto dispose = std::exchange(end_.movie, nullptr);
+  dispose(std::move(movie), [self = shared_from_this()](const std::optional<URL>& url) {
+    self->context_->sequence.async([self, url] { self->completeEnd(url, std::nullopt); });
+  });
+}
+
+void QVRecording::completeEnd(const std::optional<URL>& movie, const std::optional<Error>& error) {
+  if (const auto handler = std::exchange(end_.handler, nullptr)) {
+    handler(movie, error);
+  } else {
+    report(movie);
+  }
+  output_.reset();
+  transaction_.reset();
+  {
+    std::lock_guard lock(shouldStopLock_);
+    state_ = State::Ended;
+  }
+  if (const auto observer = std::exchange(endObserver_, nullptr)) observer->recordingDidEnd(shared_from_this());
+  for (const auto& work : std::exchange(whenAnswered_, {})) work();
+  for (const auto& work : std::exchange(whenEnded_, {})) work();
+}
+
+void QVRecording::report(const std::optional<URL>& movie) {
+  if (!answer_.isGiven()) {
+    answer_.refused(end_.cause.value_or(_qvUserErrorForCode(errorcode::kInterrupted)));
+  } else if (end_.cause) {
+    if (endObserver_) endObserver_->recordingStopped(shared_from_this(), *end_.cause, movie);
+  }
+}
+
+void QVRecording::whenEnded(std::function<void()> work) {
+  if (state() == State::Ended) {
+    work();
+  } else {
+    whenEnded_.push_back(std::move(work));
+  }
+}
+
+std::string QVRecording::_serviceNameForReporting() const {
+  if (settings_.systemRecording) return settings_.broadcast ? "SystemBroadcast" : kSystemRecording;
+  if (settings_.broadcast) return "InAppBroadcast";
+  return settings_.captureEnabled ? "InAppCapture" : kInAppRecording;
+}
+
+uint64_t QVRecording::getRecordedFileSize() const {
+  if (reportingAgent_->serviceName() != kSystemRecording && reportingAgent_->serviceName() != kInAppRecording) return 0;
+  const auto attributes = Platform::current().fileSystem->attributesOfItem(output_->moviePath());
+  if (!attributes) {
+    QV_LOG_ERROR(logs::kSession, "error getting recordedFileSize :%ld", static_cast<long>(attributes.error().code));
+    return 0;
+  }
+  QV_LOG(logs::kSession, "recordedFileSize for URL %lu bytes", static_cast<unsigned long>(attributes.value().size));
+  return attributes.value().size;
+}
+
+bool QVRecording::writesMovies() const {
+  if (settings_.broadcast) return settings_.broadcast->info.extensionProcessMode == BroadcastProcessMode::MovieClips;
+  return !settings_.captureEnabled;
+}
+
+void QVRecording::reportSummaryEvent() {
+  reportingAgent_->setRecordedFileSize(getRecordedFileSize());
+  reportingAgent_->setEndReason(end_.cause ? end_.cause->code : 0);
+  reportingAgent_->reportEventWithType(QVReportingAgent::kSessionSummaryEvent,
+                                       reportingAgent_->collectSummaryEventMetrics());
+}
+
+}  // namespace qv

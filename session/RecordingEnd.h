@@ -1,0 +1,40 @@
+#pragma once
+
+#include <functional>
+#include <memory>
+#include <optional>
+
+#include "platform/Error.h"
+#include "support/QVTemporaryMovies.h"
+
+namespace qv {
+
+/// What becomes of the movie of a recording that ends. It takes the claim over, and calls `done` (on any thread) when
+/// that is complete, with the URL that the client is told.
+using MovieFate = std::function<void(std::shared_ptr<MovieClaim> movie,
+                                     std::function<void(const std::optional<platform::URL>&)> done)>;
+
+namespace moviefate {
+/// The client may save or discard it.
+[[nodiscard]] MovieFate handTo(const std::string& bundleID);
+[[nodiscard]] MovieFate remove();
+/// It stays in the store, and ages out there.
+[[nodiscard]] MovieFate keep();
+}  // namespace moviefate
+
+/// How a recording ends.
+struct RecordingEnd {
+  using Handler = std::function<void(const std::optional<platform::URL>&, const std::optional<platform::Error>&)>;
+
+  /// Why, for the client and the metrics; nothing where the client itself wants it, or has gone.
+  std::optional<platform::Error> cause = std::nullopt;
+  MovieFate movie = moviefate::keep();
+  /// The answer of a stop, on the sequence, when the end is complete. It is the report of the end too: with a handler
+  /// the client gets no message.
+  Handler handler = nullptr;
+  /// Seconds that are cut off, where both are positive.
+  double startClipDuration = 0;
+  double endClipDuration = 0;
+};
+
+}  // namespace qv

@@ -1,0 +1,41 @@
+#include "session/VideoSize.h"
+
+#include "platform/Log.h"
+#include "platform/Platform.h"
+
+namespace qv {
+
+using platform::Platform;
+using platform::Size;
+namespace logs = platform::logs;
+
+namespace {
+constexpr const char kPreferenceDomain[] = "com.tarnwick.quorveld";
+constexpr double kMaximumSide = 1920.0;
+constexpr double kSmallTabletMaximumSide = 1600.0;
+constexpr int64_t kSmallTabletChip = 0x8960;
+}  // namespace
+
+int64_t chipId() { return Platform::current().deviceInfo->integerProperty("ChipID"); }
+
+Size _maximumSizeWithSize(Size size) {
+  Platform& platform = Platform::current();
+  if (platform.preferences->valueForKey(kPreferenceDomain, "QVFullResCapture").asBool()) {
+    QV_LOG(logs::kSession, "full res capture enabled");
+    return size;
+  }
+  const bool isSmallTablet =
+      platform.deviceInfo->userInterfaceIdiom() == platform::UserInterfaceIdiom::Tablet && chipId() == kSmallTabletChip;
+  const double limit = isSmallTablet ? kSmallTabletMaximumSide : kMaximumSide;
+  if (size.height > limit) {
+    size.width *= limit / size.height;
+    size.height = limit;
+  }
+  if (size.width > limit) {
+    size.height *= limit / size.width;
+    size.width = limit;
+  }
+  return size;
+}
+
+}  // namespace qv

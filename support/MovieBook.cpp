@@ -1,0 +1,141 @@
+#include "support/MovieBook.h"
+
+#include <filesystem>
+#include <utility>
+
+#include "platform/Platform.h"
+
+namespace qv {
+namespace {
+
+/// "Chess.mp4" itself, "Chess 2.mp4", ...
+std::string numbered(const std::string& path, int number) {
+  if (number == 1) return path;
+  const std::filesystem::path whole(path);
+  const std::string name = whole.stem().string() + " " + std::to_string(number) + whole.extension().string();
+  return (whole.parent_path() / name).string();
+}
+
+template <typename Test>
+std::string firstNumbered(const std::string& path, const Test& suits) {
+  for (int number = 1;; ++number) {
+    std::string candidate = numbered(path, number);
+    if (suits(candidate)) return candidate;
+  }
+}
+
+}  // namespace
+
+std::optional<std::string> MovieBook::takeForRecording(const std::string& path, const std::string& bundleID,
+                                                       Continuation whenSettled) {
+  std::lock_guard lock(mutex_);
+  std::string at = firstNumbered(path, [&](const std::string& candidate) {
+    const Movie* movie = find(candidate);
+    return !movie || (movie->hands != Hands::Made && (movie->bundleID == bundleID || movie->bundleID.empty()));
+  });
+  Movie& movie = movies_[at];
+  if (movie.hands == Hands::Saved || movie.hands == Hands::Removed) {
+    movie.waiting.push_back(std::move(whenSettled));
+    return std::nullopt;
+  }
+  movie = {Hands::Made, bundleID, {}};
+  return at;
+}
+
+std::string MovieBook::takeForCopy(const std::string& path, const std::string& bundleID) {
+  return take(path, bundleID,
+              [&](const std::string&, const Movie* movie) { return !movie || isHandedTo(movie, bundleID); });
+}
+
+std::string MovieBook::takeUnused(const std::string& path) {
+  platform::FileSystem& disk = *platform::Platform::current().fileSystem;
+  return take(path, {},
+              [&](const std::string& candidate, const Movie* movie) { return !movie && !disk.itemExists(candidate); });
+}
+
+std::string MovieBook::take(const std::string& path, const std::string& bundleID,
+                            const std::function<bool(const std::string&, const Movie*)>& mayTake) {
+  std::lock_guard lock(mutex_);
+  std::string at =
+      firstNumbered(path, [&](const std::string& candidate) { return mayTake(candidate, find(candidate)); });
+  movies_.insert_or_assign(at, Movie{Hands::Made, bundleID, {}});
+  return at;
+}
+
+void MovieBook::hand(const std::string& path, const std::string& bundleID) {
+  std::lock_guard lock(mutex_);
+  movies_.insert_or_assign(path, Movie{Hands::Handed, bundleID, {}});
+  lastHanded_[bundleID] = path;
+}
+
+bool MovieBook::isHanded(const std::string& path, const std::string& bundleID) const {
+  std::lock_guard lock(mutex_);
+  return isHandedTo(find(path), bundleID);
+}
+
+bool MovieBook::beginSave(const std::string& path, const std::string& bundleID) {
+  std::lock_guard lock(mutex_);
+  if (!isHandedTo(find(path), bundleID)) return false;
+  movies_[path].hands = Hands::Saved;
+  return true;
+}
+
+std::optional<std::string> MovieBook::beginDiscard(const std::string& bundleID) {
+  std::lock_guard lock(mutex_);
+  const auto last = lastHanded_.find(bundleID);
+  if (last == lastHanded_.end() || !isHandedTo(find(last->second), bundleID)) return std::nullopt;
+  movies_[last->second].hands = Hands::Removed;
+  return last->second;
+}
+
+void MovieBook::beginRemoval(const std::string& path) {
+  std::lock_guard lock(mutex_);
+  movies_[path].hands = Hands::Removed;
+}
+
+bool MovieBook::beginPurge(const std::string& path) {
+  std::lock_guard lock(mutex_);
+  const Movie* movie = find(path);
+  if (movie && movie->hands != Hands::Handed) return false;
+  movies_[path].hands = Hands::Removed;
+  return true;
+}
+
+void MovieBook::release(const std::string& path) {
+  std::vector<Continuation> waiting;
+  {
+    std::lock_guard lock(mutex_);
+    waiting = std::move(movies_[path].waiting);
+    movies_.erase(path);
+  }
+  for (const Continuation& goOn : waiting) goOn();
+}
+
+void MovieBook::giveBack(const std::string& path) {
+  std::vector<Continuation> waiting;
+  {
+    std::lock_guard lock(mutex_);
+    Movie& movie = movies_[path];
+    waiting = std::exchange(movie.waiting, {});
+    movie.hands = Hands::Handed;
+    if (movie.bundleID.empty()) movies_.erase(path);
+  }
+  for (const Continuation& goOn : waiting) goOn();
+}
+
+void MovieBook::dropWaiting() {
+  std::vector<std::vector<Continuation>> dropped;
+  std::lock_guard lock(mutex_);
+  for (auto& [path, movie] : movies_) dropped.push_back(std::exchange(movie.waiting, {}));
+}
+
+const MovieBook::Movie* MovieBook::find(const std::string& path) const {
+  const auto found = movies_.find(path);
+  return found == movies_.end() ? nullptr : &found->second;
+}
+
+bool MovieBook::isHandedTo(const Movie* movie, const std::string& bundleID) {
+  return movie && movie->hands == Hands::Handed && movie->bundleID == bundleID;
+}
+
+}  // namespace qv

@@ -1,0 +1,165 @@
+#include "support/QVTemporaryMovies.h"
+
+#include <cerrno>
+#include <filesystem>
+#include <utility>
+
+#include "platform/Guarded.h"
+#include "platform/Platform.h"
+#include "support/MovieBook.h"
+
+namespace qv {
+namespace {
+
+using platform::Error;
+using platform::Platform;
+using platform::URL;
+using Book = std::shared_ptr<MovieBook>;
+
+std::string normalized(const std::string& path) { return std::filesystem::path(path).lexically_normal().string(); }
+
+/// Whether there is a file of more than no bytes.
+bool isMovieAt(const std::string& path) {
+  const auto attributes = Platform::current().fileSystem->attributesOfItem(path);
+  return attributes && !attributes.value().isDirectory && attributes.value().size > 0;
+}
+
+/// The path is its remover's until the file is gone, and nobody's also where that fails: then it ages out.
+void removeAndRelease(const Book& book, const std::string& path, FileCompletion completion) {
+  _srRemoveFile(URL::fileURL(path), [book, path, completion = std::move(completion)](const auto& error) {
+    book->release(path);
+    if (completion) completion(error);
+  });
+}
+
+void answerInBackground(FileCompletion completion, std::optional<Error> error) {
+  if (!completion) return;
+  Platform::current().backgroundQueue->post(
+      [completion = std::move(completion), error = std::move(error)] { completion(error); });
+}
+
+/// What could not be removed stays its application's.
+void endPurge(MovieBook& book, const std::string& path) {
+  if (isMovieAt(path)) {
+    book.giveBack(path);
+  } else {
+    book.release(path);
+  }
+}
+
+/// The book, for as long as one has a right that is written there. The right is used up by taking it.
+class Right {
+ public:
+  Right(Book book, std::string path) : path_(std::move(path)), book_(std::move(book)) {}
+  [[nodiscard]] const std::string& path() const { return path_; }
+  /// Nothing from the second time on.
+  [[nodiscard]] Book use() { return book_.exchange(nullptr); }
+  void useForRemoval(FileCompletion completion) {
+    const Book book = use();
+    if (!book) {
+      answerInBackground(std::move(completion), Error::posix(ENOENT, path_));
+      return;
+    }
+    book->beginRemoval(path_);
+    removeAndRelease(book, path_, std::move(completion));
+  }
+
+ private:
+  const std::string path_;
+  platform::Guarded<Book> book_;
+};
+
+class Claim final : public MovieClaim {
+ public:
+  Claim(Book book, std::string path) : right_(std::move(book), std::move(path)) {}
+  ~Claim() override {
+    if (const Book book = right_.use()) book->release(path());
+  }
+  [[nodiscard]] const std::string& path() const override { return right_.path(); }
+  [[nodiscard]] bool hasFile() const override { return isMovieAt(path()); }
+  void handTo(const std::string& bundleID) override {
+    if (const Book book = right_.use()) book->hand(path(), bundleID);
+  }
+  void remove(FileCompletion completion) override { right_.useForRemoval(std::move(completion)); }
+
+ private:
+  Right right_;
+};
+
+class Save final : public MovieSave {
+ public:
+  Save(Book book, const std::string& path) : right_(std::move(book), path), movie_(URL::fileURL(path)) {}
+  ~Save() override {
+    if (const Book book = right_.use()) book->giveBack(right_.path());
+  }
+  [[nodiscard]] const URL& movie() const override { return movie_; }
+  void succeeded(FileCompletion completion) override { right_.useForRemoval(std::move(completion)); }
+
+ private:
+  Right right_;
+  const URL movie_;
+};
+
+class Movies final : public QVTemporaryMovies {
+ public:
+  ~Movies() override { book_->dropWaiting(); }
+
+  void claimForRecording(const std::string& path, const std::string& bundleID, ClaimHandler handler) override {
+    const auto taken =
+        book_->takeForRecording(normalized(path), bundleID, [weak = weak_from_this(), path, bundleID, handler] {
+          if (const auto self = weak.lock()) self->claimForRecording(path, bundleID, handler);
+        });
+    if (taken) handler(claimAt(*taken));
+  }
+  std::shared_ptr<MovieClaim> claimNew(const std::string& path) override {
+    return claimAt(book_->takeUnused(normalized(path)));
+  }
+  std::shared_ptr<MovieClaim> claimTrimmed(const std::string& path, const std::string& bundleID) override {
+    return claimAt(book_->takeForCopy(normalized(path), bundleID));
+  }
+
+  [[nodiscard]] bool isHandedTo(const std::string& bundleID, const URL& movie) const override {
+    const std::string path = normalized(movie.path());
+    return book_->isHanded(path, bundleID) && isMovieAt(path);
+  }
+  std::shared_ptr<MovieSave> beginSave(const std::string& bundleID, const URL& movie) override {
+    const std::string path = normalized(movie.path());
+    if (!book_->beginSave(path, bundleID)) return nullptr;
+    // Looked at under the right, which no purge can take any more; without a file it goes back.
+    auto save = std::make_shared<Save>(book_, path);
+    return isMovieAt(path) ? save : nullptr;
+  }
+  void discardLast(const std::string& bundleID, FileCompletion completion) override {
+    if (const auto path = book_->beginDiscard(bundleID)) {
+      removeAndRelease(book_, *path, std::move(completion));
+    } else {
+      answerInBackground(std::move(completion), std::nullopt);
+    }
+  }
+
+  int64_t deleteFilesOlderThanTimeToLiveInSeconds(double timeToLive) override {
+    return _srDeleteFilesOlderThanTimeToLiveInSeconds(timeToLive, purging());
+  }
+  int64_t deleteAllTempFiles() override { return _srDeleteAllTempFiles(purging()); }
+
+ private:
+  [[nodiscard]] std::shared_ptr<MovieClaim> claimAt(const std::string& path) const {
+    return std::make_shared<Claim>(book_, path);
+  }
+  /// Nobody makes or saves a movie while it is purged.
+  [[nodiscard]] RemovalRight purging() const {
+    return [book = book_](const std::string& path) -> std::shared_ptr<void> {
+      const std::string at = normalized(path);
+      if (!book->beginPurge(at)) return nullptr;
+      return {book.get(), [book, at](void*) { endPurge(*book, at); }};
+    };
+  }
+
+  const Book book_ = std::make_shared<MovieBook>();
+};
+
+}  // namespace
+
+std::shared_ptr<QVTemporaryMovies> QVTemporaryMovies::create() { return std::make_shared<Movies>(); }
+
+}  // namespace qv

@@ -1,0 +1,173 @@
+#include "capture/AppAudioLease.h"
+
+#include "tests/capture/CaptureTest.h"
+
+namespace qv {
+namespace {
+
+using fakes::FakeAppAudioTap;
+using platform::MediaTime;
+
+using AppAudioLeaseTest = CaptureTest;
+
+TEST_F(AppAudioLeaseTest, TapDeliversStampedAudioAndRecyclesItsBuffers) {
+  startTap(a_);
+  EXPECT_EQ(a_.tapStarts, 1);
+  EXPECT_EQ(a_.tap->process, 42);
+  EXPECT_EQ(a_.tap->capacities, std::vector<uint32_t>(10, 57344));
+
+  a_.appAudioLease->setCaptureStartTime(MediaTime::make(1, platform::kHostTimescale));
+  play(a_, 28672, 5 * kSecond);
+  ASSERT_EQ(a_.appAudio.size(), 1u);
+  EXPECT_EQ(a_.appAudio[0]->presentationTime(), MediaTime::make(5, 1));
+  EXPECT_EQ(a_.appAudio[0]->numSamples(), 28672);
+  EXPECT_EQ(a_.appAudio[0]->data()->bytes()[57343], 7);
+  EXPECT_EQ(a_.tap->enqueued.size(), 10u);
+
+  a_.appAudioLease->stopAppAudioCapture();
+  EXPECT_TRUE(a_.tap->disposed);
+  EXPECT_EQ(a_.tap->freed, 10);
+  a_.appAudioLease->stopAppAudioCapture();
+}
+
+TEST_F(AppAudioLeaseTest, SoundBeforeTheFirstFrameIsLeftOutAndItsBuffersGoBack) {
+  startTap(a_);
+  for (int i = 0; i < 20; ++i) play(a_, 1024, kSecond);
+  EXPECT_EQ(a_.tap->enqueued.size(), 10u);
+  EXPECT_TRUE(a_.appAudio.empty());
+}
+
+TEST_F(AppAudioLeaseTest, WhatOneRecordingEndsIsNoOthers) {
+  for (const bool olderEnds : {true, false}) {
+    start(a_);
+    start(b_);
+    Recording& ending = olderEnds ? a_ : b_;
+    Recording& staying = olderEnds ? b_ : a_;
+    ending.appAudioLease->startAppAudioCaptureForProcessID(43, nullptr);
+    device_.run();
+    EXPECT_TRUE(ending.tap->disposed) << "replaced within its lease";
+    const auto replacement = device_.tap.tap;
+    end(ending);
+    EXPECT_TRUE(replacement->disposed);
+    EXPECT_FALSE(ending.session->running);
+
+    EXPECT_FALSE(staying.tap->disposed);
+    EXPECT_TRUE(staying.session->running);
+    play(staying, 100, 5 * kSecond);
+    speak(staying, 5 * kSecond, 100);
+    EXPECT_EQ(staying.appAudio.size(), 1u);
+    EXPECT_EQ(staying.microphone.size(), 1u);
+    EXPECT_EQ(ending.appAudio.size() + ending.microphone.size(), 0u);
+    end(staying);
+    EXPECT_TRUE(staying.tap->disposed);
+    a_ = {};
+    b_ = {};
+  }
+}
+
+TEST_F(AppAudioLeaseTest, BufferOfAStoppedTapIsIgnoredWhateverRunsSince) {
+  start(a_);
+  const auto old = a_.tap;
+  a_.appAudioLease->stopAppAudioCapture();
+  a_.appAudioLease->resumeAppAudioCaptureForProcessID(43, nullptr);
+  startTap(b_);
+  b_.appAudioLease->setCaptureStartTime(MediaTime::make(1, 1));
+  old->callback(b_.tap->enqueued.front(), {}, 10);
+  device_.run();
+  EXPECT_TRUE(a_.appAudio.empty());
+  EXPECT_TRUE(b_.appAudio.empty());
+}
+
+TEST_F(AppAudioLeaseTest, EndDeliversWhatTapAndMicrophoneHandOverAtIt) {
+  start(a_);
+  a_.tap->atStop = [&] {
+    ASSERT_TRUE(FakeAppAudioTap::fill(*a_.tap, 300, 3 * kSecond, 300));
+    // A tap also tells that it runs no more.
+    if (a_.tap->listener) a_.tap->listener();
+  };
+  a_.session->atStop = [&] { queueSpeech(a_, 3 * kSecond, 441); };
+  end(a_);
+  ASSERT_EQ(a_.appAudio.size(), 1u);
+  EXPECT_EQ(a_.appAudio[0]->numSamples(), 300);
+  EXPECT_EQ(a_.microphone.size(), 1u);
+  EXPECT_EQ(a_.tapStarts, 1) << "it has not started again";
+}
+
+TEST_F(AppAudioLeaseTest, ProcessReplacedBeforeTheFirstTapRanStartsOnce) {
+  a_.appAudioLease = manager_.leaseAppAudio(nullptr);
+  a_.appAudioLease->startAppAudioCaptureForProcessID(42, [&] { a_.tapStarts += 100; });
+  a_.appAudioLease->resumeAppAudioCaptureForProcessID(43, [&] { ++a_.tapStarts; });
+  device_.run();
+  EXPECT_EQ(a_.tapStarts, 1);
+  EXPECT_EQ(device_.tap.tap->process, 43);
+  EXPECT_TRUE(device_.tap.taps.front()->disposed);
+}
+
+TEST_F(AppAudioLeaseTest, ReplacedTapStillHandsOverItsRest) {
+  start(a_);
+  a_.tap->atStop = [&] { ASSERT_TRUE(FakeAppAudioTap::fill(*a_.tap, 300, 3 * kSecond, 300)); };
+  a_.appAudioLease->startAppAudioCaptureForProcessID(43, nullptr);
+  device_.run();
+  EXPECT_EQ(a_.appAudio.size(), 1u);
+}
+
+TEST_F(AppAudioLeaseTest, ResumeFillsTheGapOnceAndInItsOwnLeaseOnly) {
+  start(a_);
+  play(a_, 22050, kSecond);  // plays for half a second
+  a_.appAudioLease->stopAppAudioCapture();
+  device_.clock.advanceSeconds(2.5);
+  a_.appAudioLease->resumeAppAudioCaptureForProcessID(43, nullptr);
+  device_.run();
+  a_.tap = device_.tap.tap;
+  start(b_);
+  play(b_, 100, 9 * kSecond);
+  EXPECT_EQ(b_.appAudio.size(), 1u);
+  play(a_, 100, 9 * kSecond);
+  play(a_, 100, 10 * kSecond);
+  ASSERT_EQ(a_.appAudio.size(), 4u);
+  EXPECT_EQ(a_.appAudio[1]->numSamples(), 88200);
+  EXPECT_EQ(a_.appAudio[1]->data()->size(), 176400u);
+  EXPECT_EQ(a_.appAudio[1]->presentationTime(), MediaTime::zero());
+  EXPECT_EQ(a_.appAudio[1]->duration(), MediaTime::make(2, 1));
+}
+
+TEST_F(AppAudioLeaseTest, AQueueWithoutPacketSizeAsksForTheLargestPacket) {
+  device_.tap.packetSize = 1;
+  auto format = manager_.audioBasicDescription();
+  format.bytesPerPacket = 0;
+  device_.tap.reportedFormat = format;
+  startTap(a_);
+  EXPECT_EQ(a_.tap->capacities.front(), 44100u);
+}
+
+TEST_F(AppAudioLeaseTest, RefusedTapIsLoggedAndForgotten) {
+  device_.tap.failures = {{"setTappedProcess", -50}, {"stop", -66}};
+  start(a_);
+  EXPECT_TRUE(device_.log.contains("QVRecordingManager: startAudioCapture error: -50"));
+  a_.tap->atStop = [&] { ASSERT_TRUE(FakeAppAudioTap::fill(*a_.tap, 300, 3 * kSecond, 300)); };
+  a_.appAudioLease->stopAppAudioCapture();
+  EXPECT_TRUE(device_.log.contains("QVRecordingManager:stopAudioCapture:error: -66"));
+  EXPECT_TRUE(device_.log.contains("recorder is not running, ignoring audio data"));
+  EXPECT_TRUE(a_.appAudio.empty());
+  EXPECT_EQ(a_.tap->freed, 0) << "the queue may still use its buffers";
+}
+
+TEST_F(AppAudioLeaseTest, SoundThatCannotBeHadIsToldLikeAStart) {
+  device_.tap.failures = {{"start", -5}};
+  startTap(a_);
+  EXPECT_EQ(a_.tapStarts, 1);
+
+  struct NoTaps final : platform::AppAudioTapService {
+    int32_t createInputQueue(const platform::AudioStreamDescription&, platform::AppAudioInputCallback, uint32_t,
+                             std::unique_ptr<platform::AppAudioTapQueue>&) override {
+      return -3;
+    }
+  } noTaps;
+  device_.platform.appAudioTap = &noTaps;
+  startTap(b_);
+  EXPECT_EQ(b_.tapStarts, 1);
+  b_.appAudioLease.reset();
+}
+
+}  // namespace
+}  // namespace qv

@@ -1,0 +1,216 @@
+#include "tests/daemon/DaemonTest.h"
+
+namespace qv {
+namespace {
+
+using platform::Value;
+
+/// Whose a movie is, from one feature to the next.
+class MovieOwnershipTest : public DaemonTest {
+ protected:
+  void record(TestClient& client, const TestClient::StartOptions& options = {}) {
+    EXPECT_EQ(client.start(options)->code(), 0);
+    sendFrame(kSecond);
+  }
+  /// Of a stop that is answered with a movie that is there.
+  std::string stop(TestClient& client) {
+    const auto answer = client.stop();
+    EXPECT_EQ(answer->code(1), 0);
+    const std::string movie = answer->values[0].asString();
+    EXPECT_NE(contentAt(movie), "") << movie;
+    return movie;
+  }
+  std::string recordMovie(TestClient& client) {
+    record(client);
+    return stop(client);
+  }
+  static int64_t save(TestClient& client, const std::string& movie) {
+    return client.request("saveVideoToCameraRoll", {Value(movie)})->code();
+  }
+  void endExports() {
+    for (const auto& session : device_.exports.sessions) session->end();
+    device_.run();
+  }
+  std::vector<std::string> storeFiles() { return device_.disk.contentsOfDirectory(fakes::kStore).value(); }
+
+  void SetUp() override { suppressAlert(); }
+};
+
+TEST_F(MovieOwnershipTest, AStartDuringASaveLosesNothingToIt) {
+  auto client = game();
+  const std::string movie = recordMovie(client);
+  device_.exports.holds = true;
+  const auto saved = client.post("saveVideoToCameraRoll", {Value(movie)});
+  const auto started = client.postStart({});
+  device_.run();
+  sendFrame(2 * kSecond);  // of a recording that did not wait
+  endExports();
+  ASSERT_TRUE(*saved && *started);
+  EXPECT_EQ((*saved)->code(), 0);
+  EXPECT_EQ(device_.exports.sessions.at(0)->content, "movie 0");
+  EXPECT_EQ((*started)->code(), 0);
+  sendFrame(3 * kSecond);
+  EXPECT_EQ(contentAt(stop(client)), "movie 1");
+}
+
+TEST_F(MovieOwnershipTest, AStartReplacesTheOwnFormerMovieAndTheRightToIt) {
+  auto client = game();
+  const std::string former = recordMovie(client);
+  record(client);
+  EXPECT_EQ(save(client, former), errorcode::kFailedToSave);
+  EXPECT_TRUE(device_.photoLibrary.stored.empty());
+  EXPECT_EQ(contentAt(stop(client)), "movie 1");
+}
+
+TEST_F(MovieOwnershipTest, ApplicationsOfOneNameLeaveEachOthersMoviesAlone) {
+  auto first = game();
+  auto second = namesake();
+  const std::string movie = recordMovie(first);
+  const std::string other = recordMovie(second);
+  EXPECT_TRUE(platform::URL(other).path().ends_with("/Game 2.mp4")) << other;
+  EXPECT_EQ(contentAt(movie), "movie 0");
+  EXPECT_EQ(contentAt(other), "movie 1");
+  EXPECT_EQ(save(second, movie), errorcode::kFailedToSave);
+  second.request("discardRecordingWithHandler");
+  EXPECT_EQ(contentAt(other), "");
+  // The takeover removes what the second records, and nothing else.
+  record(second);
+  auto third = chat();
+  record(third);
+  EXPECT_EQ(second.takeEnds(), std::vector<int64_t>{errorcode::kInterrupted});
+  EXPECT_EQ(second.lastMovie(), "");
+  EXPECT_EQ(contentAt(movie), "movie 0");
+  EXPECT_EQ(save(first, movie), 0);
+}
+
+TEST_F(MovieOwnershipTest, ADiscardTakesOnlyWhatItsCallerWasHandedLast) {
+  auto first = game();
+  auto second = namesake();
+  const std::string movie = recordMovie(first);
+  second.request("discardRecordingWithHandler");
+  EXPECT_EQ(contentAt(movie), "movie 0");
+  EXPECT_EQ(save(first, movie), 0);
+  const std::string others = recordMovie(second);
+  first.request("discardRecordingWithHandler");  // its movie is in the library
+  EXPECT_EQ(contentAt(others), "movie 1");
+}
+
+TEST_F(MovieOwnershipTest, ATrimmedStopLeavesOneMovieAndADiscardNone) {
+  auto client = game();
+  record(client);
+  const auto answer = client.request("stopRecordingWithStartClipDuration", {Value(2.0), Value(3.0)});
+  EXPECT_TRUE(answer->values[0].asString().ends_with("/Game_trimmed.mp4"));
+  EXPECT_EQ(storeFiles(), std::vector<std::string>{"Game_trimmed.mp4"});
+  client.request("discardRecordingWithHandler");
+  EXPECT_EQ(storeFiles(), std::vector<std::string>{});
+}
+
+TEST_F(MovieOwnershipTest, AMovieWhoseFileHasGoneIsNotAnswered) {
+  auto client = game();
+  record(client);
+  device_.disk.removeItem(device_.movies.last().url.path());
+  const auto answer = client.stop();
+  EXPECT_EQ(answer->code(1), errorcode::kFailedToSave);
+  EXPECT_EQ(answer->values[0].asString(), "");
+}
+
+TEST_F(MovieOwnershipTest, ACaptureLeavesTheUnsavedMovieAlone) {
+  auto client = game();
+  const std::string movie = recordMovie(client);
+  record(client, {.capture = true});
+  client.stop();
+  EXPECT_EQ(contentAt(movie), "movie 0");
+  EXPECT_EQ(save(client, movie), 0);
+}
+
+TEST_F(MovieOwnershipTest, TwoSavesAtOnceMixIntoFilesOfTheirOwn) {
+  auto first = game();
+  auto second = chat();
+  const std::vector<std::string> movies{recordMovie(first), recordMovie(second)};
+  device_.exports.holds = true;
+  const auto firstSave = first.post("saveVideoToCameraRoll", {Value(movies[0])});
+  const auto secondSave = second.post("saveVideoToCameraRoll", {Value(movies[1])});
+  device_.run();
+  EXPECT_NE(device_.exports.sessions.at(0)->output.path(), device_.exports.sessions.at(1)->output.path());
+  endExports();
+  ASSERT_TRUE(*firstSave && *secondSave);
+  EXPECT_EQ((*firstSave)->code(), 0);
+  EXPECT_EQ((*secondSave)->code(), 0);
+  EXPECT_EQ(device_.photoLibrary.stored.size(), 2u);
+  EXPECT_EQ(storeFiles(), std::vector<std::string>{});
+}
+
+TEST_F(MovieOwnershipTest, ALibraryThatRefusesLeavesTheMovieToBeSavedAgain) {
+  auto client = game();
+  const std::string movie = recordMovie(client);
+  device_.photoLibrary.failure = platform::Error::posix(ENOSPC);
+  EXPECT_EQ(save(client, movie), ENOSPC);
+  EXPECT_EQ(storeFiles(), std::vector<std::string>{"Game.mp4"});
+
+  auto system = systemUI();
+  record(system, {.system = true});
+  record(client);
+  EXPECT_EQ(system.takeEnds(), std::vector<int64_t>{errorcode::kInterrupted});
+  EXPECT_EQ(contentAt(system.lastMovie()), "movie 1");
+  device_.photoLibrary.failure.reset();
+  EXPECT_EQ(save(system, system.lastMovie()), 0);
+  EXPECT_EQ(save(client, stop(client)), 0);
+  EXPECT_EQ(storeFiles(), std::vector<std::string>{});
+}
+
+TEST_F(MovieOwnershipTest, ADailyPurgeLeavesWhatIsBeingRecorded) {
+  auto client = game();
+  record(client);
+  client.request("pauseRecording");
+  device_.clock.advance(std::chrono::hours(48));
+  device_.disk.addFile(std::string(fakes::kStore) + "/young.mp4", "x", device_.clock.now());
+  device_.disk.addFile(std::string(fakes::kStore) + "/old.mp4", "x");
+  device_.purgeableSpace.callbacks.periodic(1, 1);
+  device_.run();
+  EXPECT_EQ(contentAt(stop(client)), "movie 0");
+  EXPECT_FALSE(device_.disk.itemExists(std::string(fakes::kStore) + "/old.mp4"));
+}
+
+TEST_F(MovieOwnershipTest, ANearlyFullDiskHandsOverTheMovieThatItEnds) {
+  auto client = game();
+  record(client);
+  EXPECT_EQ(device_.purgeableSpace.callbacks.purge(1, 2), 0);
+  EXPECT_TRUE(client.isRecording());
+  device_.disk.setFreeSize(49'999'999);
+  device_.purgeableSpace.callbacks.purge(1, 2);
+  device_.run();
+  EXPECT_EQ(client.takeEnds(), std::vector<int64_t>{errorcode::kInsufficientStorage});
+  EXPECT_EQ(contentAt(client.lastMovie()), "movie 0");
+  EXPECT_EQ(save(client, client.lastMovie()), 0);
+}
+
+class InterruptionTest : public MovieOwnershipTest {
+ protected:
+  void SetUp() override {}
+};
+
+TEST_F(InterruptionTest, AnInterruptedMovieIsNeverToldByTheNameOfTheNextOne) {
+  auto asked = game();
+  auto client = chat();
+  asked.start();
+  client.start();
+  device_.alerts.shown.at(1)->handler(platform::UserAlertAnswer::Default);
+  device_.run();
+  sendFrame(kSecond);
+  device_.alerts.shown.at(0)->handler(platform::UserAlertAnswer::Default);
+  device_.run();
+  const auto told = client.takeEnd();
+  ASSERT_TRUE(told);
+  EXPECT_EQ(told->code, errorcode::kInterrupted);
+  EXPECT_EQ(contentAt(told->movie), "movie 0");
+  record(client);
+  client.request("clientDidBecomeActive");
+  const auto again = client.takeEnd();
+  ASSERT_TRUE(again);
+  EXPECT_EQ(again->code, errorcode::kInterrupted);
+  EXPECT_NE(contentAt(again->movie), device_.movies.last().content);
+  EXPECT_TRUE(client.isRecording());
+}
+
+}  // namespace
+}  // namespace qv

@@ -1,0 +1,99 @@
+#include <gtest/gtest.h>
+
+#include <future>
+#include <optional>
+
+#include "platform/ffmpeg/FFmpegMovies.h"
+#include "tests/ffmpeg/MovieProbe.h"
+#include "tests/ffmpeg/SyntheticMedia.h"
+
+namespace qv::platform::test {
+namespace {
+
+/// Two pictures a second, a pause, and a stop 0.43 s after the last picture; a beep lies between these two.
+class StillScreenTest : public ::testing::Test {
+ protected:
+  static constexpr double kBegin = 100.73;
+  static constexpr double kPause = 7.11;
+  /// 2 s to a pause, then to the stop.
+  static constexpr double kStop = kBegin + 2 + 1.43;
+  void SetUp() override {
+    double offset = 0;
+    for (uint32_t i = 0; i < 7; ++i) {
+      if (i == 4) offset = kPause;
+      const double time = kBegin + i / 2.0;
+      if (i > 0) sound(time - 0.5 + (i == 4 ? 0 : offset), 22050);
+      // The first picture of the second part is shown at the time at which the pause began.
+      recording_.appendPicture(picture(i, time + offset, time));
+      if (i == 4) sound(kBegin + 5, 44100);  // of the pause
+    }
+    sound(kBegin + 3 + kPause, 44100 * 43 / 100);
+    sound(kStop + kPause, 44100);  // what the source delivers after the stop
+  }
+  void sound(double captureTime, int64_t frames) {
+    for (const int track : {1, 2}) recording_.appendSound(track, beepingSound(captureTime, frames));
+  }
+  ProbedMovie finish(std::optional<double> end) {
+    if (end) recording_.writer().endSessionAtSourceTime(at(*end));
+    recording_.finish();
+    auto movie = probe(path_);
+    EXPECT_EQ(movie.errors, "");
+    EXPECT_EQ(movie.tracks.size(), 3u);
+    return movie;
+  }
+
+  ScratchDirectory scratch_;
+  ffmpeg::FFmpegAssetWriterService service_;
+  const std::string path_ = scratch_ / "movie.mp4";
+  RecordingUnderTest recording_{service_, path_};
+};
+
+TEST_F(StillScreenTest, LastsUntilTheStopWithAllSoundBeforeIt) {
+  for (const auto& track : finish(kStop).tracks) EXPECT_NEAR(track.duration, 3.43, 1.0 / 44100) << track.type;
+  EXPECT_EQ(decodePictures(path_).size(), 7u);
+  // By capture time: at 101, 102, 110 and 111.
+  for (const int track : {0, 1}) {
+    const auto heard = beeps(decodeSound(path_, track));
+    ASSERT_EQ(heard.size(), 4u);
+    EXPECT_NEAR(heard[3], 111 - kPause - kBegin, 0.001);
+  }
+}
+
+/// What the last picture lasts is kept by whatever is made of the movie.
+TEST_F(StillScreenTest, IsExportedInItsWholeLength) {
+  finish(kStop);
+  ffmpeg::FFmpegExportService exports;
+  for (const ExportPreset preset : {ExportPreset::PassThrough, ExportPreset::HighestQuality}) {
+    const std::string copy = scratch_ / "copy.mp4";
+    auto session = exports.createExportSession(exports.openMovie(URL::fileURL(path_)), preset);
+    session->setOutputURL(URL::fileURL(copy));
+    session->setOutputFileType(kFileTypeMPEG4);
+    const double start = preset == ExportPreset::PassThrough ? 2.2 : 0;
+    if (start > 0) session->setTimeRange({at(start), at(3.43 - start)});
+    std::promise<void> done;
+    session->exportAsynchronously([&] { done.set_value(); });
+    done.get_future().wait();
+    ASSERT_EQ(session->status(), ExportStatus::Completed);
+    const auto movie = probe(copy);
+    EXPECT_EQ(movie.errors, "");
+    for (const auto& track : movie.tracks) EXPECT_NEAR(track.duration, 3.43 - start, 1e-3) << track.type;
+  }
+}
+
+TEST_F(StillScreenTest, EndsExactlyWhereTheNextMovieBegins) {
+  // 4 ms after a picture, which is less than a frame.
+  for (const auto& track : finish(kBegin + 2.504).tracks) EXPECT_NEAR(track.duration, 2.504, 1.0 / 44100) << track.type;
+  EXPECT_EQ(decodePictures(path_).size(), 6u);
+}
+
+TEST_F(StillScreenTest, LastsUntilTheLastSoundWhereNoEndIsTold) {
+  for (const auto& track : finish(std::nullopt).tracks) EXPECT_NEAR(track.duration, 4.43, 2.0 / 44100) << track.type;
+}
+
+TEST_F(StillScreenTest, ShowsThePictureOfItsEndForAFrameAndNeverEndsBeforeItsFirst) {
+  for (const auto& track : finish(kBegin - 5).tracks) EXPECT_NEAR(track.duration, 1 / 60.0, 1.0 / 44100) << track.type;
+  EXPECT_EQ(decodePictures(path_).size(), 1u);
+}
+
+}  // namespace
+}  // namespace qv::platform::test

@@ -1,0 +1,30 @@
+#include "daemon/client/QVClientProxy.h"
+#include "platform/RawRecord.h"
+#include "platform/SampleBuffer.h"
+#include "tests/fakes/LogRecorder.h"
+#include "tests/sdk/RecorderFixture.h"
+
+namespace qv::client {
+namespace {
+
+class ClientProxy : public RecorderFixture {};
+
+TEST_F(ClientProxy, FailuresOfSamplesAreToldAsTheirNumberDoubles) {
+  startRecording();
+  const auto connection = daemonEnd_;
+  QVClientProxy proxy("com.example.game", connection);
+  killDaemon();
+  const fakes::LogRecorder log;
+  const platform::Data bytes(2);
+  for (int i = 0; i < 1000; ++i) proxy.captureHandlerWithAudioSample(bytes, bytes, 1, 2, bytes);
+  for (int i = 0; i < 3; ++i) proxy.updateBroadcastURL(platform::URL("https://x"));
+  run();
+  const std::string sound = "QVClientProxy:captureHandlerWithAudioSample: error getting remote proxy: ";
+  EXPECT_EQ(log.count(sound + "1"), 1u);
+  EXPECT_EQ(log.countContaining(sound), 10u) << "1, 2, 4 ... 512";
+  EXPECT_EQ(log.count(sound + "1 (512 times)"), 1u);
+  EXPECT_EQ(log.countContaining("updateBroadcastURL: error getting remote proxy"), 3u);
+}
+
+}  // namespace
+}  // namespace qv::client
