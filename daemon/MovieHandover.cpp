@@ -60,7 +60,7 @@ void MovieHandover::saveVideoToCameraRoll(const std::string& bundleID, const URL
 
 void MovieHandover::storeSystemRecording(const std::shared_ptr<MovieClaim>& movie, const std::string& bundleID,
                                          KeptHandler handler) {
-  if (auto save = handAndSave(movie, bundleID)) {
+  if (auto save = movie ? movie->saveFor(bundleID) : nullptr) {
     store(std::make_shared<Storing>(Storing{kStopByOtherStart, std::move(save), std::move(handler), nullptr}));
     return;
   }
@@ -75,18 +75,11 @@ void MovieHandover::saveInterrupted(const std::shared_ptr<MovieClaim>& movie, co
     if (error) QV_LOG_ERROR(logs::kDaemon, "error saving file with code: %i", static_cast<int>(error->code));
     if (handler) handler(kept, error);
   };
-  if (auto save = handAndSave(movie, bundleID)) {
+  if (auto save = movie ? movie->saveFor(bundleID) : nullptr) {
     mixAndStore(std::make_shared<Storing>(Storing{kSave, std::move(save), logged, nullptr}));
   } else {
     logged(std::nullopt, _qvUserErrorForCode(errorcode::kFailedToSave));
   }
-}
-
-std::shared_ptr<MovieSave> MovieHandover::handAndSave(const std::shared_ptr<MovieClaim>& movie,
-                                                      const std::string& bundleID) {
-  if (!movie || !movie->hasFile()) return nullptr;
-  movie->handTo(bundleID);
-  return movies_->beginSave(bundleID, movie->url());
 }
 
 void MovieHandover::discard(const std::string& bundleID, std::function<void()> handler) {

@@ -44,9 +44,6 @@ class MovieHandover : public std::enable_shared_from_this<MovieHandover> {
   struct Storing;
   using Work = std::function<void(MovieHandover&)>;
 
-  /// Hands the claim's movie to the application, and begins to save it; nothing where there is no file.
-  [[nodiscard]] std::shared_ptr<MovieSave> handAndSave(const std::shared_ptr<MovieClaim>& movie,
-                                                       const std::string& bundleID);
   void mixAndStore(const std::shared_ptr<Storing>& storing);
   void store(const std::shared_ptr<Storing>& storing);
   void libraryAnswered(const std::shared_ptr<Storing>& storing, const std::optional<platform::Error>& error);

@@ -27,14 +27,16 @@ std::string firstNumbered(const std::string& path, const Test& suits) {
 }  // namespace
 
 std::optional<std::string> MovieBook::takeForRecording(const std::string& path, const std::string& bundleID,
-                                                       Continuation whenSettled) {
+                                                       OwnMovie own, Continuation whenSettled) {
   std::lock_guard lock(mutex_);
   std::string at = firstNumbered(path, [&](const std::string& candidate) {
     const Movie* movie = find(candidate);
-    return !movie || (movie->hands != Hands::Made && (movie->bundleID == bundleID || movie->bundleID.empty()));
+    if (!movie) return true;
+    if (movie->hands == Hands::Made || (movie->hands == Hands::Handed && own == OwnMovie::Keep)) return false;
+    return movie->bundleID == bundleID || movie->bundleID.empty();
   });
   Movie& movie = movies_[at];
-  if (movie.hands == Hands::Saved || movie.hands == Hands::Removed) {
+  if (movie.hands == Hands::Saved || movie.hands == Hands::Stored || movie.hands == Hands::Removed) {
     movie.waiting.push_back(std::move(whenSettled));
     return std::nullopt;
   }
@@ -80,6 +82,11 @@ bool MovieBook::beginSave(const std::string& path, const std::string& bundleID) 
   return true;
 }
 
+void MovieBook::beginStoring(const std::string& path, const std::string& bundleID) {
+  std::lock_guard lock(mutex_);
+  movies_.insert_or_assign(path, Movie{Hands::Stored, bundleID, {}});
+}
+
 std::optional<std::string> MovieBook::beginDiscard(const std::string& bundleID) {
   std::lock_guard lock(mutex_);
   const auto last = lastHanded_.find(bundleID);
@@ -117,6 +124,7 @@ void MovieBook::giveBack(const std::string& path) {
     std::lock_guard lock(mutex_);
     Movie& movie = movies_[path];
     waiting = std::exchange(movie.waiting, {});
+    if (movie.hands == Hands::Stored) lastHanded_[movie.bundleID] = path;
     movie.hands = Hands::Handed;
     if (movie.bundleID.empty()) movies_.erase(path);
   }

@@ -17,9 +17,11 @@ class MovieBook {
  public:
   using Continuation = std::function<void()>;
 
+  /// What is done with this application's own movie at that path, which it was handed and never saved.
+  enum class OwnMovie { Replace, Keep };
   /// The path, which is being made from now on. Nothing where this application's movie at that path is being saved, or
   /// is on its way to being removed: `whenSettled` is called when that is over.
-  std::optional<std::string> takeForRecording(const std::string& path, const std::string& bundleID,
+  std::optional<std::string> takeForRecording(const std::string& path, const std::string& bundleID, OwnMovie own,
                                               Continuation whenSettled);
   /// The same for a copy, which replaces only what was handed to this application, and waits for nothing.
   std::string takeForCopy(const std::string& path, const std::string& bundleID);
@@ -30,6 +32,8 @@ class MovieBook {
   [[nodiscard]] bool isHanded(const std::string& path, const std::string& bundleID) const;
   /// False unless the movie was handed to this application.
   [[nodiscard]] bool beginSave(const std::string& path, const std::string& bundleID);
+  /// From whoever made the movie: it is being saved, and is handed to this application where that fails.
+  void beginStoring(const std::string& path, const std::string& bundleID);
   /// The path of what was handed to this application last, which is being removed from now on; nothing unless it waits
   /// there.
   std::optional<std::string> beginDiscard(const std::string& bundleID);
@@ -39,13 +43,14 @@ class MovieBook {
   [[nodiscard]] bool beginPurge(const std::string& path);
   /// Ends the making, save or removal: the path is nobody's, and whoever waits for it goes on.
   void release(const std::string& path);
-  /// Ends the save or purge of a movie that stays: it is handed to its application as before.
+  /// Ends the save or purge of a movie that stays: it is handed to its application, as before or from now on.
   void giveBack(const std::string& path);
   /// Whoever still waits does not go on.
   void dropWaiting();
 
  private:
-  enum class Hands { Made, Handed, Saved, Removed };
+  /// Stored: saved, before any application was handed it.
+  enum class Hands { Made, Handed, Saved, Stored, Removed };
   struct Movie {
     Hands hands = Hands::Made;
     std::string bundleID;  ///< of its application; empty for what belongs to none

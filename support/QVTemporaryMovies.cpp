@@ -80,6 +80,7 @@ class Claim final : public MovieClaim {
   void handTo(const std::string& bundleID) override {
     if (const Book book = right_.use()) book->hand(path(), bundleID);
   }
+  std::shared_ptr<MovieSave> saveFor(const std::string& bundleID) override;
   void remove(FileCompletion completion) override { right_.useForRemoval(std::move(completion)); }
 
  private:
@@ -100,16 +101,19 @@ class Save final : public MovieSave {
   const URL movie_;
 };
 
+std::shared_ptr<MovieSave> Claim::saveFor(const std::string& bundleID) {
+  const Book book = hasFile() ? right_.use() : nullptr;
+  if (!book) return nullptr;
+  book->beginStoring(path(), bundleID);
+  return std::make_shared<Save>(book, path());
+}
+
 class Movies final : public QVTemporaryMovies {
  public:
   ~Movies() override { book_->dropWaiting(); }
 
   void claimForRecording(const std::string& path, const std::string& bundleID, ClaimHandler handler) override {
-    const auto taken =
-        book_->takeForRecording(normalized(path), bundleID, [weak = weak_from_this(), path, bundleID, handler] {
-          if (const auto self = weak.lock()) self->claimForRecording(path, bundleID, handler);
-        });
-    if (taken) handler(claimAt(*taken));
+    claim(path, bundleID, MovieBook::OwnMovie::Replace, handler);
   }
   std::shared_ptr<MovieClaim> claimNew(const std::string& path) override {
     return claimAt(book_->takeUnused(normalized(path)));
@@ -143,6 +147,17 @@ class Movies final : public QVTemporaryMovies {
   int64_t deleteAllTempFiles() override { return _srDeleteAllTempFiles(purging()); }
 
  private:
+  void claim(const std::string& path, const std::string& bundleID, MovieBook::OwnMovie own,
+             const ClaimHandler& handler) {
+    const auto whenSettled = [weak = weak_from_this(), path, bundleID, handler] {
+      const auto self = std::static_pointer_cast<Movies>(weak.lock());
+      // A movie that could not be saved is its application's still, and was wanted a moment ago.
+      if (self) self->claim(path, bundleID, MovieBook::OwnMovie::Keep, handler);
+    };
+    if (const auto taken = book_->takeForRecording(normalized(path), bundleID, own, whenSettled)) {
+      handler(claimAt(*taken));
+    }
+  }
   [[nodiscard]] std::shared_ptr<MovieClaim> claimAt(const std::string& path) const {
     return std::make_shared<Claim>(book_, path);
   }

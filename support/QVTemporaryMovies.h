@@ -26,6 +26,9 @@ class MovieClaim {
   /// Gives the file to an application, which may save or discard it from now on. The claim ends. Nothing happens where
   /// it has ended.
   virtual void handTo(const std::string& bundleID) = 0;
+  /// Begins to save the file before any application has it; nothing, and the claim goes on, where there is no file. The
+  /// claim ends. Where the save ends without success, the movie is handed to this application.
+  [[nodiscard]] virtual std::shared_ptr<class MovieSave> saveFor(const std::string& bundleID) = 0;
   /// Removes the file later on; the claim ends when it is gone, and also where that fails: then the file is nobody's.
   /// `completion` (may be empty) runs on the background queue; an ended claim removes nothing and gives ENOENT.
   virtual void remove(FileCompletion completion) = 0;
@@ -58,9 +61,10 @@ class QVTemporaryMovies : public std::enable_shared_from_this<QVTemporaryMovies>
 
   /// Claims a path for a recording of this application. What was handed to the same application there is forgotten (its
   /// file is removed by whoever writes, as is one that is nobody's); while that is being saved or removed, the claim
-  /// waits for the end of it. A path that another application's movie has, or that is being made, is numbered:
-  /// "Chess.mp4", "Chess 2.mp4". The handler runs once, at once where there is nothing to wait for, else in the thread
-  /// that ends the save or removal. Destroyed with this, it does not run.
+  /// waits for the end of it, and what a save has left there is kept by numbering. A path that another application's
+  /// movie has, or that is being made, is numbered: "Chess.mp4", "Chess 2.mp4". The handler runs once, at once where
+  /// there is nothing to wait for, else in the thread that ends the save or removal. Destroyed with this, it does not
+  /// run.
   virtual void claimForRecording(const std::string& path, const std::string& bundleID, ClaimHandler handler) = 0;
   /// The same for a file that must not replace one: a path that nobody has and where no file is, numbered where need
   /// be.

@@ -77,7 +77,7 @@ void RecordingModel::saveAnswered(App app, RequestID request, const std::string&
   const bool wasCertain = isRight && movie->doubts == std::set{request};
   if (movie) movie->doubts.erase(request);
   if (code == 0) {
-    if (!isRight) fault("saved by " + std::to_string(app) + ", which has no right to it: " + name);
+    if (!isRight && !apps_[app].hasLeft) fault("saved by " + std::to_string(app) + ", which has no right to it: " + name);
     if (wasCertain && !saved.empty() && saved != movie->content) fault("saved " + saved + " for " + movie->content);
     if (movie) movie->isGone = true;
   } else if (code != ENOSPC && wasCertain) {
@@ -110,6 +110,7 @@ void RecordingModel::connected(App app, bool isRecording) {
 
 /// Its requests go unanswered: whatever was in doubt stays so.
 void RecordingModel::left(App app) {
+  apps_[app].hasLeft = true;
   for (auto& [name, movie] : apps_[app].movies) {
     if (!movie.doubts.empty()) movie.doubts = {kForGood};
   }

@@ -62,6 +62,7 @@ class RecordingModel {
     int began = 0, told = 0;
     std::map<std::string, Movie> movies;  ///< by file name
     std::string last;                     ///< handed last
+    bool hasLeft = false;                 ///< what it was handed meanwhile, it was never told
   };
   static constexpr RequestID kForGood = 0;
 

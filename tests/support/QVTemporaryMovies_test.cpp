@@ -140,15 +140,17 @@ TEST_F(TemporaryMoviesTest, ARecordingWaitsForASaveThatFailsAndForARemoval) {
   auto save = movies_->beginSave(kChess, url("Chess.mp4"));
   wait("Chess.mp4");
   save = nullptr;
-  EXPECT_EQ(waitedNames(), Names{"Chess.mp4"});
+  EXPECT_EQ(waitedNames(), Names{"Chess 2.mp4"});
+  EXPECT_TRUE(movies_->isHandedTo(kChess, url("Chess.mp4"))) << "it was wanted a moment ago";
   waited_[0]->remove(recordError());
   waited_[0]->remove(recordError());
   waited_[0]->handTo(kChess);
+  movies_->discardLast(kChess, recordError());
   wait("Chess.mp4");
   EXPECT_EQ(waited_.size(), 1u);
   background_.runUntilIdle();
-  EXPECT_EQ(errors_, (std::vector<int64_t>{0, ENOENT})) << "a claim ends once";
-  EXPECT_EQ(waitedNames(), (Names{"Chess.mp4", "Chess.mp4"}));
+  EXPECT_EQ(errors_, (std::vector<int64_t>{0, ENOENT, 0})) << "a claim ends once";
+  EXPECT_EQ(waitedNames(), (Names{"Chess 2.mp4", "Chess.mp4"}));
 }
 
 TEST_F(TemporaryMoviesTest, WhoeverWaitsIsDroppedWithTheStore) {
