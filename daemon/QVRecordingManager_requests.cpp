@@ -121,9 +121,14 @@ void QVRecordingManager::discardRecording(const Caller& caller, const IPCReply& 
     QV_LOG_ERROR(logs::kDaemon, "can't discard recording while recording is in progress");
     reply.fail(requesterror::kRecording, "a recording is in progress");
   } else {
-    sessions_->whenEnded(session->bundleID(), [handover = handover_, bundleID = session->bundleID(), reply] {
+    const auto discard = [handover = handover_, bundleID = session->bundleID(), reply] {
       handover->discard(bundleID, [reply] { reply({}); });
-    });
+    };
+    if (session->recording()) {
+      session->recording()->whenEnded(discard);
+    } else {
+      discard();
+    }
   }
 }
 

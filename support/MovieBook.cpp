@@ -87,12 +87,18 @@ void MovieBook::beginStoring(const std::string& path, const std::string& bundleI
   movies_.insert_or_assign(path, Movie{Hands::Stored, bundleID, {}});
 }
 
-std::optional<std::string> MovieBook::beginDiscard(const std::string& bundleID) {
+MovieBook::Discard MovieBook::beginDiscard(const std::string& bundleID, Continuation whenSettled) {
   std::lock_guard lock(mutex_);
   const auto last = lastHanded_.find(bundleID);
-  if (last == lastHanded_.end() || !isHandedTo(find(last->second), bundleID)) return std::nullopt;
-  movies_[last->second].hands = Hands::Removed;
-  return last->second;
+  const auto movie = last == lastHanded_.end() ? movies_.end() : movies_.find(last->second);
+  if (movie == movies_.end() || movie->second.bundleID != bundleID) return {};
+  if (movie->second.hands == Hands::Saved) {
+    movie->second.waiting.push_back(std::move(whenSettled));
+    return {std::nullopt, true};
+  }
+  if (movie->second.hands != Hands::Handed) return {};
+  movie->second.hands = Hands::Removed;
+  return {movie->first, false};
 }
 
 void MovieBook::beginRemoval(const std::string& path) {

@@ -34,9 +34,13 @@ class MovieBook {
   [[nodiscard]] bool beginSave(const std::string& path, const std::string& bundleID);
   /// From whoever made the movie: it is being saved, and is handed to this application where that fails.
   void beginStoring(const std::string& path, const std::string& bundleID);
-  /// The path of what was handed to this application last, which is being removed from now on; nothing unless it waits
-  /// there.
-  std::optional<std::string> beginDiscard(const std::string& bundleID);
+  struct Discard {
+    /// Of what was handed to this application last, which is being removed from now on; nothing unless it waits there.
+    std::optional<std::string> path;
+    /// It is being saved: `whenSettled` is called when that is over.
+    bool waits = false;
+  };
+  Discard beginDiscard(const std::string& bundleID, Continuation whenSettled);
   /// From whoever makes or saves the movie.
   void beginRemoval(const std::string& path);
   /// From whoever else wants it away; false while somebody makes, saves or removes it.

@@ -134,9 +134,12 @@ class Movies final : public QVTemporaryMovies {
     return isMovieAt(path) ? save : nullptr;
   }
   void discardLast(const std::string& bundleID, FileCompletion completion) override {
-    if (const auto path = book_->beginDiscard(bundleID)) {
-      removeAndRelease(book_, *path, std::move(completion));
-    } else {
+    const auto discard = book_->beginDiscard(bundleID, [weak = weak_from_this(), bundleID, completion] {
+      if (const auto self = weak.lock()) self->discardLast(bundleID, completion);
+    });
+    if (discard.path) {
+      removeAndRelease(book_, *discard.path, std::move(completion));
+    } else if (!discard.waits) {
       answerInBackground(std::move(completion), std::nullopt);
     }
   }

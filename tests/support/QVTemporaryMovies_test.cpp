@@ -171,6 +171,7 @@ TEST_F(TemporaryMoviesTest, DiscardTakesTheLastHandedMovieOfItsCallerAlone) {
   movies_->discardLast(kChess, recordError());
   background_.runUntilIdle();
   EXPECT_TRUE(exists("Chess_trimmed.mp4")) << "it is being saved";
+  EXPECT_TRUE(errors_.empty()) << "whether it goes is not known yet";
   save = nullptr;
   movies_->discardLast(kChess, recordError());
   movies_->discardLast(kChess, recordError());
