@@ -62,22 +62,26 @@ void RecordingModel::handed(App app, const std::string& name, const std::string&
     former->isGone = true;
   }
   if (content.empty() && isQuiet) fault("handed but not there: " + name);
-  apps_[app].movies[name] = {content, isQuiet ? std::set<RequestID>() : std::set{kForGood}};
+  apps_[app].movies[name] = {content, isQuiet ? std::set<RequestID>() : std::set{kForGood}, {}};
   apps_[app].last = name;
 }
 
 void RecordingModel::savePosted(App app, RequestID request, const std::string& name) {
-  if (Movie* movie = find(app, name)) movie->doubts.insert(request);
+  Movie* movie = find(app, name);
+  if (!movie) return;
+  if (!movie->doubts.empty()) movie->lateSaves.insert(request);
+  movie->doubts.insert(request);
 }
 
 void RecordingModel::saveAnswered(App app, RequestID request, const std::string& name, int64_t code,
                                   const std::string& saved) {
   Movie* movie = find(app, name);
   const bool isRight = movie && !movie->isGone;
-  const bool wasCertain = isRight && movie->doubts == std::set{request};
+  const bool wasCertain = isRight && movie->doubts == std::set{request} && !movie->lateSaves.contains(request);
   if (movie) movie->doubts.erase(request);
   if (code == 0) {
-    if (!isRight && !apps_[app].hasLeft) fault("saved by " + std::to_string(app) + ", which has no right to it: " + name);
+    if (!isRight && !apps_[app].hasLeft)
+      fault("saved by " + std::to_string(app) + ", which has no right to it: " + name);
     if (wasCertain && !saved.empty() && saved != movie->content) fault("saved " + saved + " for " + movie->content);
     if (movie) movie->isGone = true;
   } else if (code != ENOSPC && wasCertain) {

@@ -47,6 +47,8 @@ class RecordingModel {
   void recordingAt(const std::string& name);
   [[nodiscard]] bool owns(const std::string& name, const std::string& content) const;
   [[nodiscard]] std::vector<std::string> names(App app) const;
+  /// Whether it was away for a time, so that movies may be its own which it was never told of.
+  [[nodiscard]] bool hasLeft(App app) const { return apps_.contains(app) && apps_.at(app).hasLeft; }
 
   void fault(const std::string& text) { faults_.push_back(text); }
   [[nodiscard]] const std::vector<std::string>& faults() const { return faults_; }
@@ -56,6 +58,7 @@ class RecordingModel {
   struct Movie {
     std::string content;
     std::set<RequestID> doubts;
+    std::set<RequestID> lateSaves;  ///< asked while something else was on its way: refused with right
     bool isGone = false, isDiscarded = false;
   };
   struct Application {
