@@ -8,7 +8,7 @@ namespace qv {
 namespace {
 
 constexpr int kSteps = 4000;
-constexpr int kRuns = 8;
+constexpr int kRuns = 48;
 
 uint64_t numberFrom(const char* variable, uint64_t otherwise) {
   const char* text = std::getenv(variable);
