@@ -56,7 +56,7 @@ void ForegroundFollower::follow(const std::shared_ptr<QVRecording>& recording) {
   lookAtForeground();
 }
 
-void ForegroundFollower::stopFollowing(const QVRecording& recording) {
+void ForegroundFollower::clearSystemRecordingUI(const QVRecording& recording) {
   QV_LOG(logs::kDaemon, "stop monitoring foreground apps");
   if (followed_.lock().get() == &recording) stopFollowing();
 }

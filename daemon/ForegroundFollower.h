@@ -23,7 +23,7 @@ class ForegroundFollower : public std::enable_shared_from_this<ForegroundFollowe
   /// From now on this recording's sound is that of the application in front; in place of another recording.
   void follow(const std::shared_ptr<QVRecording>& recording);
   /// Nothing happens where another recording is followed: a late end must not take away the next one's follower.
-  void stopFollowing(const QVRecording& recording);
+  void clearSystemRecordingUI(const QVRecording& recording);
   /// Whoever is followed.
   void stopFollowing();
 

@@ -14,14 +14,22 @@ namespace logs = platform::logs;
 
 namespace {
 
-constexpr const char kSave[] = "saveVideoToCameraRoll";
-constexpr const char kStopByOtherStart[] = "stopCurrentRecordingSession";
+/// What the log says of one way to store a movie.
+struct StoringLines {
+  const char* success;
+  const char* failure;
+};
+constexpr StoringLines kSave{"QVRecordingManager:saveVideoToCameraRoll: Video saved to camera roll successful",
+                             "QVRecordingManager:saveVideoToCameraRoll: Video saved to camera roll failed"};
+constexpr StoringLines kStopByOtherStart{
+    "QVRecordingManager:stopCurrentRecordingSession: Video saved to camera roll successful",
+    "QVRecordingManager:stopCurrentRecordingSession: Video saved to camera roll failed"};
 
-void logResult(const char* operation, const std::optional<Error>& error) {
+void logResult(const StoringLines& lines, const std::optional<Error>& error) {
   if (error) {
-    QV_LOG_ERROR(logs::kDaemon, "QVRecordingManager:%s: Video saved to camera roll failed", operation);
+    QV_LOG_ERROR(logs::kDaemon, "%s", lines.failure);
   } else {
-    QV_LOG(logs::kDaemon, "QVRecordingManager:%s: Video saved to camera roll successful", operation);
+    QV_LOG(logs::kDaemon, "%s", lines.success);
   }
 }
 
@@ -34,7 +42,7 @@ void logRemoval(const std::optional<Error>& error) {
 /// One movie on its way into the photo library. Touched on the sequence only; dropped with it, the movie is its
 /// application's as before.
 struct MovieHandover::Storing {
-  const char* operation;  ///< what the log calls it
+  StoringLines lines;
   std::shared_ptr<MovieSave> save;
   KeptHandler handler;
   std::shared_ptr<MovieClaim> mixed;  ///< where mixing worked
@@ -105,7 +113,7 @@ void MovieHandover::store(const std::shared_ptr<Storing>& storing) {
   photoLibrary_.createAsset(
       storing->mixed ? storing->mixed->url() : storing->save->movie(), platform::PhotoResourceType::Video,
       [weak = weak_from_this(), storing](const std::optional<Error>& error) {
-        logResult(storing->operation, error);
+        logResult(storing->lines, error);
         onSequence(weak, [storing, error](MovieHandover& self) { self.libraryAnswered(storing, error); });
       });
 }

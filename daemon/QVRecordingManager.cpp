@@ -36,21 +36,23 @@ QVRecordingManager::QVRecordingManager(QVCaptureManager& captureManager)
           sequence_, [this] { endRecordingsOfApplications(_qvUserErrorForCode(errorcode::kContentResize)); })),
       sessions_(std::make_shared<SessionRegistry>(context_)),
       starts_(startServices()),
-      purge_(movies_, StorePurge::Recordings{
-                          [this] { return !sessions_->recordingSessions().empty(); },
-                          [this] {
-                            for (const Session& session : sessions_->recordingSessions()) {
-                              if (!session->recording()->writesMovies()) continue;
-                              session->recording()->fail(_qvUserErrorForCode(errorcode::kInsufficientStorage));
-                            }
-                          },
-                          [this] {
-                            for (const Session& session : sessions_->recordingSessions()) {
-                              stopRecordingSession(session,
-                                                   {.cause = _qvUserErrorForCode(errorcode::kInsufficientStorage),
-                                                    .movie = moviefate::remove()});
-                            }
-                          }}),
+      purge_(movies_,
+             StorePurge::Recordings{
+                 [this] { return !sessions_->recordingSessions().empty(); },
+                 [this] {
+                   for (const Session& session : sessions_->recordingSessions()) {
+                     if (!session->recording()->writesMovies()) continue;
+                     session->recording()->fail(_qvUserErrorForCode(errorcode::kInsufficientStorage));
+                   }
+                 },
+                 [this] {
+                   for (const Session& session : sessions_->recordingSessions()) {
+                     stopRecordingSession(session, [](QVRecording& recording) {
+                       QV_LOG(logs::kDaemon, "recording stopped without handler!");
+                       recording.finishAndCleanupSessionFiles(_qvUserErrorForCode(errorcode::kInsufficientStorage));
+                     });
+                   }
+                 }}),
       alerts_(*platform_.globalQueue) {
   _srSetupTempDirectory();
   _srSalvageUnfinishedMovies();

@@ -101,15 +101,16 @@ class QVRecordingManager final : public platform::IPCListenerDelegate,
   void setupBroadcast(const Caller& caller, const request::SetupBroadcast& request, const platform::IPCReply& reply);
 
   // --- Ends.
-  void stopRecordingSession(const Session& session, RecordingEnd end);
+  void stopRecordingSession(const Session& session, const std::function<void(QVRecording&)>& end);
   void stopCurrentRecordingSessionWithHandler();
+  [[nodiscard]] MovieFate storeInPhotoLibrary(const std::string& bundleID) const;
   void interruptOtherRecordingSessionAgainstSession(const Session& session);
   void endRecordingsOfApplications(const platform::Error& cause);
   void recordingStarted(const Session& session);
 
   // --- System recording.
   void checkAndPlaySystemRecordSound(const Session& session, bool isRecordingOn);
-  void stopSystemRecordingWithHandler(const std::function<RecordingEnd(const Session&)>& endOf);
+  void stopSystemRecordingWithHandler(const std::function<void(QVRecording&)>& end);
 
   platform::Platform& platform_;
   platform::SerialQueue sequence_;

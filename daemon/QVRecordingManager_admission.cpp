@@ -76,7 +76,10 @@ void QVRecordingManager::applicationDisconnectedWithBundleID(const std::optional
     if (proxy) proxy->setConnection(nullptr);
     return;
   }
-  stopRecordingSession(session, {.movie = moviefate::remove()});
+  stopRecordingSession(session, [](QVRecording& recording) {
+    QV_LOG(logs::kDaemon, "recording stopped without handler!");
+    recording.finishAndCleanupSessionFiles(std::nullopt);
+  });
   sessions_->removeSessionForBundleID(*bundleID);
 }
 

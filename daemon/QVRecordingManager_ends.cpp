@@ -11,14 +11,13 @@ using platform::URL;
 namespace logs = platform::logs;
 
 /// The stop that somebody asked for: a client, its leaving, or another start.
-void QVRecordingManager::stopRecordingSession(const Session& session, RecordingEnd end) {
+void QVRecordingManager::stopRecordingSession(const Session& session, const std::function<void(QVRecording&)>& end) {
   // A session remembers what its last recording was, so one that does not record makes no sound when its client goes.
   if (session->isRecording()) checkAndPlaySystemRecordSound(session, false);
   QV_LOG(logs::kDaemon, "QVRecordingManager: stopRecordingSession:handler:");
   broadcasts_->clearPresentation();
   if (!session->isRecording()) return;
-  if (!end.handler) QV_LOG(logs::kDaemon, "recording stopped without handler!");
-  session->recording()->end(std::move(end));
+  end(*session->recording());
 }
 
 /// The movie of an application goes; that of a system recording goes to the photo library, or stays its client's where
@@ -26,15 +25,22 @@ void QVRecordingManager::stopRecordingSession(const Session& session, RecordingE
 void QVRecordingManager::stopCurrentRecordingSessionWithHandler() {
   QV_LOG(logs::kDaemon, "QVRecordingManager:stopCurrentRecordingSession:");
   for (const Session& session : sessions_->recordingSessions()) {
-    RecordingEnd end{.cause = _qvUserErrorForCode(errorcode::kInterrupted), .movie = moviefate::remove()};
-    if (session->isSystemRecording()) {
-      end.movie = [handover = handover_, bundleID = session->bundleID()](std::shared_ptr<MovieClaim> movie, auto done) {
-        handover->storeSystemRecording(std::move(movie), bundleID,
-                                       [done](const std::optional<URL>& kept, const auto&) { done(kept); });
-      };
-    }
-    stopRecordingSession(session, std::move(end));
+    stopRecordingSession(session, [this](QVRecording& recording) {
+      const Error interrupted = _qvUserErrorForCode(errorcode::kInterrupted);
+      if (recording.settings().systemRecording) {
+        recording.end({.cause = interrupted, .movie = storeInPhotoLibrary(recording.settings().bundleID)});
+      } else {
+        recording.finishAndCleanupSessionFiles(interrupted);
+      }
+    });
   }
+}
+
+MovieFate QVRecordingManager::storeInPhotoLibrary(const std::string& bundleID) const {
+  return [handover = handover_, bundleID](const std::shared_ptr<MovieClaim>& movie, auto done) {
+    handover->storeSystemRecording(movie, bundleID,
+                                   [done](const std::optional<URL>& kept, const auto&) { done(kept); });
+  };
 }
 
 void QVRecordingManager::interruptOtherRecordingSessionAgainstSession(const Session& session) {
@@ -65,7 +71,7 @@ void QVRecordingManager::recordingStarted(const Session& session) {
 }
 
 void QVRecordingManager::recordingSessionWillStop(const Session&, const std::shared_ptr<QVRecording>& recording) {
-  if (recording->settings().systemRecording) foreground_->stopFollowing(*recording);
+  if (recording->settings().systemRecording) foreground_->clearSystemRecordingUI(*recording);
   layoutRule_->ignore();
 }
 

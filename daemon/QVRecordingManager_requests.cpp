@@ -102,13 +102,12 @@ void QVRecordingManager::stopForClient(const Session& session, double startClipD
     reply.fail(requesterror::kNotRecording, "the recording has ended already");
     return;
   }
-  stopRecordingSession(session, {.movie = moviefate::handTo(session->bundleID()),
-                                 .handler =
-                                     [reply](const std::optional<URL>& movie, const std::optional<Error>& error) {
-                                       reply({encodeURL(movie), Value(platform::encodeError(error))});
-                                     },
-                                 .startClipDuration = startClipDuration,
-                                 .endClipDuration = endClipDuration});
+  const auto answer = [reply](const std::optional<URL>& movie, const std::optional<Error>& error) {
+    reply({encodeURL(movie), Value(platform::encodeError(error))});
+  };
+  stopRecordingSession(session, [&](QVRecording& recording) {
+    recording.finishSessionWithStartClipDuration(startClipDuration, endClipDuration, answer);
+  });
 }
 
 /// What the caller was handed last. While its recording is ending, that is not known yet.
@@ -150,8 +149,10 @@ void QVRecordingManager::resumeRecording(const Caller& caller, const Session& se
   if (matches) {
     session->recording()->resumeSessionWithContextID(contextID);
   } else {
-    stopRecordingSession(session, {.cause = _qvUserErrorForCode(errorcode::kNoContextIDMatch),
-                                   .movie = moviefate::handTo(session->bundleID())});
+    stopRecordingSession(session, [](QVRecording& recording) {
+      recording.end({.cause = _qvUserErrorForCode(errorcode::kNoContextIDMatch),
+                     .movie = moviefate::handTo(recording.settings().bundleID)});
+    });
   }
 }
 

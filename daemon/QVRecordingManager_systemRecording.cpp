@@ -19,18 +19,18 @@ void QVRecordingManager::checkAndPlaySystemRecordSound(const Session& session, b
   platform_.sounds->play(isRecordingOn ? kRecordingBeginsSound : kRecordingEndsSound);
 }
 
-void QVRecordingManager::stopSystemRecordingWithHandler(const std::function<RecordingEnd(const Session&)>& endOf) {
-  for (const Session& session : sessions_->systemRecordingSessions()) stopRecordingSession(session, endOf(session));
+void QVRecordingManager::stopSystemRecordingWithHandler(const std::function<void(QVRecording&)>& end) {
+  for (const Session& session : sessions_->systemRecordingSessions()) stopRecordingSession(session, end);
 }
 
 void QVRecordingManager::stopSystemRecordingWithInterruption() {
   sequence_.async(weak_from_this(), [](QVRecordingManager& manager) {
-    manager.stopSystemRecordingWithHandler([handover = manager.handover_](const Session& session) {
-      RecordingEnd end{.cause = _qvUserErrorForCode(errorcode::kInterrupted)};
-      end.movie = [handover, bundleID = session->bundleID()](std::shared_ptr<MovieClaim> movie, auto done) {
+    manager.stopSystemRecordingWithHandler([handover = manager.handover_](QVRecording& recording) {
+      const auto save = [handover, bundleID = recording.settings().bundleID](const std::shared_ptr<MovieClaim>& movie,
+                                                                             auto done) {
         handover->saveInterrupted(movie, bundleID, [done](const auto& kept, const auto&) { done(kept); });
       };
-      return end;
+      recording.end({.cause = _qvUserErrorForCode(errorcode::kInterrupted), .movie = save});
     });
   });
 }

@@ -182,7 +182,7 @@ void StartFlow::cancel() {
   if (!recording_) {
     refuse(_qvUserErrorForCode(errorcode::kUserDeclined));
   } else if (!request_.systemRecording) {
-    recording_->end({.movie = moviefate::remove()});
+    recording_->finishAndCleanupSessionFiles(std::nullopt);
   }
 }
 

@@ -77,6 +77,12 @@ class QVRecording final : public platform::ScreenCaptureControllerDelegate,
   void whenAnswered(std::function<void()> work);
   void pauseSession();
   void resumeSessionWithContextID(uint32_t contextID);
+  /// Its client's stop. The handler gets the movie, which its client may save or discard from then on; without the
+  /// first and last seconds where both durations are positive.
+  void finishSessionWithStartClipDuration(double startClipDuration, double endClipDuration,
+                                          RecordingEnd::Handler handler);
+  /// Ends it without a movie. `cause`: nothing where nobody is left to be told.
+  void finishAndCleanupSessionFiles(const std::optional<platform::Error>& cause);
   /// False when it is ending already. Thread-safe; what follows runs on the sequence.
   bool end(RecordingEnd end);
   /// A failure has ended it. Its movie stays in the store, or is handed to the client where only the disk is full.

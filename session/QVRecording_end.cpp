@@ -33,6 +33,18 @@ bool QVRecording::end(RecordingEnd end) {
   return true;
 }
 
+void QVRecording::finishSessionWithStartClipDuration(double startClipDuration, double endClipDuration,
+                                                     RecordingEnd::Handler handler) {
+  end({.movie = moviefate::handTo(settings_.bundleID),
+       .handler = std::move(handler),
+       .startClipDuration = startClipDuration,
+       .endClipDuration = endClipDuration});
+}
+
+void QVRecording::finishAndCleanupSessionFiles(const std::optional<Error>& cause) {
+  end({.cause = cause, .movie = moviefate::remove()});
+}
+
 void QVRecording::fail(const Error& error) {
   const bool isDiskFull = error.domain == kQVRecordingErrorDomain && error.code == errorcode::kInsufficientStorage;
   end({.cause = error, .movie = isDiskFull ? moviefate::handTo(settings_.bundleID) : moviefate::keep()});

@@ -20,6 +20,7 @@ MovieFate handTo(const std::string& bundleID) {
 
 MovieFate remove() {
   return [](const std::shared_ptr<MovieClaim>& movie, std::function<void(const std::optional<URL>&)> done) {
+    QV_LOG(logs::kSession, "QVRecordingSession: cleanupSessionFiles");
     movie->remove([done = std::move(done)](const std::optional<Error>& error) {
       if (error) {
         QV_LOG_ERROR(logs::kSession, "error removing file with code: %i", static_cast<int>(error->code));

@@ -1,6 +1,7 @@
 """The daemon lives on, and says what is wrong, where the world around it is not as it should be."""
 import os
 import shutil
+import urllib.parse
 
 import movie
 from harness import PATIENCE, Device, check, main, wait_for_line, wait_until
@@ -111,8 +112,8 @@ def record_while_disk_fills(room):
         ballast = os.path.join(device.media, 'ballast')
         fill_disk(ballast, room)
         output, _ = game.communicate(timeout=PATIENCE)
-        check(f'stopped url= error={FAILED_TO_SAVE}\n' in output, output)
         path, = device.movie_files()
+        check(f'stopped url=file://{urllib.parse.quote(path)} error={INSUFFICIENT_STORAGE}\n' in output, output)
         check(float(movie.streams(path)[0]['duration']) > 0.5, 'nothing is left of the recording')
         if room > 0:
             check(movie.fragment_count(path) == 0, 'the movie was not finished')

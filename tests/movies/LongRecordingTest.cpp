@@ -36,6 +36,7 @@ class LongRecordingTest : public DaemonTest {
     device_.platform.assetWriter = &movies_;
     device_.deviceInfo.audioCaptureDevice = true;
     device_.applications.owners[5] = 100;
+    device_.clock.setHostTime(platform::MediaTime::make(now_, platform::kHostTimescale));
   }
 
   static std::vector<uint8_t> soundAt(int64_t time, double frequency) {
@@ -89,6 +90,7 @@ class LongRecordingTest : public DaemonTest {
       advance(kStep);
     }
     now_ -= kStep;
+    device_.clock.setHostTime(platform::MediaTime::make(now_, platform::kHostTimescale));
   }
   void advance(int64_t nanoseconds) {
     now_ += nanoseconds;
