@@ -45,7 +45,7 @@ void QVRecording::prepare(std::function<void()> handler) {
     const auto self = weakSelf.lock();
     if (!self) return;
     self->context_->sequence.async([self, handler, error] {
-      if (error) self->end({.cause = error});
+      if (error) self->fail(*error);
       if (self->isRecording()) handler();
     });
   });
@@ -66,7 +66,7 @@ void QVRecording::startSessionWithHandler(int32_t processID, std::function<void(
 }
 
 void QVRecording::outputStarted(const std::optional<Error>& error, const std::function<void()>& handler) {
-  if (error) end({.cause = error});
+  if (error) fail(*error);
   if (!isRecording()) return;
   updateBundleIdForFirstForegroundApp();
   _resumeOrStartSession();

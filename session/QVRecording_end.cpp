@@ -47,7 +47,9 @@ void QVRecording::finishAndCleanupSessionFiles(const std::optional<Error>& cause
 
 void QVRecording::fail(const Error& error) {
   const bool isDiskFull = error.domain == kQVRecordingErrorDomain && error.code == errorcode::kInsufficientStorage;
-  end({.cause = error, .movie = isDiskFull ? moviefate::handTo(settings_.bundleID) : moviefate::keep()});
+  end({.cause = error,
+       .endReason = error.code,
+       .movie = isDiskFull ? moviefate::handTo(settings_.bundleID) : moviefate::keep()});
 }
 
 void QVRecording::beginEnd() {
@@ -176,7 +178,7 @@ bool QVRecording::writesMovies() const {
 
 void QVRecording::reportSummaryEvent() {
   reportingAgent_->setRecordedFileSize(getRecordedFileSize());
-  reportingAgent_->setEndReason(end_.cause ? end_.cause->code : 0);
+  reportingAgent_->setEndReason(end_.endReason);
   reportingAgent_->reportEventWithType(QVReportingAgent::kSessionSummaryEvent,
                                        reportingAgent_->collectSummaryEventMetrics());
 }

@@ -26,8 +26,10 @@ namespace moviefate {
 struct RecordingEnd {
   using Handler = std::function<void(const std::optional<platform::URL>&, const std::optional<platform::Error>&)>;
 
-  /// Why, for the client and the metrics; nothing where the client itself wants it, or has gone.
+  /// Why, for the client; nothing where the client itself wants it, or has gone.
   std::optional<platform::Error> cause = std::nullopt;
+  /// The end reason of the metrics: the code of a failure, 0 where somebody stopped it.
+  int64_t endReason = 0;
   MovieFate movie = moviefate::keep();
   /// The answer of a stop, on the sequence, when the end is complete. It is the report of the end too: with a handler
   /// the client gets no message.
