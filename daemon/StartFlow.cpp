@@ -182,7 +182,10 @@ void StartFlow::cancel() {
   if (!recording_) {
     refuse(_qvUserErrorForCode(errorcode::kUserDeclined));
   } else if (!request_.systemRecording) {
+    // Over at once: an application that comes back may start again, and waits for the end of this.
+    const auto self = shared_from_this();
     recording_->finishAndCleanupSessionFiles(std::nullopt);
+    over_();
   }
 }
 
