@@ -26,7 +26,6 @@ class RequestTable {
         [serve = std::move(serve)](const Caller& caller, const NamedArguments& arguments,
                                    const platform::IPCReply& reply) { serve(caller, Request(arguments), reply); });
   }
-  [[nodiscard]] bool contains(const std::string& member) const { return entries_.contains(member); }
   void serve(const Caller& caller, const platform::IPCOperation& operation, const platform::IPCArguments& arguments,
              const platform::IPCReply& reply) const {
     const auto entry = entries_.find(operation.member);

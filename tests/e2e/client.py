@@ -81,6 +81,13 @@ class Client:
         """The reply's values: none, one, or a tuple."""
         return self.connection.call_blocking(None, PATH, interface, member, signature, arguments, timeout=PATIENCE)
 
+    def send(self, member, signature='', *arguments):
+        """Sends without waiting; the list that is returned gets the reply, or the error."""
+        answers = []
+        self.connection.call_async(None, PATH, DAEMON, member, signature, arguments, answers.append, answers.append,
+                                   timeout=PATIENCE)
+        return answers
+
     def refusal(self, member, signature='', *arguments, interface=DAEMON):
         """The name of the D-Bus error with which the call fails."""
         try:

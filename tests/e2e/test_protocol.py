@@ -134,6 +134,28 @@ def movie(client, movies):
     check(not os.path.exists(path), 'the discarded movie is still there')
 
 
+def save_meets_start(client, movies):
+    """A movie that is being saved when its application starts to record again is the one that is saved."""
+    def record():
+        check(client.start() == 0, 'the recording is refused')
+        wait_until(lambda: any(os.stat(os.path.join(movies, name)).st_size > 8000 for name in os.listdir(movies)
+                               if name == 'Test.mp4'), 'the movie to grow')
+
+    for _ in range(3):
+        record()
+        former, code = client.stop()
+        check(code == 0, f'the stop gives {code}')
+        saved = client.send('saveVideoToCameraRoll', 's', former)
+        record()
+        url, code = client.stop()
+        check(code == 0, f'the stop gives {code}')
+        client.run_until(lambda: saved, 'the save')  # pylint: disable=cell-var-from-loop
+        check(not saved[0], f'the save gives {saved[0]}')
+        check(os.path.exists(urllib.parse.unquote(urllib.parse.urlparse(url).path)), 'the movie is not there')
+        check(client.refusal('discardRecordingWithHandler') is None, 'the movie cannot be discarded')
+    check(not os.listdir(movies), f'left: {os.listdir(movies)}')
+
+
 def bad_input(client, _movies):
     """Each nonsense is refused, and the connection goes on."""
     def still_serves():
@@ -195,7 +217,8 @@ def run_client(case, movies):
     CLIENT_CASES[case](Client(), movies)
 
 
-CLIENT_CASES = {'capture': capture, 'microphone': microphone, 'movie': movie, 'bad_input': bad_input}
+CLIENT_CASES = {'capture': capture, 'microphone': microphone, 'movie': movie, 'save_meets_start': save_meets_start,
+                'bad_input': bad_input}
 
 if __name__ == '__main__':
     sys.dont_write_bytecode = True
