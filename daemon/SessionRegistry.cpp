@@ -68,9 +68,4 @@ void SessionRegistry::whenEnded(const std::string& bundleID, std::function<void(
   continuation();
 }
 
-bool SessionRegistry::isAnythingRecorded() {
-  std::erase_if(recordings_, isOver);
-  return !recordings_.empty();
-}
-
 }  // namespace qv

@@ -33,8 +33,6 @@ class SessionRegistry : public std::enable_shared_from_this<SessionRegistry> {
   void noteRecording(const std::shared_ptr<QVRecording>& recording);
   /// Runs it when no recording of this application is ending any more: nothing of a former one reaches what comes then.
   void whenEnded(const std::string& bundleID, std::function<void()> continuation);
-  /// Whether any recording goes on or is ending.
-  [[nodiscard]] bool isAnythingRecorded();
 
  private:
   const std::shared_ptr<RecordingContext> context_;

@@ -10,8 +10,6 @@ namespace logs = platform::logs;
 
 namespace {
 constexpr double kTimeToLive = 86400.0;  // seconds
-constexpr int32_t kUrgencyEndsMovies = 2;
-constexpr int32_t kUrgencyTakesAll = 3;
 }  // namespace
 
 int64_t StorePurge::purgeableSpace() {
@@ -22,12 +20,12 @@ int64_t StorePurge::purgeableSpace() {
 
 int64_t StorePurge::purge(int32_t urgency) {
   QV_LOG(logs::kDaemon, "QVRecordingManager: cache delete purge callback");
-  if (urgency >= kUrgencyTakesAll) {
+  if (urgency >= kUrgencyRemovesMovies) {
     recordings_.endAndRemove();
     return movies_->deleteAllTempFiles();
   }
   const bool wasRecording = recordings_.isAnyRecording();
-  if (urgency >= kUrgencyEndsMovies && !_srDeviceHasSufficientFreeSpaceToContinueRecording()) {
+  if (urgency >= kUrgencyEndsRecordings && !_srDeviceHasSufficientFreeSpaceToContinueRecording()) {
     recordings_.endKeepingMovies();
   }
   // Only a recording that stopped while it was looked at leaves files that may go.

@@ -90,6 +90,11 @@ void MovieOutput::finish(platform::MediaTime endTime, FinishHandler handler) {
   });
 }
 
+std::optional<platform::Error> MovieOutput::failure() const {
+  const auto of = writer();
+  return of ? of->failure() : std::nullopt;
+}
+
 void MovieOutput::notifyRecordingMayBeStopped() {
   if (const auto to = writer()) to->notifyRecordingMayBeStopped();
 }

@@ -30,6 +30,7 @@ class MovieOutput final : public RecordingOutput, public std::enable_shared_from
   void finish(platform::MediaTime endTime, FinishHandler handler) override;
   [[nodiscard]] bool makesMovie() const override { return true; }
   [[nodiscard]] std::string moviePath() const override;
+  [[nodiscard]] std::optional<platform::Error> failure() const override;
   void notifyRecordingMayBeStopped() override;
   void notifyRecordingResumed() override;
 

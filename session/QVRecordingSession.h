@@ -65,7 +65,6 @@ class QVRecordingSession final : public QVRecordingObserver, public std::enable_
   [[nodiscard]] bool isRecording() const { return recording_ && recording_->isRecording(); }
   [[nodiscard]] bool isPaused() const { return recording_ && recording_->state() == QVRecording::State::Paused; }
   [[nodiscard]] bool isBroadcasting() const { return isRecording() && recording_->settings().broadcast; }
-  [[nodiscard]] bool isCapturing() const { return recording_ && recording_->settings().captureEnabled; }
   /// Of the recording that goes on, or the last one.
   [[nodiscard]] bool isSystemRecording() const { return systemRecording_; }
   [[nodiscard]] bool microphoneEnabled() const { return microphoneEnabled_; }

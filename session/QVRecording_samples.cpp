@@ -1,3 +1,5 @@
+#include <cerrno>
+
 #include "platform/Log.h"
 #include "session/ClipSeam.h"
 #include "session/QVRecording.h"
@@ -9,6 +11,14 @@ namespace qv {
 using platform::MediaTime;
 using platform::SampleBufferRef;
 namespace logs = platform::logs;
+
+namespace {
+/// Also of a quota, whose disk has room.
+bool isLackOfSpace(const std::optional<platform::Error>& failure) {
+  return failure && failure->domain == platform::kPosixErrorDomain &&
+         (failure->code == ENOSPC || failure->code == EDQUOT);
+}
+}  // namespace
 
 /// Seconds since the first picture.
 void QVRecording::updateDuartionWithSample(const SampleBufferRef& sample) {
@@ -38,6 +48,7 @@ void QVRecording::screenCaptureControllerDidReceiveSampleBuffer(platform::Screen
 void QVRecording::_processSampleBuffer(const SampleBufferRef& sample, uint64_t transformFlags) {
   QV_LOG_DEBUG(logs::kSession, "QVRecordingSession:screenCaptureController:didReceiveSampleBuffer:transformFlags:");
   bool accepted = true;
+  std::optional<platform::Error> failure;
   {
     std::lock_guard lock(shouldStopLock_);
     if (state_ == State::Paused) QV_LOG(logs::kSession, "session is paused discard sample");
@@ -47,12 +58,13 @@ void QVRecording::_processSampleBuffer(const SampleBufferRef& sample, uint64_t t
       appAudio.setCaptureStartTime(sample->presentationTime());
     }
     accepted = output_->appendVideo(timing_.place(sample, transformFlags));
+    if (!accepted) failure = output_->failure();
     reportingAgent_->addVideoFrame();
   }
   if (accepted) return;
   QV_LOG_ERROR(logs::kSession, "QVRecordingSession: failed to start writer when appending video sample");
-  fail(_qvUserErrorForCode(_srDeviceHasSufficientFreeSpaceToContinueRecording() ? errorcode::kFailedToSave
-                                                                                : errorcode::kInsufficientStorage));
+  const bool isDiskFull = isLackOfSpace(failure) || !_srDeviceHasSufficientFreeSpaceToContinueRecording();
+  fail(_qvUserErrorForCode(isDiskFull ? errorcode::kInsufficientStorage : errorcode::kFailedToSave));
 }
 
 /// Sound comes later than it was captured: a pause and the end leave out only what was captured after they began. What

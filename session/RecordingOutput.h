@@ -73,6 +73,8 @@ class RecordingOutput {
   [[nodiscard]] virtual bool makesMovie() const { return false; }
   /// The path of the movie that is being written; empty without.
   [[nodiscard]] virtual std::string moviePath() const { return {}; }
+  /// What went wrong with its file, where that is known.
+  [[nodiscard]] virtual std::optional<platform::Error> failure() const { return std::nullopt; }
   virtual void notifyRecordingMayBeStopped() {}
   virtual void notifyRecordingResumed() {}
 };
