@@ -30,13 +30,6 @@ TEST_F(AppAudioLeaseTest, TapDeliversStampedAudioAndRecyclesItsBuffers) {
   a_.appAudioLease->stopAppAudioCapture();
 }
 
-TEST_F(AppAudioLeaseTest, SoundBeforeTheFirstFrameIsLeftOutAndItsBuffersGoBack) {
-  startTap(a_);
-  for (int i = 0; i < 20; ++i) play(a_, 1024, kSecond);
-  EXPECT_EQ(a_.tap->enqueued.size(), 10u);
-  EXPECT_TRUE(a_.appAudio.empty());
-}
-
 TEST_F(AppAudioLeaseTest, WhatOneRecordingEndsIsNoOthers) {
   for (const bool olderEnds : {true, false}) {
     start(a_);
@@ -157,13 +150,7 @@ TEST_F(AppAudioLeaseTest, SoundThatCannotBeHadIsToldLikeAStart) {
   startTap(a_);
   EXPECT_EQ(a_.tapStarts, 1);
 
-  struct NoTaps final : platform::AppAudioTapService {
-    int32_t createInputQueue(const platform::AudioStreamDescription&, platform::AppAudioInputCallback, uint32_t,
-                             std::unique_ptr<platform::AppAudioTapQueue>&) override {
-      return -3;
-    }
-  } noTaps;
-  device_.platform.appAudioTap = &noTaps;
+  device_.tap.failures = {{"create", -3}};
   startTap(b_);
   EXPECT_EQ(b_.tapStarts, 1);
   b_.appAudioLease.reset();

@@ -111,34 +111,17 @@ TEST_F(ScreenSourceTest, ControllerIsTakenAgainForTheSameSizeAndRate) {
 
 /// A recording whose callback is waited for may begin another one's capture meanwhile.
 TEST_F(ScreenSourceTest, EndHoldsNoLockWhileItWaitsForTheCapture) {
-  struct Controller final : ScreenCaptureController {
-    explicit Controller(std::function<void()>& hook) : atStop(hook) {}
-    void setDelegate(std::weak_ptr<platform::ScreenCaptureControllerDelegate>) override {}
-    void startCapture() override {}
-    void stopCapture() override {
-      if (const auto call = std::exchange(atStop, nullptr)) call();
-    }
-    std::function<void()>& atStop;
-  };
-  struct Service final : platform::ScreenCaptureService {
-    std::unique_ptr<ScreenCaptureController> createController(platform::Size, platform::MediaTime) override {
-      return std::make_unique<Controller>(atStop);
-    }
-    platform::DisplayCloneService& displayClone() override { return clone; }
-    fakes::FakeScreenCapture clone;
-    std::function<void()> atStop;
-  } service;
-  QVScreenSource source(service);
-  auto a = source.lease(windows({1}), a_);
-  auto b = source.lease(windows({2}), b_);
+  auto a = source_.lease(windows({1}), a_);
+  auto& ofA = device_.screen.last();
+  auto b = source_.lease(windows({2}), b_);
   bool met = false;
-  service.atStop = [&] {
+  ofA.atStop = [&] {
     b->startCapture();
     met = true;
   };
   a.reset();
   EXPECT_TRUE(met);
-  EXPECT_EQ(service.clone.contexts, std::set<uint32_t>{2});
+  expectShown({2});
 }
 
 }  // namespace

@@ -17,9 +17,9 @@
 #include "tests/fakes/FakeMovieSalvage.h"
 #include "tests/fakes/FakePreferences.h"
 #include "tests/fakes/FakeServices.h"
-#include "tests/fakes/FakeTimers.h"
 #include "tests/fakes/LogRecorder.h"
 #include "tests/fakes/ManualExecutor.h"
+#include "tests/fakes/ManualTimers.h"
 
 namespace qv::fakes {
 
@@ -37,7 +37,7 @@ struct FakeDevice {
   ManualExecutor executor;
   platform::SerialQueue mainQueue{"main", executor};
   FakeClock clock;
-  FakeTimers timers;
+  ManualTimers timers;
   FakeIPCService ipc{executor};
   FakeKeepAlive keepAlive;
   FakeScreenCapture screen;

@@ -2,7 +2,6 @@
 
 #include <algorithm>
 #include <cerrno>
-#include <map>
 #include <memory>
 #include <string>
 #include <utility>
@@ -46,10 +45,8 @@ class FakeExtensionService final : public platform::ExtensionService {
     }
     executor_.post([completion = std::move(completion), found, error = queryError] { completion(found, error); });
   }
-  void setHostContextClass(const std::string& point,
-                           std::function<std::shared_ptr<platform::ExtensionHostContext>()> make) override {
-    hostContexts[point] = std::move(make);
-  }
+  void setHostContextClass(const std::string&,
+                           std::function<std::shared_ptr<platform::ExtensionHostContext>()>) override {}
   std::shared_ptr<platform::ExtensionUse> useExtension(const platform::ExtensionRecordRef& extension) override {
     return std::make_shared<Use>(*this, extension);
   }
@@ -79,11 +76,9 @@ class FakeExtensionService final : public platform::ExtensionService {
 
   std::vector<platform::ExtensionRecordRef> installed;
   std::vector<Request> requests;
-  std::vector<std::string> killed, revoked;
-  std::map<std::string, std::function<std::shared_ptr<platform::ExtensionHostContext>()>> hostContexts;
+  std::vector<std::string> killed;
   std::shared_ptr<platform::IPCConnection> vendor;
   std::optional<platform::Error> queryError, launchError;
-  bool refusesTokens = false;
 
  private:
   /// Its end ends its requests, as the death of the process does.
@@ -107,10 +102,9 @@ class FakeExtensionService final : public platform::ExtensionService {
           [began = service_.requests.back().handlers.began, id, error = service_.launchError] { began(id, error); });
     }
     std::optional<std::string> issueSandboxToken(const std::string& tokenClass, const std::string& path) override {
-      if (service_.refusesTokens) return std::nullopt;
       return tokenClass + " for " + path;
     }
-    void revokeSandboxToken(const std::string& token) override { service_.revoked.push_back(token); }
+    void revokeSandboxToken(const std::string&) override {}
 
    private:
     FakeExtensionService& service_;
@@ -125,8 +119,7 @@ class FakeExtensionService final : public platform::ExtensionService {
 class FakeBroadcastExtension {
  public:
   FakeBroadcastExtension(FakeIPCService& ipc, FakeExtensionService& service, platform::Executor& executor) : ipc_(ipc) {
-    auto mail = std::make_shared<FakeIPCMail>();
-    auto [daemon, extension] = FakeIPCConnection::makePair(executor, mail, {}, {}, false);
+    auto [daemon, extension] = FakeIPCConnection::makePair(executor, {}, {}, false);
     daemon->setRemoteInterface(extensionVendorProtocol());
     daemon->resume();
     vendorEnd_ = extension;

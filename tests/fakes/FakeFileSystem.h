@@ -19,12 +19,6 @@ namespace qv::fakes {
 class FakeFileSystem final : public platform::FileSystem {
  public:
   enum class Operation { CreateDirectory, List, Attributes, Remove, Move, FreeSize, Read };
-  struct Event {
-    Operation operation;
-    std::string path;
-    std::string destination;  ///< of a move
-    bool operator==(const Event&) const = default;
-  };
 
   FakeFileSystem() { add("/", {4096, {}, {}, true}, {}); }
 
@@ -56,10 +50,10 @@ class FakeFileSystem final : public platform::FileSystem {
     std::lock_guard lock(mutex_);
     freeSize_ = bytes;
   }
-  /// What was changed or asked for, in order (itemExists is not counted).
-  [[nodiscard]] std::vector<Event> events() const {
+  /// How often something was changed or asked for (itemExists is not counted).
+  [[nodiscard]] size_t operations() const {
     std::lock_guard lock(mutex_);
-    return events_;
+    return operations_;
   }
 
   bool itemExists(const std::string& path) override {
@@ -80,27 +74,21 @@ class FakeFileSystem final : public platform::FileSystem {
   }
 
   platform::Result<std::vector<std::string>> contentsOfDirectory(const std::string& path) override {
-    std::lock_guard lock(mutex_);
-    const std::string at = normal(path);
-    if (auto error = begin(Operation::List, at)) return *error;
-    const Entry* directory = find(at);
-    if (!directory) return platform::Error::posix(ENOENT, at);
-    if (!directory->attributes.isDirectory) return platform::Error::posix(ENOTDIR, at);
-    std::vector<std::string> names;
-    for (const Entry& entry : entries_) {
-      if (entry.path != "/" && parentOf(entry.path) == at)
-        names.push_back(entry.path.substr(entry.path.rfind('/') + 1));
-    }
-    return names;
+    using Names = std::vector<std::string>;
+    return of<Names>(Operation::List, path, [this](const Entry& directory) -> platform::Result<Names> {
+      if (!directory.attributes.isDirectory) return platform::Error::posix(ENOTDIR, directory.path);
+      Names names;
+      for (const Entry& entry : entries_) {
+        if (entry.path != "/" && parentOf(entry.path) == directory.path)
+          names.push_back(entry.path.substr(entry.path.rfind('/') + 1));
+      }
+      return names;
+    });
   }
 
   platform::Result<platform::FileAttributes> attributesOfItem(const std::string& path) override {
-    std::lock_guard lock(mutex_);
-    const std::string at = normal(path);
-    if (auto error = begin(Operation::Attributes, at)) return *error;
-    const Entry* entry = find(at);
-    if (!entry) return platform::Error::posix(ENOENT, at);
-    return entry->attributes;
+    return of<platform::FileAttributes>(Operation::Attributes, path,
+                                        [](const Entry& entry) { return entry.attributes; });
   }
 
   std::optional<platform::Error> removeItem(const std::string& path) override {
@@ -116,7 +104,7 @@ class FakeFileSystem final : public platform::FileSystem {
     std::lock_guard lock(mutex_);
     const std::string from = normal(source);
     const std::string to = normal(destination);
-    if (auto error = begin(Operation::Move, from, to)) return error;
+    if (auto error = begin(Operation::Move, from)) return error;
     if (!find(from)) return platform::Error::posix(ENOENT, from);
     if (find(to)) return platform::Error::posix(EEXIST, to);
     if (!find(parentOf(to))) return platform::Error::posix(ENOENT, to);
@@ -127,21 +115,14 @@ class FakeFileSystem final : public platform::FileSystem {
   }
 
   platform::Result<uint64_t> freeSizeOfFileSystem(const std::string& path) override {
-    std::lock_guard lock(mutex_);
-    const std::string at = normal(path);
-    if (auto error = begin(Operation::FreeSize, at)) return *error;
-    if (!find(at)) return platform::Error::posix(ENOENT, at);
-    return freeSize_;
+    return of<uint64_t>(Operation::FreeSize, path, [this](const Entry&) { return freeSize_; });
   }
 
   platform::Result<std::string> readFile(const std::string& path) override {
-    std::lock_guard lock(mutex_);
-    const std::string at = normal(path);
-    if (auto error = begin(Operation::Read, at)) return *error;
-    const Entry* entry = find(at);
-    if (!entry) return platform::Error::posix(ENOENT, at);
-    if (entry->attributes.isDirectory) return platform::Error::posix(EISDIR, at);
-    return entry->content;
+    return of<std::string>(Operation::Read, path, [](const Entry& entry) -> platform::Result<std::string> {
+      if (entry.attributes.isDirectory) return platform::Error::posix(EISDIR, entry.path);
+      return entry.content;
+    });
   }
 
  private:
@@ -151,6 +132,16 @@ class FakeFileSystem final : public platform::FileSystem {
     std::string content;
   };
 
+  /// What `operation` finds out of an entry that is there.
+  template <typename T, typename Read>
+  platform::Result<T> of(Operation operation, const std::string& path, const Read& read) {
+    std::lock_guard lock(mutex_);
+    const std::string at = normal(path);
+    if (auto error = begin(operation, at)) return *error;
+    const Entry* entry = find(at);
+    if (!entry) return platform::Error::posix(ENOENT, at);
+    return read(*entry);
+  }
   static std::string normal(const std::string& path) {
     std::string out;
     for (const char c : path) {
@@ -179,8 +170,8 @@ class FakeFileSystem final : public platform::FileSystem {
     addParents(parent);
     add(parent, {4096, {}, {}, true}, {});
   }
-  std::optional<platform::Error> begin(Operation operation, const std::string& path, const std::string& to = {}) {
-    events_.push_back({operation, path, to});
+  std::optional<platform::Error> begin(Operation operation, const std::string& path) {
+    ++operations_;
     const auto it = failures_.find({operation, path});
     if (it == failures_.end() || it->second == 0) return std::nullopt;
     return platform::Error::posix(it->second, path);
@@ -189,7 +180,7 @@ class FakeFileSystem final : public platform::FileSystem {
   mutable std::mutex mutex_;
   std::vector<Entry> entries_;
   std::map<std::pair<Operation, std::string>, int> failures_;
-  std::vector<Event> events_;
+  size_t operations_ = 0;
   uint64_t freeSize_ = 10'000'000'000;
 };
 

@@ -15,57 +15,12 @@ using platform::IPCPeer;
 using platform::IPCReply;
 using platform::SerialQueue;
 
-void FakeIPCMail::hold() {
-  std::lock_guard lock(mutex_);
-  holding_ = true;
-}
-
-void FakeIPCMail::release() {
-  deliverAll();
-  std::lock_guard lock(mutex_);
-  holding_ = false;
-}
-
-bool FakeIPCMail::deliverNext() {
-  std::function<void()> delivery;
-  {
-    std::lock_guard lock(mutex_);
-    if (held_.empty()) return false;
-    delivery = std::move(held_.front());
-    held_.pop_front();
-  }
-  delivery();
-  return true;
-}
-
-void FakeIPCMail::deliverAll() {
-  while (deliverNext()) {
-  }
-}
-
-size_t FakeIPCMail::heldCount() const {
-  std::lock_guard lock(mutex_);
-  return held_.size();
-}
-
-void FakeIPCMail::send(std::function<void()> delivery) {
-  {
-    std::lock_guard lock(mutex_);
-    if (holding_) {
-      held_.push_back(std::move(delivery));
-      return;
-    }
-  }
-  delivery();
-}
-
 namespace {
 
-Error ipcError(platform::IPCErrorCode code, const std::string& name, const std::string& message) {
+Error localError(platform::IPCErrorCode code, const std::string& message) {
   return {platform::kIPCErrorDomain,
           static_cast<int64_t>(code),
-          {{platform::kLocalizedDescriptionKey, platform::Value(message)},
-           {platform::kIPCRemoteErrorNameKey, platform::Value(name)}}};
+          {{platform::kLocalizedDescriptionKey, platform::Value(message)}}};
 }
 
 /// An error reply, sorted as the real messaging does.
@@ -74,13 +29,9 @@ Error errorReply(const std::string& name, const std::string& message) {
   const Code code = name == kNoReplyErrorName         ? Code::NoReply
                     : name == kUnknownMethodErrorName ? Code::UnknownOperation
                                                       : Code::RemoteError;
-  return ipcError(code, name, message);
-}
-
-Error localError(platform::IPCErrorCode code, const std::string& message) {
-  return {platform::kIPCErrorDomain,
-          static_cast<int64_t>(code),
-          {{platform::kLocalizedDescriptionKey, platform::Value(message)}}};
+  Error error = localError(code, message);
+  error.userInfo[platform::kIPCRemoteErrorNameKey] = platform::Value(name);
+  return error;
 }
 
 std::optional<IPCArguments> argumentsFor(const IPCArguments& values, const std::vector<std::string>& signatures) {
@@ -117,7 +68,6 @@ struct FakeIPCConnection::End : std::enable_shared_from_this<End> {
   bool named = false;
   std::weak_ptr<End> other;
   std::weak_ptr<FakeIPCConnection> connection;
-  std::shared_ptr<FakeIPCMail> mail;
   std::unique_ptr<SerialQueue> queue;
   bool resumed = false, ended = false, checksMessages = true;
   std::vector<std::function<void()>> inbox;  // until `resumed`
@@ -165,11 +115,7 @@ void FakeIPCConnection::End::enqueue(std::function<void()> work) {
 }
 
 void FakeIPCConnection::End::sendToOther(std::function<void(End&)> delivery) {
-  mail->send([target = other, delivery = std::move(delivery)] {
-    if (const auto end = target.lock()) {
-      end->enqueue([end, delivery] { delivery(*end); });
-    }
-  });
+  if (const auto end = other.lock()) end->enqueue([end, delivery = std::move(delivery)] { delivery(*end); });
 }
 
 void FakeIPCConnection::End::receiveCall(const std::string& interface, const std::string& member,
@@ -252,12 +198,11 @@ void FakeIPCConnection::End::end(bool byPeer) {
   if (!byPeer) sendToOther([](End& peerEnd) { peerEnd.end(true); });
 }
 
-FakeIPCConnection::Pair FakeIPCConnection::makePair(platform::Executor& executor, std::shared_ptr<FakeIPCMail> mail,
-                                                    IPCPeer firstsPeer, IPCPeer secondsPeer, bool named) {
+FakeIPCConnection::Pair FakeIPCConnection::makePair(platform::Executor& executor, IPCPeer firstsPeer,
+                                                    IPCPeer secondsPeer, bool named) {
   auto makeEnd = [&](const char* label, IPCPeer peer) {
     auto end = std::make_shared<End>();
     end->peer = std::move(peer);
-    end->mail = mail;
     end->queue = std::make_unique<SerialQueue>(label, executor);
     return end;
   };

@@ -19,26 +19,6 @@ namespace qv::fakes {
 inline constexpr const char kNoReplyErrorName[] = "com.tarnwick.quorveld.Error.NoReply";
 inline constexpr const char kUnknownMethodErrorName[] = "org.freedesktop.DBus.Error.UnknownMethod";
 
-/// Brings messages from one end to the other: at once, or, while held, one by one as the test says.
-///
-/// Threading: thread-safe.
-class FakeIPCMail {
- public:
-  void hold();
-  /// Delivers what is held and stops holding.
-  void release();
-  /// Delivers the oldest held message; false when there is none.
-  bool deliverNext();
-  void deliverAll();
-  [[nodiscard]] size_t heldCount() const;
-  void send(std::function<void()> delivery);
-
- private:
-  mutable std::mutex mutex_;
-  bool holding_ = false;
-  std::deque<std::function<void()>> held_;
-};
-
 /// One end of a connection within this process.
 ///
 /// Behaves as platform/IPC.h says: arguments and replies are brought to the operation's types (a
@@ -53,8 +33,8 @@ class FakeIPCConnection final : public platform::IPCConnection, public std::enab
   using Pair = std::pair<std::shared_ptr<FakeIPCConnection>, std::shared_ptr<FakeIPCConnection>>;
 
   /// `first` is the connector: it sees `firstsPeer`. With `named`, its loss is an interruption.
-  static Pair makePair(platform::Executor& executor, std::shared_ptr<FakeIPCMail> mail, platform::IPCPeer firstsPeer,
-                       platform::IPCPeer secondsPeer, bool named);
+  static Pair makePair(platform::Executor& executor, platform::IPCPeer firstsPeer, platform::IPCPeer secondsPeer,
+                       bool named);
   explicit FakeIPCConnection(std::shared_ptr<End> end);
   ~FakeIPCConnection() override;
 
@@ -97,11 +77,8 @@ class FakeIPCService final : public platform::IPCService {
 
   /// What listeners see of the clients that connect from now on.
   void setClientPeer(platform::IPCPeer peer);
-  /// What clients see of the services that they connect to from now on.
-  void setServerPeer(platform::IPCPeer peer);
   /// See FakeIPCConnection::setChecksMessages; for both ends of the connections made from now on.
   void setChecksMessages(bool checks);
-  [[nodiscard]] FakeIPCMail& mail() { return *mail_; }
   /// How often `connect` was called, with success or without.
   [[nodiscard]] size_t connectCount() const;
 
@@ -110,11 +87,9 @@ class FakeIPCService final : public platform::IPCService {
   platform::Result<std::shared_ptr<platform::IPCConnection>> connectTo(const std::string& key, bool named);
 
   platform::Executor& executor_;
-  const std::shared_ptr<FakeIPCMail> mail_ = std::make_shared<FakeIPCMail>();
   mutable std::mutex mutex_;
   std::map<std::string, FakeIPCListener*> listeners_;
   platform::IPCPeer clientPeer_;
-  platform::IPCPeer serverPeer_;
   size_t connectCount_ = 0;
   bool checksMessages_ = true;
 };

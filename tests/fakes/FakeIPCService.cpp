@@ -28,7 +28,9 @@ std::string endpointKey(int fd) {
 class FakeIPCListener final : public platform::IPCListener {
  public:
   FakeIPCListener(FakeIPCService& service, std::string key, ListenerEndpoint endpoint)
-      : service_(service), key_(std::move(key)), endpoint_(std::move(endpoint)) {}
+      : service_(service), key_(std::move(key)), endpoint_(std::move(endpoint)) {
+    state_->listener = this;
+  }
   ~FakeIPCListener() override { FakeIPCListener::invalidate(); }
 
   void setDelegate(platform::IPCListenerDelegate* delegate, SerialQueue& queue) override {
@@ -74,16 +76,11 @@ class FakeIPCListener final : public platform::IPCListener {
     SerialQueue* queue = nullptr;
     FakeIPCListener* listener = nullptr;
   };
-  static std::shared_ptr<State> makeState(FakeIPCListener* listener) {
-    auto state = std::make_shared<State>();
-    state->listener = listener;
-    return state;
-  }
 
   FakeIPCService& service_;
   const std::string key_;
   const ListenerEndpoint endpoint_;
-  const std::shared_ptr<State> state_ = makeState(this);
+  const std::shared_ptr<State> state_ = std::make_shared<State>();
 };
 
 FakeIPCService::FakeIPCService(platform::Executor& executor) : executor_(executor) {}
@@ -113,7 +110,7 @@ Result<std::shared_ptr<IPCConnection>> FakeIPCService::connectTo(const std::stri
   ++connectCount_;
   const auto it = listeners_.find(key);
   if (it == listeners_.end()) return Error::posix(ECONNREFUSED, key);
-  auto [client, server] = FakeIPCConnection::makePair(executor_, mail_, serverPeer_, clientPeer_, named);
+  auto [client, server] = FakeIPCConnection::makePair(executor_, {}, clientPeer_, named);
   client->setChecksMessages(checksMessages_);
   server->setChecksMessages(checksMessages_);
   it->second->accept(std::move(server));
@@ -123,11 +120,6 @@ Result<std::shared_ptr<IPCConnection>> FakeIPCService::connectTo(const std::stri
 void FakeIPCService::setClientPeer(IPCPeer peer) {
   std::lock_guard lock(mutex_);
   clientPeer_ = std::move(peer);
-}
-
-void FakeIPCService::setServerPeer(IPCPeer peer) {
-  std::lock_guard lock(mutex_);
-  serverPeer_ = std::move(peer);
 }
 
 void FakeIPCService::setChecksMessages(bool checks) {

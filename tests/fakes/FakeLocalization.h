@@ -13,7 +13,7 @@
 namespace qv::fakes {
 
 /// Languages without a language library: matches tags exactly, then by what stands before the
-/// first "-"; dates are UTC and know the fields yyyy MM dd HH mm ss; folding is ASCII case.
+/// first "-"; every date is UTC and to the second, whatever the pattern; folding is ASCII case.
 ///
 /// Threading: set it up before it is shared.
 class FakeLocalization final : public platform::Localization {
@@ -38,21 +38,12 @@ class FakeLocalization final : public platform::Localization {
     return matches;
   }
 
-  std::string formatDate(platform::Date date, const std::string& pattern) override {
+  std::string formatDate(platform::Date date, const std::string&) override {
     const auto seconds = static_cast<std::time_t>(std::floor(date.secondsSince1970));
     std::tm parts{};
     ::gmtime_r(&seconds, &parts);
-    std::string text = pattern;
-    for (const auto& [field, format] : {std::pair{"yyyy", "%Y"}, std::pair{"MM", "%m"}, std::pair{"dd", "%d"},
-                                        std::pair{"HH", "%H"}, std::pair{"mm", "%M"}, std::pair{"ss", "%S"}}) {
-      char digits[16];
-      if (std::strftime(digits, sizeof digits, format, &parts) == 0) continue;
-      const std::string name = field;
-      for (size_t at = text.find(name); at != std::string::npos; at = text.find(name)) {
-        text.replace(at, name.size(), digits);
-      }
-    }
-    return text;
+    char text[32];
+    return {text, std::strftime(text, sizeof text, "%m-%d-%Y %H:%M:%S", &parts)};
   }
 
   bool beginsWithFolded(const std::string& text, const std::string& prefix) override {

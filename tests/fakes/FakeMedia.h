@@ -38,7 +38,10 @@ class FakeScreenCaptureController final : public platform::ScreenCaptureControll
   ~FakeScreenCaptureController() override { std::erase(living, this); }
   void setDelegate(std::weak_ptr<platform::ScreenCaptureControllerDelegate> to) override { delegate = std::move(to); }
   void startCapture() override { running = true; }
-  void stopCapture() override { running = false; }
+  void stopCapture() override {
+    running = false;
+    if (const auto call = std::exchange(atStop, nullptr)) call();
+  }
 
   void send(const platform::SampleBufferRef& sample, uint64_t flags = 0) {
     if (const auto to = delegate.lock(); to && running) {
@@ -51,6 +54,7 @@ class FakeScreenCaptureController final : public platform::ScreenCaptureControll
   const platform::MediaTime interval;
   std::vector<FakeScreenCaptureController*>& living;
   std::weak_ptr<platform::ScreenCaptureControllerDelegate> delegate;
+  std::function<void()> atStop;
   bool running = false;
 };
 
@@ -115,9 +119,7 @@ class FakeDeviceCapture final : public platform::DeviceCaptureService, public pl
   std::shared_ptr<platform::DeviceCaptureSession> createSession() override {
     return session = std::make_shared<Session>();
   }
-  std::shared_ptr<platform::CaptureDeviceInput> createDefaultAudioInput() override {
-    return hasInput ? std::make_shared<Input>() : nullptr;
-  }
+  std::shared_ptr<platform::CaptureDeviceInput> createDefaultAudioInput() override { return std::make_shared<Input>(); }
   std::shared_ptr<platform::AudioDataOutput> createAudioDataOutput() override {
     return output = std::make_shared<Output>();
   }
@@ -132,7 +134,6 @@ class FakeDeviceCapture final : public platform::DeviceCaptureService, public pl
     output->queue->async([to = output, sample] { to->delegate->captureOutputDidOutputSampleBuffer(*to, sample); });
   }
 
-  bool hasInput = true;
   uint32_t categoryOptions = 0;
   std::shared_ptr<Session> session;
   std::shared_ptr<Output> output;
@@ -213,11 +214,12 @@ class FakeAppAudioTap final : public platform::AppAudioTapService {
 
   int32_t createInputQueue(const platform::AudioStreamDescription& format, platform::AppAudioInputCallback callback,
                            uint32_t, std::unique_ptr<platform::AppAudioTapQueue>& queue) override {
+    if (const int32_t failure = status("create")) return failure;
     tap = std::make_shared<State>();
     tap->callback = std::move(callback);
     taps.push_back(tap);
     queue = std::make_unique<Queue>(*this, format, tap);
-    return status("create");
+    return 0;
   }
   int32_t status(const std::string& operation) const {
     const auto it = failures.find(operation);

@@ -70,6 +70,7 @@ class FakeApplications final : public platform::ApplicationService, public platf
   }
   std::optional<std::string> frontmostApplication() override { return frontmost; }
   std::optional<pid_t> ownerOfContext(uint32_t contextID) override {
+    ++ownersAsked;
     const auto it = owners.find(contextID);
     return it == owners.end() ? std::nullopt : std::optional(it->second);
   }
@@ -83,6 +84,7 @@ class FakeApplications final : public platform::ApplicationService, public platf
   std::map<std::string, uint32_t> states;
   std::map<std::string, pid_t> processes;
   std::map<uint32_t, pid_t> owners;
+  int ownersAsked = 0;
   std::optional<std::string> frontmost;
   std::function<void(const platform::Dictionary&)> handler;
 };
@@ -90,9 +92,8 @@ class FakeApplications final : public platform::ApplicationService, public platf
 class FakeSounds final : public platform::SystemSounds, public platform::ScreenReader {
  public:
   void play(uint32_t soundID) override { played.push_back(soundID); }
-  bool isRunning() override { return readerRuns; }
+  bool isRunning() override { return false; }
   std::vector<uint32_t> played;
-  bool readerRuns = false;
 };
 
 class FakeKeepAlive final : public platform::KeepAliveService {
@@ -105,11 +106,9 @@ class FakeKeepAlive final : public platform::KeepAliveService {
 
 class FakePurgeableSpace final : public platform::PurgeableSpaceService {
  public:
-  void registerCallbacks(const std::string& name, platform::PurgeableSpaceCallbacks to) override {
-    serviceName = name;
+  void registerCallbacks(const std::string&, platform::PurgeableSpaceCallbacks to) override {
     callbacks = std::move(to);
   }
-  std::string serviceName;
   platform::PurgeableSpaceCallbacks callbacks;
 };
 

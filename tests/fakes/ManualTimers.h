@@ -33,6 +33,11 @@ class ManualTimers final : public platform::TimerService {
     }
     return next;
   }
+  /// How many are waiting.
+  [[nodiscard]] size_t pending() const {
+    std::lock_guard lock(mutex_);
+    return entries_.size();
+  }
   /// Runs what is due within `time`, each at its time, and lets the rest of the time pass.
   void advance(std::chrono::nanoseconds time) {
     const auto end = now_ + time;

@@ -1,5 +1,5 @@
-#include <limits>
 #include <optional>
+#include <utility>
 
 #include "tests/fakes/FakeIPC.h"
 
@@ -33,19 +33,11 @@ template <typename T>
 std::optional<Value> integerFor(const Value& value) {
   if (value.isNone()) return Value(T{0});
   if (!value.isNumber() || value.getIf<double>() || value.getIf<bool>()) return std::nullopt;
-  if (const auto* wide = value.getIf<uint64_t>()) {
-    if (*wide > static_cast<uint64_t>(std::numeric_limits<T>::max())) return std::nullopt;
-    return Value(static_cast<T>(*wide));
-  }
-  const int64_t number = value.asInteger();
-  if constexpr (std::is_unsigned_v<T>) {
-    if (number < 0) return std::nullopt;
-  } else if (number < std::numeric_limits<T>::min()) {
-    return std::nullopt;
-  }
-  if (static_cast<uint64_t>(number) > static_cast<uint64_t>(std::numeric_limits<T>::max()) && number >= 0)
-    return std::nullopt;
-  return Value(static_cast<T>(number));
+  const auto fit = [](auto number) {
+    return std::in_range<T>(number) ? std::optional(Value(static_cast<T>(number))) : std::nullopt;
+  };
+  const auto* wide = value.getIf<uint64_t>();
+  return wide ? fit(*wide) : fit(value.asInteger());
 }
 
 std::optional<Value> stringFor(const Value& value) {

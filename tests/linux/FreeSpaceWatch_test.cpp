@@ -2,8 +2,8 @@
 
 #include <gtest/gtest.h>
 
-#include "tests/fakes/FakeTimers.h"
 #include "tests/fakes/ManualExecutor.h"
+#include "tests/fakes/ManualTimers.h"
 
 namespace qv::platform {
 namespace {
@@ -36,7 +36,7 @@ class FreeSpaceWatchTest : public testing::Test {
     return std::exchange(requests_, {});
   }
 
-  fakes::FakeTimers timers_;
+  fakes::ManualTimers timers_;
   fakes::ManualExecutor executor_;
   uint64_t free_ = 10'000'000'000;
   int looks_ = 0, periodic_ = 0;

@@ -31,12 +31,12 @@ TEST_F(TemporaryFilesTest, SetupMakesTheDirectoryOnceAndSurvivesFailure) {
   _srSetupTempDirectory();
   EXPECT_TRUE(disk_.itemExists(kStore));
   _srSetupTempDirectory();
-  EXPECT_EQ(disk_.events().size(), 1u);
+  EXPECT_EQ(disk_.operations(), 1u);
 
   disk_.addFile("/other/private/var/mobile/Library/Quorvel", "a plain file in the way");
   platform_.deviceRoot = "/other";
   _srSetupTempDirectory();
-  EXPECT_EQ(disk_.events().size(), 1u);
+  EXPECT_EQ(disk_.operations(), 1u);
   EXPECT_EQ(log_.texts(), std::vector<std::string>(3, "_srSetupTempDirectory"));
 
   platform_.deviceRoot = "/without/parents";
@@ -101,14 +101,6 @@ TEST_F(TemporaryFilesTest, TheSizeIsThatOfTheDirectoryEntryAlone) {
   disk_.addDirectory(kStore, 4096);
   addFile("big.mp4", 1'000'000);
   EXPECT_EQ(_srSizeOfTempDir(nullptr), 4096);
-}
-
-TEST_F(TemporaryFilesTest, FreeSpaceMustExceedTheThreshold) {
-  disk_.addDirectory(kStore);
-  disk_.setFreeSize(100'000'000);
-  EXPECT_FALSE(_srDeviceHasSufficientFreeSpaceForRecording());
-  disk_.setFreeSize(100'000'001);
-  EXPECT_TRUE(_srDeviceHasSufficientFreeSpaceForRecording());
 }
 
 TEST_F(TemporaryFilesTest, RemovingAFileWorksInTheBackgroundAndToleratesAMissingOne) {

@@ -1,7 +1,7 @@
 #include "ui/QVStatusBarAssertion.h"
 
 #include "tests/fakes/FakeDevice.h"
-#include "tests/fakes/FakeTimers.h"
+#include "tests/fakes/ManualTimers.h"
 
 namespace qv {
 namespace {
@@ -15,7 +15,7 @@ struct CountingAssertion final : QVStatusBarAssertion {
 
 TEST(QVStatusBarAssertionTest, ASecondStartReplacesTheTimerAndItEndsWithTheObject) {
   fakes::FakeDevice device;
-  fakes::FakeTimers timers;
+  fakes::ManualTimers timers;
   device.platform.timers = &timers;
   auto assertion = std::make_shared<CountingAssertion>();
   assertion->startRepeatingTimer();
