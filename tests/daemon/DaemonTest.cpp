@@ -47,13 +47,14 @@ std::optional<TestClient::Answer> TestClient::request(const char* member, platfo
   return seen_->answer;
 }
 
-TestClient::Slot TestClient::postStart(const StartOptions& o) {
+platform::IPCArguments TestClient::startArguments(const StartOptions& o) {
   using platform::Value;
   platform::Array contexts;
   for (const uint32_t context : o.contexts) contexts.emplace_back(context);
-  return post("startRecordingWindowLayerContextIDs",
-              {Value(contexts), Value(platform::Array{Value(o.width), Value(o.height)}), Value(o.microphone),
-               Value(o.camera), Value(o.broadcast), Value(o.system), Value(o.capture), Value(platform::Array{})});
+  return {Value(contexts),     Value(platform::Array{Value(o.width), Value(o.height)}),
+          Value(o.microphone), Value(o.camera),
+          Value(o.broadcast),  Value(o.system),
+          Value(o.capture),    Value(platform::Array{})};
 }
 
 std::optional<TestClient::Answer> TestClient::start(const StartOptions& o) {

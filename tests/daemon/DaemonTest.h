@@ -46,11 +46,13 @@ class TestClient {
     std::string movie;
   };
 
+  static constexpr const char* kStart = "startRecordingWindowLayerContextIDs";
   void send(const char* member, platform::IPCArguments arguments = {});
   /// Like `send`, but nothing has run yet.
   Slot post(const char* member, platform::IPCArguments arguments = {});
   std::optional<Answer> request(const char* member, platform::IPCArguments arguments = {});
-  Slot postStart(const StartOptions& o);
+  static platform::IPCArguments startArguments(const StartOptions& o);
+  Slot postStart(const StartOptions& o) { return post(kStart, startArguments(o)); }
   std::optional<Answer> start(const StartOptions& o);
   std::optional<Answer> start() { return start(StartOptions{}); }
   std::optional<Answer> stop() { return request("stopRecordingWithHandler"); }
@@ -99,6 +101,12 @@ class DaemonTest : public testing::Test {
   void suppressAlert();
   /// By the newest screen capture that runs, if any does.
   void sendFrame(int64_t nanoseconds, uint64_t flags = 0);
+  /// Some of the daemon's work.
+  void runWork(int count) {
+    for (int done = 0; done < count && device_.executor.runOne(); ++done) {
+    }
+  }
+  static constexpr int kPieces = 24;  ///< more than a start takes
   /// What a file holds; nothing where there is none.
   std::string contentAt(const std::string& url);
   bool areSourcesOff();
@@ -107,6 +115,12 @@ class DaemonTest : public testing::Test {
   fakes::FakeDevice device_;
   QVCaptureManager captureManager_{device_.platform};
   std::shared_ptr<QVRecordingManager> manager_ = QVRecordingManager::create(captureManager_);
+};
+
+/// Where consent is not what a test is about.
+class QuietDaemonTest : public DaemonTest {
+ protected:
+  QuietDaemonTest() { suppressAlert(); }
 };
 
 }  // namespace qv

@@ -43,60 +43,24 @@ RandomDriver::~RandomDriver() {
   device_.run();
 }
 
-const std::vector<RandomDriver::Step>& RandomDriver::steps() {
-  static const std::vector<Step> all{{8, "start", &RandomDriver::start},
-                                     {10, "stop", &RandomDriver::stop},
-                                     {5, "stopTrimmed", &RandomDriver::stopTrimmed},
-                                     {10, "save", &RandomDriver::save},
-                                     {2, "saveOfAnother", &RandomDriver::saveOfAnother},
-                                     {4, "discard", &RandomDriver::discard},
-                                     {3, "pause", &RandomDriver::pause},
-                                     {4, "resume", &RandomDriver::resume},
-                                     {4, "setUpBroadcast", &RandomDriver::setUpBroadcast},
-                                     {3, "changeSound", &RandomDriver::changeSound},
-                                     {2, "reconnect", &RandomDriver::reconnect},
-                                     {1, "goAway", &RandomDriver::goAway},
-                                     {24, "frame", &RandomDriver::frame},
-                                     {4, "sound", &RandomDriver::sound},
-                                     {10, "answerAlert", &RandomDriver::answerAlert},
-                                     {2, "failCapture", &RandomDriver::failCapture},
-                                     {1, "purgeDaily", &RandomDriver::purgeDaily},
-                                     {1, "purgeUrgently", &RandomDriver::purgeUrgently},
-                                     {1, "changeFront", &RandomDriver::changeFront},
-                                     {2, "changeLibrary", &RandomDriver::changeLibrary},
-                                     {2, "changeExports", &RandomDriver::changeExports},
-                                     {5, "endExports", &RandomDriver::endExports},
-                                     {8, "moveExtension", &RandomDriver::moveExtension},
-                                     {1, "killExtension", &RandomDriver::killExtension},
-                                     {3, "answerClip", &RandomDriver::answerClip}};
-  return all;
-}
-
-const RandomDriver::Step& RandomDriver::chooseStep() {
-  int total = 0;
-  for (const Step& step : steps()) total += step.weight;
-  int at = static_cast<int>(pick(static_cast<size_t>(total)));
-  for (const Step& step : steps()) {
-    if ((at -= step.weight) < 0) return step;
-  }
-  return steps().back();
-}
-
 void RandomDriver::trace(const std::string& text) {
   trace_.push_back(text);
   if (trace_.size() > kTraceLength) trace_.pop_front();
 }
 
 bool RandomDriver::run(int steps) {
-  for (int done = 1; done <= steps && model_.faults().empty(); ++done) {
-    const Step& step = chooseStep();
-    trace(step.name);
-    (this->*step.act)();
-    if (chance(40)) {
-      runPieces(-1);
-    } else {
-      runPieces(static_cast<int>(pick(6)));
+  static const auto wheel = [] {
+    std::vector<Step> each;
+    for (const auto* some : {&clientSteps(), &deviceSteps()}) {
+      for (const Step& step : *some) each.insert(each.end(), step.weight, step);
     }
+    return each;
+  }();
+  for (int done = 1; done <= steps && model_.faults().empty(); ++done) {
+    const Step& step = wheel[pick(wheel.size())];
+    trace(step.name);
+    step.act(*this);
+    runPieces(chance(40) ? -1 : static_cast<int>(pick(6)));
     device_.clock.advance(std::chrono::milliseconds(pick(700)));
     if (done % kStepsBetweenRests == 0 && model_.faults().empty()) settle();
   }
@@ -137,14 +101,15 @@ void RandomDriver::poll() {
 
 void RandomDriver::resolve(const Request& request, const TestClient::Answer& answer) {
   const bool failed = answer.failure.has_value();
-  const int64_t code = answer.values.empty() ? 0 : answer.code(request.kind == Kind::Stop ? 1 : 0);
+  const bool isStop = request.kind == Kind::Stop || request.kind == Kind::StopTrimmed;
+  const int64_t code = answer.values.empty() ? 0 : answer.code(isStop ? 1 : 0);
   trace("  " + std::to_string(request.app) + " is answered #" + std::to_string(request.id) + ": " +
         (failed ? answer.failureName() : std::to_string(code)));
   if (answer.failureName() == fakes::kNoReplyErrorName) model_.fault("request " + std::to_string(request.id) + " lost");
   if (request.kind == Kind::Start) {
     if (code == 0) lastStarted_ = request.app;
     model_.startAnswered(request.app, request.id, code, request.makesMovie);
-  } else if (request.kind == Kind::Stop) {
+  } else if (isStop) {
     model_.stopAnswered(request.app, request.id, failed);
     const std::string movie = failed ? std::string() : answer.values.at(0).asString();
     if (code != 0 && !movie.empty()) model_.fault("an error and a movie");
@@ -164,16 +129,11 @@ void RandomDriver::takeHanded(App app, const std::string& url) {
 
 /// Whether something is on its way that may take a movie before its receiver looks at it.
 bool RandomDriver::mayLose(App app, const std::string& name) const {
-  return wasPurged_ || std::any_of(requests_.begin(), requests_.end(), [&](const Request& request) {
+  return wasPurged_ || std::ranges::any_of(requests_, [&](const Request& request) {
            if (request.app != app) return false;
            if (request.kind == Kind::Save) return request.name == name;
            return request.makesMovie || request.kind == Kind::Discard;
          });
-}
-
-std::string RandomDriver::contentOf(const std::string& name) {
-  const auto content = device_.disk.readFile(std::string(fakes::kStore) + "/" + name);
-  return content ? content.value() : std::string();
 }
 
 /// Of the newest mix of this movie; empty where it was saved as it was.
@@ -223,7 +183,7 @@ void RandomDriver::settle() {
 }
 
 bool RandomDriver::answerSomebody() {
-  if (std::any_of(device_.alerts.shown.begin(), device_.alerts.shown.end(), [](auto& each) { return each->visible; })) {
+  if (std::ranges::any_of(device_.alerts.shown, [](auto& each) { return each->visible; })) {
     answerAlert();
     return true;
   }
@@ -278,8 +238,7 @@ void RandomDriver::checkSources(int recording) {
     if (!valueForKey(state, "isRecording").asBool() || broadcasts) continue;
     actors_[app].client->post("resumeRecordingWithWindowLayerContextID", {platform::Value(actors_[app].context)});
     runPieces(-1);
-    const auto& all = device_.screen.controllers;
-    const bool isSeen = std::any_of(all.begin(), all.end(), [](const auto* each) { return each->running; });
+    const bool isSeen = std::ranges::any_of(device_.screen.controllers, [](const auto* each) { return each->running; });
     if (!isSeen || device_.screen.mode == platform::DisplayCloneMode::Off) {
       model_.fault(std::to_string(app) + " records, and sees nothing");
     }
@@ -310,7 +269,7 @@ void RandomDriver::checkStore() {
 
 bool RandomDriver::finish() {
   for (App app = 0; app < actors_.size(); ++app) {
-    post(app, Kind::Stop, "stopRecordingWithHandler", {});
+    post(app, Kind::Stop, "stopRecordingWithHandler");
     runPieces(-1);
   }
   settle();

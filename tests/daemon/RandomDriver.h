@@ -34,7 +34,7 @@ class RandomDriver : public DaemonTest {
 
  private:
   using App = RecordingModel::App;
-  enum class Kind { Start, Stop, Save, Discard, SetUp };
+  enum class Kind { Start, Stop, StopTrimmed, Save, Discard, SetUp };
   struct Request {
     App app = 0;
     Kind kind = Kind::Start;
@@ -51,15 +51,15 @@ class RandomDriver : public DaemonTest {
     std::map<std::string, std::string> urls = {};  ///< as they were handed over, by name
   };
   struct Step {
-    int weight;
+    size_t weight;
     const char* name;
-    void (RandomDriver::*act)();
+    void (*act)(RandomDriver&);
   };
   static constexpr App kGame = 0, kNamesake = 1, kChat = 2, kSystem = 3;
   static constexpr size_t kTraceLength = 80;
 
-  static const std::vector<Step>& steps();
-  const Step& chooseStep();
+  static const std::vector<Step>& clientSteps();
+  static const std::vector<Step>& deviceSteps();
   size_t pick(size_t count) { return count == 0 ? 0 : random_() % count; }
   bool chance(int percent) { return static_cast<int>(pick(100)) < percent; }
   void trace(const std::string& text);
@@ -73,7 +73,9 @@ class RandomDriver : public DaemonTest {
   void resolve(const Request& request, const TestClient::Answer& answer);
   void takeHanded(App app, const std::string& url);
   [[nodiscard]] bool mayLose(App app, const std::string& name) const;
-  [[nodiscard]] std::string contentOf(const std::string& name);
+  std::string contentOf(const std::string& name) {
+    return contentAt("file://" + std::string(fakes::kStore) + "/" + name);
+  }
   [[nodiscard]] std::string savedContent(const std::string& name) const;
   void checkMoviesBeingWritten();
 
@@ -87,34 +89,15 @@ class RandomDriver : public DaemonTest {
   // --- Clients.
   void connect(App app, bool waits);
   void leave(App app);
-  void post(App app, Kind kind, const char* member, platform::IPCArguments arguments, const std::string& name = {});
-  void start();
-  void stop();
-  void stopTrimmed();
-  void save();
-  void saveOfAnother();
-  void saveNamed(App app, const std::string& name, const std::string& url);
-  void discard();
-  void pause();
-  void resume();
-  void setUpBroadcast();
-  void changeSound();
-  void reconnect();
-  void goAway();
+  void tell(App app, const char* member, platform::IPCArguments arguments = {});
+  /// Like `tell`, of what the model follows.
+  void post(App app, Kind kind, const char* member, platform::IPCArguments arguments = {}, const std::string& name = {},
+            bool makesMovie = false);
+  void start(App app);
+  void save(App app, App owner);
 
   // --- The device.
-  void frame();
-  void sound();
   void answerAlert();
-  void failCapture();
-  void purgeDaily();
-  void purgeUrgently();
-  void changeFront();
-  void changeLibrary();
-  void changeExports();
-  void endExports();
-  void moveExtension();
-  void killExtension();
   void answerClip();
   bool connectExtension();
   void abandonWhatIsOpen();

@@ -8,6 +8,60 @@ namespace qv {
 using platform::Dictionary;
 using platform::Value;
 
+const std::vector<RandomDriver::Step>& RandomDriver::clientSteps() {
+  using D = RandomDriver;
+  static const std::vector<Step> all{
+      {8, "start", [](D& d) { d.start(d.pickApp()); }},
+      {10, "stop", [](D& d) { d.post(d.pickRecordingApp(), Kind::Stop, "stopRecordingWithHandler"); }},
+      {5, "stopTrimmed",
+       [](D& d) {
+         d.post(d.pickRecordingApp(), Kind::StopTrimmed, "stopRecordingWithStartClipDuration",
+                {Value(1.0), Value(1.0)});
+       }},
+      {10, "save",
+       [](D& d) {
+         const App app = d.pickApp();
+         d.save(app, app);
+       }},
+      {2, "saveOfAnother",
+       [](D& d) {
+         const App owner = d.pickApp();
+         d.save(d.pickApp(), owner);
+       }},
+      {4, "discard", [](D& d) { d.post(d.pickApp(), Kind::Discard, "discardRecordingWithHandler"); }},
+      {3, "pause", [](D& d) { d.tell(d.pickRecordingApp(), "pauseRecording"); }},
+      {4, "resume",
+       [](D& d) {
+         const App app = d.pickRecordingApp();
+         // Now and then with the window of another.
+         const App owner = d.chance(90) ? app : d.pickApp();
+         d.tell(app, "resumeRecordingWithWindowLayerContextID", {Value(d.actors_[owner].context)});
+       }},
+      {4, "setUpBroadcast",
+       [](D& d) {
+         const App app = d.chance(50) ? kGame : kChat;
+         const std::string& host = d.actors_[app].bundleID;
+         d.post(app, Kind::SetUp, "setupBroadcastWithHostBundleID",
+                {Value(host), Value(host + ".setup"), Value(QVBroadcastConfiguration{1, {}}.encode()),
+                 Value(Dictionary{})});
+       }},
+      {3, "changeSound",
+       [](D& d) {
+         const App app = d.pickRecordingApp();
+         if (d.chance(50)) return d.tell(app, "setMicrophoneEnabled", {Value(d.chance(50))});
+         d.tell(app, "updateProcessIDForAudioCaptureWithPID", {Value(int32_t{d.chance(50) ? d.actors_[app].pid : 0})});
+       }},
+      {2, "reconnect",
+       [](D& d) {
+         const App app = d.pickApp();
+         d.leave(app);
+         if (d.chance(50)) d.runPieces(static_cast<int>(d.pick(4)));
+         d.connect(app, false);
+       }},
+      {1, "goAway", [](D& d) { d.leave(d.pickApp()); }}};
+  return all;
+}
+
 void RandomDriver::connect(App app, bool waits) {
   Actor& actor = actors_[app];
   Dictionary entitlements;
@@ -21,6 +75,7 @@ void RandomDriver::connect(App app, bool waits) {
 }
 
 void RandomDriver::leave(App app) {
+  trace("  " + std::to_string(app) + " leaves");
   Actor& actor = actors_[app];
   if (!actor.client) return;
   const auto waits = [app](const Request& request) { return request.app == app; };
@@ -33,115 +88,43 @@ void RandomDriver::leave(App app) {
   model_.left(app);
 }
 
-void RandomDriver::post(App app, Kind kind, const char* member, platform::IPCArguments arguments,
-                        const std::string& name) {
-  TestClient* client = actors_[app].client.get();
-  if (!client) return;
-  trace("  " + std::to_string(app) + " asks #" + std::to_string(lastRequest_ + 1) + " " + member + " " + name);
-  const uint64_t id = ++lastRequest_;
-  requests_.push_back({app, kind, id, false, name, client->post(member, std::move(arguments))});
+void RandomDriver::tell(App app, const char* member, platform::IPCArguments arguments) {
+  if (actors_[app].client) actors_[app].client->post(member, std::move(arguments));
 }
 
-void RandomDriver::start() {
-  const App app = pickApp();
-  Actor& actor = actors_[app];
-  if (!actor.client) return;
-  TestClient::StartOptions options{.contexts = {actor.context}, .microphone = chance(30)};
+void RandomDriver::post(App app, Kind kind, const char* member, platform::IPCArguments arguments,
+                        const std::string& name, bool makesMovie) {
+  if (!actors_[app].client) return;
+  const uint64_t id = ++lastRequest_;
+  trace("  " + std::to_string(app) + " asks #" + std::to_string(id) + " " + member + " " + name);
+  if (kind == Kind::Start) model_.startPosted(app, id, makesMovie);
+  if (kind == Kind::StopTrimmed) model_.trimPosted(app, id);
+  if (kind == Kind::Save) model_.savePosted(app, id, name);
+  if (kind == Kind::Discard) model_.discardPosted(app, id, !mayLose(app, {}));
+  requests_.push_back({app, kind, id, makesMovie, name, actors_[app].client->post(member, std::move(arguments))});
+}
+
+void RandomDriver::start(App app) {
+  TestClient::StartOptions options{.contexts = {actors_[app].context}, .microphone = chance(30)};
   options.system = app == kSystem && chance(90);
   options.capture = chance(12);
   options.broadcast = (app == kGame || app == kChat) && !options.capture && chance(35);
-  if (options.broadcast && app == kGame) {
+  if (options.broadcast && app == kGame && actors_[app].client) {
     extensions_.push_back(
         std::make_unique<fakes::FakeBroadcastExtension>(device_.ipc, device_.extensions, device_.executor));
   }
-  const uint64_t id = ++lastRequest_;
-  const bool makesMovie = !options.capture && !options.broadcast;
-  trace("  " + std::to_string(app) + " asks #" + std::to_string(id) + " start" + (options.capture ? " capture" : "") +
-        (options.broadcast ? " broadcast" : ""));
-  model_.startPosted(app, id, makesMovie);
-  requests_.push_back({app, Kind::Start, id, makesMovie, {}, actor.client->postStart(options)});
+  post(app, Kind::Start, TestClient::kStart, TestClient::startArguments(options),
+       options.capture     ? "a capture"
+       : options.broadcast ? "a broadcast"
+                           : "",
+       !options.capture && !options.broadcast);
 }
 
-void RandomDriver::stop() { post(pickRecordingApp(), Kind::Stop, "stopRecordingWithHandler", {}); }
-
-void RandomDriver::stopTrimmed() {
-  const App app = pickRecordingApp();
-  if (!actors_[app].client) return;
-  model_.stopPosted(app, lastRequest_ + 1, true);
-  post(app, Kind::Stop, "stopRecordingWithStartClipDuration", {Value(1.0), Value(1.0)});
-}
-
-void RandomDriver::save() {
-  const App app = pickApp();
-  const auto names = model_.names(app);
-  if (names.empty()) return;
-  const std::string& name = names[pick(names.size())];
-  saveNamed(app, name, actors_[app].urls[name]);
-}
-
-void RandomDriver::saveOfAnother() {
-  const App owner = pickApp();
-  const App app = pickApp();
+void RandomDriver::save(App app, App owner) {
   const auto names = model_.names(owner);
   if (names.empty()) return;
   const std::string& name = names[pick(names.size())];
-  saveNamed(app, name, actors_[owner].urls[name]);
-}
-
-void RandomDriver::saveNamed(App app, const std::string& name, const std::string& url) {
-  if (!actors_[app].client) return;
-  model_.savePosted(app, lastRequest_ + 1, name);
-  post(app, Kind::Save, "saveVideoToCameraRoll", {Value(url)}, name);
-}
-
-void RandomDriver::discard() {
-  const App app = pickApp();
-  if (!actors_[app].client) return;
-  model_.discardPosted(app, lastRequest_ + 1, !mayLose(app, {}));
-  post(app, Kind::Discard, "discardRecordingWithHandler", {});
-}
-
-void RandomDriver::pause() {
-  if (Actor& actor = actors_[pickRecordingApp()]; actor.client) actor.client->post("pauseRecording");
-}
-
-void RandomDriver::resume() {
-  const App app = pickRecordingApp();
-  if (!actors_[app].client) return;
-  // Now and then with the window of another.
-  const App owner = chance(90) ? app : pickApp();
-  actors_[app].client->post("resumeRecordingWithWindowLayerContextID", {Value(actors_[owner].context)});
-}
-
-void RandomDriver::setUpBroadcast() {
-  const App app = chance(50) ? kGame : kChat;
-  const std::string& host = actors_[app].bundleID;
-  post(app, Kind::SetUp, "setupBroadcastWithHostBundleID",
-       {Value(host), Value(host + ".setup"), Value(QVBroadcastConfiguration{1, {}}.encode()), Value(Dictionary{})});
-}
-
-void RandomDriver::changeSound() {
-  Actor& actor = actors_[pickRecordingApp()];
-  if (!actor.client) return;
-  if (chance(50)) {
-    actor.client->post("setMicrophoneEnabled", {Value(chance(50))});
-  } else {
-    actor.client->post("updateProcessIDForAudioCaptureWithPID", {Value(int32_t{chance(50) ? actor.pid : 0})});
-  }
-}
-
-void RandomDriver::reconnect() {
-  const App app = pickApp();
-  trace("  " + std::to_string(app));
-  leave(app);
-  if (chance(50)) runPieces(static_cast<int>(pick(4)));
-  connect(app, false);
-}
-
-void RandomDriver::goAway() {
-  const App app = pickApp();
-  trace("  " + std::to_string(app));
-  leave(app);
+  post(app, Kind::Save, "saveVideoToCameraRoll", {Value(actors_[owner].urls[name])}, name);
 }
 
 }  // namespace qv

@@ -3,31 +3,101 @@
 
 namespace qv {
 
-using platform::Value;
-
-void RandomDriver::frame() {
-  for (auto* controller : device_.screen.controllers) {
-    if (controller->running) controller->sendAt(device_.clock.hostTime().value);
-  }
-}
-
-void RandomDriver::sound() {
-  const auto& tap = device_.tap.tap;
-  if (tap && tap->running) {
-    (void)device_.tap.fill(4410, static_cast<uint64_t>(device_.clock.hostTime().value), 4410);
-  }
+const std::vector<RandomDriver::Step>& RandomDriver::deviceSteps() {
+  using D = RandomDriver;
+  static const std::vector<Step> all{
+      {24, "frame",
+       [](D& d) {
+         for (auto* controller : d.device_.screen.controllers) {
+           if (controller->running) controller->sendAt(d.device_.clock.hostTime().value);
+         }
+       }},
+      {4, "sound",
+       [](D& d) {
+         const auto& tap = d.device_.tap.tap;
+         if (tap && tap->running) {
+           (void)d.device_.tap.fill(4410, static_cast<uint64_t>(d.device_.clock.hostTime().value), 4410);
+         }
+       }},
+      {10, "answerAlert", [](D& d) { d.answerAlert(); }},
+      {2, "failCapture",
+       [](D& d) {
+         for (auto* controller : d.device_.screen.controllers) {
+           const auto delegate = controller->delegate.lock();
+           if (!controller->running || !delegate) continue;
+           d.abandonWhatIsOpen();
+           const size_t how = d.pick(3);
+           if (how == 0) delegate->screenCaptureControllerWasPreempted(*controller);
+           if (how == 1) delegate->screenCaptureControllerMediaServicesWereReset(*controller);
+           if (how == 2) delegate->screenCaptureControllerDidFailWithStatus(*controller, -1);
+           return;
+         }
+       }},
+      {1, "purgeDaily",
+       [](D& d) {
+         if (d.chance(30)) {
+           d.trace("  two days later");
+           d.device_.clock.advance(std::chrono::hours(48));
+           d.model_.purged();
+           d.wasPurged_ = true;
+         }
+         d.device_.purgeableSpace.callbacks.periodic(1, 1);
+       }},
+      {1, "purgeUrgently",
+       [](D& d) {
+         d.model_.purged();
+         d.wasPurged_ = true;
+         const bool isNearlyFull = d.chance(50);
+         if (isNearlyFull) d.device_.disk.setFreeSize(49'000'000);
+         d.device_.purgeableSpace.callbacks.purge(1, isNearlyFull ? 2 : 3);
+         d.device_.disk.setFreeSize(1'000'000'000);
+       }},
+      {1, "changeFront",
+       [](D& d) {
+         const App app = d.pickApp();
+         d.device_.applications.frontmost = d.actors_[app].bundleID;
+         if (d.device_.applications.handler) {
+           d.device_.applications.report(platform::kApplicationForeground, d.actors_[app].pid, d.chance(80));
+         }
+       }},
+      {2, "changeLibrary",
+       [](D& d) {
+         const bool refuses = d.chance(40);
+         d.device_.photoLibrary.failure = refuses ? std::optional(platform::Error::posix(ENOSPC)) : std::nullopt;
+       }},
+      {2, "changeExports",
+       [](D& d) {
+         d.device_.exports.holds = d.chance(50);
+         d.device_.exports.result = d.chance(80) ? platform::ExportStatus::Completed : platform::ExportStatus::Failed;
+       }},
+      {5, "endExports",
+       [](D& d) {
+         for (const auto& session : d.device_.exports.sessions) {
+           if (session->whenEnded && d.chance(70)) session->end();
+         }
+       }},
+      {8, "moveExtension",
+       [](D& d) {
+         if (!d.connectExtension() && !d.extensions_.empty() && d.extensions_.back()->connection) {
+           d.extensions_.back()->answers = d.chance(90);
+           if (d.chance(30)) d.extensions_.back()->call("ping");
+         }
+       }},
+      {1, "killExtension",
+       [](D& d) {
+         if (!d.extensions_.empty() && d.extensions_.back()->connection) d.extensions_.back()->connection->invalidate();
+       }},
+      {3, "answerClip", [](D& d) { d.answerClip(); }}};
+  return all;
 }
 
 void RandomDriver::answerAlert() {
-  std::vector<std::shared_ptr<fakes::FakeUserAlerts::Shown>> visible;
-  for (const auto& alert : device_.alerts.shown) {
-    if (alert->visible) visible.push_back(alert);
-  }
-  std::swap(device_.alerts.shown, visible);
-  if (device_.alerts.shown.empty()) return;
-  const auto chosen = device_.alerts.shown.begin() + static_cast<std::ptrdiff_t>(pick(device_.alerts.shown.size()));
+  auto& shown = device_.alerts.shown;
+  std::erase_if(shown, [](const auto& alert) { return !alert->visible; });
+  if (shown.empty()) return;
+  const auto chosen = shown.begin() + static_cast<std::ptrdiff_t>(pick(shown.size()));
   const auto alert = *chosen;
-  device_.alerts.shown.erase(chosen);  // nobody answers twice
+  shown.erase(chosen);  // nobody answers twice
   using platform::UserAlertAnswer;
   const UserAlertAnswer answers[] = {UserAlertAnswer::Default,   UserAlertAnswer::Default, UserAlertAnswer::Alternate,
                                      UserAlertAnswer::Alternate, UserAlertAnswer::Other,   UserAlertAnswer::Cancelled};
@@ -39,62 +109,6 @@ void RandomDriver::abandonWhatIsOpen() {
   const auto& movies = device_.movies.movies;
   for (size_t i = movies.size() > 8 ? movies.size() - 8 : 0; i < movies.size(); ++i) {
     abandoned_.insert(movies[i]->content);
-  }
-}
-
-void RandomDriver::failCapture() {
-  for (auto* controller : device_.screen.controllers) {
-    const auto delegate = controller->delegate.lock();
-    if (!controller->running || !delegate) continue;
-    abandonWhatIsOpen();
-    const size_t how = pick(3);
-    if (how == 0) delegate->screenCaptureControllerWasPreempted(*controller);
-    if (how == 1) delegate->screenCaptureControllerMediaServicesWereReset(*controller);
-    if (how == 2) delegate->screenCaptureControllerDidFailWithStatus(*controller, -1);
-    return;
-  }
-}
-
-void RandomDriver::purgeDaily() {
-  if (chance(30)) {
-    trace("  two days later");
-    device_.clock.advance(std::chrono::hours(48));
-    model_.purged();
-    wasPurged_ = true;
-  }
-  device_.purgeableSpace.callbacks.periodic(1, 1);
-}
-
-void RandomDriver::purgeUrgently() {
-  model_.purged();
-  wasPurged_ = true;
-  const bool isNearlyFull = chance(50);
-  if (isNearlyFull) device_.disk.setFreeSize(49'000'000);
-  device_.purgeableSpace.callbacks.purge(1, isNearlyFull ? 2 : 3);
-  device_.disk.setFreeSize(1'000'000'000);
-}
-
-void RandomDriver::changeFront() {
-  const App app = pickApp();
-  device_.applications.frontmost = actors_[app].bundleID;
-  if (device_.applications.handler) {
-    device_.applications.report(platform::kApplicationForeground, actors_[app].pid, chance(80));
-  }
-}
-
-void RandomDriver::changeLibrary() {
-  const bool refuses = chance(40);
-  device_.photoLibrary.failure = refuses ? std::optional(platform::Error::posix(ENOSPC)) : std::nullopt;
-}
-
-void RandomDriver::changeExports() {
-  device_.exports.holds = chance(50);
-  device_.exports.result = chance(80) ? platform::ExportStatus::Completed : platform::ExportStatus::Failed;
-}
-
-void RandomDriver::endExports() {
-  for (const auto& session : device_.exports.sessions) {
-    if (session->whenEnded && chance(70)) session->end();
   }
 }
 
@@ -111,17 +125,6 @@ bool RandomDriver::connectExtension() {
   extension.serve(std::move(*connection));
   extension.call("ping");
   return true;
-}
-
-void RandomDriver::moveExtension() {
-  if (!connectExtension() && !extensions_.empty() && extensions_.back()->connection) {
-    extensions_.back()->answers = chance(90);
-    if (chance(30)) extensions_.back()->call("ping");
-  }
-}
-
-void RandomDriver::killExtension() {
-  if (!extensions_.empty() && extensions_.back()->connection) extensions_.back()->connection->invalidate();
 }
 
 /// Any of the requests of extensions that are not answered yet, one after the other.

@@ -44,10 +44,6 @@ void RecordingModel::startAnswered(App app, RequestID request, int64_t code, boo
   if (!makesMovie || isRefusedBeforeItsFile(code)) clear(app, request);
 }
 
-void RecordingModel::stopPosted(App app, RequestID request, bool trims) {
-  if (trims) doubt(app, request, isTrimmed);
-}
-
 void RecordingModel::stopAnswered(App app, RequestID request, bool failed) {
   if (failed) clear(app, request);
   if (!failed) ++apps_[app].told;

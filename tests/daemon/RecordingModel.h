@@ -23,7 +23,7 @@ class RecordingModel {
 
   void startPosted(App app, RequestID request, bool makesMovie);
   void startAnswered(App app, RequestID request, int64_t code, bool makesMovie);
-  void stopPosted(App app, RequestID request, bool trims);
+  void trimPosted(App app, RequestID request) { doubt(app, request, isTrimmed); }
   /// With `failed` nothing was recording.
   void stopAnswered(App app, RequestID request, bool failed);
   void endTold(App app) { ++apps_[app].told; }
