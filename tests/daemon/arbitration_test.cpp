@@ -5,42 +5,15 @@ namespace {
 
 using platform::Value;
 
-class ArbitrationTest : public DaemonTest {
- protected:
-  ArbitrationTest() { suppressAlert(); }
-};
+using ArbitrationTest = QuietDaemonTest;
 
-TEST_F(ArbitrationTest, AStartEndsTheRecordingOfAnotherApplication) {
+TEST_F(ArbitrationTest, AStartThatIsRefusedLateHasEndedTheRunningRecordingAllTheSame) {
   auto first = game();
   auto second = chat();
   first.start();
-  sendFrame(kSecond);
-  EXPECT_EQ(second.start()->code(), 0);
-  EXPECT_EQ(first.takeEnds(), std::vector<int64_t>{errorcode::kInterrupted});
-  EXPECT_EQ(first.lastMovie(), "");
-  EXPECT_TRUE(second.isRecording());
-  EXPECT_FALSE(first.isRecording());
-  EXPECT_EQ(openTransactions(), 1);
-  // A start that is refused later has ended the running recording all the same.
   device_.disk.setFreeSize(0);
-  EXPECT_EQ(first.start()->code(), errorcode::kInsufficientStorage);
-  EXPECT_EQ(second.takeEnds(), std::vector<int64_t>{errorcode::kInterrupted});
-  EXPECT_EQ(openTransactions(), 0);
-}
-
-TEST_F(ArbitrationTest, ARestartIsNotTouchedByTheEndOfTheFormerRecording) {
-  auto client = game();
-  client.start();
-  sendFrame(kSecond);
-  const auto former = device_.movies.movies.back();
-  EXPECT_EQ(client.start()->code(), 0);
-  EXPECT_EQ(former->status, platform::AssetWriterStatus::Completed);
-  EXPECT_EQ(client.takeEnds(), std::vector<int64_t>{errorcode::kInterrupted});
-  EXPECT_TRUE(client.isRecording());
-  EXPECT_EQ(openTransactions(), 1);
-  EXPECT_EQ(device_.keepAlive.begun, 2);
-  sendFrame(2 * kSecond);
-  EXPECT_EQ(client.stop()->code(1), 0);
+  EXPECT_EQ(second.start()->code(), errorcode::kInsufficientStorage);
+  EXPECT_EQ(first.takeEnds(), std::vector<int64_t>{errorcode::kInterrupted});
   EXPECT_EQ(openTransactions(), 0);
 }
 
@@ -70,7 +43,28 @@ TEST_F(ArbitrationTest, ADisconnectedApplicationLosesItsRecordingASystemRecordin
   auto next = game();
   next.start();
   EXPECT_EQ(device_.photoLibrary.stored.size(), 1u);
+  EXPECT_TRUE(device_.exports.sessions.empty()) << "unmixed";
   EXPECT_EQ(back.takeEnds(), std::vector<int64_t>{errorcode::kInterrupted});
+  EXPECT_TRUE(
+      device_.log.contains("QVRecordingManager:stopCurrentRecordingSession: Video saved to camera roll successful"));
+}
+
+TEST_F(ArbitrationTest, AClientThatDiesBeforeTheAnswerToItsStartEndsARecordingUnlessItIsTheSystems) {
+  const auto startUntilItRecords = [this](TestClient& client, bool system) {
+    client.postStart({.system = system});
+    while (!manager_->sessions().recordingSessionForBundleID(client.bundleID())->isRecording()) {
+      ASSERT_TRUE(device_.executor.runOne());
+    }
+  };
+  auto system = systemUI();
+  startUntilItRecords(system, true);
+  system.disconnect();
+  EXPECT_TRUE(systemUI().isRecording());
+  auto killed = game();
+  startUntilItRecords(killed, false);
+  auto relaunched = game();
+  EXPECT_FALSE(relaunched.isRecording());
+  EXPECT_EQ(openTransactions(), 0);
 }
 
 TEST_F(ArbitrationTest, ASystemRecordingFollowsTheFront) {
@@ -123,6 +117,14 @@ TEST_F(ArbitrationTest, ADeviceThatInterruptsKeepsTheSystemRecordingInThePhotoLi
   auto system = systemUI();
   system.start({.system = true});
   sendFrame(kSecond);
+  device_.photoLibrary.failure = platform::Error::posix(ENOSPC);
+  manager_->stopSystemRecordingWithInterruption();
+  device_.run();
+  EXPECT_EQ(system.takeEnds(), std::vector<int64_t>{errorcode::kInterrupted});
+  EXPECT_EQ(contentAt(system.lastMovie()), "movie 0") << "a refused one is its application's";
+  device_.photoLibrary = {};
+  system.start({.system = true});
+  sendFrame(kSecond);
   // What is recorded from the warning on is left out, unless the warning is taken back.
   manager_->notifySystemRecordingMayBeStopped();
   manager_->notifySystemRecordingResumed();
@@ -137,34 +139,6 @@ TEST_F(ArbitrationTest, ADeviceThatInterruptsKeepsTheSystemRecordingInThePhotoLi
   EXPECT_EQ(device_.movies.last().sessionEnd, platform::MediaTime::make(2 * kSecond, platform::kHostTimescale));
   EXPECT_EQ(system.takeEnds(), std::vector<int64_t>{errorcode::kInterrupted});
   EXPECT_EQ(device_.photoLibrary.stored.size(), 1u);
-  EXPECT_EQ(openTransactions(), 0);
-}
-
-TEST_F(ArbitrationTest, TheDisplayLayoutRuleEndsApplicationRecordings) {
-  struct Monitor final : platform::DisplayLayoutMonitor {
-    void addObserver(std::weak_ptr<platform::DisplayLayoutObserver> to) override { observer = std::move(to); }
-    void removeObserver(const platform::DisplayLayoutObserver*) override { observer.reset(); }
-    void invalidate() override {}
-    std::weak_ptr<platform::DisplayLayoutObserver> observer;
-  };
-  const auto monitor = std::make_shared<Monitor>();
-  manager_->setLayoutMonitor(monitor);
-  auto client = game();
-  const auto layout = [&](std::vector<int64_t> levels) {
-    platform::DisplayLayout shown;
-    for (const int64_t level : levels) shown.elements.push_back({"e", level});
-    if (const auto to = monitor->observer.lock()) to->layoutMonitorDidUpdateDisplayLayout(*monitor, shown);
-    device_.run();
-  };
-  client.start();
-  sendFrame(kSecond);
-  layout({0});
-  layout({0, 0, 5});  // two ordinary ones and one above: counted, nothing ends
-  EXPECT_TRUE(client.isRecording());
-  layout({0});
-  EXPECT_EQ(client.takeEnds(), std::vector<int64_t>{errorcode::kContentResize});
-  EXPECT_TRUE(client.lastMovie().ends_with("Game.mp4"));
-  EXPECT_EQ(client.request("saveVideoToCameraRoll", {Value(client.lastMovie())})->code(), 0);
   EXPECT_EQ(openTransactions(), 0);
 }
 

@@ -1,7 +1,6 @@
 #include <algorithm>
 
-#include "extensions/AnswerDeadline.h"
-#include "tests/daemon/DaemonTest.h"
+#include "tests/daemon/BroadcastFixture.h"
 
 namespace qv {
 namespace {
@@ -11,16 +10,9 @@ using platform::ExtensionItem;
 using platform::Value;
 
 /// Broadcasts one after another, and beside recordings.
-class BroadcastJointsTest : public DaemonTest {
+class BroadcastJointsTest : public BroadcastFixture {
  protected:
   BroadcastJointsTest() { suppressAlert(); }
-  ~BroadcastJointsTest() override {
-    // What still waits for an extension's answer gives up.
-    device_.timers.advance(std::chrono::minutes(5));
-    device_.run();
-  }
-  static constexpr const char* kSamples = "QVBroadcastProcessModeSampleBuffer";
-
   void setUp(TestClient& client, double clipDuration = 5) {
     const auto answer =
         client.request("setupBroadcastWithHostBundleID",
@@ -28,29 +20,6 @@ class BroadcastJointsTest : public DaemonTest {
                         Value(QVBroadcastConfiguration{clipDuration, {}}.encode()), Value(Dictionary{})});
     EXPECT_EQ(answer->code(), 0);
   }
-  void install(const TestClient& client, const std::string& mode = {}) {
-    device_.extensions.install(client.bundleID() + ".upload", broadcastpoint::kUpload, mode);
-  }
-  /// A start of a broadcast of samples whose extension is ready.
-  TestClient::Slot startSamples(TestClient& client, bool system = false) {
-    auto started = client.postStart({.broadcast = true, .system = system});
-    device_.run();
-    extension_.connect();
-    device_.run();
-    extension_.call("ping");
-    device_.run();
-    return started;
-  }
-  /// Pictures and their sound, in tenths of a second.
-  void play(int64_t from, int64_t to) {
-    for (int64_t tenth = from; tenth < to; ++tenth) {
-      sendFrame(tenth * kSecond / 10);
-      ASSERT_TRUE(device_.tap.fill(4410 * 2, static_cast<uint64_t>(tenth * kSecond / 10), 4410));
-      device_.run();
-    }
-  }
-
-  fakes::FakeBroadcastExtension extension_{device_.ipc, device_.extensions, device_.executor};
 };
 
 TEST_F(BroadcastJointsTest, ASetUpServesOneBroadcastAlsoOverAReconnectionOfItsHost) {
@@ -81,9 +50,6 @@ TEST_F(BroadcastJointsTest, ALateAnswerOfAFormerBroadcastChangesNothingOfTheNext
   setUp(client, 1);
   ASSERT_EQ(client.start({.broadcast = true})->code(), 0);
   play(200, 203);
-  const auto item = [](const char* title, Value value) {
-    return ExtensionItem{title, {{platform::kGenericDataType, std::move(value)}}};
-  };
   device_.extensions.complete(
       0, std::vector<ExtensionItem>{
              item(broadcastitem::kBroadcastConfiguration, Value(QVBroadcastConfiguration{100, {}}.encode())),
@@ -153,6 +119,7 @@ TEST_F(BroadcastJointsTest, AStartWhoseExtensionCannotBeEnabledIsAnsweredTheReas
   const auto started = client.postStart({.broadcast = true});
   device_.run();
   EXPECT_FALSE(*started);
+  EXPECT_EQ(chat().state().size(), 7u) << "others are served meanwhile";
   device_.timers.advance(kExtensionPatience);  // nobody connects
   device_.run();
   ASSERT_TRUE(*started);

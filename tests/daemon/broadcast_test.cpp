@@ -1,9 +1,7 @@
 #include <cmath>
 
-#include "extensions/AnswerDeadline.h"
-#include "extensions/QVBroadcastProtocols.h"
 #include "platform/KeyedArchive.h"
-#include "tests/daemon/DaemonTest.h"
+#include "tests/daemon/BroadcastFixture.h"
 
 namespace qv {
 namespace {
@@ -13,15 +11,10 @@ using platform::Dictionary;
 using platform::ExtensionItem;
 using platform::Value;
 
-class BroadcastTest : public DaemonTest {
+class BroadcastTest : public BroadcastFixture {
  protected:
   BroadcastTest() : client_(game()) {}
-  ~BroadcastTest() override {
-    client_.disconnect();
-    // What still waits for an extension's answer gives up.
-    device_.timers.advance(std::chrono::minutes(5));
-    device_.run();
-  }
+  ~BroadcastTest() override { client_.disconnect(); }
 
   int64_t setUp(const Data& configuration = QVBroadcastConfiguration{}.encode(),
                 const std::string& extension = "com.example.game.setup", const std::string& host = "com.example.game") {
@@ -35,29 +28,11 @@ class BroadcastTest : public DaemonTest {
     const auto answer = client_.start({.broadcast = true});
     return answer && !answer->failure ? answer->code() : -1;
   }
-  void installSampleExtension() {
-    device_.extensions.install("com.example.game.upload", broadcastpoint::kUpload,
-                               "QVBroadcastProcessModeSampleBuffer");
-  }
   /// A broadcast in samples mode that runs.
   void broadcastSamples() {
-    installSampleExtension();
+    install(client_, kSamples);
     setUp();
-    client_.send("startRecordingWindowLayerContextIDs", startArguments());
-    extension_.connect();
-    device_.run();
-    extension_.call("ping");
-    device_.run();
-  }
-  static platform::IPCArguments startArguments() {
-    return {Value(platform::Array{}),
-            Value(platform::Array{Value(1280.0), Value(720.0)}),
-            Value(false),
-            Value(false),
-            Value(true),
-            Value(false),
-            Value(false),
-            Value(platform::Array{})};
+    (void)startSamples(client_);
   }
   std::vector<int64_t> actions() {
     std::vector<int64_t> actions;
@@ -65,19 +40,6 @@ class BroadcastTest : public DaemonTest {
       if (const Value* action = find(payload, broadcastpayload::kActionType)) actions.push_back(action->asInteger());
     }
     return actions;
-  }
-  /// A tenth of a second of sound.
-  void sound(int64_t tenths) {
-    ASSERT_TRUE(device_.tap.fill(4410 * 2, static_cast<uint64_t>(tenths * kSecond / 10), 4410));
-    device_.run();
-  }
-  void frame(int64_t tenths) { sendFrame(tenths * kSecond / 10); }
-  /// Sound that reaches the daemon `lag` tenths after the pictures of the same time.
-  void play(int64_t from, int64_t to, int64_t lag = 0) {
-    for (int64_t tenth = from; tenth < to; ++tenth) {
-      frame(tenth);
-      if (tenth - lag >= from) sound(tenth - lag);
-    }
   }
   std::string finishFlag(size_t request) {
     return device_.extensions.requests.at(request).value(broadcastitem::kRequestedFinish).asString();
@@ -87,14 +49,13 @@ class BroadcastTest : public DaemonTest {
   }
   fakes::FakeAssetWriterService::Movie& movie(size_t index) { return *device_.movies.movies.at(index); }
 
-  fakes::FakeBroadcastExtension extension_{device_.ipc, device_.extensions, device_.executor};
   TestClient client_;
 };
 
 TEST_F(BroadcastTest, SetUpRefusesWhatNoBroadcastCouldComeOf) {
   const auto invalid = errorcode::kInvalidBroadcastSession;
   EXPECT_EQ(setUp(), invalid) << "no extension";
-  installSampleExtension();
+  install(client_, kSamples);
   EXPECT_EQ(setUp({1, 2, 3}), invalid);
   EXPECT_EQ(setUp(platform::encodeKeyedArchive("Other", {})), invalid);
   EXPECT_EQ(setUp(QVBroadcastConfiguration{-1, {}}.encode()), invalid);
@@ -193,27 +154,10 @@ TEST_F(BroadcastTest, AnExtensionThatGoesEndsItsBroadcastOnly) {
   EXPECT_EQ(openTransactions(), 0);
 }
 
-TEST_F(BroadcastTest, AStartWhoseExtensionNeverConnectsIsAnsweredSo) {
-  installSampleExtension();
-  setUp();
-  client_.send("startRecordingWindowLayerContextIDs", startArguments());
-  EXPECT_FALSE(client_.answer());
-  auto other = chat();
-  EXPECT_TRUE(other.state().size() > 0) << "the manager serves others meanwhile";
-  device_.timers.advance(kExtensionPatience);
-  device_.run();
-  ASSERT_TRUE(client_.answer());
-  EXPECT_EQ(client_.answer()->code(), errorcode::kInvalidBroadcastSession);
-  EXPECT_TRUE(device_.alerts.shown.empty()) << "nobody asked for a recording";
-  EXPECT_TRUE(device_.movies.movies.empty());
-  EXPECT_EQ(device_.extensions.killed.size(), 1u);
-  EXPECT_EQ(openTransactions(), 0);
-}
-
 TEST_F(BroadcastTest, AClientThatLeavesWhileTheExtensionIsLaunchedLeavesNothing) {
-  installSampleExtension();
+  install(client_, kSamples);
   setUp();
-  client_.send("startRecordingWindowLayerContextIDs", startArguments());
+  client_.start({.broadcast = true});
   client_.disconnect();
   EXPECT_EQ(openTransactions(), 0);
   EXPECT_EQ(device_.extensions.killed.size(), 1u);
@@ -221,7 +165,7 @@ TEST_F(BroadcastTest, AClientThatLeavesWhileTheExtensionIsLaunchedLeavesNothing)
 }
 
 TEST_F(BroadcastTest, ClipsFollowOneAnotherWithoutAGap) {
-  device_.extensions.install("com.example.game.upload", broadcastpoint::kUpload);
+  install(client_);
   EXPECT_EQ(setUp(QVBroadcastConfiguration{2.5, {}}.encode()), 0);
   EXPECT_EQ(startBroadcast(), 0);
   play(100, 160, 2);
@@ -251,7 +195,7 @@ TEST_F(BroadcastTest, ClipsFollowOneAnotherWithoutAGap) {
 }
 
 TEST_F(BroadcastTest, AStillScreensClipBeginsWithTheLastPictureAndCutsTheSoundThere) {
-  device_.extensions.install("com.example.game.upload", broadcastpoint::kUpload);
+  install(client_);
   setUp(QVBroadcastConfiguration{0.5, {}}.encode());
   startBroadcast();
   frame(100);
@@ -275,16 +219,13 @@ TEST_F(BroadcastTest, AStillScreensClipBeginsWithTheLastPictureAndCutsTheSoundTh
 }
 
 TEST_F(BroadcastTest, EachRequestRemovesItsOwnClipAndMayChangeTheNext) {
-  device_.extensions.install("com.example.game.upload", broadcastpoint::kUpload);
+  install(client_);
   setUp(QVBroadcastConfiguration{1, {}}.encode());
   startBroadcast();
   play(100, 125);
   ASSERT_EQ(device_.extensions.requests.size(), 2u);
   device_.disk.addFile(clipPath(0), "1");
   device_.disk.addFile(clipPath(1), "2");
-  const auto item = [](const char* title, Value value) {
-    return ExtensionItem{title, {{platform::kGenericDataType, std::move(value)}}};
-  };
   device_.extensions.complete(
       1, std::vector<ExtensionItem>{
              item(broadcastitem::kBroadcastConfiguration, Value(Data{9})),
@@ -307,7 +248,7 @@ TEST_F(BroadcastTest, EachRequestRemovesItsOwnClipAndMayChangeTheNext) {
 }
 
 TEST_F(BroadcastTest, AnExtensionThatDiesOverAClipEndsTheBroadcastWithItsLastClip) {
-  device_.extensions.install("com.example.game.upload", broadcastpoint::kUpload);
+  install(client_);
   setUp(QVBroadcastConfiguration{1, {}}.encode());
   startBroadcast();
   play(100, 115);

@@ -71,6 +71,8 @@ TEST_F(MovieOwnershipTest, ApplicationsOfOneNameLeaveEachOthersMoviesAlone) {
   EXPECT_EQ(contentAt(movie), "movie 0");
   EXPECT_EQ(contentAt(other), "movie 1");
   EXPECT_EQ(save(second, movie), errorcode::kFailedToSave);
+  device_.disk.addFile("/etc/passwd", "root");
+  EXPECT_EQ(save(second, "file:///etc/passwd"), errorcode::kFailedToSave);
   second.request("discardRecordingWithHandler");
   EXPECT_EQ(contentAt(other), "");
   // The takeover removes what the second records, and nothing else.
@@ -118,7 +120,7 @@ TEST_F(MovieOwnershipTest, ACaptureLeavesTheUnsavedMovieAlone) {
   auto client = game();
   const std::string movie = recordMovie(client);
   record(client, {.capture = true});
-  client.stop();
+  EXPECT_EQ(client.stop()->code(1), 0);
   EXPECT_EQ(contentAt(movie), "movie 0");
   EXPECT_EQ(save(client, movie), 0);
 }
@@ -158,6 +160,42 @@ TEST_F(MovieOwnershipTest, ALibraryThatRefusesLeavesTheMovieToBeSavedAgain) {
   EXPECT_EQ(storeFiles(), std::vector<std::string>{});
 }
 
+TEST_F(MovieOwnershipTest, WhereMixingFailsTheMovieItselfIsStored) {
+  auto client = game();
+  const std::string movie = recordMovie(client);
+  device_.exports.result = platform::ExportStatus::Failed;
+  EXPECT_EQ(save(client, movie), 0);
+  EXPECT_EQ(device_.photoLibrary.contents, std::vector<std::string>{"movie 0"});
+  EXPECT_EQ(storeFiles(), std::vector<std::string>{});
+}
+
+TEST_F(MovieOwnershipTest, ASaveThatTheLibraryForgetsCanBeTriedAgain) {
+  auto client = game();
+  const std::string movie = recordMovie(client);
+  device_.photoLibrary.holds = true;
+  const auto forgotten = client.post("saveVideoToCameraRoll", {Value(movie)});
+  device_.run();
+  EXPECT_EQ(save(client, movie), errorcode::kFailedToSave) << "it is being saved already";
+  device_.photoLibrary.drop();
+  device_.run();
+  device_.photoLibrary.holds = false;
+  EXPECT_EQ(save(client, movie), 0);
+}
+
+TEST_F(MovieOwnershipTest, AFileThatCannotBeRemovedIsToldAndKeepsNobodyWaiting) {
+  using Operation = fakes::FakeFileSystem::Operation;
+  auto client = game();
+  const std::string movie = recordMovie(client);
+  device_.clock.setNow({1700000000});
+  const std::string mix = "QVQuorvel_Final1700000000.mp4";
+  device_.disk.failOn(Operation::Remove, std::string(fakes::kStore) + "/" + mix, EBUSY);
+  EXPECT_EQ(save(client, movie), EBUSY);
+  EXPECT_EQ(storeFiles(), std::vector<std::string>{mix}) << "it ages out";
+  device_.disk.failOn(Operation::Remove, platform::URL(recordMovie(client)).path(), EBUSY);
+  EXPECT_FALSE(client.request("discardRecordingWithHandler")->failure);
+  EXPECT_EQ(device_.log.count("error removing file with code: " + std::to_string(EBUSY)), 2u);
+}
+
 TEST_F(MovieOwnershipTest, ADailyPurgeLeavesWhatIsBeingRecorded) {
   auto client = game();
   record(client);
@@ -176,8 +214,9 @@ TEST_F(MovieOwnershipTest, ANearlyFullDiskHandsOverTheMovieThatItEnds) {
   record(client);
   EXPECT_EQ(device_.purgeableSpace.callbacks.purge(1, 2), 0);
   EXPECT_TRUE(client.isRecording());
+  device_.disk.addFile(std::string(fakes::kStore) + "/old.mp4", "12345");
   device_.disk.setFreeSize(49'999'999);
-  device_.purgeableSpace.callbacks.purge(1, 2);
+  EXPECT_EQ(device_.purgeableSpace.callbacks.purge(1, 2), 5);
   device_.run();
   EXPECT_EQ(client.takeEnds(), std::vector<int64_t>{errorcode::kInsufficientStorage});
   EXPECT_EQ(contentAt(client.lastMovie()), "movie 0");

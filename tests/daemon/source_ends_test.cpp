@@ -16,17 +16,12 @@ class SourceEndsTest : public DaemonTest {
     // A second process of the same application.
     device_.bundles.setProcess(101, "/Applications/Game/bin/helper");
   }
-  void runPieces(int count) {
-    for (int done = 0; done < count && device_.executor.runOne(); ++done) {
-    }
-  }
   bool play(int64_t time, uint32_t frames = 441) {
     const bool taken = device_.tap.fill(frames, static_cast<uint64_t>(time), frames);
     device_.run();
     return taken;
   }
   int64_t now() { return device_.clock.hostTime().value; }
-  static constexpr int kPieces = 24;
 };
 
 TEST_F(SourceEndsTest, ALateFailureOfOneRecordingLeavesTheSourcesOfTheNextOn) {
@@ -44,7 +39,7 @@ TEST_F(SourceEndsTest, ALateFailureOfOneRecordingLeavesTheSourcesOfTheNextOn) {
       auto& controller = device_.screen.last();
       const auto delegate = controller.delegate.lock();
       const auto started = second.postStart({.microphone = true});
-      runPieces(pieces);
+      runWork(pieces);
       report(*delegate, controller);
       first.leave();
       device_.run();
@@ -70,7 +65,7 @@ TEST_F(SourceEndsTest, AChangeOfSoundThatMeetsTheEndStartsNothing) {
       system.start({.system = true});
       sendFrame(kSecond);
       const auto stopped = system.post("stopRecordingWithHandler");
-      runPieces(pieces);
+      runWork(pieces);
       system.post(member, {value});
       device_.run();
       ASSERT_TRUE(*stopped);
@@ -103,6 +98,8 @@ TEST_F(SourceEndsTest, AnApplicationTapsItsOwnProcessesTheSystemAny) {
   EXPECT_EQ(device_.tap.tap->process, 101);
   client.request("updateProcessIDForAudioCaptureWithPID", {Value(int32_t{200})});
   EXPECT_NE(device_.tap.tap->process, 200) << "what another application plays is not its own";
+  client.request("updateProcessIDForAudioCaptureWithPID", {Value(int32_t{0})});
+  EXPECT_FALSE(device_.tap.tap->running);
   auto system = systemUI();
   system.start({.system = true});
   system.request("updateProcessIDForAudioCaptureWithPID", {Value(int32_t{200})});

@@ -1,6 +1,3 @@
-#include <algorithm>
-#include <map>
-
 #include "tests/daemon/DaemonTest.h"
 
 namespace qv {
@@ -10,21 +7,14 @@ using platform::UserAlertAnswer;
 using platform::Value;
 
 /// What a start is answered, and when.
-class StartAnswersTest : public DaemonTest {
- protected:
-  void runPieces(int count) {
-    for (int done = 0; done < count && device_.executor.runOne(); ++done) {
-    }
-  }
-  static constexpr int kPieces = 24;  ///< more than a start takes
-};
+using StartAnswersTest = QuietDaemonTest;
+class StartQuestionsTest : public DaemonTest {};
 
 TEST_F(StartAnswersTest, AStopWaitsForItsStartHoweverEarlyItComes) {
-  suppressAlert();
   auto client = game();
   for (int pieces = 0; pieces < kPieces; ++pieces) {
     const auto started = client.postStart({});
-    runPieces(pieces);
+    runWork(pieces);
     const auto stopped = client.post("stopRecordingWithHandler");
     device_.run();
     ASSERT_TRUE(*started && *stopped) << pieces;
@@ -38,11 +28,10 @@ TEST_F(StartAnswersTest, AStopWaitsForItsStartHoweverEarlyItComes) {
 }
 
 TEST_F(StartAnswersTest, AStartWhoseEndHasAKnownCauseIsAnsweredThatCause) {
-  suppressAlert();
   auto client = game();
   for (int pieces = 0; pieces < kPieces; ++pieces) {
     const auto started = client.postStart({});
-    runPieces(pieces);
+    runWork(pieces);
     device_.purgeableSpace.callbacks.purge(1, 3);
     device_.run();
     ASSERT_TRUE(*started) << pieces;
@@ -59,7 +48,6 @@ TEST_F(StartAnswersTest, AStartWhoseEndHasAKnownCauseIsAnsweredThatCause) {
 }
 
 TEST_F(StartAnswersTest, AStartBetweenAReportedMediaResetAndItsCompletionRecords) {
-  suppressAlert();
   auto client = game();
   client.start();
   sendFrame(kSecond);
@@ -74,7 +62,7 @@ TEST_F(StartAnswersTest, AStartBetweenAReportedMediaResetAndItsCompletionRecords
   EXPECT_EQ(contentAt(stopped->values[0].asString()), "movie 1");
 }
 
-TEST_F(StartAnswersTest, TheUserIsAskedAboutNothingThatWillNotBeRecorded) {
+TEST_F(StartQuestionsTest, TheUserIsAskedAboutNothingThatWillNotBeRecorded) {
   auto client = game();
   EXPECT_EQ(client.start({.microphone = true, .camera = true}), std::nullopt);
   EXPECT_TRUE(device_.alerts.shown.at(0)->request.alternateButton.empty()) << "there is no microphone";
@@ -97,28 +85,20 @@ TEST_F(StartAnswersTest, TheUserIsAskedAboutNothingThatWillNotBeRecorded) {
 }
 
 TEST_F(StartAnswersTest, WindowsAreFewAndEachIsAskedForOnce) {
-  struct Server final : platform::RenderServer {
-    std::optional<pid_t> ownerOfContext(uint32_t contextID) override {
-      ++asked[contextID];
-      return 100;
-    }
-    std::map<uint32_t, int> asked;
-  } server;
-  device_.platform.renderServer = &server;
-  suppressAlert();
   auto client = game();
   std::vector<uint32_t> contexts;
-  for (uint32_t context = 1; context <= 64; ++context) contexts.insert(contexts.end(), 20, context);
+  for (uint32_t context = 1; context <= 64; ++context) {
+    contexts.insert(contexts.end(), 20, context);
+    device_.applications.owners[context] = 100;
+  }
   EXPECT_EQ(client.start({.contexts = contexts})->code(), 0);
-  EXPECT_EQ(server.asked.size(), 64u);
-  EXPECT_TRUE(std::all_of(server.asked.begin(), server.asked.end(), [](const auto& each) { return each.second == 1; }));
+  EXPECT_EQ(device_.applications.ownersAsked, 64);
   contexts.push_back(65);
+  device_.applications.owners[65] = 100;
   EXPECT_EQ(client.start({.contexts = contexts})->code(), errorcode::kFailedToStart);
-  device_.platform.renderServer = &device_.applications;
 }
 
 TEST_F(StartAnswersTest, NoMovieIsSmallerThanAPictureCanBe) {
-  suppressAlert();
   auto client = game();
   for (const auto& [width, height] : {std::pair(1.0, 1.0), std::pair(1.0, 1080.0), std::pair(4000.0, 1.0)}) {
     const int64_t code = client.start({.width = width, .height = height})->code();

@@ -1,10 +1,11 @@
+#include <cmath>
+
 #include "daemon/DeviceSleep.h"
 #include "tests/daemon/DaemonTest.h"
 
 namespace qv {
 namespace {
 
-using platform::UserAlertAnswer;
 using platform::Value;
 
 /// A monitor that says who observes it.
@@ -16,8 +17,8 @@ struct FakeLayoutMonitor final : platform::DisplayLayoutMonitor {
   std::weak_ptr<platform::DisplayLayoutObserver> observer;
 };
 
-/// Every way in which a recording starts or does not, with every way in which it ends.
-class TransactionsTest : public DaemonTest {
+/// Whether a recording starts, and every way in which it ends.
+class TransactionsTest : public QuietDaemonTest {
  protected:
   TransactionsTest() { manager_->setLayoutMonitor(monitor_); }
 
@@ -29,43 +30,12 @@ class TransactionsTest : public DaemonTest {
     platform::DisplayLayout layout;
     for (const int64_t level : levels) layout.elements.push_back({"e", level});
     if (const auto to = monitor_->observer.lock()) to->layoutMonitorDidUpdateDisplayLayout(*monitor_, layout);
+    device_.run();
   }
-  static const std::vector<Case>& refusals();
   static const std::vector<Case>& ends();
 
   const std::shared_ptr<FakeLayoutMonitor> monitor_ = std::make_shared<FakeLayoutMonitor>();
 };
-
-const std::vector<TransactionsTest::Case>& TransactionsTest::refusals() {
-  static const std::vector<Case> cases{
-      {"no size", [](auto&, TestClient& client) { client.start({.width = 0}); }},
-      {"no entitlement", [](auto&, TestClient& client) { client.start({.system = true}); }},
-      {"broadcast", [](auto&, TestClient& client) { client.start({.broadcast = true}); }},
-      {"full disk",
-       [](TransactionsTest& t, TestClient& client) {
-         t.device_.disk.setFreeSize(0);
-         client.start();
-         t.device_.disk.setFreeSize(1'000'000'000);
-       }},
-      {"background",
-       [](TransactionsTest& t, TestClient& client) {
-         t.device_.applications.states[client.bundleID()] = platform::kApplicationBackground;
-         client.start();
-         t.device_.applications.states[client.bundleID()] = platform::kApplicationForeground;
-       }},
-      {"declined",
-       [](TransactionsTest& t, TestClient& client) {
-         client.start({.capture = true});
-         t.device_.alerts.answer(UserAlertAnswer::Other);
-       }},
-      {"left in the alert",
-       [](TransactionsTest&, TestClient& client) {
-         client.start();
-         client.disconnect();
-       }},
-  };
-  return cases;
-}
 
 const std::vector<TransactionsTest::Case>& TransactionsTest::ends() {
   static const std::vector<Case> cases{
@@ -126,18 +96,35 @@ const std::vector<TransactionsTest::Case>& TransactionsTest::ends() {
   return cases;
 }
 
-TEST_F(TransactionsTest, ARefusedStartLeavesNoneOpen) {
-  for (const Case& refusal : refusals()) {
-    auto client = game();
-    refusal.run(*this, client);
-    device_.run();
-    EXPECT_EQ(openTransactions(), 0) << refusal.name;
-    EXPECT_FALSE(monitor_->isObserved()) << refusal.name;
-  }
+TEST_F(TransactionsTest, AStartIsRefusedByItsFirstFailingCheckAndLeavesNoneOpen) {
+  auto client = game();
+  const auto codeOf = [&](const TestClient::StartOptions& options) {
+    const int64_t code = client.start(options)->code();
+    EXPECT_EQ(openTransactions(), code == 0 ? 1 : 0);
+    EXPECT_EQ(monitor_->isObserved(), code == 0);
+    return code;
+  };
+  EXPECT_EQ(codeOf({.system = true}), errorcode::kEntitlements);
+  device_.applications.owners = {{7, 100}, {8, 200}, {9, 999}};
+  EXPECT_EQ(codeOf({.contexts = {7, 8}}), errorcode::kFailedToStart);
+  EXPECT_EQ(codeOf({.contexts = {0}}), errorcode::kFailedToStart);
+  EXPECT_EQ(codeOf({.contexts = {9}}), errorcode::kFailedToStart);
+  EXPECT_EQ(codeOf({.width = 0, .height = 0}), errorcode::kFailedToStart);
+  EXPECT_EQ(codeOf({.width = std::nan(""), .height = 720}), errorcode::kFailedToStart);
+  EXPECT_EQ(codeOf({.width = 1e9, .height = 1e9}), errorcode::kFailedToStart);
+  EXPECT_EQ(codeOf({.broadcast = true}), errorcode::kInvalidBroadcastSession);
+  EXPECT_EQ(platform::decodeError(client.answer()->values[0].asDictionary())->localizedDescription(), "");
+  device_.disk.setFreeSize(100'000'000);
+  EXPECT_EQ(codeOf({}), errorcode::kInsufficientStorage);
+  device_.disk.setFreeSize(100'000'001);
+  device_.applications.states["com.example.game"] = platform::kApplicationBackground;
+  EXPECT_EQ(codeOf({}), errorcode::kFailedToStart);
+  device_.applications.states["com.example.game"] = platform::kApplicationForeground;
+  EXPECT_EQ(codeOf({.contexts = {7}}), 0);
+  EXPECT_EQ(device_.screen.contexts, std::set<uint32_t>{7});
 }
 
 TEST_F(TransactionsTest, EveryEndOfARecordingClosesItsOwn) {
-  suppressAlert();
   for (const bool capture : {false, true}) {
     for (const bool hasFrame : {true, false}) {
       for (const Case& end : ends()) {
@@ -156,6 +143,18 @@ TEST_F(TransactionsTest, EveryEndOfARecordingClosesItsOwn) {
       }
     }
   }
+}
+
+TEST_F(TransactionsTest, ADividedDisplayEndsAnApplicationsRecordingWithItsMovie) {
+  auto client = game();
+  client.start();
+  sendFrame(kSecond);
+  showLayout({0});
+  showLayout({0, 0, 5});  // two ordinary ones and one above: counted, nothing ends
+  EXPECT_TRUE(client.isRecording());
+  showLayout({0});
+  EXPECT_EQ(client.takeEnds(), std::vector<int64_t>{errorcode::kContentResize});
+  EXPECT_EQ(client.request("saveVideoToCameraRoll", {Value(client.lastMovie())})->code(), 0);
 }
 
 TEST_F(TransactionsTest, ALongSleepEndsASystemRecordingAShortOneDoesNot) {

@@ -187,38 +187,24 @@ TEST_F(MovieWriterTest, FailuresAnswerWithoutAMovie) {
   EXPECT_EQ(startsAnswered_, 2);
 }
 
-TEST_F(MovieWriterTest, AnAnnouncedStopEndsTheMovieThereUnlessItResumes) {
-  auto writer = started();
-  append(*writer, 100);
-  append(*writer, 200);
-  writer->notifyRecordingMayBeStopped();
-  append(*writer, 300);
-  finish(writer);
-  EXPECT_EQ(device_.movies.last().sessionEnd, MediaTime::make(200, platform::kHostTimescale));
-  writer = started();
-  append(*writer, 100);
-  append(*writer, 200);
-  writer->notifyRecordingMayBeStopped();
-  writer->notifyRecordingResumed();
-  finish(writer);
-  EXPECT_FALSE(device_.movies.last().sessionEnd.isValid());
-}
-
-TEST_F(MovieWriterTest, AStopEndsTheMovieAtItsTimeUnlessAnAnnouncedOneCameBefore) {
+TEST_F(MovieWriterTest, TheMovieEndsAtItsStopUnlessAnAnnouncedOneCameBefore) {
   const MediaTime stop = MediaTime::make(430, platform::kHostTimescale);
-  auto writer = started();
-  append(*writer, 100);
-  writer->endAtSourceTime(stop);
-  finish(writer);
-  EXPECT_EQ(device_.movies.last().sessionEnd, stop);
-  writer = started();
-  append(*writer, 100);
-  append(*writer, 200);
-  writer->notifyRecordingMayBeStopped();
-  append(*writer, 300);
-  writer->endAtSourceTime(stop);
-  finish(writer);
-  EXPECT_EQ(device_.movies.last().sessionEnd, MediaTime::make(200, platform::kHostTimescale));
+  const MediaTime lastFrame = MediaTime::make(200, platform::kHostTimescale);
+  const auto endAfter = [&](bool isAnnounced, bool resumes, bool stops) {
+    const auto writer = started();
+    append(*writer, 100);
+    append(*writer, 200);
+    if (isAnnounced) writer->notifyRecordingMayBeStopped();
+    if (resumes) writer->notifyRecordingResumed();
+    append(*writer, 300);
+    if (stops) writer->endAtSourceTime(stop);
+    finish(writer);
+    return device_.movies.last().sessionEnd;
+  };
+  EXPECT_EQ(endAfter(true, false, false), lastFrame);
+  EXPECT_EQ(endAfter(true, false, true), lastFrame);
+  EXPECT_FALSE(endAfter(true, true, false).isValid());
+  EXPECT_EQ(endAfter(false, false, true), stop);
 }
 
 TEST_F(MovieWriterTest, TellsWhetherTheMovieIsSoundAndWhatFailed) {
@@ -306,7 +292,9 @@ class MixTest : public testing::Test {
     QVAudioMixUtility::mixAudioForMovie(movies_, movie, [&](const auto& mixed, const auto& error) {
       answer = {mixed, error};
     });
+    EXPECT_EQ(device_.exports.sessions.size(), mixes_) << "no movie is opened on the caller's thread";
     device_.run();
+    mixes_ = device_.exports.sessions.size();
     return answer;
   }
   [[nodiscard]] std::vector<std::string> store() { return device_.disk.contentsOfDirectory(fakes::kStore).value(); }
@@ -314,6 +302,7 @@ class MixTest : public testing::Test {
   fakes::FakeDevice device_;
   const std::shared_ptr<QVTemporaryMovies> movies_ = QVTemporaryMovies::create();
   const URL movie_ = URL::fileURL(pathInStore("Game.mp4"));
+  size_t mixes_ = 0;
 };
 
 TEST_F(MixTest, EveryTrackGoesIntoAMixOfItsOwnWhichItsClaimOwns) {
@@ -328,14 +317,6 @@ TEST_F(MixTest, EveryTrackGoesIntoAMixOfItsOwnWhichItsClaimOwns) {
   EXPECT_EQ(second.movie->path(), std::string(fakes::kStore) + "/QVQuorvel_Final1700000000 2.mp4");
   EXPECT_EQ(movies_->deleteAllTempFiles(), 4) << "the movie, but neither mix";
   EXPECT_TRUE(first.movie->hasFile() && second.movie->hasFile());
-}
-
-TEST_F(MixTest, TheMovieIsNotOpenedInTheCallersThread) {
-  device_.disk.addFile(movie_.path(), "game");
-  QVAudioMixUtility::mixAudioForMovie(movies_, movie_, [](const auto&, const auto&) {});
-  EXPECT_TRUE(device_.exports.sessions.empty());
-  device_.run();
-  EXPECT_EQ(device_.exports.sessions.size(), 1u);
 }
 
 TEST_F(MixTest, WhatFailsLeavesNothing) {
