@@ -91,7 +91,7 @@ class QVRecordingManager final : public platform::IPCListenerDelegate,
   void addBroadcastRequests();
   void requestStop(const Caller& caller, double startClipDuration, double endClipDuration,
                    const platform::IPCReply& reply);
-  void stopForClient(const Session& session, double startClipDuration, double endClipDuration,
+  void stopForClient(const Caller& caller, const Session& session, double startClipDuration, double endClipDuration,
                      const platform::IPCReply& reply);
   void discardRecording(const Caller& caller, const platform::IPCReply& reply);
   void pauseRecording(const Session& session);

@@ -91,15 +91,26 @@ void QVRecordingManager::requestStop(const Caller& caller, double startClipDurat
     reply.fail(requesterror::kNotRecording, "nothing is being recorded for this application");
     return;
   }
-  session->recording()->whenAnswered([weakSelf = weak_from_this(), session, startClipDuration, endClipDuration, reply] {
-    if (const auto self = weakSelf.lock()) self->stopForClient(session, startClipDuration, endClipDuration, reply);
-  });
+  session->recording()->whenAnswered(
+      [weakSelf = weak_from_this(), caller, session, startClipDuration, endClipDuration, reply] {
+        if (const auto self = weakSelf.lock())
+          self->stopForClient(caller, session, startClipDuration, endClipDuration, reply);
+      });
 }
 
-void QVRecordingManager::stopForClient(const Session& session, double startClipDuration, double endClipDuration,
-                                       const IPCReply& reply) {
+void QVRecordingManager::stopForClient(const Caller& caller, const Session& session, double startClipDuration,
+                                       double endClipDuration, const IPCReply& reply) {
   if (!session->isRecording()) {
     reply.fail(requesterror::kNotRecording, "the recording has ended already");
+    return;
+  }
+  const auto proxy = session->clientProxy();
+  if (proxy && proxy->connection() != caller.connection) {
+    // Whoever asked has gone meanwhile. The client that came after it is told, and has the movie.
+    stopRecordingSession(session, [](QVRecording& recording) {
+      recording.end({.cause = _qvUserErrorForCode(errorcode::kInterrupted),
+                     .movie = moviefate::handTo(recording.settings().bundleID)});
+    });
     return;
   }
   const auto answer = [reply](const std::optional<URL>& movie, const std::optional<Error>& error) {

@@ -68,7 +68,7 @@ void RandomDriver::connect(App app, bool waits) {
   if (app == kSystem) entitlements.emplace("com.tarnwick.private.quorvel", Value(true));
   actor.client = std::make_unique<TestClient>(device_, actor.bundleID, actor.pid, entitlements, waits);
   // What a former connection began goes on without it, if at all: from here on its end is told to this one.
-  model_.connected(app, false);
+  model_.arrived(app);
   const auto state = actor.client->post("synchronousGetCurrentState");
   runPieces(-1);
   model_.connected(app, *state && valueForKey((*state)->values.at(0).asDictionary(), "isRecording").asBool());

@@ -1,6 +1,7 @@
 #include "tests/daemon/RecordingModel.h"
 
 #include <cerrno>
+#include <utility>
 
 #include "support/QuorvelErrors.h"
 
@@ -60,6 +61,7 @@ void RecordingModel::handed(App app, const std::string& name, const std::string&
   if (content.empty() && isQuiet) fault("handed but not there: " + name);
   apps_[app].movies[name] = {content, isQuiet ? std::set<RequestID>() : std::set{kForGood}, {}};
   apps_[app].last = name;
+  apps_[app].mayHaveMissed = false;
 }
 
 void RecordingModel::savePosted(App app, RequestID request, const std::string& name) {
@@ -88,14 +90,14 @@ void RecordingModel::saveAnswered(App app, RequestID request, const std::string&
 void RecordingModel::discardPosted(App app, RequestID request, bool isQuiet) {
   const std::string last = apps_[app].last;
   const Movie* movie = find(app, last);
-  const bool takesLast = isQuiet && movie && !movie->isGone;
+  const bool takesLast = isQuiet && movie && !movie->isGone && !apps_[app].mayHaveMissed;
   doubt(app, request, [&](const std::string& name) { return !takesLast || name == last; });
 }
 
 void RecordingModel::discardAnswered(App app, RequestID request, bool failed) {
   if (failed) clear(app, request);
   Movie* movie = find(app, apps_[app].last);
-  if (!movie || movie->isGone || movie->doubts != std::set{request}) return;
+  if (!movie || movie->isGone || movie->doubts != std::set{request} || apps_[app].mayHaveMissed) return;
   movie->isGone = movie->isDiscarded = true;
 }
 
@@ -105,12 +107,12 @@ void RecordingModel::purged() {
 
 void RecordingModel::connected(App app, bool isRecording) {
   apps_[app].began = isRecording ? 1 : 0;
-  apps_[app].told = 0;
+  apps_[app].mayEndLate = !isRecording;
 }
 
 /// Its requests go unanswered: whatever was in doubt stays so.
 void RecordingModel::left(App app) {
-  apps_[app].hasLeft = true;
+  apps_[app].hasLeft = apps_[app].mayHaveMissed = true;
   for (auto& [name, movie] : apps_[app].movies) {
     if (!movie.doubts.empty()) movie.doubts = {kForGood};
   }
@@ -132,8 +134,12 @@ void RecordingModel::checkMovies(const ContentAt& contentAt) {
 }
 
 void RecordingModel::checkTold(App app, bool isRecording) {
-  const Application& application = apps_[app];
-  const int open = application.began - application.told;
+  Application& application = apps_[app];
+  int open = application.began - application.told;
+  if (open < (isRecording ? 1 : 0) && std::exchange(application.mayEndLate, false)) {
+    ++application.began;
+    ++open;
+  }
   if (open != (isRecording ? 1 : 0)) {
     fault(std::to_string(app) + " was told " + std::to_string(application.began) + " beginnings and " +
           std::to_string(application.told) + " ends, and records: " + std::to_string(isRecording));

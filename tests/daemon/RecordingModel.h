@@ -37,6 +37,7 @@ class RecordingModel {
   /// The store was purged of all, or of what is old.
   void purged();
   /// A client went; whether it records when it comes back is asked anew.
+  void arrived(App app) { apps_[app].began = apps_[app].told = 0; }
   void connected(App app, bool isRecording);
   void left(App app);
 
@@ -63,6 +64,8 @@ class RecordingModel {
   };
   struct Application {
     int began = 0, told = 0;
+    bool mayEndLate = false;              ///< of what was ending when it came back
+    bool mayHaveMissed = false;           ///< a movie that was handed to it while it was away
     std::map<std::string, Movie> movies;  ///< by file name
     std::string last;                     ///< handed last
     bool hasLeft = false;                 ///< what it was handed meanwhile, it was never told

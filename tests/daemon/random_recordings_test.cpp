@@ -8,7 +8,11 @@ namespace qv {
 namespace {
 
 constexpr int kSteps = 4000;
+#if defined(__SANITIZE_ADDRESS__) || defined(__SANITIZE_THREAD__)
+constexpr int kRuns = 6;
+#else
 constexpr int kRuns = 48;
+#endif
 
 uint64_t numberFrom(const char* variable, uint64_t otherwise) {
   const char* text = std::getenv(variable);
