@@ -5,9 +5,9 @@
 
 #include "capture/AppAudioLease.h"
 #include "capture/AudioRecorderRecord.h"
-#include "platform/Clock.h"
-#include "platform/Guarded.h"
 #include "platform/Platform.h"
+#include "platform/threads/Clock.h"
+#include "platform/threads/Guarded.h"
 
 namespace qv {
 

@@ -2,7 +2,7 @@
 
 #include "capture/AppAudioCapture.h"
 #include "capture/QVCaptureManager.h"
-#include "platform/Log.h"
+#include "platform/threads/Log.h"
 
 namespace qv {
 

@@ -3,8 +3,8 @@
 #include <functional>
 #include <memory>
 
-#include "platform/MediaTime.h"
-#include "platform/SampleBuffer.h"
+#include "platform/base/MediaTime.h"
+#include "platform/base/SampleBuffer.h"
 
 namespace qv {
 

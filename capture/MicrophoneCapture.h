@@ -5,9 +5,9 @@
 #include <optional>
 
 #include "capture/MicrophoneLease.h"
-#include "platform/Clock.h"
-#include "platform/Guarded.h"
 #include "platform/Platform.h"
+#include "platform/threads/Clock.h"
+#include "platform/threads/Guarded.h"
 
 namespace qv {
 

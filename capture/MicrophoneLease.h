@@ -2,7 +2,7 @@
 
 #include <functional>
 
-#include "platform/SampleBuffer.h"
+#include "platform/base/SampleBuffer.h"
 
 namespace qv {
 

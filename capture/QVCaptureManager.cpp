@@ -3,7 +3,7 @@
 #include <utility>
 
 #include "capture/AppAudioCapture.h"
-#include "platform/Log.h"
+#include "platform/threads/Log.h"
 
 namespace qv {
 

@@ -5,9 +5,9 @@
 
 #include "capture/AppAudioLease.h"
 #include "capture/MicrophoneCapture.h"
-#include "platform/Guarded.h"
 #include "platform/Platform.h"
-#include "platform/SampleBuffer.h"
+#include "platform/base/SampleBuffer.h"
+#include "platform/threads/Guarded.h"
 
 namespace qv {
 

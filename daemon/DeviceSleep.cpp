@@ -1,7 +1,7 @@
 #include "daemon/DeviceSleep.h"
 
 #include "daemon/QVRecordingManager.h"
-#include "platform/Log.h"
+#include "platform/threads/Log.h"
 
 namespace qv {
 

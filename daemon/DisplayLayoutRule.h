@@ -4,8 +4,8 @@
 #include <functional>
 #include <memory>
 
-#include "platform/SerialQueue.h"
-#include "platform/SystemServices.h"
+#include "platform/DisplayLayout.h"
+#include "platform/threads/SerialQueue.h"
 
 namespace qv {
 

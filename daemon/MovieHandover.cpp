@@ -2,7 +2,7 @@
 
 #include <utility>
 
-#include "platform/Log.h"
+#include "platform/threads/Log.h"
 #include "support/QuorvelErrors.h"
 #include "writer/QVAudioMixUtility.h"
 

@@ -6,7 +6,7 @@
 #include <string>
 
 #include "platform/Platform.h"
-#include "platform/SerialQueue.h"
+#include "platform/threads/SerialQueue.h"
 #include "support/QVTemporaryMovies.h"
 
 namespace qv {

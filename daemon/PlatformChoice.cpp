@@ -3,7 +3,6 @@
 #include <cstdlib>
 
 #include "daemon/SoundChoice.h"
-#include "platform/Log.h"
 #include "platform/appstream/AppStreamStore.h"
 #include "platform/ffmpeg/MoviesLoader.h"
 #include "platform/headless/HeadlessPlatform.h"
@@ -12,6 +11,7 @@
 #include "platform/mp4/MP4MovieSalvage.h"
 #include "platform/sdbus/LogindKeepAlive.h"
 #include "platform/sdbus/SdBusIPC.h"
+#include "platform/threads/Log.h"
 #include "platform/x11/X11Platform.h"
 #include "support/QVDiskSpace.h"
 #include "support/QVTemporaryFiles.h"

@@ -2,6 +2,7 @@
 
 #include <memory>
 
+#include "platform/DisplayLayout.h"
 #include "platform/Platform.h"
 #include "platform/SuspendMonitor.h"
 

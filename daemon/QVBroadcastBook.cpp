@@ -2,9 +2,9 @@
 
 #include <utility>
 
-#include "platform/Log.h"
 #include "platform/Platform.h"
-#include "support/QVExtensions.h"
+#include "platform/threads/Log.h"
+#include "support/QVBundleTexts.h"
 #include "support/QuorvelErrors.h"
 
 namespace qv {

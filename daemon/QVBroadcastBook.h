@@ -8,7 +8,7 @@
 
 #include "extensions/QVExtensions.h"
 #include "platform/Extensions.h"
-#include "platform/SerialQueue.h"
+#include "platform/threads/SerialQueue.h"
 #include "session/QVRecording.h"
 
 namespace qv {

@@ -2,9 +2,9 @@
 
 #include <utility>
 
-#include "daemon/client/QVDaemonProtocol.h"
 #include "extensions/QVExtensionHostContext.h"
-#include "platform/Log.h"
+#include "platform/threads/Log.h"
+#include "protocol/QVDaemonProtocol.h"
 #include "support/QVTemporaryFiles.h"
 #include "support/QVUnfinishedMovies.h"
 #include "support/QuorvelErrors.h"

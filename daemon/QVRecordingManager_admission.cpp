@@ -1,7 +1,7 @@
 #include "daemon/QVRecordingManager.h"
-#include "daemon/client/QVClientProtocol.h"
-#include "daemon/client/QVDaemonProtocol.h"
-#include "platform/Log.h"
+#include "platform/threads/Log.h"
+#include "protocol/QVClientProtocol.h"
+#include "protocol/QVDaemonProtocol.h"
 
 namespace qv {
 

@@ -1,7 +1,7 @@
 #include <utility>
 
 #include "daemon/QVRecordingManager.h"
-#include "platform/Log.h"
+#include "platform/threads/Log.h"
 #include "support/QuorvelErrors.h"
 
 namespace qv {

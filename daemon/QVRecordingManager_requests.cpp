@@ -1,8 +1,8 @@
 #include <utility>
 
 #include "daemon/QVRecordingManager.h"
-#include "platform/Log.h"
-#include "support/QVExtensions.h"
+#include "platform/threads/Log.h"
+#include "support/QVBundleTexts.h"
 #include "support/QuorvelErrors.h"
 
 namespace qv {

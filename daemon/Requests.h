@@ -4,8 +4,8 @@
 #include <string_view>
 #include <vector>
 
-#include "platform/Geometry.h"
 #include "platform/IPC.h"
+#include "platform/base/Geometry.h"
 
 namespace qv {
 

@@ -3,7 +3,7 @@
 #include <memory>
 #include <optional>
 
-#include "platform/SerialQueue.h"
+#include "platform/threads/SerialQueue.h"
 #include "session/QVRecordingSession.h"
 
 namespace qv {

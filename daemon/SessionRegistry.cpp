@@ -3,7 +3,7 @@
 #include <algorithm>
 #include <utility>
 
-#include "platform/Log.h"
+#include "platform/threads/Log.h"
 
 namespace qv {
 

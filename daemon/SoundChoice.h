@@ -5,6 +5,7 @@
 
 #include "platform/AppAudioTap.h"
 #include "platform/DeviceCapture.h"
+#include "platform/ScreenReader.h"
 #include "platform/Sounds.h"
 #include "platform/headless/HeadlessPlatform.h"
 #include "platform/pulse/PulsePlatform.h"

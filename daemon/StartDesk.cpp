@@ -3,8 +3,8 @@
 #include <cmath>
 #include <set>
 
-#include "platform/Log.h"
-#include "support/QVExtensions.h"
+#include "platform/threads/Log.h"
+#include "support/QVBundleTexts.h"
 #include "support/QuorvelErrors.h"
 
 namespace qv {

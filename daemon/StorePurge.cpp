@@ -1,6 +1,6 @@
 #include "daemon/StorePurge.h"
 
-#include "platform/Log.h"
+#include "platform/threads/Log.h"
 #include "support/QVDiskSpace.h"
 #include "support/QVTemporaryFiles.h"
 

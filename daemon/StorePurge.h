@@ -4,7 +4,6 @@
 #include <functional>
 #include <memory>
 
-#include "platform/SystemServices.h"
 #include "support/QVTemporaryMovies.h"
 
 namespace qv {

@@ -7,8 +7,8 @@
 #include "daemon/DeviceSleep.h"
 #include "daemon/PlatformChoice.h"
 #include "daemon/QVRecordingManager.h"
-#include "platform/Log.h"
-#include "platform/RunLoop.h"
+#include "platform/threads/Log.h"
+#include "platform/threads/RunLoop.h"
 
 namespace {
 

@@ -5,7 +5,7 @@
 #include <memory>
 #include <mutex>
 
-#include "platform/Timer.h"
+#include "platform/threads/Timer.h"
 
 namespace qv {
 

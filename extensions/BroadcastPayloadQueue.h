@@ -6,8 +6,8 @@
 #include <vector>
 
 #include "extensions/PayloadAnswer.h"
-#include "extensions/QVSharedFrameObject.h"
-#include "platform/Value.h"
+#include "platform/base/Value.h"
+#include "protocol/QVSharedFrameObject.h"
 
 namespace qv {
 

@@ -1,6 +1,6 @@
 #include "extensions/LinkHandshake.h"
 
-#include "platform/Log.h"
+#include "platform/threads/Log.h"
 #include "support/QuorvelErrors.h"
 
 namespace qv {

@@ -6,7 +6,7 @@
 #include <optional>
 
 #include "extensions/AnswerDeadline.h"
-#include "platform/Error.h"
+#include "platform/base/Error.h"
 
 namespace qv {
 

@@ -12,7 +12,7 @@
 #include "extensions/LinkHandshake.h"
 #include "platform/Extensions.h"
 #include "platform/IPC.h"
-#include "platform/RareLog.h"
+#include "platform/threads/RareLog.h"
 
 namespace qv {
 

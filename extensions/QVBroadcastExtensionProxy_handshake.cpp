@@ -2,9 +2,9 @@
 #include <utility>
 
 #include "extensions/QVBroadcastExtensionProxy.h"
-#include "extensions/QVBroadcastProtocols.h"
-#include "platform/Log.h"
 #include "platform/Platform.h"
+#include "platform/threads/Log.h"
+#include "protocol/QVBroadcastProtocols.h"
 #include "support/QuorvelErrors.h"
 
 namespace qv {

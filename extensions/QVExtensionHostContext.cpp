@@ -1,7 +1,7 @@
 #include "extensions/QVExtensionHostContext.h"
 
-#include "extensions/QVBroadcastProtocols.h"
-#include "platform/Log.h"
+#include "platform/threads/Log.h"
+#include "protocol/QVBroadcastProtocols.h"
 
 namespace qv {
 

@@ -1,7 +1,7 @@
 #include "extensions/QVExtensions.h"
 
-#include "platform/Log.h"
 #include "platform/Platform.h"
+#include "platform/threads/Log.h"
 
 namespace qv {
 

@@ -5,8 +5,8 @@
 #include <string>
 #include <vector>
 
-#include "extensions/QVBroadcastProtocols.h"
 #include "platform/Extensions.h"
+#include "protocol/QVBroadcastProtocols.h"
 
 /// Utilities on the platform's extension types: finding installed extensions, and the items of their requests.
 ///

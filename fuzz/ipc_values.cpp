@@ -5,8 +5,8 @@
 #include <cstring>
 
 #include "fuzz/Target.h"
-#include "platform/FileDescriptor.h"
-#include "platform/KeyedArchive.h"
+#include "platform/base/FileDescriptor.h"
+#include "platform/base/KeyedArchive.h"
 #include "platform/sdbus/BusCoding.h"
 #include "platform/sdbus/Handles.h"
 #include "tests/sdbus/RawCall.h"

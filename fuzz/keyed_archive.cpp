@@ -1,6 +1,6 @@
 // Configuration archives, which an application hands over and an extension reads.
 #include "fuzz/Target.h"
-#include "platform/KeyedArchive.h"
+#include "platform/base/KeyedArchive.h"
 
 namespace {
 

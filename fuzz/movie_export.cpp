@@ -4,7 +4,7 @@
 
 #include "fuzz/MovieSeeds.h"
 #include "fuzz/Target.h"
-#include "platform/ffmpeg/LibraryLog.h"
+#include "platform/ffmpeg/FFmpegLog.h"
 #include "platform/ffmpeg/MovieExport.h"
 
 namespace {

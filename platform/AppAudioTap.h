@@ -4,7 +4,7 @@
 #include <functional>
 #include <memory>
 
-#include "platform/Audio.h"
+#include "platform/base/Audio.h"
 
 namespace qv::platform {
 

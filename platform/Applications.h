@@ -8,7 +8,7 @@
 #include <optional>
 #include <string>
 
-#include "platform/Value.h"
+#include "platform/base/Value.h"
 
 namespace qv::platform {
 
@@ -55,15 +55,6 @@ class ApplicationService {
   virtual std::unique_ptr<ApplicationStateMonitor> createStateMonitor() = 0;
   /// The bundle identifier of the frontmost application; nothing when there is none.
   [[nodiscard]] virtual std::optional<std::string> frontmostApplication() = 0;
-};
-
-/// The render server's knowledge of layer contexts.
-class RenderServer {
- public:
-  virtual ~RenderServer() = default;
-  /// The process that owns a layer context; nothing for context 0, an unknown context, or one
-  /// whose owner cannot be established beyond doubt.
-  [[nodiscard]] virtual std::optional<pid_t> ownerOfContext(uint32_t contextID) = 0;
 };
 
 }  // namespace qv::platform

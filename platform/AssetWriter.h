@@ -5,10 +5,10 @@
 #include <optional>
 #include <string>
 
-#include "platform/Error.h"
-#include "platform/Geometry.h"
-#include "platform/Result.h"
-#include "platform/SampleBuffer.h"
+#include "platform/base/Error.h"
+#include "platform/base/Geometry.h"
+#include "platform/base/Result.h"
+#include "platform/base/SampleBuffer.h"
 
 namespace qv::platform {
 

@@ -8,7 +8,7 @@
 #include <string_view>
 #include <vector>
 
-#include "platform/Value.h"
+#include "platform/base/Value.h"
 
 namespace qv::platform {
 
@@ -60,24 +60,6 @@ class BundleService {
   [[nodiscard]] virtual BundleRef bundleEnclosingExecutable(const std::string& executablePath) = 0;
   /// The path of a process's executable; nothing where it cannot be read.
   [[nodiscard]] virtual std::optional<std::string> executablePathOfProcess(pid_t pid) = 0;
-};
-
-/// The user's languages and the texts that depend on them.
-///
-/// Threading: thread-safe.
-class Localization {
- public:
-  virtual ~Localization() = default;
-  /// BCP 47 tags, most preferred first; never empty.
-  [[nodiscard]] virtual std::vector<std::string> preferredLanguages() = 0;
-  /// Orders `available` localizations by the preferences, best first; those that match nothing
-  /// are left out, unless nothing at all matches: then "en" or the first stands alone.
-  [[nodiscard]] virtual std::vector<std::string> matchLocalizations(const std::vector<std::string>& available,
-                                                                    const std::vector<std::string>& preferred) = 0;
-  /// A date in the local time zone, by a pattern of the CLDR kind ("MM-dd-yyyy HH:mm:ss").
-  [[nodiscard]] virtual std::string formatDate(Date date, const std::string& pattern) = 0;
-  /// Whether `text` begins with `prefix`, without regard to case and diacritics.
-  [[nodiscard]] virtual bool beginsWithFolded(const std::string& text, const std::string& prefix) = 0;
 };
 
 }  // namespace qv::platform

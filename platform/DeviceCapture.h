@@ -4,8 +4,8 @@
 #include <functional>
 #include <memory>
 
-#include "platform/SampleBuffer.h"
-#include "platform/SerialQueue.h"
+#include "platform/base/SampleBuffer.h"
+#include "platform/threads/SerialQueue.h"
 
 namespace qv::platform {
 

@@ -6,8 +6,8 @@
 #include <string>
 #include <vector>
 
-#include "platform/Error.h"
-#include "platform/MediaTime.h"
+#include "platform/base/Error.h"
+#include "platform/base/MediaTime.h"
 
 namespace qv::platform {
 

@@ -8,10 +8,10 @@
 #include <string_view>
 #include <vector>
 
-#include "platform/Error.h"
 #include "platform/IPC.h"
-#include "platform/Result.h"
-#include "platform/Value.h"
+#include "platform/base/Error.h"
+#include "platform/base/Result.h"
+#include "platform/base/Value.h"
 
 namespace qv::platform {
 
@@ -125,23 +125,5 @@ class ExtensionService {
   /// Its remote interface is the vendor's; nothing once it is gone.
   [[nodiscard]] virtual std::shared_ptr<IPCConnection> auxiliaryConnectionForRequest(ExtensionRequestID request) = 0;
 };
-
-/// Between the daemon and an extension's process, by two connections that the process makes to the endpoints which it
-/// inherits: their descriptor numbers stand in these environment variables. The first is for requests, by the
-/// interfaces below; the second, the auxiliary one, for those of the host context.
-inline constexpr const char kExtensionRequestsEndpointVariable[] = "QUORVEL_EXTENSION_REQUESTS";
-inline constexpr const char kExtensionAuxiliaryEndpointVariable[] = "QUORVEL_EXTENSION_AUXILIARY";
-
-/// Called on the extension: "beginRequest" (t request, aa{sv} items) -> (). It is answered when the request was taken.
-const IPCInterface& extensionRequestProtocol();
-/// Called on the daemon: "completeRequest" (t request, aa{sv} items), and "openFile" (s token) -> (h file), which fails
-/// with "com.tarnwick.quorveld.Error.NoSuchFile" for any token that is not this extension's to use.
-const IPCInterface& extensionRequestHostProtocol();
-inline constexpr const char kNoSuchFileErrorName[] = "com.tarnwick.quorveld.Error.NoSuchFile";
-
-/// Items as they stand in those messages: an array of dictionaries with "title" (s) and "attachments" (av). Titles and
-/// attachments that are missing or of another type are left out.
-[[nodiscard]] Value valueOfExtensionItems(const std::vector<ExtensionItem>& items);
-[[nodiscard]] std::vector<ExtensionItem> extensionItemsOfValue(const Value& value);
 
 }  // namespace qv::platform

@@ -5,8 +5,8 @@
 #include <string>
 #include <vector>
 
-#include "platform/Result.h"
-#include "platform/Value.h"
+#include "platform/base/Result.h"
+#include "platform/base/Value.h"
 
 namespace qv::platform {
 

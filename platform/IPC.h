@@ -2,6 +2,7 @@
 
 #include <sys/types.h>
 
+#include <algorithm>
 #include <functional>
 #include <memory>
 #include <optional>
@@ -9,10 +10,10 @@
 #include <string_view>
 #include <vector>
 
-#include "platform/Error.h"
-#include "platform/Result.h"
-#include "platform/SerialQueue.h"
-#include "platform/Value.h"
+#include "platform/base/Error.h"
+#include "platform/base/Result.h"
+#include "platform/base/Value.h"
+#include "platform/threads/SerialQueue.h"
 
 namespace qv::platform {
 
@@ -48,7 +49,10 @@ struct IPCOperation {
 struct IPCInterface {
   std::string name;  ///< e.g. "com.tarnwick.quorveld.QVDaemonProtocol"
   std::vector<IPCOperation> operations;
-  [[nodiscard]] const IPCOperation* operation(std::string_view member) const;
+  [[nodiscard]] const IPCOperation* operation(std::string_view member) const {
+    const auto found = std::ranges::find(operations, member, &IPCOperation::member);
+    return found == operations.end() ? nullptr : &*found;
+  }
 };
 
 /// How Values stand in messages, by signature: b bool, i/u/x/t integers, d double, s string (also
@@ -200,18 +204,6 @@ class IPCService {
   /// Fails when nobody serves that name now.
   virtual Result<std::shared_ptr<IPCConnection>> connect(const std::string& serviceName) = 0;
   virtual Result<std::shared_ptr<IPCConnection>> connect(const ListenerEndpoint& endpoint) = 0;
-};
-
-/// While at least one transaction is open, the platform keeps the daemon running and the device
-/// from idling to sleep. Unbalanced closes are ignored with a log line.
-///
-/// Threading: thread-safe.
-class KeepAliveService {
- public:
-  virtual ~KeepAliveService() = default;
-  virtual void beginTransaction() = 0;
-  virtual void endTransaction() = 0;
-  [[nodiscard]] virtual int openTransactionCount() const = 0;
 };
 
 }  // namespace qv::platform

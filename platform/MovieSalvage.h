@@ -3,8 +3,8 @@
 #include <cstdint>
 #include <string>
 
-#include "platform/MediaTime.h"
-#include "platform/Result.h"
+#include "platform/base/MediaTime.h"
+#include "platform/base/Result.h"
 
 namespace qv::platform {
 

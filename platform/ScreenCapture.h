@@ -4,8 +4,8 @@
 #include <memory>
 #include <set>
 
-#include "platform/Geometry.h"
-#include "platform/SampleBuffer.h"
+#include "platform/base/Geometry.h"
+#include "platform/base/SampleBuffer.h"
 
 namespace qv::platform {
 

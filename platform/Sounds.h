@@ -14,11 +14,4 @@ class SystemSounds {
   virtual void play(uint32_t soundID) = 0;
 };
 
-/// Whether the platform's screen reader is running.
-class ScreenReader {
- public:
-  virtual ~ScreenReader() = default;
-  [[nodiscard]] virtual bool isRunning() = 0;
-};
-
 }  // namespace qv::platform

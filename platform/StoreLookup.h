@@ -6,7 +6,7 @@
 #include <string>
 #include <vector>
 
-#include "platform/Error.h"
+#include "platform/base/Error.h"
 
 namespace qv::platform {
 

@@ -1,8 +1,8 @@
 #pragma once
 
-#include "extensions/QVBroadcastConfiguration.h"
-#include "extensions/QVBroadcastProtocols.h"
 #include "platform/Extensions.h"
+#include "protocol/QVBroadcastConfiguration.h"
+#include "protocol/QVBroadcastProtocols.h"
 
 namespace qv {
 

@@ -1,6 +1,6 @@
 #include "session/ClientOutput.h"
 
-#include "platform/RawRecord.h"
+#include "platform/base/RawRecord.h"
 
 namespace qv {
 

@@ -4,9 +4,9 @@
 #include <memory>
 #include <mutex>
 
-#include "daemon/client/QVClientProxy.h"
+#include "protocol/SampleType.h"
+#include "session/QVClientProxy.h"
 #include "session/RecordingOutput.h"
-#include "session/SampleType.h"
 
 namespace qv {
 

@@ -6,8 +6,8 @@
 #include <mutex>
 #include <optional>
 
-#include "extensions/QVBroadcastConfiguration.h"
-#include "platform/Timer.h"
+#include "platform/threads/Timer.h"
+#include "protocol/QVBroadcastConfiguration.h"
 #include "session/ClipSeam.h"
 #include "session/RecordingOutput.h"
 

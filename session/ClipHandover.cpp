@@ -2,10 +2,10 @@
 
 #include <utility>
 
-#include "extensions/QVBroadcastProtocols.h"
 #include "extensions/QVExtensions.h"
-#include "platform/Log.h"
 #include "platform/Platform.h"
+#include "platform/threads/Log.h"
+#include "protocol/QVBroadcastProtocols.h"
 
 namespace qv {
 

@@ -8,8 +8,8 @@
 #include <string>
 
 #include "extensions/AnswerDeadline.h"
-#include "extensions/QVBroadcastConfiguration.h"
 #include "platform/Extensions.h"
+#include "protocol/QVBroadcastConfiguration.h"
 #include "support/QVTemporaryMovies.h"
 
 namespace qv {

@@ -3,7 +3,7 @@
 #include <memory>
 #include <vector>
 
-#include "platform/SampleBuffer.h"
+#include "platform/base/SampleBuffer.h"
 #include "writer/QVMovieWriter.h"
 
 namespace qv {

@@ -2,7 +2,7 @@
 
 #include <utility>
 
-#include "platform/Log.h"
+#include "platform/threads/Log.h"
 #include "session/MovieNames.h"
 #include "session/PictureTransform.h"
 #include "support/QuorvelErrors.h"

@@ -3,7 +3,7 @@
 #include <memory>
 #include <string>
 
-#include "platform/Guarded.h"
+#include "platform/threads/Guarded.h"
 #include "session/BroadcastPlan.h"
 #include "session/ClipCutter.h"
 #include "session/ClipHandover.h"

@@ -1,6 +1,7 @@
 #pragma once
 
 #include "platform/IPC.h"
+#include "platform/KeepAlive.h"
 
 namespace qv {
 

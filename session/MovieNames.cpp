@@ -3,7 +3,7 @@
 #include <algorithm>
 
 #include "platform/Platform.h"
-#include "support/QVExtensions.h"
+#include "support/QVBundleTexts.h"
 #include "support/QVTemporaryFiles.h"
 
 namespace qv {

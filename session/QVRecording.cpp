@@ -2,8 +2,8 @@
 
 #include <utility>
 
-#include "platform/Log.h"
 #include "platform/Platform.h"
+#include "platform/threads/Log.h"
 
 namespace qv {
 

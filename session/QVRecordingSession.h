@@ -4,8 +4,8 @@
 #include <optional>
 #include <string>
 
-#include "daemon/client/QVClientProxy.h"
-#include "platform/Guarded.h"
+#include "platform/threads/Guarded.h"
+#include "session/QVClientProxy.h"
 #include "session/QVRecording.h"
 
 namespace qv {

@@ -1,7 +1,7 @@
 #include <utility>
 
-#include "platform/Log.h"
 #include "platform/Platform.h"
+#include "platform/threads/Log.h"
 #include "session/MovieNames.h"
 #include "session/QVRecording.h"
 #include "support/QuorvelErrors.h"

@@ -1,6 +1,6 @@
 #include <cerrno>
 
-#include "platform/Log.h"
+#include "platform/threads/Log.h"
 #include "session/ClipSeam.h"
 #include "session/QVRecording.h"
 #include "support/QVDiskSpace.h"

@@ -1,9 +1,9 @@
 #include <utility>
 
-#include "platform/Log.h"
 #include "platform/Platform.h"
+#include "platform/threads/Log.h"
 #include "session/QVRecording.h"
-#include "support/QVExtensions.h"
+#include "support/QVBundleTexts.h"
 
 namespace qv {
 

@@ -2,8 +2,8 @@
 
 #include <cmath>
 
-#include "platform/Log.h"
 #include "platform/Platform.h"
+#include "platform/threads/Log.h"
 
 namespace qv {
 

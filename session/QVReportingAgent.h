@@ -4,9 +4,9 @@
 #include <cstdint>
 #include <string>
 
-#include "platform/Geometry.h"
-#include "platform/Guarded.h"
-#include "platform/Value.h"
+#include "platform/base/Geometry.h"
+#include "platform/base/Value.h"
+#include "platform/threads/Guarded.h"
 
 namespace qv {
 

@@ -4,7 +4,7 @@
 #include <memory>
 #include <optional>
 
-#include "platform/Error.h"
+#include "platform/base/Error.h"
 #include "support/QVTemporaryMovies.h"
 
 namespace qv {

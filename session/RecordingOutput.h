@@ -5,8 +5,8 @@
 #include <optional>
 #include <string>
 
-#include "platform/Error.h"
-#include "platform/SampleBuffer.h"
+#include "platform/base/Error.h"
+#include "platform/base/SampleBuffer.h"
 #include "support/QVTemporaryMovies.h"
 
 namespace qv {

@@ -6,7 +6,7 @@
 #include "capture/AppAudioLease.h"
 #include "capture/MicrophoneLease.h"
 #include "capture/QVScreenSource.h"
-#include "platform/Value.h"
+#include "platform/base/Value.h"
 
 namespace qv {
 

@@ -7,10 +7,10 @@
 
 #include "extensions/AnswerDeadline.h"
 #include "extensions/QVBroadcastExtensionProxy.h"
-#include "platform/RareLog.h"
+#include "platform/threads/RareLog.h"
+#include "protocol/SampleType.h"
 #include "session/BroadcastPlan.h"
 #include "session/RecordingOutput.h"
-#include "session/SampleType.h"
 
 namespace qv {
 

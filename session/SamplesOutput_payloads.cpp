@@ -1,7 +1,7 @@
 #include <utility>
 
-#include "platform/Log.h"
-#include "platform/RawRecord.h"
+#include "platform/base/RawRecord.h"
+#include "platform/threads/Log.h"
 #include "session/PictureTransform.h"
 #include "session/SamplesOutput.h"
 

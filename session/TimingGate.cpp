@@ -3,7 +3,7 @@
 #include <utility>
 #include <vector>
 
-#include "platform/Log.h"
+#include "platform/threads/Log.h"
 
 namespace qv {
 

@@ -2,7 +2,7 @@
 
 #include <cstdint>
 
-#include "platform/Geometry.h"
+#include "platform/base/Geometry.h"
 
 namespace qv {
 

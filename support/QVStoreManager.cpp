@@ -3,7 +3,7 @@
 #include <utility>
 
 #include "platform/Platform.h"
-#include "support/QVExtensions.h"
+#include "support/QVBundleTexts.h"
 
 namespace qv {
 

@@ -4,8 +4,8 @@
 #include <limits>
 #include <utility>
 
-#include "platform/Log.h"
 #include "platform/Platform.h"
+#include "platform/threads/Log.h"
 
 namespace qv {
 namespace {

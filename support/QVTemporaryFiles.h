@@ -6,8 +6,8 @@
 #include <optional>
 #include <string>
 
-#include "platform/Error.h"
-#include "platform/Value.h"
+#include "platform/base/Error.h"
+#include "platform/base/Value.h"
 #include "support/QVDiskSpace.h"
 
 /// The temporary file store: one private directory, in which every movie is written before it is

@@ -4,8 +4,8 @@
 #include <filesystem>
 #include <utility>
 
-#include "platform/Guarded.h"
 #include "platform/Platform.h"
+#include "platform/threads/Guarded.h"
 #include "support/MovieBook.h"
 
 namespace qv {

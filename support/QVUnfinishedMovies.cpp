@@ -5,8 +5,8 @@
 #include <string>
 #include <string_view>
 
-#include "platform/Log.h"
 #include "platform/Platform.h"
+#include "platform/threads/Log.h"
 #include "support/QVTemporaryFiles.h"
 
 namespace qv {

@@ -2,7 +2,7 @@
 
 #include <utility>
 
-#include "support/QVExtensions.h"
+#include "support/QVBundleTexts.h"
 
 namespace qv {
 

@@ -3,9 +3,9 @@
 #include <cstdint>
 #include <optional>
 
-#include "platform/Error.h"
-#include "platform/Value.h"
-#include "support/RecordingErrorKeys.h"
+#include "platform/base/Error.h"
+#include "platform/base/Value.h"
+#include "protocol/RecordingErrorKeys.h"
 
 /// The errors that clients, extensions and the components of the daemon get: one domain, negative
 /// codes, a localized text.

@@ -1,6 +1,6 @@
 #include "ui/LocalizedTexts.h"
 
-#include "support/QVExtensions.h"
+#include "support/QVBundleTexts.h"
 
 namespace qv {
 

@@ -1,8 +1,8 @@
 #include "ui/QVAcknowledgementAlert.h"
 
-#include "platform/Log.h"
 #include "platform/Platform.h"
-#include "support/QVExtensions.h"
+#include "platform/threads/Log.h"
+#include "support/QVBundleTexts.h"
 #include "ui/LocalizedTexts.h"
 
 namespace qv {

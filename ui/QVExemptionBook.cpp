@@ -1,6 +1,6 @@
 #include "ui/QVExemptionBook.h"
 
-#include "platform/Log.h"
+#include "platform/threads/Log.h"
 
 namespace qv {
 

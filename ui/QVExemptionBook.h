@@ -4,7 +4,7 @@
 #include <set>
 #include <string>
 
-#include "platform/Value.h"
+#include "platform/base/Value.h"
 
 namespace qv {
 

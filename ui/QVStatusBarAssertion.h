@@ -6,8 +6,8 @@
 #include <string>
 
 #include "platform/StatusBar.h"
-#include "platform/Timer.h"
-#include "platform/Value.h"
+#include "platform/base/Value.h"
+#include "platform/threads/Timer.h"
 
 namespace qv {
 

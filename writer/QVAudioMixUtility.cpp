@@ -3,8 +3,8 @@
 #include <utility>
 #include <vector>
 
-#include "platform/Log.h"
 #include "platform/Platform.h"
+#include "platform/threads/Log.h"
 #include "support/QVTemporaryFiles.h"
 #include "support/QuorvelErrors.h"
 

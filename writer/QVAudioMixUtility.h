@@ -4,8 +4,8 @@
 #include <memory>
 #include <optional>
 
-#include "platform/Error.h"
-#include "platform/Value.h"
+#include "platform/base/Error.h"
+#include "platform/base/Value.h"
 #include "support/QVTemporaryMovies.h"
 
 namespace qv {

@@ -1,6 +1,6 @@
 #include "writer/QVMovieWriter.h"
 
-#include "platform/Log.h"
+#include "platform/threads/Log.h"
 #include "support/QVTemporaryFiles.h"
 
 namespace qv {

@@ -6,10 +6,10 @@
 #include <optional>
 #include <string>
 
-#include "extensions/QVBroadcastConfiguration.h"
-#include "platform/BufferQueue.h"
-#include "platform/Guarded.h"
 #include "platform/Platform.h"
+#include "platform/base/BufferQueue.h"
+#include "platform/threads/Guarded.h"
+#include "protocol/QVBroadcastConfiguration.h"
 
 namespace qv {
 

@@ -1,4 +1,4 @@
-#include "platform/Log.h"
+#include "platform/threads/Log.h"
 #include "writer/QVMovieWriter.h"
 
 namespace qv {

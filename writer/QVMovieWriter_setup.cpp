@@ -1,6 +1,6 @@
 #include <algorithm>
 
-#include "platform/Log.h"
+#include "platform/threads/Log.h"
 #include "writer/QVMovieWriter.h"
 
 namespace qv {

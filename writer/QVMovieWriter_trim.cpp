@@ -1,6 +1,6 @@
 #include <cerrno>
 
-#include "platform/Log.h"
+#include "platform/threads/Log.h"
 #include "support/QVTemporaryFiles.h"
 #include "writer/QVMovieWriter.h"
 

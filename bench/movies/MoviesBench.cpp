@@ -15,11 +15,11 @@
 #include "bench/movies/MadeUpMovie.h"
 #include "bench/movies/Recording.h"
 #include "platform/ExportSession.h"
-#include "platform/Log.h"
 #include "platform/ffmpeg/ColorConversion.h"
 #include "platform/ffmpeg/FFmpegMovies.h"
 #include "platform/ffmpeg/MovieReader.h"
 #include "platform/ffmpeg/VideoEncoderChoice.h"
+#include "platform/threads/Log.h"
 
 using namespace qv::platform;
 using namespace qv::bench;

@@ -5,7 +5,7 @@
 #include <vector>
 
 #include "platform/AssetWriter.h"
-#include "platform/SampleBuffer.h"
+#include "platform/base/SampleBuffer.h"
 
 namespace qv::bench {
 

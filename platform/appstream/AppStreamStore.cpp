@@ -3,8 +3,8 @@
 #include <mutex>
 #include <utility>
 
-#include "platform/Log.h"
 #include "platform/appstream/StoreModule.h"
+#include "platform/threads/Log.h"
 
 namespace qv::platform::appstream {
 
@@ -30,7 +30,7 @@ Result<StoreLookupResponse> AppStreamStore::State::lookUp(const StoreLookupReque
   const bool inUsersLanguage = request.localizationStyle == 1;
   const auto languages = inUsersLanguage ? localization.preferredLanguages() : std::vector<std::string>();
   Result<StoreLookupResponse> answer{StoreLookupResponse()};
-  reinterpret_cast<LookUpInCatalogue>(entry.value())(moduleHost(), deviceRoot, languages, request, answer);
+  reinterpret_cast<LookUpInCatalogue>(entry.value())(deviceRoot, languages, request, answer);
   return answer;
 }
 

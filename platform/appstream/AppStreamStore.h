@@ -5,8 +5,9 @@
 #include <string>
 
 #include "platform/Bundles.h"
-#include "platform/Executor.h"
+#include "platform/Localization.h"
 #include "platform/StoreLookup.h"
+#include "platform/threads/Executor.h"
 
 namespace qv::platform::appstream {
 

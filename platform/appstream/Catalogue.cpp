@@ -6,8 +6,8 @@
 #include <memory>
 #include <utility>
 
-#include "platform/Log.h"
 #include "platform/appstream/CatalogueText.h"
+#include "platform/threads/Log.h"
 
 namespace qv::platform::appstream {
 namespace {

@@ -3,8 +3,8 @@
 #include <string>
 #include <vector>
 
-#include "platform/Result.h"
 #include "platform/StoreLookup.h"
+#include "platform/base/Result.h"
 
 namespace qv::platform::appstream {
 

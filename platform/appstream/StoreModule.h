@@ -3,8 +3,8 @@
 #include <string>
 #include <vector>
 
-#include "platform/LateModule.h"
 #include "platform/StoreLookup.h"
+#include "platform/process/LateModule.h"
 
 namespace qv::platform::appstream {
 
@@ -12,9 +12,8 @@ namespace qv::platform::appstream {
 inline constexpr const char kStoreModule[] = "quorveld-store.so";
 
 /// One look into the catalogue. `languages`: BCP 47 tags, most preferred first.
-using LookUpInCatalogue = void (*)(const ModuleHost& host, const std::string& deviceRoot,
-                                   const std::vector<std::string>& languages, const StoreLookupRequest& request,
-                                   Result<StoreLookupResponse>& answer);
+using LookUpInCatalogue = void (*)(const std::string& deviceRoot, const std::vector<std::string>& languages,
+                                   const StoreLookupRequest& request, Result<StoreLookupResponse>& answer);
 inline constexpr const char kStoreModuleEntry[] = "qvLookUpInCatalogue";
 
 }  // namespace qv::platform::appstream

@@ -4,7 +4,7 @@
 #include <memory>
 #include <vector>
 
-#include "platform/Result.h"
+#include "platform/base/Result.h"
 #include "platform/ffmpeg/FFmpegHandles.h"
 #include "platform/ffmpeg/WriterSettings.h"
 #include "platform/mp4/MovieTrack.h"

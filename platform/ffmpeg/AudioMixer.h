@@ -4,7 +4,7 @@
 #include <optional>
 #include <vector>
 
-#include "platform/Result.h"
+#include "platform/base/Result.h"
 #include "platform/ffmpeg/AACEncoder.h"
 #include "platform/ffmpeg/MovieReader.h"
 #include "platform/ffmpeg/TrackCopier.h"

@@ -3,8 +3,8 @@
 #include <algorithm>
 #include <cmath>
 
-#include "platform/Log.h"
 #include "platform/mp4/MovieTrack.h"
+#include "platform/threads/Log.h"
 
 namespace qv::platform::ffmpeg {
 namespace {

@@ -6,7 +6,7 @@
 #include <optional>
 #include <vector>
 
-#include "platform/SampleBuffer.h"
+#include "platform/base/SampleBuffer.h"
 #include "platform/ffmpeg/AACEncoder.h"
 #include "platform/ffmpeg/PCMConverter.h"
 #include "platform/ffmpeg/RecordingTimeline.h"

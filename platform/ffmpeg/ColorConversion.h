@@ -3,7 +3,7 @@
 #include <cstdint>
 #include <vector>
 
-#include "platform/SharedFrame.h"
+#include "platform/base/SharedFrame.h"
 
 namespace qv::platform::ffmpeg {
 

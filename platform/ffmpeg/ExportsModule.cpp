@@ -5,8 +5,7 @@ using namespace qv::platform;
 
 QV_MODULE_DEFINE_ABI;
 
-QV_MODULE_EXPORT ExportService* qvOpenExports(const ModuleHost& host) {
-  logThroughHost(host);
+QV_MODULE_EXPORT ExportService* qvOpenExports() {
   static auto* const exports = new ffmpeg::FFmpegExportService;
   return exports;
 }

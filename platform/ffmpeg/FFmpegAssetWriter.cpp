@@ -3,9 +3,9 @@
 #include <malloc.h>
 #include <pthread.h>
 
-#include "platform/Executor.h"
-#include "platform/Log.h"
 #include "platform/ffmpeg/MovieEncoder.h"
+#include "platform/threads/Executor.h"
+#include "platform/threads/Log.h"
 
 namespace qv::platform::ffmpeg {
 

@@ -1,8 +1,8 @@
 #include "platform/ffmpeg/FFmpegExportSession.h"
 
 #include "platform/AssetWriter.h"
-#include "platform/Executor.h"
-#include "platform/Log.h"
+#include "platform/threads/Executor.h"
+#include "platform/threads/Log.h"
 
 namespace qv::platform::ffmpeg {
 

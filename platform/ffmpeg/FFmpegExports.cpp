@@ -1,6 +1,6 @@
 #include "platform/ffmpeg/FFmpegExportSession.h"
+#include "platform/ffmpeg/FFmpegLog.h"
 #include "platform/ffmpeg/FFmpegMovies.h"
-#include "platform/ffmpeg/LibraryLog.h"
 
 namespace qv::platform::ffmpeg {
 

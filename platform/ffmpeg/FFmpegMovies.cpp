@@ -7,8 +7,8 @@
 #include <filesystem>
 
 #include "platform/ffmpeg/FFmpegAssetWriter.h"
+#include "platform/ffmpeg/FFmpegLog.h"
 #include "platform/ffmpeg/FFmpegWriterInput.h"
-#include "platform/ffmpeg/LibraryLog.h"
 #include "platform/ffmpeg/VideoEncoderChoice.h"
 
 namespace qv::platform::ffmpeg {

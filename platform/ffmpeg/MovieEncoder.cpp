@@ -4,9 +4,9 @@
 #include <cinttypes>
 #include <future>
 
-#include "platform/Executor.h"
-#include "platform/Log.h"
 #include "platform/mp4/MovieWriter.h"
+#include "platform/threads/Executor.h"
+#include "platform/threads/Log.h"
 
 namespace qv::platform::ffmpeg {
 namespace {

@@ -2,19 +2,18 @@
 
 #include <utility>
 
-#include "platform/Executor.h"
-#include "platform/Log.h"
 #include "platform/ffmpeg/MoviesModule.h"
+#include "platform/threads/Executor.h"
+#include "platform/threads/Log.h"
 
 namespace qv::platform::ffmpeg {
 namespace {
 
 /// The service that the module's entry opens.
 template <typename Open>
-auto openModule(const std::filesystem::path& path, const char* entry)
-    -> Result<decltype(std::declval<Open>()(std::declval<const ModuleHost&>()))> {
+auto openModule(const std::filesystem::path& path, const char* entry) -> Result<decltype(std::declval<Open>()())> {
   const auto open = entryOfModule(path, entry);
-  if (open) return reinterpret_cast<Open>(open.value())(moduleHost());
+  if (open) return reinterpret_cast<Open>(open.value())();
   QV_LOG_ERROR(logs::kMovie, "movie module: %s", open.error().description().c_str());
   return open.error();
 }

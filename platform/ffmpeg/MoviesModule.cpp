@@ -6,8 +6,7 @@ using namespace qv::platform;
 
 QV_MODULE_DEFINE_ABI;
 
-QV_MODULE_EXPORT AssetWriterService* qvOpenMovies(const ModuleHost& host) {
-  logThroughHost(host);
+QV_MODULE_EXPORT AssetWriterService* qvOpenMovies() {
   static auto* const assetWriters = new ffmpeg::FFmpegAssetWriterService;
   return assetWriters;
 }

@@ -2,7 +2,7 @@
 
 #include "platform/AssetWriter.h"
 #include "platform/ExportSession.h"
-#include "platform/LateModule.h"
+#include "platform/process/LateModule.h"
 
 namespace qv::platform::ffmpeg {
 
@@ -13,8 +13,8 @@ inline constexpr const char kExportsModule[] = "quorveld-exports.so";
 
 /// The modules' entries. The services live as long as the process.
 inline constexpr const char kMoviesModuleEntry[] = "qvOpenMovies";
-using OpenMovies = AssetWriterService* (*)(const ModuleHost&);
+using OpenMovies = AssetWriterService* (*)();
 inline constexpr const char kExportsModuleEntry[] = "qvOpenExports";
-using OpenExports = ExportService* (*)(const ModuleHost&);
+using OpenExports = ExportService* (*)();
 
 }  // namespace qv::platform::ffmpeg

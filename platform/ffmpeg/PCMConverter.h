@@ -5,7 +5,7 @@
 #include <span>
 #include <vector>
 
-#include "platform/SampleBuffer.h"
+#include "platform/base/SampleBuffer.h"
 #include "platform/ffmpeg/FFmpegHandles.h"
 
 namespace qv::platform::ffmpeg {

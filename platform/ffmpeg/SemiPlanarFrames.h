@@ -3,7 +3,7 @@
 #include <memory>
 #include <vector>
 
-#include "platform/Result.h"
+#include "platform/base/Result.h"
 #include "platform/ffmpeg/FFmpegHandles.h"
 
 namespace qv::platform::ffmpeg {

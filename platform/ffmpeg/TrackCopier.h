@@ -5,7 +5,7 @@
 #include <optional>
 #include <vector>
 
-#include "platform/Result.h"
+#include "platform/base/Result.h"
 #include "platform/ffmpeg/MovieReader.h"
 #include "platform/mp4/MovieTrack.h"
 

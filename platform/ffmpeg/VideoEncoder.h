@@ -4,9 +4,9 @@
 #include <memory>
 #include <vector>
 
-#include "platform/Geometry.h"
-#include "platform/Result.h"
-#include "platform/SharedFrame.h"
+#include "platform/base/Geometry.h"
+#include "platform/base/Result.h"
+#include "platform/base/SharedFrame.h"
 #include "platform/ffmpeg/ColorConversion.h"
 #include "platform/ffmpeg/H264Codec.h"
 #include "platform/mp4/MovieTrack.h"

@@ -5,8 +5,8 @@
 #include <condition_variable>
 #include <mutex>
 
-#include "platform/Executor.h"
-#include "platform/Log.h"
+#include "platform/threads/Executor.h"
+#include "platform/threads/Log.h"
 
 namespace qv::platform::ffmpeg {
 namespace {

@@ -4,7 +4,7 @@
 #include <string>
 
 #include "platform/AssetWriter.h"
-#include "platform/Log.h"
+#include "platform/threads/Log.h"
 
 namespace qv::platform::ffmpeg {
 namespace {

@@ -2,7 +2,7 @@
 
 #include <cstdint>
 
-#include "platform/Value.h"
+#include "platform/base/Value.h"
 
 namespace qv::platform::ffmpeg {
 

@@ -5,8 +5,8 @@
 #include <string_view>
 #include <utility>
 
-#include "platform/Executor.h"
-#include "platform/Log.h"
+#include "platform/threads/Executor.h"
+#include "platform/threads/Log.h"
 
 namespace qv::platform {
 namespace {

@@ -6,7 +6,7 @@
 #include <utility>
 #include <vector>
 
-#include "platform/SerialQueue.h"
+#include "platform/threads/SerialQueue.h"
 
 namespace qv::platform {
 namespace {

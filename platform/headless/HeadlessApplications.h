@@ -3,6 +3,7 @@
 #include <memory>
 
 #include "platform/Applications.h"
+#include "platform/RenderServer.h"
 
 namespace qv::platform {
 

@@ -1,7 +1,7 @@
 #include "platform/headless/HeadlessPlatform.h"
 
-#include "platform/Log.h"
 #include "platform/headless/TestSignal.h"
+#include "platform/threads/Log.h"
 
 namespace qv::platform {
 namespace {

@@ -1,11 +1,12 @@
 #pragma once
 
-#include "platform/PacedDeviceCapture.h"
-#include "platform/PacedTapQueue.h"
+#include "platform/ScreenReader.h"
 #include "platform/Sounds.h"
 #include "platform/headless/HeadlessAlerts.h"
 #include "platform/headless/HeadlessApplications.h"
 #include "platform/headless/HeadlessScreen.h"
+#include "platform/sound/PacedDeviceCapture.h"
+#include "platform/sound/PacedTapQueue.h"
 
 namespace qv::platform {
 

@@ -5,10 +5,10 @@
 #include <condition_variable>
 #include <mutex>
 
-#include "platform/Clock.h"
-#include "platform/Log.h"
-#include "platform/PacedThread.h"
 #include "platform/headless/TestPattern.h"
+#include "platform/threads/Clock.h"
+#include "platform/threads/Log.h"
+#include "platform/threads/PacedThread.h"
 
 namespace qv::platform {
 namespace {

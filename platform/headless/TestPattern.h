@@ -2,7 +2,7 @@
 
 #include <unordered_map>
 
-#include "platform/SharedFrame.h"
+#include "platform/base/SharedFrame.h"
 
 namespace qv::platform {
 

@@ -7,8 +7,8 @@
 #include <system_error>
 #include <utility>
 
-#include "platform/Log.h"
 #include "platform/linux/DirectoryBundle.h"
+#include "platform/threads/Log.h"
 
 namespace qv::platform {
 namespace {

@@ -8,7 +8,8 @@
 #include <vector>
 
 #include "platform/Bundles.h"
-#include "platform/RareLog.h"
+#include "platform/Localization.h"
+#include "platform/threads/RareLog.h"
 
 namespace qv::platform {
 

@@ -2,8 +2,8 @@
 
 #include <cerrno>
 
-#include "platform/Log.h"
 #include "platform/linux/Json.h"
+#include "platform/threads/Log.h"
 
 namespace qv::platform {
 namespace {

@@ -3,7 +3,8 @@
 #include <mutex>
 #include <string>
 
-#include "platform/SystemServices.h"
+#include "platform/DeviceInfo.h"
+#include "platform/base/Value.h"
 
 namespace qv::platform {
 

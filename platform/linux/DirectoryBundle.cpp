@@ -10,8 +10,8 @@
 #include <memory>
 #include <system_error>
 
-#include "platform/Log.h"
 #include "platform/linux/Json.h"
+#include "platform/threads/Log.h"
 
 namespace qv::platform {
 namespace {

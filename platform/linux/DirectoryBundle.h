@@ -4,6 +4,7 @@
 #include <vector>
 
 #include "platform/Bundles.h"
+#include "platform/Localization.h"
 
 namespace qv::platform {
 

@@ -6,10 +6,10 @@
 
 #include <cerrno>
 
-#include "platform/FileDescriptor.h"
-#include "platform/Log.h"
+#include "platform/base/FileDescriptor.h"
 #include "platform/linux/Json.h"
 #include "platform/linux/SmallFile.h"
+#include "platform/threads/Log.h"
 
 namespace qv::platform {
 namespace {

@@ -8,9 +8,9 @@
 #include <string>
 
 #include "platform/Extensions.h"
-#include "platform/Guarded.h"
-#include "platform/Timer.h"
 #include "platform/linux/ExtensionLaunch.h"
+#include "platform/threads/Guarded.h"
+#include "platform/threads/Timer.h"
 
 namespace qv::platform {
 

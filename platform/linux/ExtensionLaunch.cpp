@@ -12,6 +12,7 @@
 #include <utility>
 
 #include "platform/linux/SmallFile.h"
+#include "protocol/ExtensionRequests.h"
 
 namespace qv::platform {
 namespace {

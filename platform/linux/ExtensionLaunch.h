@@ -3,8 +3,8 @@
 #include <string>
 
 #include "platform/Extensions.h"
-#include "platform/Result.h"
-#include "platform/SpawnedProcess.h"
+#include "platform/base/Result.h"
+#include "platform/process/SpawnedProcess.h"
 
 namespace qv::platform {
 

@@ -11,8 +11,8 @@
 #include <string_view>
 #include <utility>
 
-#include "platform/Log.h"
 #include "platform/linux/SmallFile.h"
+#include "platform/threads/Log.h"
 
 namespace qv::platform {
 namespace {

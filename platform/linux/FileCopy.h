@@ -4,8 +4,8 @@
 #include <optional>
 #include <string>
 
-#include "platform/FileDescriptor.h"
-#include "platform/Result.h"
+#include "platform/base/FileDescriptor.h"
+#include "platform/base/Result.h"
 
 namespace qv::platform {
 

@@ -6,9 +6,9 @@
 #include <system_error>
 #include <utility>
 
-#include "platform/Log.h"
 #include "platform/linux/FileCopy.h"
 #include "platform/linux/SmallFile.h"
+#include "platform/threads/Log.h"
 
 namespace qv::platform {
 namespace {

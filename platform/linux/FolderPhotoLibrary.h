@@ -3,8 +3,8 @@
 #include <memory>
 #include <string>
 
-#include "platform/Executor.h"
-#include "platform/SystemServices.h"
+#include "platform/PhotoLibrary.h"
+#include "platform/threads/Executor.h"
 
 namespace qv::platform {
 

@@ -10,9 +10,9 @@
 #include <optional>
 #include <string>
 
-#include "platform/Executor.h"
-#include "platform/SystemServices.h"
-#include "platform/Timer.h"
+#include "platform/PurgeableSpace.h"
+#include "platform/threads/Executor.h"
+#include "platform/threads/Timer.h"
 
 namespace qv::platform {
 

@@ -4,7 +4,8 @@
 #include <string>
 
 #include "platform/Bundles.h"
-#include "platform/SystemServices.h"
+#include "platform/Localization.h"
+#include "platform/Preferences.h"
 
 namespace qv::platform {
 

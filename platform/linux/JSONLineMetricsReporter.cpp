@@ -7,7 +7,7 @@
 #include <cerrno>
 #include <cstdio>
 
-#include "platform/FileDescriptor.h"
+#include "platform/base/FileDescriptor.h"
 #include "platform/linux/Json.h"
 #include "platform/linux/SmallFile.h"
 

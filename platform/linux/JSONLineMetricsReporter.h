@@ -3,8 +3,8 @@
 #include <mutex>
 #include <string>
 
-#include "platform/Clock.h"
-#include "platform/SystemServices.h"
+#include "platform/Metrics.h"
+#include "platform/threads/Clock.h"
 
 namespace qv::platform {
 

@@ -2,9 +2,9 @@
 
 #include <cerrno>
 
-#include "platform/Log.h"
 #include "platform/linux/Json.h"
 #include "platform/linux/SmallFile.h"
+#include "platform/threads/Log.h"
 
 namespace qv::platform {
 

@@ -2,7 +2,7 @@
 
 #include <string>
 
-#include "platform/SystemServices.h"
+#include "platform/Preferences.h"
 
 namespace qv::platform {
 

@@ -3,8 +3,8 @@
 #include <string>
 #include <string_view>
 
-#include "platform/Result.h"
-#include "platform/Value.h"
+#include "platform/base/Result.h"
+#include "platform/base/Value.h"
 
 namespace qv::platform {
 

@@ -8,7 +8,7 @@
 #include <optional>
 #include <thread>
 
-#include "platform/SpawnedProcess.h"
+#include "platform/process/SpawnedProcess.h"
 
 namespace qv::platform {
 

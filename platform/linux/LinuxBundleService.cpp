@@ -8,8 +8,8 @@
 #include <filesystem>
 #include <system_error>
 
-#include "platform/Log.h"
 #include "platform/linux/DirectoryBundle.h"
+#include "platform/threads/Log.h"
 
 namespace qv::platform {
 namespace {

@@ -3,9 +3,9 @@
 #include <set>
 #include <utility>
 
-#include "platform/Log.h"
 #include "platform/linux/ExtensionManifest.h"
 #include "platform/linux/LinuxExtensionUse.h"
+#include "platform/threads/Log.h"
 
 namespace qv::platform {
 namespace {

@@ -38,20 +38,19 @@ void ExtensionProcesses::begin(ExtensionRequestID request, std::vector<Extension
   }
 }
 
-ExtensionProcess& ExtensionProcesses::processForRequests() {
+LinuxExtensionProcess& ExtensionProcesses::processForRequests() {
   if (all_.empty() || all_.back()->isEnding()) {
-    all_.push_back(ExtensionProcess::create(host_.lock(), tokens, queue, extension_,
-                                            // Not within its own call.
-                                            [queue = queue, weak = weak_from_this()](ExtensionProcess* ended) {
-                                              queue->async(weak, [ended](ExtensionProcesses& processes) {
-                                                processes.processEnded(ended);
-                                              });
-                                            }));
+    all_.push_back(LinuxExtensionProcess::create(
+        host_.lock(), tokens, queue, extension_,
+        // Not within its own call.
+        [queue = queue, weak = weak_from_this()](LinuxExtensionProcess* ended) {
+          queue->async(weak, [ended](ExtensionProcesses& processes) { processes.processEnded(ended); });
+        }));
   }
   return *all_.back();
 }
 
-void ExtensionProcesses::processEnded(const ExtensionProcess* ended) {
+void ExtensionProcesses::processEnded(const LinuxExtensionProcess* ended) {
   std::erase_if(all_, [&](const auto& process) { return process.get() == ended; });
   leaveWhenDead();
 }

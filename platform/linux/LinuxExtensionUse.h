@@ -3,7 +3,7 @@
 #include <memory>
 #include <vector>
 
-#include "platform/linux/ExtensionProcess.h"
+#include "platform/linux/LinuxExtensionProcess.h"
 
 namespace qv::platform {
 
@@ -27,15 +27,15 @@ class ExtensionProcesses : public std::enable_shared_from_this<ExtensionProcesse
 
  private:
   ExtensionProcesses(const std::shared_ptr<ExtensionHost>& host, ExtensionRecordRef extension);
-  ExtensionProcess& processForRequests();
-  void processEnded(const ExtensionProcess* ended);
+  LinuxExtensionProcess& processForRequests();
+  void processEnded(const LinuxExtensionProcess* ended);
   void leaveWhenDead();
 
   const std::weak_ptr<ExtensionHost> host_;  ///< which keeps this
   const ExtensionRecordRef extension_;
   bool isBeyondBound_ = false;
   bool hasEnded_ = false;
-  std::vector<std::shared_ptr<ExtensionProcess>> all_;
+  std::vector<std::shared_ptr<LinuxExtensionProcess>> all_;
 };
 
 /// Threading: as ExtensionUse.

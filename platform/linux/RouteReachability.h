@@ -4,8 +4,8 @@
 #include <memory>
 #include <string>
 
-#include "platform/Executor.h"
 #include "platform/NetworkReachability.h"
+#include "platform/threads/Executor.h"
 
 namespace qv::platform {
 

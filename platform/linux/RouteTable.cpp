@@ -9,8 +9,8 @@
 #include <cstring>
 #include <optional>
 
-#include "platform/FileDescriptor.h"
 #include "platform/NetworkReachability.h"
+#include "platform/base/FileDescriptor.h"
 
 namespace qv::platform {
 namespace {

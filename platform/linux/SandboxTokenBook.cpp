@@ -7,7 +7,7 @@
 #include <array>
 #include <utility>
 
-#include "platform/Log.h"
+#include "platform/threads/Log.h"
 
 namespace qv::platform {
 namespace {

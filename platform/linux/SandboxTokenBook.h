@@ -6,7 +6,7 @@
 #include <vector>
 
 #include "platform/Extensions.h"
-#include "platform/Guarded.h"
+#include "platform/threads/Guarded.h"
 
 namespace qv::platform {
 

@@ -5,8 +5,8 @@
 #include <string>
 #include <string_view>
 
-#include "platform/FileDescriptor.h"
-#include "platform/Result.h"
+#include "platform/base/FileDescriptor.h"
+#include "platform/base/Result.h"
 
 namespace qv::platform {
 

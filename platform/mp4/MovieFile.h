@@ -6,9 +6,9 @@
 #include <span>
 #include <string>
 
-#include "platform/Error.h"
-#include "platform/FileDescriptor.h"
-#include "platform/Result.h"
+#include "platform/base/Error.h"
+#include "platform/base/FileDescriptor.h"
+#include "platform/base/Result.h"
 
 namespace qv::platform::mp4 {
 

@@ -3,7 +3,7 @@
 #include <cstdint>
 #include <vector>
 
-#include "platform/Result.h"
+#include "platform/base/Result.h"
 #include "platform/mp4/FileBoxes.h"
 #include "platform/mp4/MovieTrack.h"
 #include "platform/mp4/TrackIndex.h"

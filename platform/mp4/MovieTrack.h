@@ -5,7 +5,7 @@
 #include <span>
 #include <vector>
 
-#include "platform/Geometry.h"
+#include "platform/base/Geometry.h"
 
 namespace qv::platform::mp4 {
 

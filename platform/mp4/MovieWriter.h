@@ -5,7 +5,7 @@
 #include <optional>
 #include <vector>
 
-#include "platform/Error.h"
+#include "platform/base/Error.h"
 #include "platform/mp4/MovieFile.h"
 #include "platform/mp4/MovieTrack.h"
 #include "platform/mp4/TrackIndex.h"

@@ -1,6 +1,6 @@
 #include "platform/pulse/PulseConnection.h"
 
-#include "platform/Log.h"
+#include "platform/threads/Log.h"
 
 namespace qv::platform {
 namespace {

@@ -1,7 +1,7 @@
 #include "platform/pulse/PulseMicrophone.h"
 
-#include "platform/Log.h"
 #include "platform/pulse/PulseTapSource.h"
+#include "platform/threads/Log.h"
 
 namespace qv::platform {
 

@@ -1,8 +1,8 @@
 #pragma once
 
-#include "platform/PCMSource.h"
 #include "platform/pulse/PulseConnection.h"
 #include "platform/pulse/PulseTrack.h"
+#include "platform/sound/PCMSource.h"
 
 namespace qv::platform {
 

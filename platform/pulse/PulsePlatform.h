@@ -3,10 +3,11 @@
 #include <memory>
 #include <string>
 
-#include "platform/PacedDeviceCapture.h"
-#include "platform/PacedTapQueue.h"
-#include "platform/Result.h"
+#include "platform/ScreenReader.h"
 #include "platform/Sounds.h"
+#include "platform/base/Result.h"
+#include "platform/sound/PacedDeviceCapture.h"
+#include "platform/sound/PacedTapQueue.h"
 
 namespace qv::platform {
 

@@ -4,9 +4,9 @@
 #include <numbers>
 #include <vector>
 
-#include "platform/Executor.h"
-#include "platform/Log.h"
 #include "platform/pulse/PulseSession.h"
+#include "platform/threads/Executor.h"
+#include "platform/threads/Log.h"
 
 namespace qv::platform {
 namespace {

@@ -4,7 +4,7 @@
 #include <fstream>
 #include <string>
 
-#include "platform/Log.h"
+#include "platform/threads/Log.h"
 
 namespace qv::platform {
 namespace {

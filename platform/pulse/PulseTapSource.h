@@ -4,9 +4,9 @@
 
 #include <map>
 
-#include "platform/PCMSource.h"
 #include "platform/pulse/PulseConnection.h"
 #include "platform/pulse/PulseTrack.h"
+#include "platform/sound/PCMSource.h"
 
 namespace qv::platform {
 

@@ -5,7 +5,7 @@
 #include <algorithm>
 #include <cstdlib>
 
-#include "platform/Log.h"
+#include "platform/threads/Log.h"
 
 namespace qv::platform {
 namespace {

@@ -1,7 +1,7 @@
-#include "platform/Log.h"
+#include "platform/sdbus/BusErrors.h"
 #include "platform/sdbus/BusLink.h"
-#include "platform/sdbus/Errors.h"
 #include "platform/sdbus/IPCContext.h"
+#include "platform/threads/Log.h"
 
 namespace qv::platform::sdbus {
 

@@ -1,10 +1,10 @@
 #include <cerrno>
 #include <cstring>
 
-#include "platform/Log.h"
+#include "platform/sdbus/BusErrors.h"
 #include "platform/sdbus/BusLink.h"
-#include "platform/sdbus/Errors.h"
 #include "platform/sdbus/IPCContext.h"
+#include "platform/threads/Log.h"
 
 namespace qv::platform::sdbus {
 namespace {

@@ -9,7 +9,7 @@
 #include <csignal>
 #include <cstring>
 
-#include "platform/Log.h"
+#include "platform/threads/Log.h"
 
 namespace qv::platform::sdbus {
 

@@ -8,7 +8,7 @@
 #include <mutex>
 #include <thread>
 
-#include "platform/FileDescriptor.h"
+#include "platform/base/FileDescriptor.h"
 
 namespace qv::platform::sdbus {
 

@@ -2,8 +2,8 @@
 
 #include <utility>
 
-#include "platform/Log.h"
 #include "platform/sdbus/LogindLink.h"
+#include "platform/threads/Log.h"
 
 namespace qv::platform {
 

@@ -6,6 +6,7 @@
 #include <string>
 
 #include "platform/IPC.h"
+#include "platform/KeepAlive.h"
 #include "platform/SuspendMonitor.h"
 
 namespace qv::platform {

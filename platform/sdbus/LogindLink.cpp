@@ -9,7 +9,7 @@
 #include <ctime>
 #include <utility>
 
-#include "platform/Log.h"
+#include "platform/threads/Log.h"
 
 namespace qv::platform::sdbus {
 namespace {

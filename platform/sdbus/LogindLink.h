@@ -5,8 +5,8 @@
 #include <mutex>
 #include <string>
 
-#include "platform/FileDescriptor.h"
 #include "platform/SuspendMonitor.h"
+#include "platform/base/FileDescriptor.h"
 #include "platform/sdbus/Handles.h"
 #include "platform/sdbus/IOThread.h"
 

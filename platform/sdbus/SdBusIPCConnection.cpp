@@ -2,7 +2,7 @@
 
 #include <utility>
 
-#include "platform/sdbus/Errors.h"
+#include "platform/sdbus/BusErrors.h"
 
 namespace qv::platform::sdbus {
 

@@ -8,9 +8,9 @@
 #include <cstring>
 #include <utility>
 
-#include "platform/Log.h"
 #include "platform/sdbus/SdBusIPCConnection.h"
 #include "platform/sdbus/Sockets.h"
+#include "platform/threads/Log.h"
 
 namespace qv::platform::sdbus {
 namespace {

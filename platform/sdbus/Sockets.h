@@ -4,9 +4,9 @@
 #include <string>
 #include <utility>
 
-#include "platform/FileDescriptor.h"
 #include "platform/IPC.h"
-#include "platform/Result.h"
+#include "platform/base/FileDescriptor.h"
+#include "platform/base/Result.h"
 
 namespace qv::platform::sdbus {
 

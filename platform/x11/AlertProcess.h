@@ -5,8 +5,8 @@
 #include <utility>
 #include <vector>
 
-#include "platform/SpawnedProcess.h"
 #include "platform/UserAlert.h"
+#include "platform/process/SpawnedProcess.h"
 
 namespace qv::platform {
 

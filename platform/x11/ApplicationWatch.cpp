@@ -6,7 +6,7 @@
 #include <algorithm>
 
 #include "platform/Applications.h"
-#include "platform/Log.h"
+#include "platform/threads/Log.h"
 
 namespace qv::platform {
 namespace {

@@ -6,8 +6,8 @@
 #include <memory>
 #include <string>
 
-#include "platform/FileDescriptor.h"
-#include "platform/Value.h"
+#include "platform/base/FileDescriptor.h"
+#include "platform/base/Value.h"
 #include "platform/x11/Desktop.h"
 
 namespace qv::platform {

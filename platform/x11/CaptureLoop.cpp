@@ -7,7 +7,7 @@
 #include <algorithm>
 #include <ctime>
 
-#include "platform/Log.h"
+#include "platform/threads/Log.h"
 #include "platform/x11/CloneSource.h"
 #include "platform/x11/ScreenSource.h"
 

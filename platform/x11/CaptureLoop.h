@@ -4,8 +4,8 @@
 #include <functional>
 #include <set>
 
-#include "platform/Clock.h"
 #include "platform/ScreenCapture.h"
+#include "platform/threads/Clock.h"
 #include "platform/x11/CaptureSource.h"
 #include "platform/x11/PointerOverlay.h"
 

@@ -5,7 +5,7 @@
 #include <map>
 #include <optional>
 
-#include "platform/SharedFrame.h"
+#include "platform/base/SharedFrame.h"
 #include "platform/x11/XcbConnection.h"
 
 namespace qv::platform {

@@ -2,7 +2,7 @@
 
 #include <xcb/res.h>
 
-#include "platform/Log.h"
+#include "platform/threads/Log.h"
 
 namespace qv::platform {
 namespace {

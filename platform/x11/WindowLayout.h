@@ -4,7 +4,7 @@
 #include <string>
 #include <vector>
 
-#include "platform/SystemServices.h"
+#include "platform/DisplayLayout.h"
 
 namespace qv::platform {
 

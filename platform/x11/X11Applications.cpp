@@ -7,7 +7,7 @@
 #include <mutex>
 #include <thread>
 
-#include "platform/SerialQueue.h"
+#include "platform/threads/SerialQueue.h"
 #include "platform/x11/ApplicationWatch.h"
 
 namespace qv::platform {

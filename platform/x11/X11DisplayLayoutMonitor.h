@@ -8,7 +8,7 @@
 #include <thread>
 #include <vector>
 
-#include "platform/FileDescriptor.h"
+#include "platform/base/FileDescriptor.h"
 #include "platform/x11/ShownWindows.h"
 
 namespace qv::platform {

@@ -8,11 +8,12 @@
 #include <string>
 
 #include "platform/Applications.h"
-#include "platform/Clock.h"
-#include "platform/Result.h"
+#include "platform/DisplayLayout.h"
+#include "platform/RenderServer.h"
 #include "platform/ScreenCapture.h"
-#include "platform/SystemServices.h"
 #include "platform/UserAlert.h"
+#include "platform/base/Result.h"
+#include "platform/threads/Clock.h"
 
 namespace qv::platform {
 

@@ -1,6 +1,7 @@
 #pragma once
 
 #include "platform/Applications.h"
+#include "platform/RenderServer.h"
 #include "platform/x11/QueryConnection.h"
 
 namespace qv::platform {

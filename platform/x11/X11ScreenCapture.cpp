@@ -6,7 +6,7 @@
 #include <cmath>
 #include <thread>
 
-#include "platform/Log.h"
+#include "platform/threads/Log.h"
 #include "platform/x11/CaptureGate.h"
 #include "platform/x11/CaptureLoop.h"
 

@@ -7,7 +7,7 @@
 #include <optional>
 #include <thread>
 
-#include "platform/Log.h"
+#include "platform/threads/Log.h"
 #include "platform/x11/AlertFocus.h"
 #include "platform/x11/AlertProcess.h"
 

@@ -7,7 +7,7 @@
 #include <memory>
 #include <string>
 
-#include "platform/Result.h"
+#include "platform/base/Result.h"
 
 namespace qv::platform {
 

@@ -7,7 +7,7 @@
 #include <memory>
 #include <mutex>
 
-#include "platform/SerialQueue.h"
+#include "platform/threads/SerialQueue.h"
 
 namespace qv::client {
 

@@ -3,10 +3,10 @@
 #include <algorithm>
 #include <utility>
 
-#include "daemon/client/QVClientProtocol.h"
-#include "daemon/client/QVDaemonProtocol.h"
-#include "platform/Log.h"
-#include "sdk/client/Errors.h"
+#include "platform/threads/Log.h"
+#include "protocol/QVClientProtocol.h"
+#include "protocol/QVDaemonProtocol.h"
+#include "sdk/client/RecordingErrors.h"
 
 namespace qv::client {
 

@@ -8,8 +8,8 @@
 #include <string_view>
 
 #include "platform/IPC.h"
-#include "platform/SerialQueue.h"
-#include "platform/Timer.h"
+#include "platform/threads/SerialQueue.h"
+#include "platform/threads/Timer.h"
 #include "sdk/client/quorvel/Recorder.h"
 
 namespace qv::client {

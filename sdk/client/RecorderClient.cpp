@@ -2,9 +2,9 @@
 
 #include <utility>
 
-#include "platform/Value.h"
-#include "sdk/client/Errors.h"
+#include "platform/base/Value.h"
 #include "sdk/client/RecorderSession.h"
+#include "sdk/client/RecordingErrors.h"
 #include "sdk/client/WireValues.h"
 
 namespace quorvel {

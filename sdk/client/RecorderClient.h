@@ -3,7 +3,7 @@
 #include <memory>
 
 #include "platform/IPC.h"
-#include "platform/Timer.h"
+#include "platform/threads/Timer.h"
 #include "sdk/client/CallbackGate.h"
 #include "sdk/client/quorvel/Recorder.h"
 

@@ -2,7 +2,7 @@
 
 #include <utility>
 
-#include "sdk/client/Errors.h"
+#include "sdk/client/RecordingErrors.h"
 #include "sdk/client/WireValues.h"
 #include "sdk/common/SampleCoding.h"
 

@@ -2,7 +2,7 @@
 
 #include <fcntl.h>
 
-#include "sdk/client/Errors.h"
+#include "sdk/client/RecordingErrors.h"
 #include "sdk/common/SampleCoding.h"
 
 namespace qv::client {

@@ -1,9 +1,9 @@
 #include <memory>
 #include <mutex>
 
-#include "platform/Executor.h"
-#include "platform/Timer.h"
 #include "platform/sdbus/SdBusIPC.h"
+#include "platform/threads/Executor.h"
+#include "platform/threads/Timer.h"
 #include "sdk/client/RecorderClient.h"
 
 namespace quorvel {

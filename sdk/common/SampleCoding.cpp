@@ -3,8 +3,8 @@
 #include <cstring>
 #include <type_traits>
 
-#include "extensions/QVSharedFrameObject.h"
-#include "platform/SampleBuffer.h"
+#include "platform/base/SampleBuffer.h"
+#include "protocol/QVSharedFrameObject.h"
 
 namespace qv::sdk {
 

@@ -2,7 +2,7 @@
 
 #include <optional>
 
-#include "platform/Value.h"
+#include "platform/base/Value.h"
 #include "sdk/common/quorvel/Types.h"
 
 namespace qv::sdk {

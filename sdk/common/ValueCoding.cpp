@@ -2,7 +2,7 @@
 
 #include <type_traits>
 
-#include "extensions/QVBroadcastConfiguration.h"
+#include "protocol/QVBroadcastConfiguration.h"
 
 namespace qv::sdk {
 

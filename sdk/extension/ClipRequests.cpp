@@ -3,8 +3,8 @@
 #include <atomic>
 #include <utility>
 
-#include "extensions/QVBroadcastProtocols.h"
-#include "platform/Log.h"
+#include "platform/threads/Log.h"
+#include "protocol/QVBroadcastProtocols.h"
 #include "sdk/common/ValueCoding.h"
 
 namespace quorvel {

@@ -5,8 +5,8 @@
 #include <vector>
 
 #include "platform/Extensions.h"
-#include "platform/Result.h"
-#include "platform/SerialQueue.h"
+#include "platform/base/Result.h"
+#include "platform/threads/SerialQueue.h"
 #include "sdk/extension/quorvel/BroadcastExtension.h"
 
 namespace qv::extension {

@@ -2,8 +2,8 @@
 
 #include <utility>
 
-#include "extensions/QVBroadcastProtocols.h"
-#include "platform/Log.h"
+#include "platform/threads/Log.h"
+#include "protocol/QVBroadcastProtocols.h"
 #include "sdk/common/SampleCoding.h"
 #include "sdk/common/ValueCoding.h"
 

@@ -2,9 +2,9 @@
 #include <cstdio>
 #include <cstdlib>
 
-#include "platform/Log.h"
 #include "platform/sdbus/SdBusIPC.h"
-#include "sdk/extension/ExtensionProcess.h"
+#include "platform/threads/Log.h"
+#include "sdk/extension/ExtensionRuntime.h"
 #include "sdk/extension/ListenerBroadcasts.h"
 
 namespace quorvel {
@@ -15,8 +15,8 @@ using namespace std::chrono_literals;
 
 constexpr auto kLongestFarewell = 5s;
 
-int run(qv::extension::ExtensionProcess::Factory make) {
-  const auto endpoints = qv::extension::ExtensionProcess::inheritedEndpoints();
+int run(qv::extension::ExtensionRuntime::Factory make) {
+  const auto endpoints = qv::extension::ExtensionRuntime::inheritedEndpoints();
   if (!endpoints.requests.isValid() || !endpoints.auxiliary.isValid()) {
     std::fprintf(stderr, "a broadcast extension is launched by the recording daemon only\n");
     return 2;
@@ -24,7 +24,7 @@ int run(qv::extension::ExtensionProcess::Factory make) {
   // A server that closes its socket is an error of the write, not the end of the process.
   std::signal(SIGPIPE, SIG_IGN);
   qv::platform::SdBusIPCService ipc;
-  const auto process = qv::extension::ExtensionProcess::create(ipc, std::move(make));
+  const auto process = qv::extension::ExtensionRuntime::create(ipc, std::move(make));
   if (const auto error = process->start(endpoints)) {
     std::fprintf(stderr, "no connection to the recording daemon: %s\n", error->description().c_str());
     return 1;

@@ -1,7 +1,7 @@
 #pragma once
 
 #include "extensions/AnswerDeadline.h"
-#include "extensions/QVBroadcastProtocols.h"
+#include "protocol/QVBroadcastProtocols.h"
 #include "tests/daemon/DaemonTest.h"
 
 namespace qv {

@@ -5,8 +5,8 @@
 #include <vector>
 
 #include "daemon/QVRecordingManager.h"
-#include "daemon/client/QVClientProtocol.h"
-#include "daemon/client/QVDaemonProtocol.h"
+#include "protocol/QVClientProtocol.h"
+#include "protocol/QVDaemonProtocol.h"
 #include "support/QuorvelErrors.h"
 #include "tests/fakes/FakeDevice.h"
 

@@ -1,6 +1,6 @@
 #include <algorithm>
 
-#include "extensions/QVBroadcastProtocols.h"
+#include "protocol/QVBroadcastProtocols.h"
 #include "tests/daemon/RandomDriver.h"
 
 namespace qv {

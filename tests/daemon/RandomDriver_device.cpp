@@ -1,4 +1,4 @@
-#include "extensions/QVBroadcastProtocols.h"
+#include "protocol/QVBroadcastProtocols.h"
 #include "tests/daemon/RandomDriver.h"
 
 namespace qv {

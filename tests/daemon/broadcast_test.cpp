@@ -1,6 +1,6 @@
 #include <cmath>
 
-#include "platform/KeyedArchive.h"
+#include "platform/base/KeyedArchive.h"
 #include "tests/daemon/BroadcastFixture.h"
 
 namespace qv {

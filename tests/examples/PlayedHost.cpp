@@ -22,15 +22,16 @@
 #include <sstream>
 #include <thread>
 
-#include "extensions/QVBroadcastConfiguration.h"
-#include "extensions/QVBroadcastProtocols.h"
-#include "extensions/QVSharedFrameObject.h"
-#include "platform/Clock.h"
 #include "platform/Extensions.h"
-#include "platform/RawRecord.h"
-#include "platform/SampleBuffer.h"
-#include "platform/SpawnedProcess.h"
+#include "platform/base/RawRecord.h"
+#include "platform/base/SampleBuffer.h"
+#include "platform/process/SpawnedProcess.h"
 #include "platform/sdbus/SdBusIPC.h"
+#include "platform/threads/Clock.h"
+#include "protocol/ExtensionRequests.h"
+#include "protocol/QVBroadcastConfiguration.h"
+#include "protocol/QVBroadcastProtocols.h"
+#include "protocol/QVSharedFrameObject.h"
 
 namespace {
 

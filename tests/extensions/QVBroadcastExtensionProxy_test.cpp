@@ -1,7 +1,7 @@
 #include "extensions/QVBroadcastExtensionProxy.h"
 
-#include "extensions/QVBroadcastProtocols.h"
-#include "platform/SharedFrameLease.h"
+#include "platform/threads/SharedFrameLease.h"
+#include "protocol/QVBroadcastProtocols.h"
 #include "support/QuorvelErrors.h"
 #include "tests/fakes/FakeDevice.h"
 

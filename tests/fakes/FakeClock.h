@@ -5,7 +5,7 @@
 #include <cstdint>
 #include <mutex>
 
-#include "platform/Clock.h"
+#include "platform/threads/Clock.h"
 
 namespace qv::fakes {
 

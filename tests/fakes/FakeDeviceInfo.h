@@ -5,7 +5,7 @@
 #include <string>
 #include <string_view>
 
-#include "platform/SystemServices.h"
+#include "platform/DeviceInfo.h"
 
 namespace qv::fakes {
 

@@ -7,8 +7,8 @@
 #include <utility>
 #include <vector>
 
-#include "extensions/QVBroadcastProtocols.h"
 #include "platform/Extensions.h"
+#include "protocol/QVBroadcastProtocols.h"
 #include "tests/fakes/FakeIPC.h"
 
 namespace qv::fakes {

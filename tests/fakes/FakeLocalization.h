@@ -9,6 +9,7 @@
 #include <vector>
 
 #include "platform/Bundles.h"
+#include "platform/Localization.h"
 
 namespace qv::fakes {
 

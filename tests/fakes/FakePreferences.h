@@ -5,7 +5,7 @@
 #include <string>
 #include <utility>
 
-#include "platform/SystemServices.h"
+#include "platform/Preferences.h"
 
 namespace qv::fakes {
 

@@ -11,9 +11,14 @@
 
 #include "platform/Applications.h"
 #include "platform/IPC.h"
+#include "platform/KeepAlive.h"
+#include "platform/Metrics.h"
+#include "platform/PhotoLibrary.h"
 #include "platform/Platform.h"
+#include "platform/PurgeableSpace.h"
+#include "platform/RenderServer.h"
+#include "platform/ScreenReader.h"
 #include "platform/Sounds.h"
-#include "platform/SystemServices.h"
 #include "platform/UserAlert.h"
 
 namespace qv::fakes {

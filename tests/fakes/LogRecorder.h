@@ -6,7 +6,7 @@
 #include <string_view>
 #include <vector>
 
-#include "platform/Log.h"
+#include "platform/threads/Log.h"
 
 namespace qv::fakes {
 

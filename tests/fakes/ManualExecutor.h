@@ -7,7 +7,7 @@
 #include <mutex>
 #include <utility>
 
-#include "platform/Executor.h"
+#include "platform/threads/Executor.h"
 
 namespace qv::fakes {
 

@@ -8,7 +8,7 @@
 #include <optional>
 #include <utility>
 
-#include "platform/Timer.h"
+#include "platform/threads/Timer.h"
 
 namespace qv::fakes {
 

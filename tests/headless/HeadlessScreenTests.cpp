@@ -5,9 +5,9 @@
 #include <thread>
 #include <vector>
 
-#include "platform/Clock.h"
 #include "platform/headless/HeadlessPlatform.h"
 #include "platform/headless/TestSignal.h"
+#include "platform/threads/Clock.h"
 
 namespace qv::platform {
 namespace {

@@ -7,9 +7,10 @@
 
 #include <cerrno>
 
-#include "platform/Executor.h"
 #include "platform/linux/ICULocalization.h"
 #include "platform/linux/JSONPreferenceStore.h"
+#include "platform/threads/Executor.h"
+#include "protocol/ExtensionRequests.h"
 #include "tests/fakes/LogRecorder.h"
 #include "tests/fakes/ManualTimers.h"
 #include "tests/linux/TemporaryRoot.h"

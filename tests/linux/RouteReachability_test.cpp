@@ -10,7 +10,7 @@
 
 #include <functional>
 
-#include "platform/FileDescriptor.h"
+#include "platform/base/FileDescriptor.h"
 #include "platform/linux/RouteTable.h"
 #include "tests/fakes/ManualExecutor.h"
 

@@ -15,9 +15,11 @@
 
 #include "platform/Extensions.h"
 #include "platform/sdbus/SdBusIPC.h"
+#include "protocol/ExtensionRequests.h"
 
 namespace {
 
+using namespace qv;
 using namespace qv::platform;
 
 std::string outcome(bool succeeded) { return succeeded ? "ok" : "errno " + std::to_string(errno); }

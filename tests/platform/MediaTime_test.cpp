@@ -1,4 +1,4 @@
-#include "platform/MediaTime.h"
+#include "platform/base/MediaTime.h"
 
 #include <gtest/gtest.h>
 

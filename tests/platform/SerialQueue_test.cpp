@@ -1,4 +1,4 @@
-#include "platform/SerialQueue.h"
+#include "platform/threads/SerialQueue.h"
 
 #include <gtest/gtest.h>
 

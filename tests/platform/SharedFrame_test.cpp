@@ -1,4 +1,4 @@
-#include "platform/SharedFrame.h"
+#include "platform/base/SharedFrame.h"
 
 #include <gtest/gtest.h>
 #include <sys/mman.h>
@@ -8,8 +8,8 @@
 #include <future>
 #include <memory>
 
-#include "platform/BufferQueue.h"
-#include "platform/SharedFrameLease.h"
+#include "platform/base/BufferQueue.h"
+#include "platform/threads/SharedFrameLease.h"
 
 namespace qv::platform {
 namespace {

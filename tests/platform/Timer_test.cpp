@@ -1,4 +1,4 @@
-#include "platform/Timer.h"
+#include "platform/threads/Timer.h"
 
 #include <gtest/gtest.h>
 
@@ -7,7 +7,7 @@
 #include <thread>
 #include <vector>
 
-#include "platform/Log.h"
+#include "platform/threads/Log.h"
 #include "tests/fakes/LogRecorder.h"
 
 namespace qv::platform {

@@ -1,11 +1,11 @@
-#include "platform/Value.h"
+#include "platform/base/Value.h"
 
 #include <gtest/gtest.h>
 
 #include <cmath>
 #include <limits>
 
-#include "platform/Error.h"
+#include "platform/base/Error.h"
 
 namespace qv::platform {
 namespace {

@@ -2,8 +2,8 @@
 
 #include <thread>
 
-#include "platform/Clock.h"
 #include "platform/pulse/MixTimeline.h"
+#include "platform/threads/Clock.h"
 
 namespace qv::platform {
 namespace {

@@ -14,8 +14,8 @@
 #include <fstream>
 #include <numbers>
 
-#include "platform/PCMSource.h"
 #include "platform/pulse/PulsePlatform.h"
+#include "platform/sound/PCMSource.h"
 
 namespace qv::platform {
 namespace {

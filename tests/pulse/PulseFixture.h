@@ -10,7 +10,7 @@
 
 #include "platform/AppAudioTap.h"
 #include "platform/DeviceCapture.h"
-#include "platform/FileDescriptor.h"
+#include "platform/base/FileDescriptor.h"
 
 namespace qv::platform {
 

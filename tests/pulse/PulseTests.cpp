@@ -7,8 +7,8 @@
 #include <initializer_list>
 #include <vector>
 
-#include "platform/Clock.h"
 #include "platform/pulse/PulsePlatform.h"
+#include "platform/threads/Clock.h"
 #include "tests/pulse/PulseFixture.h"
 
 namespace qv::platform {

@@ -16,7 +16,7 @@
 #include <thread>
 #include <vector>
 
-#include "platform/FileDescriptor.h"
+#include "platform/base/FileDescriptor.h"
 #include "tests/sdbus/SdBusTest.h"
 
 namespace qv::platform::test {

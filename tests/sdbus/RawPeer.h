@@ -8,7 +8,7 @@
 #include <chrono>
 #include <string>
 
-#include "platform/FileDescriptor.h"
+#include "platform/base/FileDescriptor.h"
 #include "tests/sdbus/RawCall.h"
 
 namespace qv::platform::test {

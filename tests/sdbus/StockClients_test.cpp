@@ -2,7 +2,7 @@
 
 #include <fstream>
 
-#include "daemon/client/QVDaemonProtocol.h"
+#include "protocol/QVDaemonProtocol.h"
 #include "tests/sdbus/SdBusTest.h"
 
 namespace qv::platform::test {

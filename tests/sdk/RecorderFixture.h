@@ -6,8 +6,8 @@
 #include <string>
 #include <vector>
 
-#include "daemon/client/QVClientProtocol.h"
-#include "daemon/client/QVDaemonProtocol.h"
+#include "protocol/QVClientProtocol.h"
+#include "protocol/QVDaemonProtocol.h"
 #include "sdk/client/RecorderClient.h"
 #include "tests/fakes/FakeIPC.h"
 #include "tests/fakes/ManualExecutor.h"

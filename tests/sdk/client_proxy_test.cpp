@@ -1,6 +1,6 @@
-#include "daemon/client/QVClientProxy.h"
-#include "platform/RawRecord.h"
-#include "platform/SampleBuffer.h"
+#include "platform/base/RawRecord.h"
+#include "platform/base/SampleBuffer.h"
+#include "session/QVClientProxy.h"
 #include "tests/fakes/LogRecorder.h"
 #include "tests/sdk/RecorderFixture.h"
 

@@ -6,13 +6,14 @@
 #include <future>
 #include <thread>
 
-#include "extensions/QVBroadcastConfiguration.h"
-#include "extensions/QVBroadcastProtocols.h"
-#include "extensions/QVSharedFrameObject.h"
-#include "platform/RawRecord.h"
-#include "platform/SampleBuffer.h"
+#include "platform/base/RawRecord.h"
+#include "platform/base/SampleBuffer.h"
 #include "platform/sdbus/SdBusIPC.h"
-#include "sdk/extension/ExtensionProcess.h"
+#include "protocol/ExtensionRequests.h"
+#include "protocol/QVBroadcastConfiguration.h"
+#include "protocol/QVBroadcastProtocols.h"
+#include "protocol/QVSharedFrameObject.h"
+#include "sdk/extension/ExtensionRuntime.h"
 #include "sdk/extension/ListenerBroadcasts.h"
 #include "tests/fakes/FakeIPC.h"
 
@@ -142,8 +143,8 @@ Dictionary audioPayload(int64_t numSamples) {
 /// The library's process over the real messaging, with a host of the test's in this process.
 class ExtensionLibrary : public ::testing::Test {
  protected:
-  void launch(ExtensionProcess::Factory make) {
-    process_ = ExtensionProcess::create(ipc_, std::move(make));
+  void launch(ExtensionRuntime::Factory make) {
+    process_ = ExtensionRuntime::create(ipc_, std::move(make));
     const auto error = process_->start({requests_.endpoint(), auxiliary_.endpoint()});
     ASSERT_FALSE(error) << error->description();
   }
@@ -166,9 +167,9 @@ class ExtensionLibrary : public ::testing::Test {
   }
 
   platform::SdBusIPCService ipc_;
-  Accepting requests_{ipc_, platform::extensionRequestHostProtocol(), platform::extensionRequestProtocol()};
+  Accepting requests_{ipc_, extensionRequestHostProtocol(), extensionRequestProtocol()};
   Accepting auxiliary_{ipc_, extensionHostProtocol(), extensionVendorProtocol()};
-  std::shared_ptr<ExtensionProcess> process_;
+  std::shared_ptr<ExtensionRuntime> process_;
 };
 
 TEST_F(ExtensionLibrary, TakesSamplesAndTellsOfItsService) {
@@ -275,7 +276,7 @@ TEST_F(ExtensionLibrary, OverlappingClipsKeepTheirOrderAndTheirAnswers) {
   auto third = requests_.calls->takeCall();
   EXPECT_EQ(first.member, "openFile");
   EXPECT_EQ(first.arguments[0], Value("one"));
-  third.reply.fail(platform::kNoSuchFileErrorName, "no such token");
+  third.reply.fail(kNoSuchFileErrorName, "no such token");
   second.reply({fileWith("2")});  // the later file comes first
   first.reply({fileWith("1")});
 
@@ -296,7 +297,7 @@ TEST_F(ExtensionLibrary, OverlappingClipsKeepTheirOrderAndTheirAnswers) {
   const auto answer = requests_.calls->takeCall();
   EXPECT_EQ(answer.member, "completeRequest");
   EXPECT_EQ(answer.arguments[0], Value(uint64_t{2}));
-  const auto returned = platform::extensionItemsOfValue(answer.arguments[1]);
+  const auto returned = extensionItemsOfValue(answer.arguments[1]);
   ASSERT_EQ(returned.size(), 2u);
   EXPECT_EQ(returned[0].attributedTitle, broadcastitem::kBroadcastConfiguration);
   EXPECT_EQ(QVBroadcastConfiguration::decode(returned[0].attachments[0].value.asData())->clipDuration, 2.5);

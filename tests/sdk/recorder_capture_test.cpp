@@ -1,8 +1,8 @@
 #include <future>
 
-#include "extensions/QVSharedFrameObject.h"
-#include "platform/RawRecord.h"
-#include "platform/SampleBuffer.h"
+#include "platform/base/RawRecord.h"
+#include "platform/base/SampleBuffer.h"
+#include "protocol/QVSharedFrameObject.h"
 #include "tests/sdk/RecorderFixture.h"
 
 namespace qv::client {

@@ -1,7 +1,7 @@
 #include <future>
 #include <thread>
 
-#include "platform/Executor.h"
+#include "platform/threads/Executor.h"
 #include "tests/sdk/RecorderFixture.h"
 
 namespace qv::client {

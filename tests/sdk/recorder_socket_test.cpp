@@ -5,12 +5,12 @@
 #include <filesystem>
 #include <future>
 
-#include "daemon/client/QVClientProtocol.h"
-#include "daemon/client/QVDaemonProtocol.h"
-#include "extensions/QVSharedFrameObject.h"
-#include "platform/RawRecord.h"
-#include "platform/SampleBuffer.h"
+#include "platform/base/RawRecord.h"
+#include "platform/base/SampleBuffer.h"
 #include "platform/sdbus/SdBusIPC.h"
+#include "protocol/QVClientProtocol.h"
+#include "protocol/QVDaemonProtocol.h"
+#include "protocol/QVSharedFrameObject.h"
 #include "sdk/client/quorvel/Recorder.h"
 #include "tests/fakes/FakeIPC.h"
 

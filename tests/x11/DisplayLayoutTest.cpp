@@ -1,6 +1,6 @@
 #include <algorithm>
 
-#include "platform/Log.h"
+#include "platform/threads/Log.h"
 #include "platform/x11/WindowLayout.h"
 #include "platform/x11/X11Platform.h"
 #include "tests/fakes/LogRecorder.h"

@@ -1,0 +1,60 @@
+#include "platform/threads/PacedThread.h"
+
+#include <condition_variable>
+#include <mutex>
+
+namespace qv::platform {
+
+struct PacedThread::State {
+  void run();
+
+  std::mutex mutex;
+  std::condition_variable changed;
+  bool stopping = false;
+  bool ended = false;
+  std::function<TimePoint()> step;  // the thread's own
+  std::function<void()> finish;     // the thread's own
+};
+
+void PacedThread::State::run() {
+  std::unique_lock lock(mutex);
+  while (!stopping) {
+    lock.unlock();
+    const TimePoint next = step();
+    lock.lock();
+    changed.wait_until(lock, next, [this] { return stopping; });
+  }
+  lock.unlock();
+  if (finish) finish();
+  step = nullptr;
+  finish = nullptr;
+  lock.lock();
+  ended = true;
+  changed.notify_all();
+}
+
+PacedThread::PacedThread(std::function<TimePoint()> step, std::function<void()> finish)
+    : state_(std::make_shared<State>()) {
+  state_->step = std::move(step);
+  state_->finish = std::move(finish);
+  thread_ = std::thread([state = state_] { state->run(); });
+}
+
+PacedThread::~PacedThread() {
+  stop();
+  if (isCurrent()) {
+    thread_.detach();
+  } else {
+    thread_.join();
+  }
+}
+
+void PacedThread::stop() {
+  std::unique_lock lock(state_->mutex);
+  state_->stopping = true;
+  state_->changed.notify_all();
+  if (isCurrent()) return;
+  state_->changed.wait(lock, [this] { return state_->ended; });
+}
+
+}  // namespace qv::platform

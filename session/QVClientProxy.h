@@ -1,0 +1,57 @@
+#pragma once
+
+#include <memory>
+#include <optional>
+#include <string>
+
+#include "platform/IPC.h"
+#include "platform/threads/Guarded.h"
+#include "platform/threads/RareLog.h"
+#include "protocol/QVSharedFrameObject.h"
+
+namespace qv {
+
+/// What a session may know of its client: turns each callback into a one-way message over the
+/// client's connection. It holds that connection but does not own it; without one, messages go
+/// nowhere. Nothing is retried, and failures are only logged: those of samples as their number doubles.
+///
+/// Threading: thread-safe; called from the manager sequence and from capture threads.
+class QVClientProxy {
+ public:
+  QVClientProxy(std::string bundleIdentifier, const std::shared_ptr<platform::IPCConnection>& connection);
+
+  /// Nothing when the client has gone or was replaced.
+  [[nodiscard]] std::shared_ptr<platform::IPCConnection> connection() const { return connection_.load().lock(); }
+  void setConnection(const std::shared_ptr<platform::IPCConnection>& connection) { connection_.store(connection); }
+  [[nodiscard]] const std::string& bundleIdentifier() const { return bundleIdentifier_; }
+
+  void updateScreenRecordingState(bool recording);
+  void stopRecordingWithError(const std::optional<platform::Error>& error,
+                              const std::optional<platform::URL>& movieURL);
+  void updateBroadcastServiceInfo(const platform::Dictionary& serviceInfo);
+  void updateBroadcastURL(const platform::URL& broadcastURL);
+  /// `timingData`: one raw SampleTimingInfo, 72 bytes.
+  void captureHandlerWithSample(const QVSharedFrameObject& sample, platform::Data timingData);
+  /// `absdData`: one raw AudioStreamDescription, 40 bytes. `bufferType`: 2 app audio, 3 microphone.
+  void captureHandlerWithAudioSample(platform::Data sample, platform::Data absdData, int64_t itemCount,
+                                     int64_t bufferType, platform::Data timingData);
+  /// `pauses`: one raw MediaTime, 24 bytes: the sum of the pauses before the samples that follow. To be sent from the
+  /// thread that sends them, before the first sample of each capture and before the first with another sum: it is never
+  /// dropped, and messages keep their order.
+  void captureTimelineDidChange(platform::Data pauses);
+  void recordingLockInterrupted(const platform::Error& error);
+  void recordingTimerDidUpdate(const std::string& time);
+
+ private:
+  /// `failures` (may be nothing) counts those of a member that is sent all the time.
+  void send(const char* member, platform::IPCArguments arguments, const char* failureLine,
+            const std::shared_ptr<platform::RareLog>& failures = nullptr);
+
+  const std::string bundleIdentifier_;
+  /// Failures come back later than this may live.
+  const std::shared_ptr<platform::RareLog> lostFrames_ = std::make_shared<platform::RareLog>();
+  const std::shared_ptr<platform::RareLog> lostSound_ = std::make_shared<platform::RareLog>();
+  platform::Guarded<std::weak_ptr<platform::IPCConnection>> connection_;
+};
+
+}  // namespace qv
