@@ -27,11 +27,6 @@ constexpr AudioStreamDescription kBasicDescription{44100.0,
 
 }  // namespace
 
-QVCaptureManager& QVCaptureManager::sharedManager() {
-  static QVCaptureManager* const manager = new QVCaptureManager(platform::Platform::current());
-  return *manager;
-}
-
 QVCaptureManager::QVCaptureManager(platform::Platform& platform)
     : platform_(platform),
       audioBasicDescription_(kBasicDescription),

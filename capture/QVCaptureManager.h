@@ -27,8 +27,6 @@ class QVCaptureManager final : public platform::CaptureOutputDelegate {
   using OutputHandler = std::function<void(const platform::SampleBufferRef&)>;
   using DidStartHandler = std::function<void()>;
 
-  static QVCaptureManager& sharedManager();
-
   explicit QVCaptureManager(platform::Platform& platform);
   ~QVCaptureManager() override;
 

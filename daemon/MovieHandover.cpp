@@ -4,7 +4,6 @@
 
 #include "platform/threads/Log.h"
 #include "support/QuorvelErrors.h"
-#include "writer/QVAudioMixUtility.h"
 
 namespace qv {
 
@@ -52,13 +51,14 @@ MovieHandover::MovieHandover(platform::Platform& platform, platform::SerialQueue
                              std::shared_ptr<QVTemporaryMovies> movies)
     : photoLibrary_(*platform.photoLibrary),
       sequence_("com.tarnwick.quorveld.handover", sequence),
-      movies_(std::move(movies)) {}
+      movies_(std::move(movies)),
+      mixes_(platform, movies_) {}
 
 void MovieHandover::saveVideoToCameraRoll(const std::string& bundleID, const URL& movie, Handler handler) {
   auto save = movies_->beginSave(bundleID, movie);
   if (!save) {
     QV_LOG_ERROR(logs::kDaemon, "a movie that was not handed to the caller is not saved");
-    handler(_qvUserErrorForCode(errorcode::kFailedToSave));
+    handler(recordingError(errorcode::kFailedToSave));
     return;
   }
   mixAndStore(std::make_shared<Storing>(
@@ -72,7 +72,7 @@ void MovieHandover::storeSystemRecording(const std::shared_ptr<MovieClaim>& movi
     store(std::make_shared<Storing>(Storing{kStopByOtherStart, std::move(save), std::move(handler), nullptr}));
     return;
   }
-  const Error error = _qvUserErrorForCode(errorcode::kFailedToSave);
+  const Error error = recordingError(errorcode::kFailedToSave);
   logResult(kStopByOtherStart, error);
   handler(std::nullopt, error);
 }
@@ -86,7 +86,7 @@ void MovieHandover::saveInterrupted(const std::shared_ptr<MovieClaim>& movie, co
   if (auto save = movie ? movie->saveFor(bundleID) : nullptr) {
     mixAndStore(std::make_shared<Storing>(Storing{kSave, std::move(save), logged, nullptr}));
   } else {
-    logged(std::nullopt, _qvUserErrorForCode(errorcode::kFailedToSave));
+    logged(std::nullopt, recordingError(errorcode::kFailedToSave));
   }
 }
 
@@ -98,15 +98,15 @@ void MovieHandover::discard(const std::string& bundleID, std::function<void()> h
 }
 
 void MovieHandover::mixAndStore(const std::shared_ptr<Storing>& storing) {
-  QVAudioMixUtility::mixAudioForMovie(movies_, storing->save->movie(),
-                                      [weak = weak_from_this(), storing](const auto& mixed, const auto& error) {
-                                        if (error) QV_LOG_ERROR(logs::kDaemon, "Error Mixing video Audio tracks");
-                                        QV_LOG(logs::kDaemon, "QVRecordingManager: saveVideoToCameraRoll:");
-                                        onSequence(weak, [storing, mixed](MovieHandover& self) {
-                                          storing->mixed = mixed;
-                                          self.store(storing);
-                                        });
-                                      });
+  mixes_.mixAudioForMovie(storing->save->movie(),
+                          [weak = weak_from_this(), storing](const auto& mixed, const auto& error) {
+                            if (error) QV_LOG_ERROR(logs::kDaemon, "Error Mixing video Audio tracks");
+                            QV_LOG(logs::kDaemon, "QVRecordingManager: saveVideoToCameraRoll:");
+                            onSequence(weak, [storing, mixed](MovieHandover& self) {
+                              storing->mixed = mixed;
+                              self.store(storing);
+                            });
+                          });
 }
 
 void MovieHandover::store(const std::shared_ptr<Storing>& storing) {

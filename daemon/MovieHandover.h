@@ -8,6 +8,7 @@
 #include "platform/Platform.h"
 #include "platform/threads/SerialQueue.h"
 #include "support/QVTemporaryMovies.h"
+#include "writer/QVAudioMixUtility.h"
 
 namespace qv {
 
@@ -53,6 +54,7 @@ class MovieHandover : public std::enable_shared_from_this<MovieHandover> {
   platform::PhotoLibrary& photoLibrary_;
   platform::SerialQueue sequence_;  ///< on the manager's; usable as long as anybody holds this
   const std::shared_ptr<QVTemporaryMovies> movies_;
+  const QVAudioMixUtility mixes_;
 };
 
 }  // namespace qv

@@ -2,9 +2,7 @@
 
 #include <utility>
 
-#include "platform/Platform.h"
 #include "platform/threads/Log.h"
-#include "support/QVBundleTexts.h"
 #include "support/QuorvelErrors.h"
 
 namespace qv {
@@ -21,13 +19,13 @@ void QVBroadcastBook::setupBroadcast(SetupRequest request, SetupHandler handler)
   auto configuration = QVBroadcastConfiguration::decodeReceived(request.configuration);
   if (!configuration) {
     QV_LOG_ERROR(logs::kDaemon, "no broadcast configuration: %s", configuration.error().description().c_str());
-    handler(_qvUserErrorForCode(errorcode::kInvalidBroadcastSession));
+    handler(recordingError(errorcode::kInvalidBroadcastSession));
     return;
   }
-  const std::string base = baseIdentifier(request.extensionBundleID).value_or("");
+  const std::string base = QVBundleTexts::baseIdentifier(request.extensionBundleID).value_or("");
   if (base.empty()) {
     QV_LOG_ERROR(logs::kDaemon, "\"%s\" names no broadcast extension", request.extensionBundleID.c_str());
-    handler(_qvUserErrorForCode(errorcode::kInvalidBroadcastSession));
+    handler(recordingError(errorcode::kInvalidBroadcastSession));
     return;
   }
   loadBroadcastUploadExtensionWithBaseIdentifier(
@@ -35,7 +33,7 @@ void QVBroadcastBook::setupBroadcast(SetupRequest request, SetupHandler handler)
              handler = std::move(handler)](const ExtensionRecordRef& extension) {
         if (!extension) {
           QV_LOG_ERROR(logs::kDaemon, "no upload extension belongs to %s", request.extensionBundleID.c_str());
-          handler(_qvUserErrorForCode(errorcode::kInvalidBroadcastSession));
+          handler(recordingError(errorcode::kInvalidBroadcastSession));
           return;
         }
         self->store(request, extension, configuration);
@@ -48,13 +46,15 @@ void QVBroadcastBook::loadBroadcastUploadExtensionWithBaseIdentifier(const std::
   const auto answer = [self = shared_from_this(), handler = std::move(handler)](const ExtensionRecordRef& extension) {
     self->sequence_.async([handler, extension] { handler(extension); });
   };
-  extensionsWithMatchingPointName({.pointName = broadcastpoint::kUpload, .baseIdentifier = base},
-                                  [base, answer](const auto& uploads, const auto& uploadError) {
+  platform::ExtensionService* const service = context_->platform.extensions;
+  extensionsWithMatchingPointName(service, {.pointName = broadcastpoint::kUpload, .baseIdentifier = base},
+                                  [service, base, answer](const auto& uploads, const auto& uploadError) {
                                     if (!uploadError && !uploads.empty()) {
                                       answer(uploads.front());
                                       return;
                                     }
                                     extensionsWithMatchingPointName(
+                                        service,
                                         {.pointName = broadcastpoint::kGeneral,
                                          .baseIdentifier = base,
                                          .unwantedActivationRule = platform::extensioninfo::kSupportsStreaming},
@@ -70,7 +70,7 @@ void QVBroadcastBook::store(const SetupRequest& request, const ExtensionRecordRe
       {extension, processMode(*extension), request.userInfo, configuration}, request.before};
   currentExtensionAppImage_ = extension->icons.empty() ? Data() : extension->icons.front();
   currentExtensionDisplayName_ = extension->displayName;
-  currentHostAppImage_ = _qvAppIconFromBundleID(request.hostBundleID);
+  currentHostAppImage_ = context_->texts._qvAppIconFromBundleID(request.hostBundleID);
 }
 
 const QVBroadcastInfo* QVBroadcastBook::infoForHostBundleID(const std::string& hostBundleID) const {
@@ -86,7 +86,7 @@ void QVBroadcastBook::recordingEnded(const std::shared_ptr<const QVRecording>& r
 
 void QVBroadcastBook::getSystemBroadcastExtensionInfo(InfoHandler handler) {
   extensionsWithMatchingPointName(
-      {.pointName = broadcastpoint::kUpload},
+      context_->platform.extensions, {.pointName = broadcastpoint::kUpload},
       [self = shared_from_this(), handler = std::move(handler)](const auto& extensions, const auto& error) {
         Array list;
         for (const ExtensionRecordRef& extension : extensions) {

@@ -29,7 +29,8 @@ class QVBroadcastBook : public std::enable_shared_from_this<QVBroadcastBook> {
   using SetupHandler = std::function<void(const std::optional<platform::Error>&)>;
   using InfoHandler = std::function<void(platform::Array, const std::optional<platform::Error>&)>;
 
-  explicit QVBroadcastBook(platform::SerialQueue& sequence) : sequence_(sequence) {}
+  QVBroadcastBook(platform::SerialQueue& sequence, std::shared_ptr<RecordingContext> context)
+      : sequence_(sequence), context_(std::move(context)) {}
 
   /// Finds the upload extension with the same base identifier and notes it, in place of any earlier one of that host.
   /// RECORDING_ERROR_INVALID_BROADCAST_SESSION, and nothing noted, where there is none or the configuration is none.
@@ -54,6 +55,7 @@ class QVBroadcastBook : public std::enable_shared_from_this<QVBroadcastBook> {
              const QVBroadcastConfiguration& configuration);
 
   platform::SerialQueue& sequence_;
+  const std::shared_ptr<RecordingContext> context_;
   struct Entry {
     QVBroadcastInfo info;
     std::weak_ptr<const QVRecording> before;

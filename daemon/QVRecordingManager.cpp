@@ -5,7 +5,6 @@
 #include "extensions/QVExtensionHostContext.h"
 #include "platform/threads/Log.h"
 #include "protocol/QVDaemonProtocol.h"
-#include "support/QVTemporaryFiles.h"
 #include "support/QVUnfinishedMovies.h"
 #include "support/QuorvelErrors.h"
 
@@ -18,44 +17,45 @@ namespace {
 constexpr const char kPurgeServiceName[] = "com.tarnwick.quorveld-cache-delete";
 }
 
-std::shared_ptr<QVRecordingManager> QVRecordingManager::create(QVCaptureManager& captureManager) {
-  std::shared_ptr<QVRecordingManager> manager(new QVRecordingManager(captureManager));
+std::shared_ptr<QVRecordingManager> QVRecordingManager::create(platform::Platform& platform,
+                                                               QVCaptureManager& captureManager) {
+  std::shared_ptr<QVRecordingManager> manager(new QVRecordingManager(platform, captureManager));
   manager->registerPurgeableSpace();
   return manager;
 }
 
-QVRecordingManager::QVRecordingManager(QVCaptureManager& captureManager)
-    : platform_(platform::Platform::current()),
+QVRecordingManager::QVRecordingManager(platform::Platform& platform, QVCaptureManager& captureManager)
+    : platform_(platform),
       sequence_("com.tarnwick.quorveld.manager", *platform_.globalQueue),
-      context_(std::make_shared<RecordingContext>(sequence_, captureManager,
-                                                  std::make_shared<QVScreenSource>(*platform_.screenCapture), movies_)),
-      broadcasts_(std::make_shared<QVBroadcastBook>(sequence_)),
-      handover_(std::make_shared<MovieHandover>(platform_, sequence_, movies_)),
+      context_(std::make_shared<RecordingContext>(platform, sequence_, captureManager)),
+      acknowledgements_(*platform_.userAlerts, context_->texts),
+      broadcasts_(std::make_shared<QVBroadcastBook>(sequence_, context_)),
+      handover_(std::make_shared<MovieHandover>(platform_, sequence_, context_->movies)),
       foreground_(std::make_shared<ForegroundFollower>(*platform_.applications, sequence_)),
       layoutRule_(std::make_shared<DisplayLayoutRule>(
-          sequence_, [this] { endRecordingsOfApplications(_qvUserErrorForCode(errorcode::kContentResize)); })),
+          sequence_, [this] { endRecordingsOfApplications(recordingError(errorcode::kContentResize)); })),
       sessions_(std::make_shared<SessionRegistry>(context_)),
       starts_(startServices()),
-      purge_(movies_,
-             StorePurge::Recordings{
-                 [this] { return !sessions_->recordingSessions().empty(); },
-                 [this] {
-                   for (const Session& session : sessions_->recordingSessions()) {
-                     if (!session->recording()->writesMovies()) continue;
-                     session->recording()->fail(_qvUserErrorForCode(errorcode::kInsufficientStorage));
-                   }
-                 },
-                 [this] {
-                   for (const Session& session : sessions_->recordingSessions()) {
-                     stopRecordingSession(session, [](QVRecording& recording) {
-                       QV_LOG(logs::kDaemon, "recording stopped without handler!");
-                       recording.finishAndCleanupSessionFiles(_qvUserErrorForCode(errorcode::kInsufficientStorage));
-                     });
-                   }
-                 }}),
+      purge_(context_,
+             StorePurge::Recordings{[this] { return !sessions_->recordingSessions().empty(); },
+                                    [this] {
+                                      for (const Session& session : sessions_->recordingSessions()) {
+                                        if (!session->recording()->writesMovies()) continue;
+                                        session->recording()->fail(recordingError(errorcode::kInsufficientStorage));
+                                      }
+                                    },
+                                    [this] {
+                                      for (const Session& session : sessions_->recordingSessions()) {
+                                        stopRecordingSession(session, [](QVRecording& recording) {
+                                          QV_LOG(logs::kDaemon, "recording stopped without handler!");
+                                          recording.finishAndCleanupSessionFiles(
+                                              recordingError(errorcode::kInsufficientStorage));
+                                        });
+                                      }
+                                    }}),
       alerts_(*platform_.globalQueue) {
-  _srSetupTempDirectory();
-  _srSalvageUnfinishedMovies();
+  context_->files._srSetupTempDirectory();
+  QVUnfinishedMovies(context_->files, *platform_.movieSalvage, *platform_.localization)._srSalvageUnfinishedMovies();
   addRecordingRequests();
   addApplicationRequests();
   addBroadcastRequests();
@@ -67,13 +67,13 @@ QVRecordingManager::QVRecordingManager(QVCaptureManager& captureManager)
 QVRecordingManager::~QVRecordingManager() = default;
 
 StartServices QVRecordingManager::startServices() {
-  return {platform_,
-          sequence_,
-          context_->captureManager,
+  return {sequence_,
+          *context_,
           *sessions_,
           *foreground_,
           *broadcasts_,
           exemptions_,
+          acknowledgements_,
           [this] { stopCurrentRecordingSessionWithHandler(); },
           [this](const Session& session) { interruptOtherRecordingSessionAgainstSession(session); },
           [this](const Session& session) { checkAndPlaySystemRecordSound(session, true); },

@@ -36,7 +36,7 @@ class QVRecordingManager final : public platform::IPCListenerDelegate,
  public:
   /// Sets up the temporary store, finishes what a crash left there, and does everything of the start-up but the
   /// listener.
-  static std::shared_ptr<QVRecordingManager> create(QVCaptureManager& captureManager);
+  static std::shared_ptr<QVRecordingManager> create(platform::Platform& platform, QVCaptureManager& captureManager);
   ~QVRecordingManager() override;
 
   /// Opens the listener: from now on clients are admitted. An error when the service is taken.
@@ -74,7 +74,7 @@ class QVRecordingManager final : public platform::IPCListenerDelegate,
  private:
   using Session = SessionRegistry::Session;
 
-  explicit QVRecordingManager(QVCaptureManager& captureManager);
+  QVRecordingManager(platform::Platform& platform, QVCaptureManager& captureManager);
   [[nodiscard]] StartServices startServices();
   void registerPurgeableSpace();
 
@@ -114,9 +114,9 @@ class QVRecordingManager final : public platform::IPCListenerDelegate,
 
   platform::Platform& platform_;
   platform::SerialQueue sequence_;
-  const std::shared_ptr<QVTemporaryMovies> movies_ = QVTemporaryMovies::create();
   const std::shared_ptr<RecordingContext> context_;
   QVExemptionBook exemptions_;
+  const QVAcknowledgementAlert acknowledgements_;
   const std::shared_ptr<QVBroadcastBook> broadcasts_;
   const std::shared_ptr<MovieHandover> handover_;
   const std::shared_ptr<ForegroundFollower> foreground_;

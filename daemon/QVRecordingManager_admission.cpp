@@ -50,7 +50,7 @@ void QVRecordingManager::adoptConnection(const Session& session, const std::stri
     // Nobody is left to be told how the former connection's start ended.
     starts_.cancelPendingStart(bundleID);
   }
-  session->setClientProxy(std::make_shared<QVClientProxy>(bundleID, connection));
+  session->setClientProxy(std::make_shared<QVClientProxy>(context_->errors, bundleID, connection));
 }
 
 void QVRecordingManager::connectionEnded(const std::weak_ptr<IPCConnection>& weakConnection, const char* line) {

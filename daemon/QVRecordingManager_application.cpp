@@ -71,11 +71,11 @@ void QVRecordingManager::clientDidBecomeActive(const Session& session) {
   if (!session->isRecording() || !session->interruptedMovieURL()) return;
   auto movie = session->interruptedMovieURL();
   session->setInterruptedMovieURL(std::nullopt);
-  if (!movies_->isHandedTo(session->bundleID(), *movie)) movie.reset();
+  if (!context_->movies->isHandedTo(session->bundleID(), *movie)) movie.reset();
   QV_LOG(logs::kDaemon, "current session was interrupted - notify client app of error");
   QV_LOG(logs::kDaemon, "QVRecordingManager:recordingSessionStoppedWithError:movieURL:");
   if (const auto proxy = session->clientProxy()) {
-    proxy->stopRecordingWithError(_qvUserErrorForCode(errorcode::kInterrupted), movie);
+    proxy->stopRecordingWithError(recordingError(errorcode::kInterrupted), movie);
   }
 }
 
@@ -90,8 +90,8 @@ void QVRecordingManager::addBroadcastRequests() {
   });
   requests_.add<Plain>("getSystemBroadcastExtensionInfo", [this](const Caller&, const Plain&, const IPCReply& reply) {
     broadcasts_->getSystemBroadcastExtensionInfo(
-        [reply](platform::Array extensions, const std::optional<Error>& error) {
-          reply({Value(std::move(extensions)), Value(platform::encodeError(error))});
+        [reply, context = context_](platform::Array extensions, const std::optional<Error>& error) {
+          reply({Value(std::move(extensions)), Value(context->errors.encoded(error))});
         });
   });
 }
@@ -101,7 +101,7 @@ void QVRecordingManager::setupBroadcast(const Caller& caller, const request::Set
                                         const IPCReply& reply) {
   if (!caller.is(request.hostBundleID) && !caller.isPrivileged()) {
     QV_LOG_ERROR(logs::kDaemon, "a broadcast of %s was set up by another application", request.hostBundleID.c_str());
-    reply({Value(platform::encodeError(_qvUserErrorForCode(errorcode::kEntitlements)))});
+    reply({Value(context_->errors.encoded(recordingError(errorcode::kEntitlements)))});
     return;
   }
   QVBroadcastBook::SetupRequest setup{request.hostBundleID,
@@ -110,8 +110,9 @@ void QVRecordingManager::setupBroadcast(const Caller& caller, const request::Set
                                       request.userInfo,
                                       {}};
   if (const Session session = sessions_->find(request.hostBundleID)) setup.before = session->recording();
-  broadcasts_->setupBroadcast(
-      std::move(setup), [reply](const std::optional<Error>& error) { reply({Value(platform::encodeError(error))}); });
+  broadcasts_->setupBroadcast(std::move(setup), [reply, context = context_](const std::optional<Error>& error) {
+    reply({Value(context->errors.encoded(error))});
+  });
 }
 
 }  // namespace qv

@@ -26,7 +26,7 @@ void QVRecordingManager::stopCurrentRecordingSessionWithHandler() {
   QV_LOG(logs::kDaemon, "QVRecordingManager:stopCurrentRecordingSession:");
   for (const Session& session : sessions_->recordingSessions()) {
     stopRecordingSession(session, [this](QVRecording& recording) {
-      const Error interrupted = _qvUserErrorForCode(errorcode::kInterrupted);
+      const Error interrupted = recordingError(errorcode::kInterrupted);
       if (recording.settings().systemRecording) {
         recording.end({.cause = interrupted, .movie = storeInPhotoLibrary(recording.settings().bundleID)});
       } else {
@@ -49,7 +49,7 @@ void QVRecordingManager::interruptOtherRecordingSessionAgainstSession(const Sess
     if (other == session) continue;
     QV_LOG(logs::kDaemon, "interrupted session");
     other->recording()->end(
-        {.cause = _qvUserErrorForCode(errorcode::kInterrupted), .movie = moviefate::handTo(other->bundleID())});
+        {.cause = recordingError(errorcode::kInterrupted), .movie = moviefate::handTo(other->bundleID())});
   }
 }
 

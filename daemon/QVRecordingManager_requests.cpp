@@ -42,9 +42,10 @@ void QVRecordingManager::addRecordingRequests() {
                                       });
   requests_.add<request::SaveVideo>(
       "saveVideoToCameraRoll", [this](const Caller& caller, const auto& request, const IPCReply& reply) {
-        handover_->saveVideoToCameraRoll(
-            caller.bundleID().value_or(std::string()), request.movieURL,
-            [reply](const std::optional<Error>& error) { reply({Value(platform::encodeError(error))}); });
+        handover_->saveVideoToCameraRoll(caller.bundleID().value_or(std::string()), request.movieURL,
+                                         [reply, context = context_](const std::optional<Error>& error) {
+                                           reply({Value(context->errors.encoded(error))});
+                                         });
       });
   requests_.add<Plain>(
       "discardRecordingWithHandler",
@@ -108,13 +109,13 @@ void QVRecordingManager::stopForClient(const Caller& caller, const Session& sess
   if (proxy && proxy->connection() != caller.connection) {
     // Whoever asked has gone meanwhile. The client that came after it is told, and has the movie.
     stopRecordingSession(session, [](QVRecording& recording) {
-      recording.end({.cause = _qvUserErrorForCode(errorcode::kInterrupted),
+      recording.end({.cause = recordingError(errorcode::kInterrupted),
                      .movie = moviefate::handTo(recording.settings().bundleID)});
     });
     return;
   }
-  const auto answer = [reply](const std::optional<URL>& movie, const std::optional<Error>& error) {
-    reply({encodeURL(movie), Value(platform::encodeError(error))});
+  const auto answer = [reply, context = context_](const std::optional<URL>& movie, const std::optional<Error>& error) {
+    reply({encodeURL(movie), Value(context->errors.encoded(error))});
   };
   stopRecordingSession(session, [&](QVRecording& recording) {
     recording.finishSessionWithStartClipDuration(startClipDuration, endClipDuration, answer);
@@ -161,7 +162,7 @@ void QVRecordingManager::resumeRecording(const Caller& caller, const Session& se
     session->recording()->resumeSessionWithContextID(contextID);
   } else {
     stopRecordingSession(session, [](QVRecording& recording) {
-      recording.end({.cause = _qvUserErrorForCode(errorcode::kNoContextIDMatch),
+      recording.end({.cause = recordingError(errorcode::kNoContextIDMatch),
                      .movie = moviefate::handTo(recording.settings().bundleID)});
     });
   }
@@ -173,7 +174,7 @@ void QVRecordingManager::updateProcessID(const Caller& caller, int32_t processID
   const Session session = sessions_->find(caller.bundleID());
   if (!session || !session->isRecording()) return;
   if (processID >= 1 && !caller.isPrivileged()) {
-    const auto bundle = bundleWithPID(processID);
+    const auto bundle = context_->texts.bundleWithPID(processID);
     if (!bundle || !caller.is(bundle->bundleIdentifier())) {
       QV_LOG_ERROR(logs::kDaemon, "the sound of process %i is not the caller's to record", processID);
       return;

@@ -30,7 +30,7 @@ void QVRecordingManager::stopSystemRecordingWithInterruption() {
                                                                              auto done) {
         handover->saveInterrupted(movie, bundleID, [done](const auto& kept, const auto&) { done(kept); });
       };
-      recording.end({.cause = _qvUserErrorForCode(errorcode::kInterrupted), .movie = save});
+      recording.end({.cause = recordingError(errorcode::kInterrupted), .movie = save});
     });
   });
 }

@@ -23,7 +23,7 @@ bool isSaneSide(double side) { return std::isfinite(side) && side >= 1 && side <
 void StartDesk::startRecordingWindowLayerContextIDs(const Caller& caller, const request::StartRecording& request,
                                                     const platform::IPCReply& reply) {
   if (const auto error = checkStartIsAllowed(caller, request)) {
-    StartAnswer(reply).refused(*error);
+    StartAnswer(services_.context.errors, reply).refused(*error);
     return;
   }
   const auto session = services_.sessions.find(caller.bundleID());
@@ -37,7 +37,7 @@ void StartDesk::startRecordingWindowLayerContextIDs(const Caller& caller, const 
 /// The checks that leave everything as it is.
 std::optional<Error> StartDesk::checkStartIsAllowed(const Caller& caller,
                                                     const request::StartRecording& request) const {
-  const Error failedToStart = _qvUserErrorForCode(errorcode::kFailedToStart);
+  const Error failedToStart = recordingError(errorcode::kFailedToStart);
   if (!services_.sessions.find(caller.bundleID())) {
     QV_LOG_ERROR(logs::kDaemon,
                  "a recording was requested by process %d, which belongs to no application bundle: put the "
@@ -46,7 +46,7 @@ std::optional<Error> StartDesk::checkStartIsAllowed(const Caller& caller,
                  static_cast<int>(caller.connection->processIdentifier()));
     return failedToStart;
   }
-  if (request.systemRecording && !caller.isPrivileged()) return _qvUserErrorForCode(errorcode::kEntitlements);
+  if (request.systemRecording && !caller.isPrivileged()) return recordingError(errorcode::kEntitlements);
   if (!request.systemRecording && !checkContextIDsMatch(caller, request.contextIDs)) return failedToStart;
   if (!isSaneSide(request.windowSize.width) || !isSaneSide(request.windowSize.height)) {
     QV_LOG_ERROR(logs::kDaemon, "window size %f x %f cannot be recorded", request.windowSize.width,
@@ -67,8 +67,8 @@ bool StartDesk::checkContextIDsMatch(const Caller& caller, const std::vector<uin
     return false;
   }
   for (const uint32_t contextID : distinct) {
-    const auto owner = services_.platform.renderServer->ownerOfContext(contextID);
-    const auto bundle = owner ? bundleWithPID(*owner) : nullptr;
+    const auto owner = services_.context.platform.renderServer->ownerOfContext(contextID);
+    const auto bundle = owner ? services_.context.texts.bundleWithPID(*owner) : nullptr;
     if (!bundle || !caller.is(bundle->bundleIdentifier())) return false;
   }
   return true;

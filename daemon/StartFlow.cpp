@@ -23,7 +23,7 @@ StartFlow::StartFlow(StartServices& services, Session session, request::StartRec
       session_(std::move(session)),
       request_(std::move(request)),
       over_(std::move(over)),
-      answer_(std::move(reply)) {}
+      answer_(std::in_place, services.context.errors, std::move(reply)) {}
 
 /// A former recording of this application ends before anything of the new one begins.
 void StartFlow::run() {
@@ -41,20 +41,20 @@ bool StartFlow::isInFront() const {
 }
 
 void StartFlow::continueAfterStops() {
-  if (!_srDeviceHasSufficientFreeSpaceForRecording()) {
+  if (!services_.context.space._srDeviceHasSufficientFreeSpaceForRecording()) {
     QV_LOG_ERROR(logs::kDaemon, "insufficient disk space for recording, calling handler with error");
-    refuse(_qvUserErrorForCode(errorcode::kInsufficientStorage));
+    refuse(recordingError(errorcode::kInsufficientStorage));
     return;
   }
   if (!isInFront()) {
     QV_LOG(logs::kDaemon, "app is not in the foreground, calling handler with error");
-    refuse(_qvUserErrorForCode(errorcode::kFailedToStart));
+    refuse(recordingError(errorcode::kFailedToStart));
     return;
   }
   // What the user is asked, and what is answered, is what will be recorded.
-  inputs_.microphone = request_.microphoneEnabled && services_.captureManager.hasAudioCaptureDevice();
-  inputs_.camera = request_.cameraEnabled && services_.captureManager.hasVideoCaptureDevice();
-  if (!request_.captureEnabled) services_.platform.assetWriter->prepareForWriting();
+  inputs_.microphone = request_.microphoneEnabled && services_.context.captureManager.hasAudioCaptureDevice();
+  inputs_.camera = request_.cameraEnabled && services_.context.captureManager.hasVideoCaptureDevice();
+  if (!request_.captureEnabled) services_.context.platform.assetWriter->prepareForWriting();
   if (request_.systemRecording || request_.broadcast) {
     begin();
   } else {
@@ -63,8 +63,9 @@ void StartFlow::continueAfterStops() {
 }
 
 bool StartFlow::isAlertSuppressed() const {
-  if (!services_.platform.deviceInfo->allowsInternalSecurityPolicies(kDaemonDomain)) return false;
-  const bool suppressed = !services_.platform.preferences->valueForKey(kDaemonDomain, "QVSuppressAlert").isNone();
+  if (!services_.context.platform.deviceInfo->allowsInternalSecurityPolicies(kDaemonDomain)) return false;
+  const bool suppressed =
+      !services_.context.platform.preferences->valueForKey(kDaemonDomain, "QVSuppressAlert").isNone();
   QV_LOG(logs::kDaemon, "QVRecordingManager: suppressAlert=%d", suppressed ? 1 : 0);
   return suppressed;
 }
@@ -81,7 +82,7 @@ void StartFlow::showAcknowledgementAlertForSession() {
   }
   const AcknowledgementRequest request{session_->bundleID(), request_.captureEnabled, inputs_.microphone,
                                        inputs_.camera};
-  alert_ = presentAcknowledgementAlert(
+  alert_ = services_.acknowledgements.present(
       request, [weakSelf = weak_from_this(), &sequence = services_.sequence](const AcknowledgementAnswer& answer) {
         sequence.async(weakSelf, [answer](StartFlow& self) { self.continueAfterAcknowledgement(answer); });
       });
@@ -92,7 +93,7 @@ void StartFlow::continueAfterAcknowledgement(const AcknowledgementAnswer& answer
   alert_.reset();
   if (!answer.allowed) {
     QV_LOG(logs::kDaemon, "user declined");
-    refuse(_qvUserErrorForCode(errorcode::kUserDeclined));
+    refuse(recordingError(errorcode::kUserDeclined));
     return;
   }
   inputs_ = {answer.microphone, answer.camera};
@@ -101,13 +102,14 @@ void StartFlow::continueAfterAcknowledgement(const AcknowledgementAnswer& answer
 }
 
 RecordingSettings StartFlow::settings(const QVBroadcastInfo* broadcast) const {
+  const platform::Platform& platform = services_.context.platform;
   RecordingSettings settings;
   settings.bundleID = session_->bundleID();
   settings.systemRecording = request_.systemRecording;
   settings.captureEnabled = request_.captureEnabled;
   settings.microphoneEnabled = request_.systemRecording ? request_.microphoneEnabled : inputs_.microphone;
   settings.contextIDs = request_.contextIDs;
-  settings.windowSize = _maximumSizeWithSize(request_.windowSize);
+  settings.windowSize = _maximumSizeWithSize(request_.windowSize, *platform.preferences, *platform.deviceInfo);
   if (broadcast) settings.broadcast = BroadcastPlan{*broadcast, request_.listenerEndpoint};
   return settings;
 }
@@ -120,7 +122,7 @@ void StartFlow::begin() {
     broadcast = services_.broadcasts.infoForHostBundleID(session_->bundleID());
     if (!broadcast) {
       QV_LOG(logs::kDaemon, "attempted to start broadcast without a session, bailing out");
-      refuse(Error{kQVRecordingErrorDomain, errorcode::kInvalidBroadcastSession, {}});
+      refuse(recordingError(errorcode::kInvalidBroadcastSession));
       return;
     }
     QV_LOG(logs::kDaemon, "found broadcast info, enabling for session");
@@ -140,7 +142,7 @@ void StartFlow::begin() {
 void StartFlow::continueAfterPreparing() {
   if (request_.broadcast && !isInFront()) {
     QV_LOG(logs::kDaemon, "app is not in the foreground, calling handler with error");
-    recording_->end({.cause = _qvUserErrorForCode(errorcode::kFailedToStart)});
+    recording_->end({.cause = recordingError(errorcode::kFailedToStart)});
     return;
   }
   frontmostSession([weakSelf = weak_from_this()](int32_t processID) {
@@ -180,7 +182,7 @@ void StartFlow::refuse(const Error& error) {
 
 void StartFlow::cancel() {
   if (!recording_) {
-    refuse(_qvUserErrorForCode(errorcode::kUserDeclined));
+    refuse(recordingError(errorcode::kUserDeclined));
   } else if (!request_.systemRecording) {
     // Over at once: an application that comes back may start again, and waits for the end of this.
     const auto self = shared_from_this();

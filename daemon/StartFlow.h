@@ -18,13 +18,13 @@ namespace qv {
 
 /// What starts need of the daemon.
 struct StartServices {
-  platform::Platform& platform;
   platform::SerialQueue& sequence;
-  QVCaptureManager& captureManager;
+  RecordingContext& context;
   SessionRegistry& sessions;
   ForegroundFollower& foreground;
   QVBroadcastBook& broadcasts;
   QVExemptionBook& exemptions;
+  const QVAcknowledgementAlert& acknowledgements;
   /// Ends all that records, as its first step.
   std::function<void()> stopCurrentRecordings;
   /// Ends what has begun to record meanwhile.

@@ -4,7 +4,7 @@
 #include <functional>
 #include <memory>
 
-#include "support/QVTemporaryMovies.h"
+#include "session/RecordingSettings.h"
 
 namespace qv {
 
@@ -21,8 +21,8 @@ class StorePurge {
     /// Ends what records, and removes what it wrote.
     std::function<void()> endAndRemove;
   };
-  StorePurge(std::shared_ptr<QVTemporaryMovies> movies, Recordings recordings)
-      : movies_(std::move(movies)), recordings_(std::move(recordings)) {}
+  StorePurge(std::shared_ptr<RecordingContext> context, Recordings recordings)
+      : context_(std::move(context)), recordings_(std::move(recordings)) {}
 
   // Each answers bytes.
   int64_t purgeableSpace();
@@ -30,7 +30,7 @@ class StorePurge {
   int64_t purgePeriodically();
 
  private:
-  const std::shared_ptr<QVTemporaryMovies> movies_;
+  const std::shared_ptr<RecordingContext> context_;
   const Recordings recordings_;
 };
 

@@ -40,8 +40,8 @@ int main() {
   ::umask(022);
   QV_LOG(logs::kDaemon, "quorveld Starting!");
   qv::PlatformChoice choice;
-  qv::platform::Platform::install(&choice.platform());
-  const auto manager = qv::QVRecordingManager::create(qv::QVCaptureManager::sharedManager());
+  qv::QVCaptureManager captureManager(choice.platform());
+  const auto manager = qv::QVRecordingManager::create(choice.platform(), captureManager);
   choice.suspendMonitor().setHandlers(qv::handlersOfDeviceSleep(manager));
   if (auto monitor = choice.layoutMonitor()) manager->setLayoutMonitor(std::move(monitor));
   if (const auto error = manager->finishStartup()) {

@@ -2,13 +2,11 @@
 
 #include <utility>
 
-#include "platform/Platform.h"
-
 namespace qv {
 
-std::shared_ptr<AnswerDeadline> AnswerDeadline::start(std::chrono::nanoseconds patience, Continuation continuation) {
+std::shared_ptr<AnswerDeadline> AnswerDeadline::start(const platform::Platform& platform,
+                                                      std::chrono::nanoseconds patience, Continuation continuation) {
   auto deadline = std::make_shared<AnswerDeadline>();
-  platform::Platform& platform = platform::Platform::current();
   std::lock_guard lock(deadline->mutex_);
   deadline->continuation_ = std::move(continuation);
   deadline->timer_ = platform.timers->after(patience, [weak = std::weak_ptr(deadline), queue = platform.globalQueue] {

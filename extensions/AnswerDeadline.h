@@ -5,7 +5,7 @@
 #include <memory>
 #include <mutex>
 
-#include "platform/threads/Timer.h"
+#include "platform/Platform.h"
 
 namespace qv {
 
@@ -20,7 +20,9 @@ inline constexpr std::chrono::seconds kExtensionPatience{10};
 class AnswerDeadline : public std::enable_shared_from_this<AnswerDeadline> {
  public:
   using Continuation = std::function<void(bool isLate)>;
-  static std::shared_ptr<AnswerDeadline> start(std::chrono::nanoseconds patience, Continuation continuation);
+  /// Timers and global queue are the platform's.
+  static std::shared_ptr<AnswerDeadline> start(const platform::Platform& platform, std::chrono::nanoseconds patience,
+                                               Continuation continuation);
   AnswerDeadline() = default;
   ~AnswerDeadline() { resume(false); }
   AnswerDeadline(const AnswerDeadline&) = delete;

@@ -4,25 +4,18 @@
 #include "support/QuorvelErrors.h"
 
 namespace qv {
-namespace {
-
-platform::Error invalidBroadcastSession() {
-  return _qvUserErrorForCode(errorcode::kInvalidBroadcastSession, platform::Dictionary{});
-}
-
-}  // namespace
-
-std::shared_ptr<LinkHandshake> LinkHandshake::start(Handler handler) {
+std::shared_ptr<LinkHandshake> LinkHandshake::start(const platform::Platform& platform, Handler handler) {
   auto handshake = std::make_shared<LinkHandshake>(std::move(handler));
-  handshake->deadline_ = AnswerDeadline::start(kExtensionPatience, [weak = std::weak_ptr(handshake)](bool isLate) {
-    const auto self = weak.lock();
-    if (!isLate || !self || !self->fail(invalidBroadcastSession())) return;
-    QV_LOG_ERROR(platform::logs::kExtensions, "the extension did not connect and ping in time");
-  });
+  handshake->deadline_ =
+      AnswerDeadline::start(platform, kExtensionPatience, [weak = std::weak_ptr(handshake)](bool isLate) {
+        const auto self = weak.lock();
+        if (!isLate || !self || !self->fail(recordingError(errorcode::kInvalidBroadcastSession))) return;
+        QV_LOG_ERROR(platform::logs::kExtensions, "the extension did not connect and ping in time");
+      });
   return handshake;
 }
 
-LinkHandshake::~LinkHandshake() { fail(invalidBroadcastSession()); }
+LinkHandshake::~LinkHandshake() { fail(recordingError(errorcode::kInvalidBroadcastSession)); }
 
 void LinkHandshake::succeed() {
   Stage stage = Stage::Waiting;

@@ -18,7 +18,7 @@ class LinkHandshake : public std::enable_shared_from_this<LinkHandshake> {
  public:
   using Handler = std::function<void(const std::optional<platform::Error>&)>;
 
-  static std::shared_ptr<LinkHandshake> start(Handler handler);
+  static std::shared_ptr<LinkHandshake> start(const platform::Platform& platform, Handler handler);
   explicit LinkHandshake(Handler handler) : handler_(std::move(handler)) {}
   ~LinkHandshake();
   LinkHandshake(const LinkHandshake&) = delete;

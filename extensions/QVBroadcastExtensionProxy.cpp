@@ -2,7 +2,6 @@
 
 #include <utility>
 
-#include "platform/Platform.h"
 #include "platform/threads/Log.h"
 #include "protocol/QVBroadcastProtocols.h"
 #include "support/QuorvelErrors.h"
@@ -12,25 +11,25 @@ namespace qv {
 using platform::Dictionary;
 using platform::Error;
 using platform::IPCArguments;
-using platform::Platform;
 using platform::URL;
 namespace logs = platform::logs;
 
-QVBroadcastExtensionProxy::QVBroadcastExtensionProxy()
-    : queue_("com.tarnwick.quorveld.BroadcastExtensionProxy", *Platform::current().globalQueue) {}
+QVBroadcastExtensionProxy::QVBroadcastExtensionProxy(const platform::Platform& platform)
+    : platform_(platform), queue_("com.tarnwick.quorveld.BroadcastExtensionProxy", *platform.globalQueue) {}
 
 std::shared_ptr<QVBroadcastExtensionProxy> QVBroadcastExtensionProxy::withBroadcastUploadExtension(
-    const platform::ExtensionRecordRef& broadcastUploadExtension) {
-  std::shared_ptr<QVBroadcastExtensionProxy> proxy(new QVBroadcastExtensionProxy());
+    const platform::Platform& platform, const platform::ExtensionRecordRef& broadcastUploadExtension) {
+  std::shared_ptr<QVBroadcastExtensionProxy> proxy(new QVBroadcastExtensionProxy(platform));
   proxy->openListener(broadcastUploadExtension);
   return proxy;
 }
 
 platform::Result<std::shared_ptr<QVBroadcastExtensionProxy>>
-QVBroadcastExtensionProxy::withBroadcastUploadListenerEndpoint(const platform::ListenerEndpoint& endpoint) {
-  auto connection = Platform::current().ipc->connect(endpoint);
+QVBroadcastExtensionProxy::withBroadcastUploadListenerEndpoint(const platform::Platform& platform,
+                                                               const platform::ListenerEndpoint& endpoint) {
+  auto connection = platform.ipc->connect(endpoint);
   if (!connection) return connection.error();
-  std::shared_ptr<QVBroadcastExtensionProxy> proxy(new QVBroadcastExtensionProxy());
+  std::shared_ptr<QVBroadcastExtensionProxy> proxy(new QVBroadcastExtensionProxy(platform));
   proxy->takeConnection(*connection);
   return proxy;
 }
@@ -38,7 +37,7 @@ QVBroadcastExtensionProxy::withBroadcastUploadListenerEndpoint(const platform::L
 QVBroadcastExtensionProxy::~QVBroadcastExtensionProxy() { invalidateConnection(); }
 
 void QVBroadcastExtensionProxy::openListener(const platform::ExtensionRecordRef& extension) {
-  auto listener = Platform::current().ipc->createAnonymousListener();
+  auto listener = platform_.ipc->createAnonymousListener();
   listener->setDelegate(this, queue_);
   if (const auto error = listener->resume()) {
     QV_LOG_ERROR(logs::kExtensions, "no listener for the extension: %s", error->description().c_str());
@@ -46,7 +45,7 @@ void QVBroadcastExtensionProxy::openListener(const platform::ExtensionRecordRef&
   std::lock_guard lock(mutex_);
   listenerEndpoint_ = listener->endpoint();
   listener_ = std::move(listener);
-  use_ = Platform::current().extensions->useExtension(extension);
+  use_ = platform_.extensions->useExtension(extension);
 }
 
 void QVBroadcastExtensionProxy::setServiceInfoHandler(std::function<void(const Dictionary&)> handler) {
@@ -108,7 +107,7 @@ void QVBroadcastExtensionProxy::payloadAnswered(const std::weak_ptr<PayloadAnswe
 void QVBroadcastExtensionProxy::payloadFailed(const std::weak_ptr<PayloadAnswer>& answer, const Error& error) {
   if (answer.expired()) return;
   QV_LOG_ERROR(logs::kExtensions, "error getting remote proxy to extension: %i", static_cast<int>(error.code));
-  lost(_qvUserErrorForCode(errorcode::kInvalidBroadcastSession, Dictionary{}));
+  lost(recordingError(errorcode::kInvalidBroadcastSession));
 }
 
 void QVBroadcastExtensionProxy::processPayload(BroadcastPayload payload, PayloadAnswer::Handler completion) {
@@ -193,7 +192,7 @@ void QVBroadcastExtensionProxy::invalidateConnection() {
   }
   if (listener) listener->invalidate();
   use.reset();
-  if (handshake) handshake->fail(_qvUserErrorForCode(errorcode::kInvalidBroadcastSession, Dictionary{}));
+  if (handshake) handshake->fail(recordingError(errorcode::kInvalidBroadcastSession));
 }
 
 }  // namespace qv

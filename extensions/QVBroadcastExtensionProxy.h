@@ -10,8 +10,7 @@
 #include "extensions/BroadcastPayloadQueue.h"
 #include "extensions/EarlyHandler.h"
 #include "extensions/LinkHandshake.h"
-#include "platform/Extensions.h"
-#include "platform/IPC.h"
+#include "platform/Platform.h"
 #include "platform/threads/RareLog.h"
 
 namespace qv {
@@ -36,11 +35,12 @@ class QVBroadcastExtensionProxy final : public platform::IPCListenerDelegate,
   using ReadyHandler = LinkHandshake::Handler;
 
   /// For an extension that is to be launched. Nothing is until `establishConnectionWithHandler`.
+  /// The platform is borrowed, and must outlive the link.
   static std::shared_ptr<QVBroadcastExtensionProxy> withBroadcastUploadExtension(
-      const platform::ExtensionRecordRef& broadcastUploadExtension);
+      const platform::Platform& platform, const platform::ExtensionRecordRef& broadcastUploadExtension);
   /// Connected at once to an extension that runs already and listens there; the error where it cannot be reached.
   static platform::Result<std::shared_ptr<QVBroadcastExtensionProxy>> withBroadcastUploadListenerEndpoint(
-      const platform::ListenerEndpoint& endpoint);
+      const platform::Platform& platform, const platform::ListenerEndpoint& endpoint);
   ~QVBroadcastExtensionProxy() override;
 
   /// What came before they were set is told when they are: the latest of each.
@@ -77,7 +77,7 @@ class QVBroadcastExtensionProxy final : public platform::IPCListenerDelegate,
     std::set<PayloadAnswerRef> inFlight;
   };
 
-  QVBroadcastExtensionProxy();
+  explicit QVBroadcastExtensionProxy(const platform::Platform& platform);
   void takeConnection(const Connection& connection);
   void openListener(const platform::ExtensionRecordRef& extension);
   [[nodiscard]] bool isCurrent(const WeakConnection& connection);
@@ -106,6 +106,7 @@ class QVBroadcastExtensionProxy final : public platform::IPCListenerDelegate,
   void payloadFailed(const std::weak_ptr<PayloadAnswer>& answer, const platform::Error& error);
   void tellError(const platform::Error& error);
 
+  const platform::Platform& platform_;
   platform::SerialQueue queue_;
   EarlyHandler<platform::Dictionary> serviceInfoHandler_;
   EarlyHandler<platform::URL> broadcastURLHandler_;

@@ -13,13 +13,12 @@ using platform::Dictionary;
 using platform::Error;
 using platform::ExtensionRequestID;
 using platform::IPCArguments;
-using platform::Platform;
 using platform::URL;
 using platform::Value;
 namespace logs = platform::logs;
 
 namespace {
-Error invalidBroadcastSession() { return _qvUserErrorForCode(errorcode::kInvalidBroadcastSession, Dictionary{}); }
+Error invalidBroadcastSession() { return recordingError(errorcode::kInvalidBroadcastSession); }
 }  // namespace
 
 /// What the extension calls. It does not keep the proxy alive: its connection may, through this.
@@ -38,7 +37,7 @@ class QVBroadcastExtensionProxy::ExportedObject final : public platform::IPCExpo
 
 void QVBroadcastExtensionProxy::establishConnectionWithHandler(ReadyHandler handler) {
   QV_LOG(logs::kExtensions, "establishing connection to extension");
-  std::shared_ptr<LinkHandshake> current = LinkHandshake::start(std::move(handler)), former;
+  std::shared_ptr<LinkHandshake> current = LinkHandshake::start(platform_, std::move(handler)), former;
   std::shared_ptr<platform::ExtensionUse> use;
   {
     std::lock_guard lock(mutex_);
@@ -68,7 +67,7 @@ void QVBroadcastExtensionProxy::requestBegan(ExtensionRequestID request, const s
 }
 
 void QVBroadcastExtensionProxy::handOverEndpoint(ExtensionRequestID request) {
-  const auto vendor = Platform::current().extensions->auxiliaryConnectionForRequest(request);
+  const auto vendor = platform_.extensions->auxiliaryConnectionForRequest(request);
   const auto fail = [weakSelf = weak_from_this()](const Error&) {
     QV_LOG_ERROR(logs::kExtensions, "Error setting listenerEndpoint");
     if (const auto self = weakSelf.lock()) self->handshakeFailed(invalidBroadcastSession());
@@ -143,7 +142,7 @@ void QVBroadcastExtensionProxy::handleCall(const std::string& member, const IPCA
 }
 
 bool QVBroadcastExtensionProxy::mayCall() {
-  const auto now = std::chrono::seconds(static_cast<int64_t>(Platform::current().clock->hostTime().seconds()));
+  const auto now = std::chrono::seconds(static_cast<int64_t>(platform_.clock->hostTime().seconds()));
   if (now != std::exchange(callSecond_, now)) callsInSecond_ = 0;
   if (callsInSecond_ == kMaximumCallsPerSecond) {
     QV_LOG_ERROR(logs::kExtensions, "the broadcast extension calls too often, some calls are ignored");

@@ -1,6 +1,5 @@
 #include "extensions/QVExtensions.h"
 
-#include "platform/Platform.h"
 #include "platform/threads/Log.h"
 
 namespace qv {
@@ -31,8 +30,8 @@ bool matches(const ExtensionRecord& extension, const ExtensionQuery& query) {
 
 }  // namespace
 
-void extensionsWithMatchingPointName(ExtensionQuery query, ExtensionsCompletion completion) {
-  platform::ExtensionService* service = platform::Platform::current().extensions;
+void extensionsWithMatchingPointName(platform::ExtensionService* service, ExtensionQuery query,
+                                     ExtensionsCompletion completion) {
   if (service == nullptr) {
     if (completion) completion({}, Error::posix(ENOTSUP, "this device has no extensions"));
     return;

@@ -28,7 +28,9 @@ using ExtensionsCompletion =
 
 /// The installed extensions that match, in the platform's order; callers take the first as "the" extension. The
 /// completion (may be empty) comes on a thread of the platform's.
-void extensionsWithMatchingPointName(ExtensionQuery query, ExtensionsCompletion completion);
+/// Without a service: an error, within the call.
+void extensionsWithMatchingPointName(platform::ExtensionService* service, ExtensionQuery query,
+                                     ExtensionsCompletion completion);
 
 /// How the extension wants its broadcast: movie clips unless it declares otherwise.
 [[nodiscard]] BroadcastProcessMode processMode(const platform::ExtensionRecord& extension);

@@ -70,17 +70,6 @@ struct Platform {
   ExtensionService* extensions = nullptr;
   StoreLookupService* storeLookup = nullptr;
   NetworkReachabilityService* reachability = nullptr;
-
-  /// The installed platform. Aborts when there is none.
-  static Platform& current();
-  /// Installs `platform` (borrowed); nullptr uninstalls.
-  static void install(Platform* platform);
-  /// Counts the installations so far: whoever keeps something of the installed platform for the
-  /// life of the process keeps this number with it, and asks anew when it has changed.
-  static uint64_t installation();
 };
-
-/// `path` under the device root.
-std::string pathUnderDeviceRoot(const std::string& path);
 
 }  // namespace qv::platform

@@ -2,7 +2,6 @@
 
 #include <utility>
 
-#include "platform/Platform.h"
 #include "platform/threads/Log.h"
 
 namespace qv {
@@ -32,8 +31,8 @@ SampleBufferRef pictureAt(const SampleBuffer& source, MediaTime captureTime) {
 
 }  // namespace
 
-ClipCutter::ClipCutter(MakeClip makeClip, ClipEnded clipEnded)
-    : makeClip_(std::move(makeClip)), clipEnded_(std::move(clipEnded)) {}
+ClipCutter::ClipCutter(const platform::Platform& platform, MakeClip makeClip, ClipEnded clipEnded)
+    : platform_(platform), makeClip_(std::move(makeClip)), clipEnded_(std::move(clipEnded)) {}
 
 void ClipCutter::begin(Clip first) {
   std::lock_guard lock(mutex_);
@@ -114,18 +113,18 @@ void ClipCutter::cutClip(MediaTime time, MediaTime soundEnd) {
 }
 
 void ClipCutter::armRepeat() {
-  platform::Platform& platform = platform::Platform::current();
   const std::weak_ptr<QVMovieWriter> beginning = current_->writer;
-  repeatTimer_ =
-      platform.timers->after(kPicturePatience, [weakSelf = weak_from_this(), beginning, queue = platform.globalQueue] {
-        queue->post([weakSelf, beginning] {
-          const auto self = weakSelf.lock();
-          const auto writer = beginning.lock();
-          if (!self || !writer) return;
-          std::lock_guard lock(self->mutex_);
-          if (self->current_ && self->current_->writer == writer) self->repeatLastPicture();
-        });
-      });
+  repeatTimer_ = platform_.timers->after(kPicturePatience,
+                                         [weakSelf = weak_from_this(), beginning, queue = platform_.globalQueue] {
+                                           queue->post([weakSelf, beginning] {
+                                             const auto self = weakSelf.lock();
+                                             const auto writer = beginning.lock();
+                                             if (!self || !writer) return;
+                                             std::lock_guard lock(self->mutex_);
+                                             if (self->current_ && self->current_->writer == writer)
+                                               self->repeatLastPicture();
+                                           });
+                                         });
 }
 
 void ClipCutter::repeatLastPicture() {

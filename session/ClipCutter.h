@@ -31,7 +31,7 @@ class ClipCutter : public std::enable_shared_from_this<ClipCutter> {
   using MakeClip = std::function<Clip(int64_t number)>;
   /// A clip has all that belongs to it: its writer is to be finished. Called with the cutter's lock held.
   using ClipEnded = std::function<void(Clip)>;
-  ClipCutter(MakeClip makeClip, ClipEnded clipEnded);
+  ClipCutter(const platform::Platform& platform, MakeClip makeClip, ClipEnded clipEnded);
 
   /// The first clip, whose writer the owner has made ready.
   void begin(Clip first);
@@ -59,6 +59,7 @@ class ClipCutter : public std::enable_shared_from_this<ClipCutter> {
     std::unique_ptr<ClipSeam> seam;
   };
 
+  const platform::Platform& platform_;
   const MakeClip makeClip_;
   const ClipEnded clipEnded_;
   std::mutex mutex_;

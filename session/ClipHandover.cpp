@@ -3,7 +3,6 @@
 #include <utility>
 
 #include "extensions/QVExtensions.h"
-#include "platform/Platform.h"
 #include "platform/threads/Log.h"
 #include "protocol/QVBroadcastProtocols.h"
 
@@ -13,7 +12,6 @@ using platform::Dictionary;
 using platform::Error;
 using platform::ExtensionItem;
 using platform::ExtensionRequestID;
-using platform::Platform;
 using platform::Result;
 using platform::URL;
 using platform::Value;
@@ -27,11 +25,13 @@ void removeClip(MovieClaim& clip) {
 }
 }  // namespace
 
-ClipHandover::ClipHandover(const platform::ExtensionRecordRef& extension, Dictionary userInfo,
-                           ClipHandoverEvents events)
-    : userInfo_(std::move(userInfo)),
+ClipHandover::ClipHandover(const platform::Platform& platform, const platform::ExtensionRecordRef& extension,
+                           Dictionary userInfo, ClipHandoverEvents events)
+
+    : platform_(platform),
+      userInfo_(std::move(userInfo)),
       events_(std::move(events)),
-      use_(Platform::current().extensions->useExtension(extension)) {}
+      use_(platform.extensions->useExtension(extension)) {}
 
 /// Files are finished by several writers at once, so a later clip may be complete before an earlier one.
 void ClipHandover::clipCompleted(int64_t number, ClipFile clip, bool finished, std::function<void()> handed) {
@@ -139,7 +139,7 @@ void ClipHandover::awaitLastRequests() {
   std::unique_lock lock(mutex_);
   isFinished_ = true;
   // It holds this until the extension is let go, whatever becomes of the session.
-  auto deadline = AnswerDeadline::start(kLastClipsPatience, [self = shared_from_this()](bool isLate) {
+  auto deadline = AnswerDeadline::start(platform_, kLastClipsPatience, [self = shared_from_this()](bool isLate) {
     if (isLate) QV_LOG_ERROR(logs::kSession, "the broadcast extension did not finish its last clips in time");
     std::shared_ptr<platform::ExtensionUse> ended;
     std::lock_guard releaseLock(self->mutex_);

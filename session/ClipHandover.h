@@ -35,7 +35,8 @@ class ClipHandover : public std::enable_shared_from_this<ClipHandover> {
   /// For what is left to be sent after the end of the broadcast.
   static constexpr std::chrono::seconds kLastClipsPatience{120};
 
-  ClipHandover(const platform::ExtensionRecordRef& extension, platform::Dictionary userInfo, ClipHandoverEvents events);
+  ClipHandover(const platform::Platform& platform, const platform::ExtensionRecordRef& extension,
+               platform::Dictionary userInfo, ClipHandoverEvents events);
 
   /// The clip of this number, from 1, is complete; nothing where it came to no movie. `handed` (may be empty) runs when
   /// it and all before it were handed over.
@@ -57,6 +58,7 @@ class ClipHandover : public std::enable_shared_from_this<ClipHandover> {
   void loadReturnedItem(const platform::ExtensionItem& item);
   void awaitLastRequests();
 
+  const platform::Platform& platform_;
   const platform::Dictionary userInfo_;
   const ClipHandoverEvents events_;
 

@@ -3,7 +3,6 @@
 #include <utility>
 
 #include "platform/threads/Log.h"
-#include "session/MovieNames.h"
 #include "session/PictureTransform.h"
 #include "support/QuorvelErrors.h"
 
@@ -25,9 +24,9 @@ void finishClip(const std::shared_ptr<ClipHandover>& handover, const Clip& clip,
 
 }  // namespace
 
-ClipsOutput::ClipsOutput(std::shared_ptr<QVTemporaryMovies> movies, Clips clips, QVBroadcastInfo info,
+ClipsOutput::ClipsOutput(std::shared_ptr<RecordingContext> context, Clips clips, QVBroadcastInfo info,
                          OutputEvents events)
-    : movies_(std::move(movies)),
+    : context_(std::move(context)),
       clips_(std::move(clips)),
       info_(std::move(info)),
       events_(std::move(events)),
@@ -39,12 +38,11 @@ void ClipsOutput::start(ReadyHandler handler) {
     if (const auto self = weak.lock()) self->configurationReceived(configuration);
   };
   events.serviceInfoReceived = events_.serviceInfoReceived;
-  events.extensionFailed = [failed = events_.failed] {
-    failed(_qvUserErrorForCode(errorcode::kInvalidBroadcastSession));
-  };
-  handover_ = std::make_shared<ClipHandover>(info_.extension, info_.extensionUserInfo, std::move(events));
+  events.extensionFailed = [failed = events_.failed] { failed(recordingError(errorcode::kInvalidBroadcastSession)); };
+  handover_ =
+      std::make_shared<ClipHandover>(context_->platform, info_.extension, info_.extensionUserInfo, std::move(events));
   cutter_ = std::make_shared<ClipCutter>(
-      [this](int64_t number) { return makeClip(number, clips_.windowSize); },
+      context_->platform, [this](int64_t number) { return makeClip(number, clips_.windowSize); },
       [handover = handover_](const Clip& clip) { finishClip(handover, clip, false, nullptr); });
   cutter_->setConfiguration(configuration_.load());
   const Clip first = makeClip(1, clips_.size);
@@ -53,8 +51,8 @@ void ClipsOutput::start(ReadyHandler handler) {
 }
 
 Clip ClipsOutput::makeClip(int64_t number, platform::Size size) {
-  auto file = movies_->claimNew(clipPath(clips_.bundleID, number));
-  auto writer = std::make_shared<QVMovieWriter>(size, file->path());
+  auto file = context_->movies->claimNew(context_->names.clipPath(clips_.bundleID, number));
+  auto writer = std::make_shared<QVMovieWriter>(context_->platform, size, file->path());
   writer->setBroadcastConfig(configuration_.load());
   writer->setSystemRecording(clips_.systemRecording);
   return {number, std::move(file), std::move(writer)};

@@ -8,6 +8,7 @@
 #include "session/ClipCutter.h"
 #include "session/ClipHandover.h"
 #include "session/RecordingOutput.h"
+#include "session/RecordingSettings.h"
 
 namespace qv {
 
@@ -22,7 +23,7 @@ class ClipsOutput final : public RecordingOutput, public std::enable_shared_from
     platform::Size windowSize;
     bool systemRecording = false;
   };
-  ClipsOutput(std::shared_ptr<QVTemporaryMovies> movies, Clips clips, QVBroadcastInfo info, OutputEvents events);
+  ClipsOutput(std::shared_ptr<RecordingContext> context, Clips clips, QVBroadcastInfo info, OutputEvents events);
 
   void start(ReadyHandler handler) override;
   [[nodiscard]] bool appendVideo(const PlacedPicture& picture) override;
@@ -36,7 +37,7 @@ class ClipsOutput final : public RecordingOutput, public std::enable_shared_from
   [[nodiscard]] Clip makeClip(int64_t number, platform::Size size);
   void configurationReceived(const QVBroadcastConfiguration& configuration);
 
-  const std::shared_ptr<QVTemporaryMovies> movies_;
+  const std::shared_ptr<RecordingContext> context_;
   const Clips clips_;
   const QVBroadcastInfo info_;
   const OutputEvents events_;

@@ -2,13 +2,7 @@
 
 #include <algorithm>
 
-#include "platform/Platform.h"
-#include "support/QVBundleTexts.h"
-#include "support/QVTemporaryFiles.h"
-
 namespace qv {
-
-using platform::Platform;
 
 namespace {
 
@@ -27,29 +21,32 @@ std::string fileNameFromDisplayName(std::string name) {
   return name;
 }
 
-std::string movieName(const std::string& bundleID) {
-  const auto displayName = _qvLocalizedAppNameFromBundleID(bundleID);
+}  // namespace
+
+std::string MovieNames::movieName(const std::string& bundleID) const {
+  const auto displayName = texts_._qvLocalizedAppNameFromBundleID(bundleID);
   const std::string name = fileNameFromDisplayName(displayName.value_or(std::string()));
   return name.empty() ? fileNameFromDisplayName(bundleID) : name;
 }
 
-}  // namespace
+std::string MovieNames::applicationMoviePath(const std::string& bundleID) const {
+  return files_.pathInStore(movieName(bundleID) + ".mp4");
+}
 
-std::string applicationMoviePath(const std::string& bundleID) { return pathInStore(movieName(bundleID) + ".mp4"); }
-
-std::string screenMoviePath() {
-  Platform& platform = Platform::current();
-  std::string date = platform.localization->formatDate(platform.clock->now(), "MM-dd-yyyy HH:mm:ss");
+std::string MovieNames::screenMoviePath() const {
+  std::string date = platform_.localization->formatDate(platform_.clock->now(), "MM-dd-yyyy HH:mm:ss");
   std::replace(date.begin(), date.end(), ':', '-');
-  return pathInStore("ScreenRecording_" + date + ".mp4");
+  return files_.pathInStore("ScreenRecording_" + date + ".mp4");
 }
 
-std::string clipPath(const std::string& bundleID, int64_t broadcastFragmentIndex) {
-  return pathInStore("QVMovie_" + fileNameFromDisplayName(bundleID) + "_" +
-                     std::to_string(Platform::current().clock->now().secondsSince1970) + "_" +
-                     std::to_string(broadcastFragmentIndex) + ".mp4");
+std::string MovieNames::clipPath(const std::string& bundleID, int64_t broadcastFragmentIndex) const {
+  return files_.pathInStore("QVMovie_" + fileNameFromDisplayName(bundleID) + "_" +
+                            std::to_string(platform_.clock->now().secondsSince1970) + "_" +
+                            std::to_string(broadcastFragmentIndex) + ".mp4");
 }
 
-std::string trimmedOutputPath(const std::string& bundleID) { return pathInStore(movieName(bundleID) + "_trimmed.mp4"); }
+std::string MovieNames::trimmedOutputPath(const std::string& bundleID) const {
+  return files_.pathInStore(movieName(bundleID) + "_trimmed.mp4");
+}
 
 }  // namespace qv

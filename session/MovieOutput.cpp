@@ -10,8 +10,8 @@ namespace qv {
 using platform::URL;
 namespace logs = platform::logs;
 
-MovieOutput::MovieOutput(std::shared_ptr<QVTemporaryMovies> movies, Movie movie)
-    : movies_(std::move(movies)), movie_(std::move(movie)) {}
+MovieOutput::MovieOutput(std::shared_ptr<RecordingContext> context, Movie movie)
+    : context_(std::move(context)), movie_(std::move(movie)) {}
 
 std::shared_ptr<MovieClaim> MovieOutput::claim() const {
   std::lock_guard lock(mutex_);
@@ -29,7 +29,7 @@ std::string MovieOutput::moviePath() const {
 }
 
 void MovieOutput::prepare(ReadyHandler handler) {
-  movies_->claimForRecording(
+  context_->movies->claimForRecording(
       movie_.path, movie_.bundleID,
       [weak = weak_from_this(), handler = std::move(handler)](std::shared_ptr<MovieClaim> claim) {
         const auto self = weak.lock();
@@ -43,7 +43,7 @@ void MovieOutput::prepare(ReadyHandler handler) {
 }
 
 void MovieOutput::start(ReadyHandler handler) {
-  auto writer = std::make_shared<QVMovieWriter>(movie_.size, moviePath());
+  auto writer = std::make_shared<QVMovieWriter>(context_->platform, movie_.size, moviePath());
   writer->setSystemRecording(movie_.systemRecording);
   {
     std::lock_guard lock(mutex_);

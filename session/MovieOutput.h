@@ -5,6 +5,7 @@
 #include <string>
 
 #include "session/RecordingOutput.h"
+#include "session/RecordingSettings.h"
 #include "writer/QVMovieWriter.h"
 
 namespace qv {
@@ -20,7 +21,7 @@ class MovieOutput final : public RecordingOutput, public std::enable_shared_from
     platform::Size size;   ///< of the pictures as they are coded
     bool systemRecording = false;
   };
-  MovieOutput(std::shared_ptr<QVTemporaryMovies> movies, Movie movie);
+  MovieOutput(std::shared_ptr<RecordingContext> context, Movie movie);
 
   void prepare(ReadyHandler handler) override;
   void start(ReadyHandler handler) override;
@@ -38,7 +39,7 @@ class MovieOutput final : public RecordingOutput, public std::enable_shared_from
   [[nodiscard]] std::shared_ptr<MovieClaim> claim() const;
   [[nodiscard]] std::shared_ptr<QVMovieWriter> writer() const;
 
-  const std::shared_ptr<QVTemporaryMovies> movies_;
+  const std::shared_ptr<RecordingContext> context_;
   const Movie movie_;
   mutable std::mutex mutex_;
   std::shared_ptr<MovieClaim> claim_;

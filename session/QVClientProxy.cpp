@@ -8,8 +8,9 @@ using platform::Data;
 using platform::Value;
 namespace logs = platform::logs;
 
-QVClientProxy::QVClientProxy(std::string bundleIdentifier, const std::shared_ptr<platform::IPCConnection>& connection)
-    : bundleIdentifier_(std::move(bundleIdentifier)), connection_(connection) {}
+QVClientProxy::QVClientProxy(const QuorvelErrors& errors, std::string bundleIdentifier,
+                             const std::shared_ptr<platform::IPCConnection>& connection)
+    : errors_(errors), bundleIdentifier_(std::move(bundleIdentifier)), connection_(connection) {}
 
 void QVClientProxy::send(const char* member, platform::IPCArguments arguments, const char* failureLine,
                          const std::shared_ptr<platform::RareLog>& failures) {
@@ -35,7 +36,7 @@ void QVClientProxy::stopRecordingWithError(const std::optional<platform::Error>&
                                            const std::optional<platform::URL>& movieURL) {
   QV_LOG(logs::kDaemon, "QVClientProxy:stopRecordingWithError:movieURL:");
   send("stopRecordingWithError",
-       {Value(platform::encodeError(error)), Value(movieURL ? movieURL->absoluteString() : std::string())},
+       {Value(errors_.encoded(error)), Value(movieURL ? movieURL->absoluteString() : std::string())},
        "QVClientProxy:recordingDidStopWithError: error getting remote proxy: %d");
 }
 
@@ -74,7 +75,7 @@ void QVClientProxy::captureTimelineDidChange(Data pauses) {
 
 void QVClientProxy::recordingLockInterrupted(const platform::Error& error) {
   QV_LOG(logs::kDaemon, "QVClientProxy:recordingLockInterrupted:");
-  send("recordingLockInterrupted", {Value(platform::encodeError(error))},
+  send("recordingLockInterrupted", {Value(errors_.encoded(error))},
        "QVClientProxy:recordingLockInterrupted: error getting remote proxy: %d");
 }
 

@@ -8,6 +8,7 @@
 #include "platform/threads/Guarded.h"
 #include "platform/threads/RareLog.h"
 #include "protocol/QVSharedFrameObject.h"
+#include "support/QuorvelErrors.h"
 
 namespace qv {
 
@@ -18,7 +19,9 @@ namespace qv {
 /// Threading: thread-safe; called from the manager sequence and from capture threads.
 class QVClientProxy {
  public:
-  QVClientProxy(std::string bundleIdentifier, const std::shared_ptr<platform::IPCConnection>& connection);
+  /// The errors' texts are borrowed, and must outlive this.
+  QVClientProxy(const QuorvelErrors& errors, std::string bundleIdentifier,
+                const std::shared_ptr<platform::IPCConnection>& connection);
 
   /// Nothing when the client has gone or was replaced.
   [[nodiscard]] std::shared_ptr<platform::IPCConnection> connection() const { return connection_.load().lock(); }
@@ -47,6 +50,7 @@ class QVClientProxy {
   void send(const char* member, platform::IPCArguments arguments, const char* failureLine,
             const std::shared_ptr<platform::RareLog>& failures = nullptr);
 
+  const QuorvelErrors& errors_;
   const std::string bundleIdentifier_;
   /// Failures come back later than this may live.
   const std::shared_ptr<platform::RareLog> lostFrames_ = std::make_shared<platform::RareLog>();

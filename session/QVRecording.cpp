@@ -2,13 +2,11 @@
 
 #include <utility>
 
-#include "platform/Platform.h"
 #include "platform/threads/Log.h"
 
 namespace qv {
 
 using platform::Error;
-using platform::Platform;
 namespace logs = platform::logs;
 
 QVRecording::QVRecording(std::shared_ptr<RecordingContext> context, RecordingSettings settings, StartAnswer answer,
@@ -20,7 +18,7 @@ QVRecording::QVRecording(std::shared_ptr<RecordingContext> context, RecordingSet
       answer_(std::move(answer)),
       contextIDs_(settings_.contextIDs) {
   QV_LOG(logs::kDaemon, "starting...");
-  transaction_.emplace(*Platform::current().keepAlive);
+  transaction_.emplace(*context_->platform.keepAlive);
 }
 
 QVRecording::~QVRecording() = default;
@@ -54,7 +52,7 @@ void QVRecording::prepare(std::function<void()> handler) {
 void QVRecording::startSessionWithHandler(int32_t processID, std::function<void()> handler) {
   if (!isRecording()) return;
   QV_LOG(logs::kSession, "QVRecordingSession: startSession");
-  reportingAgent_ = std::make_unique<QVReportingAgent>(_serviceNameForReporting());
+  reportingAgent_ = std::make_unique<QVReportingAgent>(_serviceNameForReporting(), *context_->platform.metrics);
   {
     std::lock_guard lock(shouldStopLock_);
     frontmostPIDForAudioTap_ = processID;
@@ -93,7 +91,7 @@ void QVRecording::pauseSession() {
     if (state_ != State::Running) return;
     state_ = State::Paused;
     // A pause that no picture has closed goes on.
-    if (!timing_.isInPause()) stoppedAt_ = Platform::current().clock->hostTime();
+    if (!timing_.isInPause()) stoppedAt_ = context_->platform.clock->hostTime();
     sources = std::move(sources_);
   }
   QV_LOG(logs::kSession, "QVRecordingSession: pauseSession");

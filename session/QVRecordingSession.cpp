@@ -20,7 +20,7 @@ std::shared_ptr<QVRecording> QVRecordingSession::beginRecording(RecordingSetting
   microphoneEnabled_ = settings.microphoneEnabled;
   recording_ = std::make_shared<QVRecording>(context_, std::move(settings), std::move(answer), weak_from_this());
   recording_->setOutput(
-      makeRecordingOutput(*context_, recording_->settings(), outputEvents(recording_), [weakSelf = weak_from_this()] {
+      makeRecordingOutput(context_, recording_->settings(), outputEvents(recording_), [weakSelf = weak_from_this()] {
         const auto self = weakSelf.lock();
         return self ? self->clientProxy() : nullptr;
       }));

@@ -1,8 +1,6 @@
 #include <utility>
 
-#include "platform/Platform.h"
 #include "platform/threads/Log.h"
-#include "session/MovieNames.h"
 #include "session/QVRecording.h"
 #include "support/QuorvelErrors.h"
 #include "writer/QVMovieWriter.h"
@@ -10,7 +8,6 @@
 namespace qv {
 
 using platform::Error;
-using platform::Platform;
 using platform::URL;
 namespace logs = platform::logs;
 
@@ -23,7 +20,7 @@ bool QVRecording::end(RecordingEnd end) {
   {
     std::lock_guard lock(shouldStopLock_);
     if (state_ >= State::Ending) return false;
-    if (state_ == State::Running && !timing_.isInPause()) stoppedAt_ = Platform::current().clock->hostTime();
+    if (state_ == State::Running && !timing_.isInPause()) stoppedAt_ = context_->platform.clock->hostTime();
     state_ = State::Ending;
     end_ = std::move(end);
     // Whoever is to be told stays until the end is complete.
@@ -80,12 +77,12 @@ void QVRecording::outputFinished(const OutputResult& result) {
   // A stop that says success means a whole movie. What there is stays in the store, and is mended at the next start.
   if (end_.handler && result.movie && !result.isSound) {
     QV_LOG_ERROR(logs::kSession, "the movie could not be completed");
-    completeEnd(std::nullopt, _qvUserErrorForCode(errorcode::kFailedToSave));
+    completeEnd(std::nullopt, recordingError(errorcode::kFailedToSave));
     return;
   }
   if (!result.movie) {
     completeEnd(std::nullopt,
-                output_->makesMovie() ? std::optional(_qvUserErrorForCode(errorcode::kFailedToSave)) : std::nullopt);
+                output_->makesMovie() ? std::optional(recordingError(errorcode::kFailedToSave)) : std::nullopt);
   } else if (end_.startClipDuration > 0 && end_.endClipDuration > 0) {
     trimMovie(result.movie);
   } else {
@@ -96,8 +93,9 @@ void QVRecording::outputFinished(const OutputResult& result) {
 /// The untrimmed movie goes when the trimmed one is known to be there.
 void QVRecording::trimMovie(const std::shared_ptr<MovieClaim>& movie) {
   QV_LOG(logs::kSession, "trimming");
-  const auto trimmed = context_->movies->claimTrimmed(trimmedOutputPath(settings_.bundleID), settings_.bundleID);
-  auto writer = std::make_shared<QVMovieWriter>(settings_.windowSize, movie->path());
+  const auto trimmed =
+      context_->movies->claimTrimmed(context_->names.trimmedOutputPath(settings_.bundleID), settings_.bundleID);
+  auto writer = std::make_shared<QVMovieWriter>(context_->platform, settings_.windowSize, movie->path());
   writer->trimMovieWithURL(
       movie->url(), end_.startClipDuration, end_.endClipDuration, trimmed->url(),
       [self = shared_from_this(), movie, trimmed](const std::optional<URL>& url) {
@@ -140,7 +138,7 @@ void QVRecording::completeEnd(const std::optional<URL>& movie, const std::option
 
 void QVRecording::report(const std::optional<URL>& movie) {
   if (!answer_.isGiven()) {
-    answer_.refused(end_.cause.value_or(_qvUserErrorForCode(errorcode::kInterrupted)));
+    answer_.refused(end_.cause.value_or(recordingError(errorcode::kInterrupted)));
   } else if (end_.cause) {
     if (endObserver_) endObserver_->recordingStopped(shared_from_this(), *end_.cause, movie);
   }
@@ -162,7 +160,7 @@ std::string QVRecording::_serviceNameForReporting() const {
 
 uint64_t QVRecording::getRecordedFileSize() const {
   if (reportingAgent_->serviceName() != kSystemRecording && reportingAgent_->serviceName() != kInAppRecording) return 0;
-  const auto attributes = Platform::current().fileSystem->attributesOfItem(output_->moviePath());
+  const auto attributes = context_->platform.fileSystem->attributesOfItem(output_->moviePath());
   if (!attributes) {
     QV_LOG_ERROR(logs::kSession, "error getting recordedFileSize :%ld", static_cast<long>(attributes.error().code));
     return 0;

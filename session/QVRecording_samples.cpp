@@ -63,8 +63,9 @@ void QVRecording::_processSampleBuffer(const SampleBufferRef& sample, uint64_t t
   }
   if (accepted) return;
   QV_LOG_ERROR(logs::kSession, "QVRecordingSession: failed to start writer when appending video sample");
-  const bool isDiskFull = isLackOfSpace(failure) || !_srDeviceHasSufficientFreeSpaceToContinueRecording();
-  fail(_qvUserErrorForCode(isDiskFull ? errorcode::kInsufficientStorage : errorcode::kFailedToSave));
+  const bool isDiskFull =
+      isLackOfSpace(failure) || !context_->space._srDeviceHasSufficientFreeSpaceToContinueRecording();
+  fail(recordingError(isDiskFull ? errorcode::kInsufficientStorage : errorcode::kFailedToSave));
 }
 
 /// Sound comes later than it was captured: a pause and the end leave out only what was captured after they began. What
@@ -104,17 +105,17 @@ void QVRecording::handleMicrophone(const SampleBufferRef& sample) {
 
 void QVRecording::screenCaptureControllerDidFailWithStatus(platform::ScreenCaptureController&, int32_t) {
   QV_LOG_ERROR(logs::kSession, "QVRecordingSession: screenCaptureController: didFailWithStatus:");
-  fail(_qvUserErrorForCode(errorcode::kMediaServicesFailed));
+  fail(recordingError(errorcode::kMediaServicesFailed));
 }
 
 void QVRecording::screenCaptureControllerWasPreempted(platform::ScreenCaptureController&) {
   QV_LOG(logs::kSession, "QVRecordingSession: screenCaptureControllerWasPreempted");
-  fail(_qvUserErrorForCode(errorcode::kInterrupted));
+  fail(recordingError(errorcode::kInterrupted));
 }
 
 void QVRecording::screenCaptureControllerMediaServicesWereReset(platform::ScreenCaptureController&) {
   QV_LOG_ERROR(logs::kSession, "QVRecordingSession: screenCaptureControllerMediaServicesWereReset");
-  fail(_qvUserErrorForCode(errorcode::kMediaServicesFailed));
+  fail(recordingError(errorcode::kMediaServicesFailed));
 }
 
 }  // namespace qv

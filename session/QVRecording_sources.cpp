@@ -1,6 +1,5 @@
 #include <utility>
 
-#include "platform/Platform.h"
 #include "platform/threads/Log.h"
 #include "session/QVRecording.h"
 #include "support/QVBundleTexts.h"
@@ -8,7 +7,6 @@
 namespace qv {
 
 using platform::DisplayCloneMode;
-using platform::Platform;
 using platform::SampleBufferRef;
 namespace logs = platform::logs;
 
@@ -55,7 +53,7 @@ std::unique_ptr<RecordingSources> QVRecording::startSources() {
                                                             screen->startCapture();
                                                         });
   }
-  sources->captureStartTime = Platform::current().clock->now();
+  sources->captureStartTime = context_->platform.clock->now();
   return sources;
 }
 
@@ -80,7 +78,7 @@ void QVRecording::stopAllCapture(std::unique_ptr<RecordingSources> sources) {
   if (!sources) return;
   QV_LOG(logs::kSession, "QVRecordingSession: stopAllCapture");
   if (const auto started = sources->captureStartTime) {
-    reportingAgent_->addActiveDuration(Platform::current().clock->now().secondsSince1970 - started->secondsSince1970);
+    reportingAgent_->addActiveDuration(context_->platform.clock->now().secondsSince1970 - started->secondsSince1970);
   }
 }
 
@@ -137,7 +135,7 @@ void QVRecording::checkAndStopAppAudioForPID(int32_t processID) {
 /// Only the first application of a broadcast is told to its extension.
 void QVRecording::updateBundleIdForFirstForegroundApp() {
   if (!settings_.broadcast || bundleIDOfFirstForegroundApp_) return;
-  const auto bundle = bundleWithPID(frontmostPIDForAudioTap());
+  const auto bundle = context_->texts.bundleWithPID(frontmostPIDForAudioTap());
   if (!bundle) return;
   bundleIDOfFirstForegroundApp_ = bundle->bundleIdentifier();
   output_->tellFrontmostApplication(bundle->bundleIdentifier());

@@ -2,7 +2,6 @@
 
 #include <cmath>
 
-#include "platform/Platform.h"
 #include "platform/threads/Log.h"
 
 namespace qv {
@@ -86,7 +85,7 @@ void QVReportingAgent::reportEventWithType(uint16_t eventType, const Dictionary&
   message.category = eventType;
   message.type = 0;
   message.payload = dictionary;
-  if (const auto error = platform::Platform::current().metrics->sendMessage(message)) {
+  if (const auto error = metrics_.sendMessage(message)) {
     QV_LOG_ERROR(logs::kSession, "eventType:%d error code %d.", eventType, static_cast<int>(error->code));
   }
 }

@@ -4,6 +4,7 @@
 #include <cstdint>
 #include <string>
 
+#include "platform/Metrics.h"
 #include "platform/base/Geometry.h"
 #include "platform/base/Value.h"
 #include "platform/threads/Guarded.h"
@@ -21,7 +22,9 @@ class QVReportingAgent {
  public:
   static constexpr uint16_t kSessionSummaryEvent = 1;
 
-  explicit QVReportingAgent(std::string serviceName) : serviceName_(std::move(serviceName)) {}
+  /// The reporter is borrowed, and must outlive this.
+  QVReportingAgent(std::string serviceName, platform::MetricsReporter& metrics)
+      : serviceName_(std::move(serviceName)), metrics_(metrics) {}
 
   [[nodiscard]] const std::string& serviceName() const { return serviceName_; }
   void addVideoFrame() { ++videoFrameCount_; }
@@ -48,6 +51,7 @@ class QVReportingAgent {
 
  private:
   const std::string serviceName_;
+  platform::MetricsReporter& metrics_;
   std::atomic<bool> frontCameraUsed_{false};
   std::atomic<bool> backCameraUsed_{false};
   std::atomic<double> activeDuration_{0};

@@ -4,7 +4,6 @@
 
 #include "platform/threads/Log.h"
 #include "session/ClipsOutput.h"
-#include "session/MovieNames.h"
 #include "session/MovieOutput.h"
 #include "session/SamplesOutput.h"
 #include "session/VideoSize.h"
@@ -28,22 +27,24 @@ platform::Size codedSize(const RecordingSettings& settings) {
 
 }  // namespace
 
-std::shared_ptr<RecordingOutput> makeRecordingOutput(const RecordingContext& context, const RecordingSettings& settings,
-                                                     OutputEvents events, ClientOutput::Client client) {
+std::shared_ptr<RecordingOutput> makeRecordingOutput(const std::shared_ptr<RecordingContext>& context,
+                                                     const RecordingSettings& settings, OutputEvents events,
+                                                     ClientOutput::Client client) {
   const platform::Size size = codedSize(settings);
   if (const auto& broadcast = settings.broadcast) {
     QV_LOG(logs::kSession, "QVRecordingSession: enableBroadcastWithExtension");
     if (broadcast->info.extensionProcessMode == BroadcastProcessMode::Samples) {
-      return std::make_shared<SamplesOutput>(*broadcast, std::move(events));
+      return std::make_shared<SamplesOutput>(context->platform, *broadcast, std::move(events));
     }
     return std::make_shared<ClipsOutput>(
-        context.movies, ClipsOutput::Clips{settings.bundleID, size, settings.windowSize, settings.systemRecording},
+        context, ClipsOutput::Clips{settings.bundleID, size, settings.windowSize, settings.systemRecording},
         broadcast->info, std::move(events));
   }
   QV_LOG(logs::kSession, "QVRecordingSession: disableBroadcast");
   if (settings.captureEnabled) return std::make_shared<ClientOutput>(std::move(client));
-  const std::string path = settings.systemRecording ? screenMoviePath() : applicationMoviePath(settings.bundleID);
-  return std::make_shared<MovieOutput>(context.movies,
+  const std::string path = settings.systemRecording ? context->names.screenMoviePath()
+                                                    : context->names.applicationMoviePath(settings.bundleID);
+  return std::make_shared<MovieOutput>(context,
                                        MovieOutput::Movie{path, settings.bundleID, size, settings.systemRecording});
 }
 

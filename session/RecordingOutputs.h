@@ -10,7 +10,7 @@ namespace qv {
 
 /// The output of a recording with these settings: an extension where it is a broadcast, else the client where it is a
 /// capture, else a movie.
-[[nodiscard]] std::shared_ptr<RecordingOutput> makeRecordingOutput(const RecordingContext& context,
+[[nodiscard]] std::shared_ptr<RecordingOutput> makeRecordingOutput(const std::shared_ptr<RecordingContext>& context,
                                                                    const RecordingSettings& settings,
                                                                    OutputEvents events, ClientOutput::Client client);
 

@@ -25,9 +25,9 @@ void SamplesOutput::letGo() {
 Result<SamplesOutput::Link> SamplesOutput::makeLink() const {
   QV_LOG(logs::kSession, "setting up extension proxy");
   if (plan_.listenerEndpoint.isValid()) {
-    return QVBroadcastExtensionProxy::withBroadcastUploadListenerEndpoint(plan_.listenerEndpoint);
+    return QVBroadcastExtensionProxy::withBroadcastUploadListenerEndpoint(platform_, plan_.listenerEndpoint);
   }
-  return QVBroadcastExtensionProxy::withBroadcastUploadExtension(plan_.info.extension);
+  return QVBroadcastExtensionProxy::withBroadcastUploadExtension(platform_, plan_.info.extension);
 }
 
 void SamplesOutput::prepare(ReadyHandler handler) {
@@ -99,11 +99,12 @@ void SamplesOutput::finish(platform::MediaTime, FinishHandler handler) {
 
 void SamplesOutput::notifyExtensionAndWait(BroadcastAction action, std::function<void()> completion) {
   auto deadline = AnswerDeadline::start(
-      kExtensionPatience, [self = shared_from_this(), action, completion = std::move(completion)](bool isLate) {
+      platform_, kExtensionPatience,
+      [self = shared_from_this(), action, completion = std::move(completion)](bool isLate) {
         if (isLate) {
           QV_LOG_ERROR(logs::kSession, "the broadcast extension has not answered action %i in time",
                        static_cast<int>(action));
-          self->linkFailed(_qvUserErrorForCode(errorcode::kInvalidBroadcastSession));
+          self->linkFailed(recordingError(errorcode::kInvalidBroadcastSession));
         }
         completion();
       });

@@ -20,7 +20,8 @@ namespace qv {
 /// Threading: as its contract says.
 class SamplesOutput final : public RecordingOutput, public std::enable_shared_from_this<SamplesOutput> {
  public:
-  SamplesOutput(BroadcastPlan plan, OutputEvents events) : plan_(std::move(plan)), events_(std::move(events)) {}
+  SamplesOutput(const platform::Platform& platform, BroadcastPlan plan, OutputEvents events)
+      : platform_(platform), plan_(std::move(plan)), events_(std::move(events)) {}
   /// Ends the link, and the extension with it.
   ~SamplesOutput() override;
 
@@ -52,6 +53,7 @@ class SamplesOutput final : public RecordingOutput, public std::enable_shared_fr
   void _notifyExtensionOfAudioSampleBuffer(const PlacedSound& sound, SampleType type);
   void _notifyExtensionOfFrontmostProcessBundleID(const std::string& bundleID);
 
+  const platform::Platform& platform_;
   const BroadcastPlan plan_;
   const OutputEvents events_;
   std::mutex mutex_;

@@ -2,19 +2,18 @@
 
 #include <utility>
 
-#include "support/QuorvelErrors.h"
-
 namespace qv {
 
 using platform::Value;
 
-StartAnswer::StartAnswer(platform::IPCReply reply) : reply_(std::move(reply)) {}
+StartAnswer::StartAnswer(const QuorvelErrors& errors, platform::IPCReply reply)
+    : errors_(&errors), reply_(std::move(reply)) {}
 
 StartAnswer::StartAnswer(StartAnswer&& other) noexcept
-    : reply_(std::move(other.reply_)), isGiven_(std::exchange(other.isGiven_, true)) {}
+    : errors_(other.errors_), reply_(std::move(other.reply_)), isGiven_(std::exchange(other.isGiven_, true)) {}
 
 StartAnswer::~StartAnswer() {
-  if (!isGiven_) refused(_qvUserErrorForCode(errorcode::kInterrupted));
+  if (!isGiven_) refused(recordingError(errorcode::kInterrupted));
 }
 
 void StartAnswer::started(RecordedInputs inputs) { give(std::nullopt, inputs); }
@@ -23,7 +22,7 @@ void StartAnswer::refused(const platform::Error& error) { give(error, {}); }
 
 void StartAnswer::give(const std::optional<platform::Error>& error, RecordedInputs inputs) {
   if (std::exchange(isGiven_, true)) return;
-  reply_({Value(platform::encodeError(error)), Value(inputs.microphone), Value(inputs.camera)});
+  reply_({Value(errors_->encoded(error)), Value(inputs.microphone), Value(inputs.camera)});
   reply_ = {};
 }
 

@@ -1,6 +1,7 @@
 #pragma once
 
 #include "platform/IPC.h"
+#include "support/QuorvelErrors.h"
 
 namespace qv {
 
@@ -16,7 +17,8 @@ struct RecordedInputs {
 /// Threading: thread-safe as its reply is; one owner at a time.
 class StartAnswer {
  public:
-  explicit StartAnswer(platform::IPCReply reply);
+  /// The errors' texts are borrowed, and must outlive this.
+  StartAnswer(const QuorvelErrors& errors, platform::IPCReply reply);
   ~StartAnswer();
   StartAnswer(StartAnswer&& other) noexcept;
   StartAnswer& operator=(StartAnswer&&) = delete;
@@ -28,6 +30,7 @@ class StartAnswer {
  private:
   void give(const std::optional<platform::Error>& error, RecordedInputs inputs);
 
+  const QuorvelErrors* errors_;
   platform::IPCReply reply_;
   bool isGiven_ = false;
 };

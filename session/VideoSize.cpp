@@ -1,11 +1,9 @@
 #include "session/VideoSize.h"
 
-#include "platform/Platform.h"
 #include "platform/threads/Log.h"
 
 namespace qv {
 
-using platform::Platform;
 using platform::Size;
 namespace logs = platform::logs;
 
@@ -16,16 +14,15 @@ constexpr double kSmallTabletMaximumSide = 1600.0;
 constexpr int64_t kSmallTabletChip = 0x8960;
 }  // namespace
 
-int64_t chipId() { return Platform::current().deviceInfo->integerProperty("ChipID"); }
+int64_t chipId(platform::DeviceInfoQuery& device) { return device.integerProperty("ChipID"); }
 
-Size _maximumSizeWithSize(Size size) {
-  Platform& platform = Platform::current();
-  if (platform.preferences->valueForKey(kPreferenceDomain, "QVFullResCapture").asBool()) {
+Size _maximumSizeWithSize(Size size, platform::PreferenceStore& preferences, platform::DeviceInfoQuery& device) {
+  if (preferences.valueForKey(kPreferenceDomain, "QVFullResCapture").asBool()) {
     QV_LOG(logs::kSession, "full res capture enabled");
     return size;
   }
   const bool isSmallTablet =
-      platform.deviceInfo->userInterfaceIdiom() == platform::UserInterfaceIdiom::Tablet && chipId() == kSmallTabletChip;
+      device.userInterfaceIdiom() == platform::UserInterfaceIdiom::Tablet && chipId(device) == kSmallTabletChip;
   const double limit = isSmallTablet ? kSmallTabletMaximumSide : kMaximumSide;
   if (size.height > limit) {
     size.width *= limit / size.height;

@@ -3,8 +3,6 @@
 #include <filesystem>
 #include <utility>
 
-#include "platform/Platform.h"
-
 namespace qv {
 namespace {
 
@@ -50,7 +48,7 @@ std::string MovieBook::takeForCopy(const std::string& path, const std::string& b
 }
 
 std::string MovieBook::takeUnused(const std::string& path) {
-  platform::FileSystem& disk = *platform::Platform::current().fileSystem;
+  platform::FileSystem& disk = files_.disk();
   return take(path, {},
               [&](const std::string& candidate, const Movie* movie) { return !movie && !disk.itemExists(candidate); });
 }

@@ -7,6 +7,8 @@
 #include <string>
 #include <vector>
 
+#include "support/QVTemporaryFiles.h"
+
 namespace qv {
 
 /// Which path of the temporary store is in whose hands. A path that is not in the book is nobody's. Paths are lexically
@@ -16,6 +18,9 @@ namespace qv {
 class MovieBook {
  public:
   using Continuation = std::function<void()>;
+
+  explicit MovieBook(QVTemporaryFiles files) : files_(files) {}
+  [[nodiscard]] const QVTemporaryFiles& files() const { return files_; }
 
   /// What is done with this application's own movie at that path, which it was handed and never saved.
   enum class OwnMovie { Replace, Keep };
@@ -66,6 +71,7 @@ class MovieBook {
                    const std::function<bool(const std::string&, const Movie*)>& mayTake);
   static bool isHandedTo(const Movie* movie, const std::string& bundleID);
 
+  const QVTemporaryFiles files_;
   mutable std::mutex mutex_;
   // Guarded by mutex_:
   std::map<std::string, Movie> movies_;

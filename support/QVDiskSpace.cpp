@@ -1,25 +1,21 @@
 #include "support/QVDiskSpace.h"
 
-#include "platform/Platform.h"
-#include "support/QVTemporaryFiles.h"
-
 namespace qv {
-namespace {
 
-platform::Result<uint64_t> freeBytes() {
-  return platform::Platform::current().fileSystem->freeSizeOfFileSystem(_srTempPath());
+platform::Result<uint64_t> QVDiskSpace::freeBytes() const {
+  return files_.disk().freeSizeOfFileSystem(files_._srTempPath());
 }
 
-}  // namespace
-
-uint64_t _srDeviceFreeDiskSpace() {
+uint64_t QVDiskSpace::_srDeviceFreeDiskSpace() const {
   const auto bytes = freeBytes();
   return bytes ? bytes.value() : 0;
 }
 
-bool _srDeviceHasSufficientFreeSpaceForRecording() { return _srDeviceFreeDiskSpace() > kMinimumFreeSpaceForRecording; }
+bool QVDiskSpace::_srDeviceHasSufficientFreeSpaceForRecording() const {
+  return _srDeviceFreeDiskSpace() > kMinimumFreeSpaceForRecording;
+}
 
-bool _srDeviceHasSufficientFreeSpaceToContinueRecording() {
+bool QVDiskSpace::_srDeviceHasSufficientFreeSpaceToContinueRecording() const {
   const auto bytes = freeBytes();
   return !bytes || bytes.value() >= kMinimumFreeSpaceWhileRecording;
 }

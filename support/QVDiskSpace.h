@@ -3,13 +3,14 @@
 #include <chrono>
 #include <cstdint>
 
+#include "platform/base/Result.h"
+#include "support/QVTemporaryFiles.h"
+
 /// How much room the disk of the temporary store must have for what. One policy: whoever starts a recording asks here,
 /// and whoever watches the disk while one runs is given these figures.
 ///
 /// When the free space falls below a threshold, space is asked for with the threshold's urgency, 1 to 3. Bytes,
 /// decimal.
-///
-/// Threading: thread-safe; the questions look at the disk in the caller's thread.
 namespace qv {
 
 /// A recording starts only with more than this.
@@ -30,10 +31,23 @@ inline constexpr int32_t kUrgencyRemovesMovies = 3;
 /// by urgency 2 can keep its movie.
 inline constexpr std::chrono::seconds kCriticalFor{5};
 
-/// Bytes free on the file system that holds the store; 0 where that cannot be read.
-[[nodiscard]] uint64_t _srDeviceFreeDiskSpace();
-[[nodiscard]] bool _srDeviceHasSufficientFreeSpaceForRecording();
-/// True also where the free space cannot be read: a recording is not given up for that.
-[[nodiscard]] bool _srDeviceHasSufficientFreeSpaceToContinueRecording();
+/// How much room there is, on the disk of the temporary store.
+///
+/// Threading: thread-safe; looks at the disk in the caller's thread.
+class QVDiskSpace {
+ public:
+  explicit QVDiskSpace(const QVTemporaryFiles& files) : files_(files) {}
+
+  /// Bytes free on the file system that holds the store; 0 where that cannot be read.
+  [[nodiscard]] uint64_t _srDeviceFreeDiskSpace() const;
+  [[nodiscard]] bool _srDeviceHasSufficientFreeSpaceForRecording() const;
+  /// True also where the free space cannot be read: a recording is not given up for that.
+  [[nodiscard]] bool _srDeviceHasSufficientFreeSpaceToContinueRecording() const;
+
+ private:
+  [[nodiscard]] platform::Result<uint64_t> freeBytes() const;
+
+  const QVTemporaryFiles files_;
+};
 
 }  // namespace qv

@@ -1,7 +1,5 @@
 #include "support/QVReachability.h"
 
-#include "platform/Platform.h"
-
 namespace qv {
 
 namespace reachability = platform::reachability;
@@ -12,7 +10,7 @@ constexpr const char kProbeHost[] = "www.example.com";
 }  // namespace
 
 bool QVReachability::isNetworkAvailable() {
-  const auto probe = platform::Platform::current().reachability->createProbe(kProbeHost);
+  const auto probe = service_.createProbe(kProbeHost);
   const auto flags = probe ? probe->flags() : std::nullopt;
   if (!flags) return false;
   return (*flags & reachability::kReachable) != 0 && (*flags & reachability::kConnectionRequired) == 0;

@@ -1,5 +1,7 @@
 #pragma once
 
+#include "platform/NetworkReachability.h"
+
 namespace qv {
 
 /// Whether the network is there.
@@ -7,10 +9,13 @@ namespace qv {
 /// Threading: thread-safe.
 class QVReachability {
  public:
-  QVReachability() = delete;
+  explicit QVReachability(platform::NetworkReachabilityService& service) : service_(service) {}
   /// Whether a well-known public web host could be reached now, without making a connection first. Nothing
   /// is sent to that host. Blocks, for a few seconds at most; any failure is a no.
-  [[nodiscard]] static bool isNetworkAvailable();
+  [[nodiscard]] bool isNetworkAvailable();
+
+ private:
+  platform::NetworkReachabilityService& service_;
 };
 
 }  // namespace qv

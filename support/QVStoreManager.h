@@ -3,6 +3,9 @@
 #include <functional>
 #include <string>
 
+#include "platform/StoreLookup.h"
+#include "platform/threads/SerialQueue.h"
+#include "support/QVBundleTexts.h"
 #include "support/QVStoreInfo.h"
 
 namespace qv {
@@ -12,8 +15,10 @@ namespace qv {
 /// Threading: thread-safe.
 class QVStoreManager {
  public:
-  /// The one of the process, made at its first use.
-  static QVStoreManager& sharedManager();
+  /// One for the process. What it is given is borrowed, and must outlive the lookups.
+  QVStoreManager(platform::StoreLookupService& storeLookup, platform::SerialQueue& mainQueue,
+                 const QVBundleTexts& texts)
+      : storeLookup_(storeLookup), mainQueue_(mainQueue), texts_(texts) {}
 
   /// Asks the catalogue and returns. The completion is called once, on the main queue, and always gets a
   /// record: what the catalogue does not know is empty, the name is that of the installed application
@@ -22,7 +27,9 @@ class QVStoreManager {
                                           std::function<void(const QVStoreInfo&)> completionHandler);
 
  private:
-  QVStoreManager() = default;
+  platform::StoreLookupService& storeLookup_;
+  platform::SerialQueue& mainQueue_;
+  const QVBundleTexts& texts_;
 };
 
 }  // namespace qv

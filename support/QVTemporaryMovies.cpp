@@ -4,7 +4,6 @@
 #include <filesystem>
 #include <utility>
 
-#include "platform/Platform.h"
 #include "platform/threads/Guarded.h"
 #include "support/MovieBook.h"
 
@@ -12,35 +11,22 @@ namespace qv {
 namespace {
 
 using platform::Error;
-using platform::Platform;
 using platform::URL;
 using Book = std::shared_ptr<MovieBook>;
 
 std::string normalized(const std::string& path) { return std::filesystem::path(path).lexically_normal().string(); }
 
-/// Whether there is a file of more than no bytes.
-bool isMovieAt(const std::string& path) {
-  const auto attributes = Platform::current().fileSystem->attributesOfItem(path);
-  return attributes && !attributes.value().isDirectory && attributes.value().size > 0;
-}
-
 /// The path is its remover's until the file is gone, and nobody's also where that fails: then it ages out.
 void removeAndRelease(const Book& book, const std::string& path, FileCompletion completion) {
-  _srRemoveFile(URL::fileURL(path), [book, path, completion = std::move(completion)](const auto& error) {
+  book->files()._srRemoveFile(URL::fileURL(path), [book, path, completion = std::move(completion)](const auto& error) {
     book->release(path);
     if (completion) completion(error);
   });
 }
 
-void answerInBackground(FileCompletion completion, std::optional<Error> error) {
-  if (!completion) return;
-  Platform::current().backgroundQueue->post(
-      [completion = std::move(completion), error = std::move(error)] { completion(error); });
-}
-
 /// What could not be removed stays its application's.
 void endPurge(MovieBook& book, const std::string& path) {
-  if (isMovieAt(path)) {
+  if (book.files().isMovieAt(path)) {
     book.giveBack(path);
   } else {
     book.release(path);
@@ -50,14 +36,15 @@ void endPurge(MovieBook& book, const std::string& path) {
 /// The book, for as long as one has a right that is written there. The right is used up by taking it.
 class Right {
  public:
-  Right(Book book, std::string path) : path_(std::move(path)), book_(std::move(book)) {}
+  Right(Book book, std::string path) : path_(std::move(path)), files_(book->files()), book_(std::move(book)) {}
+  [[nodiscard]] bool hasFile() const { return files_.isMovieAt(path_); }
   [[nodiscard]] const std::string& path() const { return path_; }
   /// Nothing from the second time on.
   [[nodiscard]] Book use() { return book_.exchange(nullptr); }
   void useForRemoval(FileCompletion completion) {
     const Book book = use();
     if (!book) {
-      answerInBackground(std::move(completion), Error::posix(ENOENT, path_));
+      files_.answerInBackground(std::move(completion), Error::posix(ENOENT, path_));
       return;
     }
     book->beginRemoval(path_);
@@ -66,6 +53,7 @@ class Right {
 
  private:
   const std::string path_;
+  const QVTemporaryFiles files_;
   platform::Guarded<Book> book_;
 };
 
@@ -76,7 +64,7 @@ class Claim final : public MovieClaim {
     if (const Book book = right_.use()) book->release(path());
   }
   [[nodiscard]] const std::string& path() const override { return right_.path(); }
-  [[nodiscard]] bool hasFile() const override { return isMovieAt(path()); }
+  [[nodiscard]] bool hasFile() const override { return right_.hasFile(); }
   void handTo(const std::string& bundleID) override {
     if (const Book book = right_.use()) book->hand(path(), bundleID);
   }
@@ -110,6 +98,7 @@ std::shared_ptr<MovieSave> Claim::saveFor(const std::string& bundleID) {
 
 class Movies final : public QVTemporaryMovies {
  public:
+  explicit Movies(QVTemporaryFiles files) : files_(files), book_(std::make_shared<MovieBook>(files)) {}
   ~Movies() override { book_->dropWaiting(); }
 
   void claimForRecording(const std::string& path, const std::string& bundleID, ClaimHandler handler) override {
@@ -124,14 +113,14 @@ class Movies final : public QVTemporaryMovies {
 
   [[nodiscard]] bool isHandedTo(const std::string& bundleID, const URL& movie) const override {
     const std::string path = normalized(movie.path());
-    return book_->isHanded(path, bundleID) && isMovieAt(path);
+    return book_->isHanded(path, bundleID) && files_.isMovieAt(path);
   }
   std::shared_ptr<MovieSave> beginSave(const std::string& bundleID, const URL& movie) override {
     const std::string path = normalized(movie.path());
     if (!book_->beginSave(path, bundleID)) return nullptr;
     // Looked at under the right, which no purge can take any more; without a file it goes back.
     auto save = std::make_shared<Save>(book_, path);
-    return isMovieAt(path) ? save : nullptr;
+    return files_.isMovieAt(path) ? save : nullptr;
   }
   void discardLast(const std::string& bundleID, FileCompletion completion) override {
     const auto discard = book_->beginDiscard(bundleID, [weak = weak_from_this(), bundleID, completion] {
@@ -140,14 +129,14 @@ class Movies final : public QVTemporaryMovies {
     if (discard.path) {
       removeAndRelease(book_, *discard.path, std::move(completion));
     } else if (!discard.waits) {
-      answerInBackground(std::move(completion), std::nullopt);
+      files_.answerInBackground(std::move(completion), std::nullopt);
     }
   }
 
   int64_t deleteFilesOlderThanTimeToLiveInSeconds(double timeToLive) override {
-    return _srDeleteFilesOlderThanTimeToLiveInSeconds(timeToLive, purging());
+    return files_._srDeleteFilesOlderThanTimeToLiveInSeconds(timeToLive, purging());
   }
-  int64_t deleteAllTempFiles() override { return _srDeleteAllTempFiles(purging()); }
+  int64_t deleteAllTempFiles() override { return files_._srDeleteAllTempFiles(purging()); }
 
  private:
   void claim(const std::string& path, const std::string& bundleID, MovieBook::OwnMovie own,
@@ -173,11 +162,14 @@ class Movies final : public QVTemporaryMovies {
     };
   }
 
-  const Book book_ = std::make_shared<MovieBook>();
+  const QVTemporaryFiles files_;
+  const Book book_;
 };
 
 }  // namespace
 
-std::shared_ptr<QVTemporaryMovies> QVTemporaryMovies::create() { return std::make_shared<Movies>(); }
+std::shared_ptr<QVTemporaryMovies> QVTemporaryMovies::create(QVTemporaryFiles files) {
+  return std::make_shared<Movies>(files);
+}
 
 }  // namespace qv

@@ -56,7 +56,7 @@ class QVTemporaryMovies : public std::enable_shared_from_this<QVTemporaryMovies>
  public:
   using ClaimHandler = std::function<void(std::shared_ptr<MovieClaim>)>;
 
-  static std::shared_ptr<QVTemporaryMovies> create();
+  static std::shared_ptr<QVTemporaryMovies> create(QVTemporaryFiles files);
   virtual ~QVTemporaryMovies() = default;
 
   /// Claims a path for a recording of this application. What was handed to the same application there is forgotten (its

@@ -5,16 +5,13 @@
 #include <string>
 #include <string_view>
 
-#include "platform/Platform.h"
 #include "platform/threads/Log.h"
-#include "support/QVTemporaryFiles.h"
 
 namespace qv {
 namespace {
 
 using platform::Error;
 using platform::MovieState;
-using platform::Platform;
 using platform::Result;
 namespace logs = platform::logs;
 
@@ -23,47 +20,46 @@ constexpr std::string_view kRecovered = "_recovered_";
 /// Names may be taken where the clock starts anew at each boot.
 constexpr int kMaximumNames = 100;
 
-std::string pathOf(const std::string& name) { return _srTempPath() + name; }
+}  // namespace
 
 /// "Chess.mp4" as "Chess_recovered_02-29-2024 19-35-12"; nothing where the file's time cannot be read.
-Result<std::string> recoveredStem(const std::string& name) {
-  Platform& platform = Platform::current();
-  const auto attributes = platform.fileSystem->attributesOfItem(pathOf(name));
+Result<std::string> QVUnfinishedMovies::recoveredStem(const std::string& name) {
+  const auto attributes = files_.disk().attributesOfItem(files_.pathInStore(name));
   if (!attributes) return attributes.error();
-  std::string date = platform.localization->formatDate(attributes.value().modificationDate, "MM-dd-yyyy HH:mm:ss");
+  std::string date = localization_.formatDate(attributes.value().modificationDate, "MM-dd-yyyy HH:mm:ss");
   std::replace(date.begin(), date.end(), ':', '-');
   return name.substr(0, name.size() - kExtension.size()) + std::string(kRecovered) + date;
 }
 
 /// Gives the movie the name under which it is kept. One that could not be finished at an earlier start has it.
-Result<std::string> keepAside(const std::string& name) {
+Result<std::string> QVUnfinishedMovies::keepAside(const std::string& name) {
   if (name.find(kRecovered) != std::string::npos) return name;
   const auto stem = recoveredStem(name);
   if (!stem) return stem.error();
   for (int number = 1; number <= kMaximumNames; ++number) {
     const std::string suffix = number == 1 ? std::string() : " " + std::to_string(number);
     const std::string kept = stem.value() + suffix + std::string(kExtension);
-    const auto error = Platform::current().fileSystem->moveItem(pathOf(name), pathOf(kept));
+    const auto error = files_.disk().moveItem(files_.pathInStore(name), files_.pathInStore(kept));
     if (!error) return kept;
     if (error->code != EEXIST) return *error;
   }
   return Error::posix(EEXIST, stem.value());
 }
 
-void removeWithoutPicture(const std::string& name) {
+void QVUnfinishedMovies::removeWithoutPicture(const std::string& name) {
   QV_LOG(logs::kSupport, "removing the unfinished movie \"%s\", which holds no whole picture", name.c_str());
-  if (const auto error = Platform::current().fileSystem->removeItem(pathOf(name))) {
+  if (const auto error = files_.disk().removeItem(files_.pathInStore(name))) {
     QV_LOG_ERROR(logs::kSupport, "unfinished movie: %s", error->description().c_str());
   }
 }
 
-void finishMovie(const std::string& name) {
+void QVUnfinishedMovies::finishMovie(const std::string& name) {
   const auto kept = keepAside(name);
   if (!kept) {
     QV_LOG_ERROR(logs::kSupport, "unfinished movie: %s", kept.error().description().c_str());
     return;
   }
-  const auto length = Platform::current().movieSalvage->salvageMovie(pathOf(kept.value()));
+  const auto length = salvage_.salvageMovie(files_.pathInStore(kept.value()));
   if (!length) {
     QV_LOG_ERROR(logs::kSupport, "the unfinished movie \"%s\" stays as it is: %s", kept.value().c_str(),
                  length.error().description().c_str());
@@ -75,17 +71,15 @@ void finishMovie(const std::string& name) {
   }
 }
 
-}  // namespace
-
-void _srSalvageUnfinishedMovies() {
-  const auto names = Platform::current().fileSystem->contentsOfDirectory(_srTempPath());
+void QVUnfinishedMovies::_srSalvageUnfinishedMovies() {
+  const auto names = files_.disk().contentsOfDirectory(files_._srTempPath());
   if (!names) {
     QV_LOG_ERROR(logs::kSupport, "unfinished movies: %s", names.error().description().c_str());
     return;
   }
   for (const std::string& name : names.value()) {
     if (!name.ends_with(kExtension)) continue;
-    const auto state = Platform::current().movieSalvage->stateOfMovie(pathOf(name));
+    const auto state = salvage_.stateOfMovie(files_.pathInStore(name));
     if (!state) {
       QV_LOG_ERROR(logs::kSupport, "\"%s\" is no movie that can be finished: %s", name.c_str(),
                    state.error().description().c_str());

@@ -1,14 +1,37 @@
 #pragma once
 
+#include <string>
+
+#include "platform/Localization.h"
+#include "platform/MovieSalvage.h"
+#include "support/QVTemporaryFiles.h"
+
 namespace qv {
 
-/// Finishes every movie of the temporary store that a crash or a loss of power left unfinished, and keeps it
-/// under a name of its own ("Chess_recovered_02-29-2024 19-35-12.mp4", with the time at which it broke off), so
-/// that the next recording of that application does not replace it. From then on it ages out like the
-/// others. What holds no whole picture is removed; what cannot be read or finished stays and ages out. Finished
-/// movies, and those that another process is writing, are not touched. Every outcome but these is logged.
+/// What a crash or a loss of power left in the temporary store.
 ///
 /// Threading: the caller's thread, at the daemon's start, before any recording.
-void _srSalvageUnfinishedMovies();
+class QVUnfinishedMovies {
+ public:
+  QVUnfinishedMovies(QVTemporaryFiles files, platform::MovieSalvage& salvage, platform::Localization& localization)
+      : files_(files), salvage_(salvage), localization_(localization) {}
+
+  /// Finishes every movie of the temporary store that was left unfinished, and keeps it
+  /// under a name of its own ("Chess_recovered_02-29-2024 19-35-12.mp4", with the time at which it broke off), so
+  /// that the next recording of that application does not replace it. From then on it ages out like the
+  /// others. What holds no whole picture is removed; what cannot be read or finished stays and ages out. Finished
+  /// movies, and those that another process is writing, are not touched. Every outcome but these is logged.
+  void _srSalvageUnfinishedMovies();
+
+ private:
+  [[nodiscard]] platform::Result<std::string> recoveredStem(const std::string& name);
+  [[nodiscard]] platform::Result<std::string> keepAside(const std::string& name);
+  void removeWithoutPicture(const std::string& name);
+  void finishMovie(const std::string& name);
+
+  const QVTemporaryFiles files_;
+  platform::MovieSalvage& salvage_;
+  platform::Localization& localization_;
+};
 
 }  // namespace qv

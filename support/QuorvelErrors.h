@@ -6,6 +6,7 @@
 #include "platform/base/Error.h"
 #include "platform/base/Value.h"
 #include "protocol/RecordingErrorKeys.h"
+#include "support/QVBundleTexts.h"
 
 /// The errors that clients, extensions and the components of the daemon get: one domain, negative
 /// codes, a localized text.
@@ -56,12 +57,28 @@ inline constexpr int64_t kMediaServicesFailed = -5817;
 inline constexpr int64_t kMixingFailure = -5818;
 }  // namespace errorcode
 
-/// An error with the localized text of `code` in the user information, in place of any text that
-/// `userInfo` has; without the framework's texts only the caller's entries. The code is kept even
-/// where it is none of the above.
+/// An error of the system's domain, for whoever makes one: a code, without a text. Its text is added where it leaves
+/// the daemon, by `QuorvelErrors`, in the language that the user has then.
+[[nodiscard]] inline platform::Error recordingError(int64_t code) { return {kQVRecordingErrorDomain, code, {}}; }
+
+/// Errors as those get them who are outside the daemon: with a localized text.
 ///
 /// Threading: thread-safe, blocking (reads a small file).
-[[nodiscard]] platform::Error _qvUserErrorForCode(int64_t code,
-                                                  const std::optional<platform::Dictionary>& userInfo = std::nullopt);
+class QuorvelErrors {
+ public:
+  /// The texts are borrowed, and must outlive this.
+  explicit QuorvelErrors(const QVBundleTexts& texts) : texts_(texts) {}
+
+  /// An error with the localized text of `code` in the user information, in place of any text that
+  /// `userInfo` has; without the framework's texts only the caller's entries. The code is kept even
+  /// where it is none of the system's.
+  [[nodiscard]] platform::Error _qvUserErrorForCode(
+      int64_t code, const std::optional<platform::Dictionary>& userInfo = std::nullopt) const;
+  /// As it crosses to a client: one of the system's that has no text yet gets it. Empty for none.
+  [[nodiscard]] platform::Dictionary encoded(const std::optional<platform::Error>& error) const;
+
+ private:
+  const QVBundleTexts& texts_;
+};
 
 }  // namespace qv

@@ -1,9 +1,7 @@
 #include "ui/QVAcknowledgementAlert.h"
 
-#include "platform/Platform.h"
 #include "platform/threads/Log.h"
-#include "support/QVBundleTexts.h"
-#include "ui/LocalizedTexts.h"
+#include "ui/FormattedText.h"
 
 namespace qv {
 
@@ -12,28 +10,6 @@ using platform::UserAlertRequest;
 namespace logs = platform::logs;
 
 namespace {
-
-UserAlertRequest buildAlert(const AcknowledgementRequest& request) {
-  const std::string name = _qvLocalizedAppNameFromBundleID(request.bundleID).value_or(request.bundleID);
-  UserAlertRequest alert;
-  alert.header = formatted(
-      localizedText(request.capture ? "ACKNOWLEDGEMENT_CAPTURE_ALERT_TITLE" : "ACKNOWLEDGEMENT_ALERT_TITLE"), name);
-  alert.message =
-      localizedText(request.capture ? "ACKNOWLEDGEMENT_CAPTURE_ALERT_BODY_TV" : "ACKNOWLEDGEMENT_ALERT_BODY_TV");
-  if (request.camera || request.microphone) {
-    alert.message +=
-        " " + localizedText(request.camera ? "ACKNOWLEDGEMENT_ALERT_BODY_CAMERA" : "ACKNOWLEDGEMENT_ALERT_BODY_MIC");
-    alert.alternateButton = localizedText(request.camera ? "ACKNOWLEDGEMENT_ALERT_ACCEPT_BUTTON_1_CAMERA"
-                                                         : "ACKNOWLEDGEMENT_ALERT_ACCEPT_BUTTON_1");
-    alert.otherButton = localizedText("ACKNOWLEDGEMENT_ALERT_ACCEPT_BUTTON_2");
-    alert.defaultButton = localizedText("ACKNOWLEDGEMENT_ALERT_DECLINE_BUTTON");
-  } else {
-    alert.defaultButton = localizedText("ACKNOWLEDGEMENT_ALERT_ACCEPT_BUTTON_1_MICROPHONE_DISABLED");
-    alert.otherButton = localizedText("ACKNOWLEDGEMENT_ALERT_DECLINE_BUTTON");
-  }
-  if (const auto framework = _qvFrameworkBundle()) alert.localizationPath = framework->path();
-  return alert;
-}
 
 AcknowledgementAnswer acceptedWithout(const AcknowledgementRequest& request) {
   QV_LOG(logs::kUI, "%s",
@@ -56,10 +32,33 @@ AcknowledgementAnswer interpret(const AcknowledgementRequest& request, UserAlert
 
 }  // namespace
 
-std::unique_ptr<platform::UserAlert> presentAcknowledgementAlert(const AcknowledgementRequest& request,
-                                                                 std::function<void(AcknowledgementAnswer)> handler) {
-  auto alert = platform::Platform::current().userAlerts->present(
-      buildAlert(request), [request, handler](UserAlertAnswer answer) { handler(interpret(request, answer)); });
+UserAlertRequest QVAcknowledgementAlert::buildAlert(const AcknowledgementRequest& request) const {
+  const std::string name = texts_._qvLocalizedAppNameFromBundleID(request.bundleID).value_or(request.bundleID);
+  UserAlertRequest alert;
+  alert.header = formatted(
+      texts_.localizedText(request.capture ? "ACKNOWLEDGEMENT_CAPTURE_ALERT_TITLE" : "ACKNOWLEDGEMENT_ALERT_TITLE"),
+      name);
+  alert.message =
+      texts_.localizedText(request.capture ? "ACKNOWLEDGEMENT_CAPTURE_ALERT_BODY_TV" : "ACKNOWLEDGEMENT_ALERT_BODY_TV");
+  if (request.camera || request.microphone) {
+    alert.message += " " + texts_.localizedText(request.camera ? "ACKNOWLEDGEMENT_ALERT_BODY_CAMERA"
+                                                               : "ACKNOWLEDGEMENT_ALERT_BODY_MIC");
+    alert.alternateButton = texts_.localizedText(request.camera ? "ACKNOWLEDGEMENT_ALERT_ACCEPT_BUTTON_1_CAMERA"
+                                                                : "ACKNOWLEDGEMENT_ALERT_ACCEPT_BUTTON_1");
+    alert.otherButton = texts_.localizedText("ACKNOWLEDGEMENT_ALERT_ACCEPT_BUTTON_2");
+    alert.defaultButton = texts_.localizedText("ACKNOWLEDGEMENT_ALERT_DECLINE_BUTTON");
+  } else {
+    alert.defaultButton = texts_.localizedText("ACKNOWLEDGEMENT_ALERT_ACCEPT_BUTTON_1_MICROPHONE_DISABLED");
+    alert.otherButton = texts_.localizedText("ACKNOWLEDGEMENT_ALERT_DECLINE_BUTTON");
+  }
+  if (const auto framework = texts_._qvFrameworkBundle()) alert.localizationPath = framework->path();
+  return alert;
+}
+
+std::unique_ptr<platform::UserAlert> QVAcknowledgementAlert::present(
+    const AcknowledgementRequest& request, std::function<void(AcknowledgementAnswer)> handler) const {
+  auto alert = alerts_.present(buildAlert(request),
+                               [request, handler](UserAlertAnswer answer) { handler(interpret(request, answer)); });
   if (!alert) {
     QV_LOG_ERROR(logs::kUI, "error showing acknowledgement alert");
     handler({});

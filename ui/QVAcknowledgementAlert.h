@@ -5,6 +5,7 @@
 #include <string>
 
 #include "platform/UserAlert.h"
+#include "support/QVBundleTexts.h"
 
 namespace qv {
 
@@ -23,16 +24,32 @@ struct AcknowledgementAnswer {
   bool camera = false;
 };
 
-/// Asks the user whether an application may record its screen.
+/// Asks users for their consent.
 ///
-/// Without microphone and camera there are two buttons: record (default) and decline (other). With
-/// one of them there are three: decline (default), record with what was asked (alternate), record
-/// without (other). Closing the alert in any other way declines, and so does an alert that cannot
-/// be shown.
-///
-/// Threading: called on the manager sequence; the handler comes on a thread of the alert service's,
-/// or at once when the alert cannot be shown. Destroying the returned alert takes it away.
-std::unique_ptr<platform::UserAlert> presentAcknowledgementAlert(const AcknowledgementRequest& request,
-                                                                 std::function<void(AcknowledgementAnswer)> handler);
+/// Threading: called on the manager sequence.
+class QVAcknowledgementAlert {
+ public:
+  /// Both are borrowed, and must outlive the alerts.
+  QVAcknowledgementAlert(platform::UserAlertService& alerts, const QVBundleTexts& texts)
+      : alerts_(alerts), texts_(texts) {}
+
+  /// Asks the user whether an application may record its screen.
+  ///
+  /// Without microphone and camera there are two buttons: record (default) and decline (other). With
+  /// one of them there are three: decline (default), record with what was asked (alternate), record
+  /// without (other). Closing the alert in any other way declines, and so does an alert that cannot
+  /// be shown.
+  ///
+  /// The handler comes on a thread of the alert service's, or at once when the alert cannot be shown. Destroying the
+  /// returned alert takes it away.
+  [[nodiscard]] std::unique_ptr<platform::UserAlert> present(const AcknowledgementRequest& request,
+                                                             std::function<void(AcknowledgementAnswer)> handler) const;
+
+ private:
+  [[nodiscard]] platform::UserAlertRequest buildAlert(const AcknowledgementRequest& request) const;
+
+  platform::UserAlertService& alerts_;
+  const QVBundleTexts& texts_;
+};
 
 }  // namespace qv

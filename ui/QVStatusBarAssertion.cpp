@@ -3,12 +3,9 @@
 #include <chrono>
 #include <cstdio>
 
-#include "platform/Platform.h"
-#include "ui/LocalizedTexts.h"
+#include "ui/FormattedText.h"
 
 namespace qv {
-
-using platform::Platform;
 
 namespace {
 constexpr std::chrono::milliseconds kTick{500};
@@ -21,17 +18,18 @@ void QVStatusBarAssertion::updateDoubleHeightStatusBarWithDuration(double, bool)
 void QVStatusBarAssertion::updateStatusStringWithTimer(platform::TimerHandle&) {}
 
 void QVStatusBarAssertion::startRepeatingTimer() {
-  Platform::current().mainQueue->async(weak_from_this(), [](QVStatusBarAssertion& self) {
-    self.timerStartDate_ = Platform::current().clock->now();
+  platform_.mainQueue->async(weak_from_this(), [](QVStatusBarAssertion& self) {
+    self.timerStartDate_ = self.platform_.clock->now();
     self.timer_.reset();
     // A tick that was queued before a new start finds that its timer has gone.
     auto timer = std::make_shared<std::weak_ptr<platform::TimerHandle>>();
-    self.timer_ = Platform::current().timers->every(kTick, [weak = self.weak_from_this(), timer] {
-      Platform::current().mainQueue->async(weak, [timer](QVStatusBarAssertion& ticked) {
-        const auto current = timer->lock();
-        if (current && current == ticked.timer_) ticked.updateStatusStringWithTimer(*current);
-      });
-    });
+    self.timer_ =
+        self.platform_.timers->every(kTick, [&queue = *self.platform_.mainQueue, weak = self.weak_from_this(), timer] {
+          queue.async(weak, [timer](QVStatusBarAssertion& ticked) {
+            const auto current = timer->lock();
+            if (current && current == ticked.timer_) ticked.updateStatusStringWithTimer(*current);
+          });
+        });
     *timer = self.timer_;
   });
 }
@@ -47,9 +45,10 @@ std::string QVStatusBarAssertion::stringWithTimeInterval(double seconds) {
 }
 
 std::string QVStatusBarAssertion::qvLocalizedRecordingDuration(double, bool isPaused) const {
-  if (!broadcasting) return localizedText(isPaused ? "RECORDING_PAUSED_STATUS_BAR" : "RECORDING_STATUS_BAR");
-  return formatted(localizedText(isPaused ? "BROADCASTING_PAUSED_STATUS_BAR_FORMAT" : "BROADCASTING_STATUS_BAR_FORMAT"),
-                   broadcastServiceName);
+  if (!broadcasting) return texts_.localizedText(isPaused ? "RECORDING_PAUSED_STATUS_BAR" : "RECORDING_STATUS_BAR");
+  return formatted(
+      texts_.localizedText(isPaused ? "BROADCASTING_PAUSED_STATUS_BAR_FORMAT" : "BROADCASTING_STATUS_BAR_FORMAT"),
+      broadcastServiceName);
 }
 
 }  // namespace qv

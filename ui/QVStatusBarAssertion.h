@@ -5,9 +5,11 @@
 #include <optional>
 #include <string>
 
+#include "platform/Platform.h"
 #include "platform/StatusBar.h"
 #include "platform/base/Value.h"
 #include "platform/threads/Timer.h"
+#include "support/QVBundleTexts.h"
 
 namespace qv {
 
@@ -26,7 +28,9 @@ class QVStatusBarAssertionDelegate {
 /// Threading: main queue only, except `startRepeatingTimer` and `stringWithTimeInterval`, which any thread may call.
 class QVStatusBarAssertion : public std::enable_shared_from_this<QVStatusBarAssertion> {
  public:
-  QVStatusBarAssertion() = default;
+  /// Both are borrowed, and must outlive this.
+  QVStatusBarAssertion(const platform::Platform& platform, const QVBundleTexts& texts)
+      : platform_(platform), texts_(texts) {}
   virtual ~QVStatusBarAssertion() = default;
   QVStatusBarAssertion(const QVStatusBarAssertion&) = delete;
   QVStatusBarAssertion& operator=(const QVStatusBarAssertion&) = delete;
@@ -60,6 +64,8 @@ class QVStatusBarAssertion : public std::enable_shared_from_this<QVStatusBarAsse
   [[nodiscard]] std::string qvLocalizedRecordingDuration(double duration, bool isPaused) const;
 
  private:
+  const platform::Platform& platform_;
+  const QVBundleTexts& texts_;
   std::shared_ptr<platform::TimerHandle> timer_;
   std::optional<platform::Date> timerStartDate_;
 };

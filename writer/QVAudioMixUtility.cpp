@@ -3,9 +3,7 @@
 #include <utility>
 #include <vector>
 
-#include "platform/Platform.h"
 #include "platform/threads/Log.h"
-#include "support/QVTemporaryFiles.h"
 #include "support/QuorvelErrors.h"
 
 namespace qv {
@@ -13,13 +11,11 @@ namespace {
 
 using platform::ExportSession;
 using platform::ExportStatus;
-using platform::Platform;
 using platform::URL;
 namespace logs = platform::logs;
 
 /// Ready to mix all audio tracks of the movie into a file at the output URL.
-std::shared_ptr<ExportSession> mixOf(const URL& movie, const URL& output) {
-  platform::ExportService& service = *Platform::current().exportService;
+std::shared_ptr<ExportSession> mixOf(platform::ExportService& service, const URL& movie, const URL& output) {
   const auto asset = service.openMovie(movie);
   auto exportSession = service.createExportSession(asset, platform::ExportPreset::HighestQuality);
   exportSession->setOutputURL(output);
@@ -47,25 +43,24 @@ void endMix(ExportStatus status, const std::shared_ptr<MovieClaim>& mixed, const
   }
   QV_CONSOLE(logs::kWriter, "QVAudioMixUtility: audio mix export %s", failure);
   mixed->remove(nullptr);
-  handler(nullptr, _qvUserErrorForCode(errorcode::kFailedToSave));
+  handler(nullptr, recordingError(errorcode::kFailedToSave));
 }
 
 }  // namespace
 
-URL QVAudioMixUtility::tempFileURL() {
-  const auto seconds = static_cast<long>(Platform::current().clock->now().secondsSince1970);
-  return URL::fileURL(pathInStore("QVQuorvel_Final" + std::to_string(seconds) + ".mp4"));
+URL QVAudioMixUtility::tempFileURL() const {
+  const auto seconds = static_cast<long>(platform_.clock->now().secondsSince1970);
+  return URL::fileURL(QVTemporaryFiles(platform_).pathInStore("QVQuorvel_Final" + std::to_string(seconds) + ".mp4"));
 }
 
-void QVAudioMixUtility::mixAudioForMovie(const std::shared_ptr<QVTemporaryMovies>& movies,
-                                         const std::optional<URL>& movie, Handler handler) {
+void QVAudioMixUtility::mixAudioForMovie(const std::optional<URL>& movie, Handler handler) const {
   if (!movie) {
-    handler(nullptr, _qvUserErrorForCode(errorcode::kMixingFailure));
+    handler(nullptr, recordingError(errorcode::kMixingFailure));
     return;
   }
-  Platform::current().globalQueue->post([movies, movie = *movie, handler = std::move(handler)] {
-    const std::shared_ptr<MovieClaim> mixed = movies->claimNew(tempFileURL().path());
-    const auto exportSession = mixOf(movie, mixed->url());
+  platform_.globalQueue->post([self = *this, movie = *movie, handler = std::move(handler)] {
+    const std::shared_ptr<MovieClaim> mixed = self.movies_->claimNew(self.tempFileURL().path());
+    const auto exportSession = mixOf(*self.platform_.exportService, movie, mixed->url());
     exportSession->exportAsynchronously(
         [exportSession, mixed, handler] { endMix(exportSession->status(), mixed, handler); });
   });

@@ -3,6 +3,7 @@
 #include <functional>
 #include <memory>
 #include <optional>
+#include <utility>
 
 #include "platform/base/Error.h"
 #include "platform/base/Value.h"
@@ -19,11 +20,17 @@ class QVAudioMixUtility {
  public:
   /// Takes the mixed movie, of which there is a file, or what went wrong; then nothing is left of it.
   using Handler = std::function<void(std::shared_ptr<MovieClaim> mixed, const std::optional<platform::Error>&)>;
-  static void mixAudioForMovie(const std::shared_ptr<QVTemporaryMovies>& movies,
-                               const std::optional<platform::URL>& movie, Handler handler);
+  /// The platform is borrowed, and must outlive the mixes.
+  QVAudioMixUtility(const platform::Platform& platform, std::shared_ptr<QVTemporaryMovies> movies)
+      : platform_(platform), movies_(std::move(movies)) {}
+  void mixAudioForMovie(const std::optional<platform::URL>& movie, Handler handler) const;
   /// A file of the temporary store, named by the current second. Two mixes within a second ask for the same, and the
   /// later one's is numbered when it is claimed.
-  static platform::URL tempFileURL();
+  [[nodiscard]] platform::URL tempFileURL() const;
+
+ private:
+  const platform::Platform& platform_;
+  const std::shared_ptr<QVTemporaryMovies> movies_;
 };
 
 }  // namespace qv

@@ -1,7 +1,6 @@
 #include "writer/QVMovieWriter.h"
 
 #include "platform/threads/Log.h"
-#include "support/QVTemporaryFiles.h"
 
 namespace qv {
 
@@ -11,10 +10,12 @@ using platform::SampleBufferRef;
 using platform::URL;
 namespace logs = platform::logs;
 
-QVMovieWriter::QVMovieWriter(platform::Size windowSize, std::string outputPath)
-    : windowSize_(windowSize),
+QVMovieWriter::QVMovieWriter(const platform::Platform& platform, platform::Size windowSize, std::string outputPath)
+    : platform_(platform),
+      files_(platform),
+      windowSize_(windowSize),
       outputPath_(std::move(outputPath)),
-      movieWriterQueue_("com.tarnwick.Quorvel.QVMovieWriterQueue", *platform::Platform::current().globalQueue) {}
+      movieWriterQueue_("com.tarnwick.Quorvel.QVMovieWriterQueue", *platform.globalQueue) {}
 
 void QVMovieWriter::setBroadcastConfig(std::optional<QVBroadcastConfiguration> configuration) {
   broadcastConfig_ = std::move(configuration);
@@ -27,7 +28,7 @@ void QVMovieWriter::startWritingHandler(std::function<void()> handler) {
 
 void QVMovieWriter::dispatchedStartWritingHandler(const std::function<void()>& handler) {
   QV_LOG(logs::kWriter, "QVMovieWriter: startWritingHandler");
-  _srRemoveFile(outputURL(), [self = shared_from_this(), handler](const auto&) {
+  files_._srRemoveFile(outputURL(), [self = shared_from_this(), handler](const auto&) {
     // On the writer's queue, so that a finish which came meanwhile cannot overlap.
     self->movieWriterQueue_.sync([&] { self->dispatchedSetupAssetWriter(); });
     if (handler) handler();

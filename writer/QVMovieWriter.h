@@ -10,6 +10,7 @@
 #include "platform/base/BufferQueue.h"
 #include "platform/threads/Guarded.h"
 #include "protocol/QVBroadcastConfiguration.h"
+#include "support/QVTemporaryFiles.h"
 
 namespace qv {
 
@@ -28,7 +29,8 @@ class QVMovieWriter : public std::enable_shared_from_this<QVMovieWriter> {
  public:
   using FinishHandler = std::function<void(const std::optional<platform::URL>&)>;
 
-  QVMovieWriter(platform::Size windowSize, std::string outputPath);
+  /// The platform is borrowed, and must outlive this and what it has begun.
+  QVMovieWriter(const platform::Platform& platform, platform::Size windowSize, std::string outputPath);
 
   void setBroadcastConfig(std::optional<QVBroadcastConfiguration> configuration);
   void setSystemRecording(bool systemRecording) { systemRecording_ = systemRecording; }
@@ -102,6 +104,8 @@ class QVMovieWriter : public std::enable_shared_from_this<QVMovieWriter> {
   void finishNotWriting(const FinishHandler& handler);
   void finishFile(FinishHandler handler);
 
+  const platform::Platform& platform_;
+  const QVTemporaryFiles files_;
   const platform::Size windowSize_;
   const std::string outputPath_;
   platform::SerialQueue movieWriterQueue_;

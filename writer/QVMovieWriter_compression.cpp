@@ -6,7 +6,6 @@
 namespace qv {
 
 using platform::Dictionary;
-using platform::Platform;
 using platform::Value;
 namespace logs = platform::logs;
 namespace settings = platform::settings;
@@ -64,10 +63,10 @@ void merge(const Dictionary& custom, Dictionary& properties) {
 }  // namespace
 
 int64_t QVMovieWriter::bitRate() const {
-  const Value override = Platform::current().preferences->valueForKey(kPreferenceDomain, "QVBitRateOverride");
+  const Value override = platform_.preferences->valueForKey(kPreferenceDomain, "QVBitRateOverride");
   if (const auto rate = wholeNumber(override, settings::kMaximumAverageBitRate)) return *rate;
   if (!override.isNone()) QV_LOG_ERROR(logs::kWriter, "QVBitRateOverride is no usable bit rate, ignored");
-  if (Platform::current().deviceInfo->userInterfaceIdiom() == platform::UserInterfaceIdiom::Tablet) {
+  if (platform_.deviceInfo->userInterfaceIdiom() == platform::UserInterfaceIdiom::Tablet) {
     return kTabletBitRate;
   }
   return windowSize_.width >= kLargeSide || windowSize_.height >= kLargeSide ? kLargeBitRate : kDefaultBitRate;

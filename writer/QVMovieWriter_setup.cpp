@@ -7,7 +7,6 @@ namespace qv {
 
 using platform::Dictionary;
 using platform::MediaTime;
-using platform::Platform;
 using platform::Value;
 namespace logs = platform::logs;
 namespace settings = platform::settings;
@@ -42,7 +41,7 @@ Dictionary audioSettings() {
 }  // namespace
 
 void QVMovieWriter::createInputs() {
-  platform::AssetWriterService& service = *Platform::current().assetWriter;
+  platform::AssetWriterService& service = *platform_.assetWriter;
   const Dictionary videoSettings{{settings::kVideoCodec, Value(settings::kCodecH264)},
                                  {settings::kVideoWidth, Value(evenSide(windowSize_.width))},
                                  {settings::kVideoHeight, Value(evenSide(windowSize_.height))},
@@ -64,7 +63,7 @@ void QVMovieWriter::dispatchedSetupAssetWriter() {
     track->queue.reset();
     track->lastPresentationTime.store(MediaTime::invalid());
   }
-  auto created = Platform::current().assetWriter->createAssetWriter(outputURL(), platform::kFileTypeMPEG4);
+  auto created = platform_.assetWriter->createAssetWriter(outputURL(), platform::kFileTypeMPEG4);
   if (!created) {
     noteFailure(created.error());
     QV_LOG_ERROR(logs::kWriter, "QVMovieWriter: setupAssetWriter error: %i", static_cast<int>(created.error().code));

@@ -1,14 +1,12 @@
 #include <cerrno>
 
 #include "platform/threads/Log.h"
-#include "support/QVTemporaryFiles.h"
 #include "writer/QVMovieWriter.h"
 
 namespace qv {
 
 using platform::ExportStatus;
 using platform::MediaTime;
-using platform::Platform;
 using platform::URL;
 namespace logs = platform::logs;
 
@@ -18,11 +16,11 @@ namespace {
 constexpr int32_t kClipTimescale = 1;
 
 /// Nothing where there is a file with something in it.
-std::optional<platform::Error> checkFile(const URL& url) {
-  const auto attributes = Platform::current().fileSystem->attributesOfItem(url.path());
+std::optional<platform::Error> checkFile(const QVTemporaryFiles& files, const URL& url) {
+  const auto attributes = files.disk().attributesOfItem(url.path());
   if (!attributes) return attributes.error();
   if (attributes.value().size > 0 && !attributes.value().isDirectory) return std::nullopt;
-  _srRemoveFile(url, {});
+  files._srRemoveFile(url, {});
   return platform::Error::posix(ENODATA, url.path());
 }
 
@@ -32,7 +30,7 @@ void reportTrimFailure(const std::optional<platform::Error>& error) {
 }
 
 /// Whether there is a trimmed movie, told in the log.
-bool succeeded(const platform::ExportSession& exportSession) {
+bool succeeded(const QVTemporaryFiles& files, const platform::ExportSession& exportSession) {
   switch (exportSession.status()) {
     case ExportStatus::Failed:
       reportTrimFailure(exportSession.error());
@@ -43,7 +41,7 @@ bool succeeded(const platform::ExportSession& exportSession) {
     default:
       break;
   }
-  if (const auto error = checkFile(exportSession.outputURL())) {
+  if (const auto error = checkFile(files, exportSession.outputURL())) {
     reportTrimFailure(error);
     return false;
   }
@@ -63,21 +61,20 @@ void QVMovieWriter::trimMovieWithURL(URL movie, double startClipDuration, double
 
 void QVMovieWriter::dispatchedTrimMovieWithURL(const URL& movie, double startClipDuration, double endClipDuration,
                                                const URL& outputFileURL, FinishHandler handler) {
-  _srRemoveFile(outputFileURL,
-                [movie, startClipDuration, endClipDuration, outputFileURL, handler = std::move(handler)](const auto&) {
-                  platform::ExportService& service = *Platform::current().exportService;
-                  auto asset = service.openMovie(movie);
-                  const MediaTime movieDuration = asset ? asset->duration() : MediaTime::zero();
-                  auto exportSession = service.createExportSession(asset, platform::ExportPreset::PassThrough);
-                  exportSession->setOutputURL(outputFileURL);
-                  exportSession->setOutputFileType(platform::kFileTypeMPEG4);
-                  const MediaTime start = MediaTime::fromSeconds(startClipDuration, kClipTimescale);
-                  const MediaTime end = MediaTime::fromSeconds(endClipDuration, kClipTimescale);
-                  exportSession->setTimeRange({start, (movieDuration - end) - start});
-                  exportSession->exportAsynchronously([exportSession, handler] {
-                    handler(succeeded(*exportSession) ? std::optional(exportSession->outputURL()) : std::nullopt);
-                  });
-                });
+  files_._srRemoveFile(outputFileURL, [&service = *platform_.exportService, files = files_, movie, startClipDuration,
+                                       endClipDuration, outputFileURL, handler = std::move(handler)](const auto&) {
+    auto asset = service.openMovie(movie);
+    const MediaTime movieDuration = asset ? asset->duration() : MediaTime::zero();
+    auto exportSession = service.createExportSession(asset, platform::ExportPreset::PassThrough);
+    exportSession->setOutputURL(outputFileURL);
+    exportSession->setOutputFileType(platform::kFileTypeMPEG4);
+    const MediaTime start = MediaTime::fromSeconds(startClipDuration, kClipTimescale);
+    const MediaTime end = MediaTime::fromSeconds(endClipDuration, kClipTimescale);
+    exportSession->setTimeRange({start, (movieDuration - end) - start});
+    exportSession->exportAsynchronously([files, exportSession, handler] {
+      handler(succeeded(files, *exportSession) ? std::optional(exportSession->outputURL()) : std::nullopt);
+    });
+  });
 }
 
 }  // namespace qv

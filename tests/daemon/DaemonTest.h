@@ -114,7 +114,7 @@ class DaemonTest : public testing::Test {
 
   fakes::FakeDevice device_;
   QVCaptureManager captureManager_{device_.platform};
-  std::shared_ptr<QVRecordingManager> manager_ = QVRecordingManager::create(captureManager_);
+  std::shared_ptr<QVRecordingManager> manager_ = QVRecordingManager::create(device_.platform, captureManager_);
 };
 
 /// Where consent is not what a test is about.

@@ -122,7 +122,8 @@ TEST_F(ArbitrationTest, ADeviceThatInterruptsKeepsTheSystemRecordingInThePhotoLi
   device_.run();
   EXPECT_EQ(system.takeEnds(), std::vector<int64_t>{errorcode::kInterrupted});
   EXPECT_EQ(contentAt(system.lastMovie()), "movie 0") << "a refused one is its application's";
-  device_.photoLibrary = {};
+  device_.photoLibrary.failure.reset();
+  device_.photoLibrary.stored.clear();
   system.start({.system = true});
   sendFrame(kSecond);
   // What is recorded from the warning on is left out, unless the warning is taken back.

@@ -11,27 +11,31 @@ using platform::Value;
 using LifecycleTest = QuietDaemonTest;
 
 TEST_F(LifecycleTest, SizesAreClampedByDeviceAndPreference) {
-  EXPECT_EQ(_maximumSizeWithSize({3840, 2160}), (Size{1920, 1080}));
-  EXPECT_EQ(_maximumSizeWithSize({1080, 2400}), (Size{864, 1920}));
-  EXPECT_EQ(_maximumSizeWithSize({1000, 800}), (Size{1000, 800}));
+  const auto clamped = [this](Size size) {
+    return _maximumSizeWithSize(size, device_.preferences, device_.deviceInfo);
+  };
+  EXPECT_EQ(clamped({3840, 2160}), (Size{1920, 1080}));
+  EXPECT_EQ(clamped({1080, 2400}), (Size{864, 1920}));
+  EXPECT_EQ(clamped({1000, 800}), (Size{1000, 800}));
   device_.deviceInfo.idiom = platform::UserInterfaceIdiom::Tablet;
   device_.deviceInfo.integers["ChipID"] = 0x8960;
-  EXPECT_EQ(_maximumSizeWithSize({2048, 1536}), (Size{1600, 1200}));
+  EXPECT_EQ(clamped({2048, 1536}), (Size{1600, 1200}));
   device_.preferences.set("com.tarnwick.quorveld", "QVFullResCapture", Value(true));
-  EXPECT_EQ(_maximumSizeWithSize({3840, 2160}), (Size{3840, 2160}));
+  EXPECT_EQ(clamped({3840, 2160}), (Size{3840, 2160}));
 }
 
 TEST_F(LifecycleTest, FileNamesHoldWhateverAnAppIsCalled) {
+  const MovieNames names(device_.platform, device_.texts);
   const auto name = [&](const std::string& displayName) {
     device_.bundles.addApplication("Game", "com.example.game")->info[platform::bundleinfo::kDisplayName] =
         Value(displayName);
-    return applicationMoviePath("com.example.game").substr(std::string(fakes::kStore).size() + 1);
+    return names.applicationMoviePath("com.example.game").substr(std::string(fakes::kStore).size() + 1);
   };
   EXPECT_EQ(name("Comet Run"), "Comet Run.mp4");
   EXPECT_EQ(name("../../etc/cron"), "_.:..:etc:cron.mp4");
   EXPECT_EQ(name(""), "com.example.game.mp4");
   EXPECT_LE(name(std::string(400, 'x')).size(), 255u);
-  const std::string path = screenMoviePath();
+  const std::string path = names.screenMoviePath();
   EXPECT_NE(path.find("/ScreenRecording_"), std::string::npos);
   EXPECT_EQ(path.find(':'), std::string::npos);
 }

@@ -60,7 +60,8 @@ class ProxyTest : public testing::Test {
   fakes::FakeDevice device_;
   fakes::FakeBroadcastExtension extension_{device_.ipc, device_.extensions, device_.executor};
   const platform::ExtensionRecordRef record_ = device_.extensions.install("a.b.upload", broadcastpoint::kUpload);
-  std::shared_ptr<QVBroadcastExtensionProxy> proxy_ = QVBroadcastExtensionProxy::withBroadcastUploadExtension(record_);
+  std::shared_ptr<QVBroadcastExtensionProxy> proxy_ =
+      QVBroadcastExtensionProxy::withBroadcastUploadExtension(device_.platform, record_);
   std::string told_;
   int completed_ = 0, givenUp_ = 0;
 };
@@ -110,7 +111,7 @@ TEST_F(ProxyTest, AnExtensionThatEndsBeforeItsPingAnswersTheWaiterAtOnce) {
       {"error-5808 ", [&] { proxy_.reset(); }},
   };
   for (const auto& [expected, end] : ends) {
-    proxy_ = QVBroadcastExtensionProxy::withBroadcastUploadExtension(record_);
+    proxy_ = QVBroadcastExtensionProxy::withBroadcastUploadExtension(device_.platform, record_);
     watch();
     proxy_->establishConnectionWithHandler(
         [this](const auto& error) { told_ += error ? "error" + std::to_string(error->code) + " " : "ready "; });
@@ -147,7 +148,7 @@ TEST_F(ProxyTest, EveryPayloadGetsItsOutcomeOnce) {
   EXPECT_EQ(std::exchange(givenUp_, 0), 6);
   EXPECT_EQ(device_.extensions.killed.size(), 1u);
 
-  proxy_ = QVBroadcastExtensionProxy::withBroadcastUploadExtension(record_);
+  proxy_ = QVBroadcastExtensionProxy::withBroadcastUploadExtension(device_.platform, record_);
   connect();
   for (int64_t i = 0; i < 7; ++i) send(Kind::Control, i);
   device_.run();
@@ -159,7 +160,7 @@ TEST_F(ProxyTest, EveryPayloadGetsItsOutcomeOnce) {
 
 TEST_F(ProxyTest, LinksToOneExtensionDoNotMeet) {
   connect();
-  const auto second = QVBroadcastExtensionProxy::withBroadcastUploadExtension(record_);
+  const auto second = QVBroadcastExtensionProxy::withBroadcastUploadExtension(device_.platform, record_);
   second->establishConnectionWithHandler([this](const auto& error) { told_ += error ? "failed " : "second ready "; });
   device_.run();
   const auto first = std::exchange(proxy_, nullptr);
@@ -183,7 +184,7 @@ TEST_F(ProxyTest, EveryHandshakeThatFailsEndsInOneError) {
   EXPECT_EQ(told(), "") << "too late";
 
   const auto failsWith = [&] {
-    proxy_ = QVBroadcastExtensionProxy::withBroadcastUploadExtension(record_);
+    proxy_ = QVBroadcastExtensionProxy::withBroadcastUploadExtension(device_.platform, record_);
     establish();
     device_.timers.advance(kExtensionPatience);
     device_.run();
@@ -268,7 +269,7 @@ TEST_F(ProxyTest, ConnectsToAnExtensionThatListensAlready) {
   listener->setDelegate(&owner, queue);
   EXPECT_EQ(listener->resume(), std::nullopt);
   const auto endpoint = listener->endpoint();
-  proxy_ = *QVBroadcastExtensionProxy::withBroadcastUploadListenerEndpoint(endpoint);
+  proxy_ = *QVBroadcastExtensionProxy::withBroadcastUploadListenerEndpoint(device_.platform, endpoint);
   device_.run();
   extension_.call("updateBroadcastURL", {Value("early")});
   device_.run();
@@ -280,7 +281,8 @@ TEST_F(ProxyTest, ConnectsToAnExtensionThatListensAlready) {
   EXPECT_EQ(received(), std::vector<int64_t>{1});
   EXPECT_EQ(completed_, 1);
   listener->invalidate();
-  EXPECT_FALSE(QVBroadcastExtensionProxy::withBroadcastUploadListenerEndpoint(endpoint)) << "its owner has gone";
+  EXPECT_FALSE(QVBroadcastExtensionProxy::withBroadcastUploadListenerEndpoint(device_.platform, endpoint))
+      << "its owner has gone";
 }
 
 }  // namespace

@@ -20,10 +20,11 @@ class QVExtensionsTest : public testing::Test {
   }
   std::string found(ExtensionQuery query) {
     std::string names;
-    extensionsWithMatchingPointName(std::move(query), [&](const auto& extensions, const auto& error) {
-      for (const auto& extension : extensions) names += extension->identifier + " ";
-      if (error) names += "error";
-    });
+    extensionsWithMatchingPointName(device_.platform.extensions, std::move(query),
+                                    [&](const auto& extensions, const auto& error) {
+                                      for (const auto& extension : extensions) names += extension->identifier + " ";
+                                      if (error) names += "error";
+                                    });
     device_.run();
     return names;
   }

@@ -32,12 +32,8 @@ FakeDevice::FakeDevice() {
   platform.extensions = &extensions;
   disk.addDirectory(kStore);
   disk.setFreeSize(1'000'000'000);
-  platform::Platform::install(&platform);
 }
 
-FakeDevice::~FakeDevice() {
-  run();
-  platform::Platform::install(nullptr);
-}
+FakeDevice::~FakeDevice() { run(); }
 
 }  // namespace qv::fakes

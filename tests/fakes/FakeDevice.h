@@ -6,6 +6,8 @@
 #include <string>
 
 #include "platform/Platform.h"
+#include "support/QVBundleTexts.h"
+#include "support/QVTemporaryFiles.h"
 #include "tests/fakes/FakeBundles.h"
 #include "tests/fakes/FakeClock.h"
 #include "tests/fakes/FakeDeviceInfo.h"
@@ -25,7 +27,7 @@ namespace qv::fakes {
 
 inline constexpr const char kStore[] = "/private/var/mobile/Library/Quorvel";
 
-/// A whole device of fakes, installed as the platform while it lives. Work waits until `run`.
+/// A whole device of fakes. Work waits until `run`.
 struct FakeDevice {
   FakeDevice();
   ~FakeDevice();
@@ -55,10 +57,12 @@ struct FakeDevice {
   FakePreferences preferences;
   FakeDeviceInfo deviceInfo;
   FakePurgeableSpace purgeableSpace;
-  FakePhotoLibrary photoLibrary;
+  FakePhotoLibrary photoLibrary{disk};
   FakeMetrics metrics;
   FakeExtensionService extensions{executor};
   platform::Platform platform;
+  QVTemporaryFiles files{platform};
+  QVBundleTexts texts{platform};
 };
 
 }  // namespace qv::fakes

@@ -10,11 +10,11 @@
 #include <vector>
 
 #include "platform/Applications.h"
+#include "platform/FileSystem.h"
 #include "platform/IPC.h"
 #include "platform/KeepAlive.h"
 #include "platform/Metrics.h"
 #include "platform/PhotoLibrary.h"
-#include "platform/Platform.h"
 #include "platform/PurgeableSpace.h"
 #include "platform/RenderServer.h"
 #include "platform/ScreenReader.h"
@@ -122,6 +122,7 @@ class FakePurgeableSpace final : public platform::PurgeableSpaceService {
 class FakePhotoLibrary final : public platform::PhotoLibrary {
  public:
   using Completion = std::function<void(const std::optional<platform::Error>&)>;
+  explicit FakePhotoLibrary(platform::FileSystem& disk) : disk_(disk) {}
   void createAsset(const platform::URL& file, platform::PhotoResourceType, Completion completion) override {
     stored.push_back(file);
     held.push_back({file, std::move(completion)});
@@ -131,7 +132,7 @@ class FakePhotoLibrary final : public platform::PhotoLibrary {
   void answer() {
     const auto [file, completion] = std::move(held.front());
     held.pop_front();
-    const auto content = platform::Platform::current().fileSystem->readFile(file.path());
+    const auto content = disk_.readFile(file.path());
     if (!failure && content) contents.push_back(content.value());
     completion(failure);
   }
@@ -148,6 +149,9 @@ class FakePhotoLibrary final : public platform::PhotoLibrary {
     Completion completion;
   };
   std::deque<Request> held;
+
+ private:
+  platform::FileSystem& disk_;
 };
 
 class FakeMetrics final : public platform::MetricsReporter {

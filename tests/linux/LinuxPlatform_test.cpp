@@ -31,9 +31,9 @@ TEST(LinuxPlatformTest, ErrorsSpeakTheUsersLanguageOnARealDisk) {
   LinuxPlatform linux_(root.path(), "", kNoWatch);
   Platform platform;
   linux_.addTo(platform);
-  Platform::install(&platform);
-  EXPECT_EQ(_qvUserErrorForCode(errorcode::kFailed).localizedDescription(), "Die Aufnahme ist fehlgeschlagen.");
-  Platform::install(nullptr);
+  const QVBundleTexts texts(platform);
+  EXPECT_EQ(QuorvelErrors(texts)._qvUserErrorForCode(errorcode::kFailed).localizedDescription(),
+            "Die Aufnahme ist fehlgeschlagen.");
 }
 
 TEST(LinuxPlatformTest, PeersAreKnownByTheBundleAroundTheirExecutable) {

@@ -12,7 +12,10 @@ class ClientProxy : public RecorderFixture {};
 TEST_F(ClientProxy, FailuresOfSamplesAreToldAsTheirNumberDoubles) {
   startRecording();
   const auto connection = daemonEnd_;
-  QVClientProxy proxy("com.example.game", connection);
+  const platform::Platform platform;
+  const QVBundleTexts texts(platform);
+  const QuorvelErrors errors(texts);
+  QVClientProxy proxy(errors, "com.example.game", connection);
   killDaemon();
   const fakes::LogRecorder log;
   const platform::Data bytes(2);

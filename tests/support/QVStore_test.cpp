@@ -10,11 +10,6 @@ using platform::Value;
 
 class StoreTest : public SupportTest, public platform::StoreLookupService, public platform::NetworkReachabilityService {
  protected:
-  StoreTest() {
-    platform_.mainQueue = &main_;
-    platform_.storeLookup = this;
-    platform_.reachability = this;
-  }
   void start(const platform::StoreLookupRequest& request, Handler handler) override {
     EXPECT_EQ(request.localizationStyle, 1);
     EXPECT_EQ(request.bundleIdentifiers, std::vector<std::string>{"com.example.chess"});
@@ -31,8 +26,9 @@ class StoreTest : public SupportTest, public platform::StoreLookupService, publi
   }
   QVStoreInfo load() {
     std::vector<QVStoreInfo> records;
-    QVStoreManager::sharedManager().loadItemDetailsForBundleIdentifier(
-        "com.example.chess", [&](const QVStoreInfo& info) { records.push_back(info); });
+    QVStoreManager(*this, main_, texts_)
+        .loadItemDetailsForBundleIdentifier("com.example.chess",
+                                            [&](const QVStoreInfo& info) { records.push_back(info); });
     EXPECT_TRUE(records.empty()) << "on the main queue, later";
     global_.runUntilIdle();
     EXPECT_EQ(records.size(), 1u);
@@ -68,7 +64,7 @@ TEST_F(StoreTest, WhatTheCatalogueLacksIsEmptyAndTheNameThatOfTheInstalledApplic
 TEST_F(StoreTest, TheNetworkIsAvailableOnlyWhereItIsReachableWithoutMore) {
   const auto isAvailable = [this](std::optional<uint32_t> flags) {
     flags_ = flags;
-    return QVReachability::isNetworkAvailable();
+    return QVReachability(*this).isNetworkAvailable();
   };
   EXPECT_TRUE(isAvailable(2));
   EXPECT_TRUE(isAvailable(2 | 1));

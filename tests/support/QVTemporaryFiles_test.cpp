@@ -3,6 +3,7 @@
 #include <cerrno>
 #include <vector>
 
+#include "support/QVDiskSpace.h"
 #include "tests/support/SupportTest.h"
 
 namespace qv {
@@ -28,20 +29,20 @@ class TemporaryFilesTest : public SupportTest {
 
 TEST_F(TemporaryFilesTest, SetupMakesTheDirectoryOnceAndSurvivesFailure) {
   disk_.addDirectory("/root/private/var/mobile/Library");
-  _srSetupTempDirectory();
+  files_._srSetupTempDirectory();
   EXPECT_TRUE(disk_.itemExists(kStore));
-  _srSetupTempDirectory();
+  files_._srSetupTempDirectory();
   EXPECT_EQ(disk_.operations(), 1u);
 
   disk_.addFile("/other/private/var/mobile/Library/Quorvel", "a plain file in the way");
   platform_.deviceRoot = "/other";
-  _srSetupTempDirectory();
+  files_._srSetupTempDirectory();
   EXPECT_EQ(disk_.operations(), 1u);
   EXPECT_EQ(log_.texts(), std::vector<std::string>(3, "_srSetupTempDirectory"));
 
   platform_.deviceRoot = "/without/parents";
   log_.clear();
-  _srSetupTempDirectory();
+  files_._srSetupTempDirectory();
   ASSERT_EQ(log_.lines().size(), 3u);
   EXPECT_EQ(log_.lines()[1].channel, platform::LogChannel::Console);
   EXPECT_TRUE(log_.lines()[1].text.starts_with("error: posix 2"));
@@ -52,7 +53,7 @@ TEST_F(TemporaryFilesTest, OnlyStrictlyOlderEntriesAgeOut) {
   addFile("old.mp4", 100, 86400.5);
   addFile("limit.mp4", 10, 86400.0);
   addFile("new.mp4", 1, 5);
-  EXPECT_EQ(_srDeleteFilesOlderThanTimeToLiveInSeconds(86400.0), 100);
+  EXPECT_EQ(files_._srDeleteFilesOlderThanTimeToLiveInSeconds(86400.0), 100);
   EXPECT_FALSE(exists("old.mp4"));
   EXPECT_TRUE(exists("limit.mp4"));
   EXPECT_TRUE(exists("new.mp4"));
@@ -68,7 +69,7 @@ TEST_F(TemporaryFilesTest, DeletingAllCountsOnlyWhatWasRemoved) {
   addFile("nameless.mp4", 300);
   disk_.failOn(Operation::Remove, path("stuck.mp4"), EBUSY);
   disk_.failOn(Operation::Attributes, path("nameless.mp4"), EIO);
-  EXPECT_EQ(_srDeleteAllTempFiles(), 7 + 4096);
+  EXPECT_EQ(files_._srDeleteAllTempFiles(), 7 + 4096);
   EXPECT_TRUE(exists("stuck.mp4"));
   EXPECT_FALSE(exists("folder/inner.mp4"));
   EXPECT_FALSE(exists("nameless.mp4"));
@@ -81,26 +82,26 @@ TEST_F(TemporaryFilesTest, AnEntryOfUnknownAgeStaysWhileOthersAgeOut) {
   addFile("unknown.mp4", 300, 1e6);
   addFile("old.mp4", 20, 1e6);
   disk_.failOn(Operation::Attributes, path("unknown.mp4"), EIO);
-  EXPECT_EQ(_srDeleteFilesOlderThanTimeToLiveInSeconds(1.9), 20);
+  EXPECT_EQ(files_._srDeleteFilesOlderThanTimeToLiveInSeconds(1.9), 20);
   EXPECT_TRUE(exists("unknown.mp4"));
   EXPECT_TRUE(log_.contains("_srDeleteFilesOlderThanTimeToLiveInSeconds: 1"));
 }
 
 TEST_F(TemporaryFilesTest, AMissingDirectoryIsReportedOnceAndHoldsNothing) {
-  EXPECT_EQ(_srDeleteAllTempFiles(), 0);
+  EXPECT_EQ(files_._srDeleteAllTempFiles(), 0);
   EXPECT_EQ(log_.count(kAgeingError + std::to_string(ENOENT)), 1u);
   std::optional<Error> error;
-  EXPECT_EQ(_srSizeOfTempDir(&error), 0);
+  EXPECT_EQ(files_._srSizeOfTempDir(&error), 0);
   ASSERT_TRUE(error);
   EXPECT_EQ(error->code, ENOENT);
-  EXPECT_EQ(_srDeviceFreeDiskSpace(), 0u);
-  EXPECT_FALSE(_srDeviceHasSufficientFreeSpaceForRecording());
+  EXPECT_EQ(QVDiskSpace(files_)._srDeviceFreeDiskSpace(), 0u);
+  EXPECT_FALSE(QVDiskSpace(files_)._srDeviceHasSufficientFreeSpaceForRecording());
 }
 
 TEST_F(TemporaryFilesTest, TheSizeIsThatOfTheDirectoryEntryAlone) {
   disk_.addDirectory(kStore, 4096);
   addFile("big.mp4", 1'000'000);
-  EXPECT_EQ(_srSizeOfTempDir(nullptr), 4096);
+  EXPECT_EQ(files_._srSizeOfTempDir(nullptr), 4096);
 }
 
 TEST_F(TemporaryFilesTest, RemovingAFileWorksInTheBackgroundAndToleratesAMissingOne) {
@@ -109,10 +110,10 @@ TEST_F(TemporaryFilesTest, RemovingAFileWorksInTheBackgroundAndToleratesAMissing
   disk_.failOn(Operation::Remove, path("stuck.mp4"), EBUSY);
   std::vector<int64_t> codes;
   const auto record = [&](const std::optional<Error>& error) { codes.push_back(error ? error->code : 0); };
-  _srRemoveFile(URL::fileURL(path("clip 1.mp4")), record);
-  _srRemoveFile(URL::fileURL(path("missing.mp4")), record);
-  _srRemoveFile(URL::fileURL(path("stuck.mp4")), record);
-  _srRemoveFile(URL::fileURL(path("missing.mp4")), nullptr);
+  files_._srRemoveFile(URL::fileURL(path("clip 1.mp4")), record);
+  files_._srRemoveFile(URL::fileURL(path("missing.mp4")), record);
+  files_._srRemoveFile(URL::fileURL(path("stuck.mp4")), record);
+  files_._srRemoveFile(URL::fileURL(path("missing.mp4")), nullptr);
   EXPECT_TRUE(exists("clip 1.mp4"));
   background_.runUntilIdle();
   EXPECT_FALSE(exists("clip 1.mp4"));
@@ -125,8 +126,8 @@ TEST_F(TemporaryFilesTest, MovingReplacesTheDestination) {
   addFile("to.mp4", 2);
   std::vector<int64_t> codes;
   const auto move = [&] {
-    _srMoveFileFromURL(URL::fileURL(path("from.mp4")), URL::fileURL(path("to.mp4")),
-                       [&](const std::optional<Error>& error) { codes.push_back(error ? error->code : 0); });
+    files_._srMoveFileFromURL(URL::fileURL(path("from.mp4")), URL::fileURL(path("to.mp4")),
+                              [&](const std::optional<Error>& error) { codes.push_back(error ? error->code : 0); });
     global_.runUntilIdle();
   };
   move();
@@ -140,11 +141,11 @@ TEST_F(TemporaryFilesTest, MovingReplacesTheDestination) {
 TEST_F(TemporaryFilesTest, DeletingByPrefixGoesOnAfterAFailure) {
   for (const char* name : {"Clip_1.mp4", "clip2.mp4", "myclip.mp4", "clip3.mp4", "cli"}) addFile(name, 1);
   disk_.failOn(Operation::Remove, path("clip2.mp4"), EBUSY);
-  _srDeleteFilesWithPrefix("clip");
+  files_._srDeleteFilesWithPrefix("clip");
   global_.runUntilIdle();
   EXPECT_EQ(disk_.contentsOfDirectory(kStore).value(), (std::vector<std::string>{"clip2.mp4", "myclip.mp4", "cli"}));
   platform_.deviceRoot = "/nowhere";
-  _srDeleteFilesWithPrefix("clip");
+  files_._srDeleteFilesWithPrefix("clip");
   global_.runUntilIdle();
   EXPECT_EQ(log_.texts(), (std::vector<std::string>{"_qvDeleteFilesWithPrefix error: " + std::to_string(EBUSY),
                                                     "_qvDeleteFilesWithPrefix error: " + std::to_string(ENOENT)}));
@@ -152,8 +153,8 @@ TEST_F(TemporaryFilesTest, DeletingByPrefixGoesOnAfterAFailure) {
 
 TEST_F(TemporaryFilesTest, CreationDateComesFromTheAttributes) {
   disk_.addFile(path("a.mp4"), "x", {200}, platform::Date{100});
-  EXPECT_EQ(_srGetCreationDateForFile(URL::fileURL(path("a.mp4"))), platform::Date{100});
-  EXPECT_EQ(_srGetCreationDateForFile(URL::fileURL(path("b.mp4"))), std::nullopt);
+  EXPECT_EQ(files_._srGetCreationDateForFile(URL::fileURL(path("a.mp4"))), platform::Date{100});
+  EXPECT_EQ(files_._srGetCreationDateForFile(URL::fileURL(path("b.mp4"))), std::nullopt);
 }
 
 }  // namespace

@@ -23,20 +23,20 @@ constexpr double kDay = 86400;
 
 class TemporaryMoviesTest : public SupportTest {
  protected:
-  TemporaryMoviesTest() { disk_.addDirectory(_srTempPath()); }
+  TemporaryMoviesTest() { disk_.addDirectory(files_._srTempPath()); }
 
   void addFile(const std::string& name, double age = 0) {
-    disk_.addFile(pathInStore(name), "movie", {FakeClock::kStart - age});
+    disk_.addFile(files_.pathInStore(name), "movie", {FakeClock::kStart - age});
   }
-  [[nodiscard]] bool exists(const std::string& name) { return disk_.itemExists(pathInStore(name)); }
-  static URL url(const std::string& name) { return URL::fileURL(pathInStore(name)); }
-  static std::string nameOf(const Claim& claim) {
-    return claim ? claim->path().substr(_srTempPath().size()) : "no claim";
+  [[nodiscard]] bool exists(const std::string& name) { return disk_.itemExists(files_.pathInStore(name)); }
+  [[nodiscard]] URL url(const std::string& name) const { return URL::fileURL(files_.pathInStore(name)); }
+  [[nodiscard]] std::string nameOf(const Claim& claim) const {
+    return claim ? claim->path().substr(files_._srTempPath().size()) : "no claim";
   }
   /// The claim, where there was nothing to wait for.
   Claim record(const std::string& name, const std::string& bundleID = kChess) {
     auto claim = std::make_shared<Claim>();
-    movies_->claimForRecording(pathInStore(name), bundleID, [claim](const Claim& to) { *claim = to; });
+    movies_->claimForRecording(files_.pathInStore(name), bundleID, [claim](const Claim& to) { *claim = to; });
     return *claim;
   }
   /// A movie that was made and handed.
@@ -48,7 +48,8 @@ class TemporaryMoviesTest : public SupportTest {
   }
   /// Starts to wait for a claim; what it gets, it keeps in `waited_`.
   void wait(const std::string& name, const std::string& bundleID = kChess) {
-    movies_->claimForRecording(pathInStore(name), bundleID, [this](const Claim& claim) { waited_.push_back(claim); });
+    movies_->claimForRecording(files_.pathInStore(name), bundleID,
+                               [this](const Claim& claim) { waited_.push_back(claim); });
   }
   [[nodiscard]] Names waitedNames() const {
     Names names;
@@ -59,7 +60,7 @@ class TemporaryMoviesTest : public SupportTest {
     return [this](const auto& error) { errors_.push_back(error ? error->code : 0); };
   }
 
-  std::shared_ptr<QVTemporaryMovies> movies_ = QVTemporaryMovies::create();
+  std::shared_ptr<QVTemporaryMovies> movies_ = QVTemporaryMovies::create(files_);
   std::vector<Claim> waited_;
   std::vector<int64_t> errors_;
 };
@@ -79,19 +80,19 @@ TEST_F(TemporaryMoviesTest, NobodyRecordsOverTheMovieOfAnotherOrOverOneThatIsBei
 
 TEST_F(TemporaryMoviesTest, CopiesLeaveAloneWhatIsNotTheirs) {
   addFile("mix.mp4");
-  const Claim mix = movies_->claimNew(pathInStore("mix.mp4"));
+  const Claim mix = movies_->claimNew(files_.pathInStore("mix.mp4"));
   EXPECT_EQ(nameOf(mix), "mix 2.mp4");
-  EXPECT_EQ(nameOf(movies_->claimNew(pathInStore("mix 2.mp4"))), "mix 2 2.mp4");
+  EXPECT_EQ(nameOf(movies_->claimNew(files_.pathInStore("mix 2.mp4"))), "mix 2 2.mp4");
 
   addFile("Chess_trimmed.mp4");
-  movies_->claimTrimmed(pathInStore("Chess_trimmed.mp4"), kChess)->handTo(kChess);
-  EXPECT_EQ(nameOf(movies_->claimTrimmed(pathInStore("Chess_trimmed.mp4"), kOther)), "Chess_trimmed 2.mp4");
+  movies_->claimTrimmed(files_.pathInStore("Chess_trimmed.mp4"), kChess)->handTo(kChess);
+  EXPECT_EQ(nameOf(movies_->claimTrimmed(files_.pathInStore("Chess_trimmed.mp4"), kOther)), "Chess_trimmed 2.mp4");
   const auto save = movies_->beginSave(kChess, url("Chess_trimmed.mp4"));
   ASSERT_TRUE(save);
-  EXPECT_EQ(nameOf(movies_->claimTrimmed(pathInStore("Chess_trimmed.mp4"), kChess)), "Chess_trimmed 2.mp4");
+  EXPECT_EQ(nameOf(movies_->claimTrimmed(files_.pathInStore("Chess_trimmed.mp4"), kChess)), "Chess_trimmed 2.mp4");
   save->succeeded(nullptr);
   background_.runUntilIdle();
-  EXPECT_EQ(nameOf(movies_->claimTrimmed(pathInStore("Chess_trimmed.mp4"), kChess)), "Chess_trimmed.mp4");
+  EXPECT_EQ(nameOf(movies_->claimTrimmed(files_.pathInStore("Chess_trimmed.mp4"), kChess)), "Chess_trimmed.mp4");
 }
 
 TEST_F(TemporaryMoviesTest, OnlyItsApplicationSavesAMovieAndOnlyOnceAtATime) {
@@ -112,10 +113,10 @@ TEST_F(TemporaryMoviesTest, OnlyItsApplicationSavesAMovieAndOnlyOnceAtATime) {
   EXPECT_FALSE(exists("Chess.mp4"));
 
   hand("Chess.mp4");
-  ASSERT_FALSE(disk_.removeItem(pathInStore("Chess.mp4")));
+  ASSERT_FALSE(disk_.removeItem(files_.pathInStore("Chess.mp4")));
   EXPECT_FALSE(movies_->isHandedTo(kChess, url("Chess.mp4")));
   EXPECT_FALSE(movies_->beginSave(kChess, url("Chess.mp4"))) << "it was removed behind our back";
-  disk_.addFile(pathInStore("Chess.mp4"), "");
+  disk_.addFile(files_.pathInStore("Chess.mp4"), "");
   EXPECT_FALSE(movies_->beginSave(kChess, url("Chess.mp4"))) << "an empty file is no movie";
 }
 
@@ -157,7 +158,8 @@ TEST_F(TemporaryMoviesTest, WhoeverWaitsIsDroppedWithTheStore) {
   hand("Chess.mp4");
   auto save = movies_->beginSave(kChess, url("Chess.mp4"));
   const auto held = std::make_shared<int>();
-  movies_->claimForRecording(pathInStore("Chess.mp4"), kChess, [held](const Claim&) { FAIL() << "its store is gone"; });
+  movies_->claimForRecording(files_.pathInStore("Chess.mp4"), kChess,
+                             [held](const Claim&) { FAIL() << "its store is gone"; });
   movies_ = nullptr;
   EXPECT_EQ(held.use_count(), 1);
   save = nullptr;
@@ -184,12 +186,12 @@ TEST_F(TemporaryMoviesTest, DiscardTakesTheLastHandedMovieOfItsCallerAlone) {
 
 TEST_F(TemporaryMoviesTest, AMovieThatCannotBeRemovedIsNobodys) {
   hand("Chess.mp4");
-  disk_.failOn(Operation::Remove, pathInStore("Chess.mp4"), EBUSY);
+  disk_.failOn(Operation::Remove, files_.pathInStore("Chess.mp4"), EBUSY);
   movies_->discardLast(kChess, recordError());
   background_.runUntilIdle();
   EXPECT_EQ(errors_, std::vector<int64_t>{EBUSY});
   EXPECT_FALSE(movies_->isHandedTo(kChess, url("Chess.mp4")));
-  disk_.failOn(Operation::Remove, pathInStore("Chess.mp4"), 0);
+  disk_.failOn(Operation::Remove, files_.pathInStore("Chess.mp4"), 0);
   EXPECT_EQ(movies_->deleteAllTempFiles(), 5);
 }
 
@@ -201,7 +203,7 @@ TEST_F(TemporaryMoviesTest, PurgesLeaveAloneWhatIsMadeOrSaved) {
   hand("Fresh.mp4", kChess);
   hand("Stuck.mp4", kChess, 2 * kDay);
   addFile("leftover.mp4", 2 * kDay);
-  disk_.failOn(Operation::Remove, pathInStore("Stuck.mp4"), EBUSY);
+  disk_.failOn(Operation::Remove, files_.pathInStore("Stuck.mp4"), EBUSY);
   auto save = movies_->beginSave(kChess, url("Saved.mp4"));
   EXPECT_EQ(movies_->deleteFilesOlderThanTimeToLiveInSeconds(kDay), 2 * 5);
   EXPECT_TRUE(paused->hasFile() && exists("Saved.mp4"));
@@ -209,7 +211,7 @@ TEST_F(TemporaryMoviesTest, PurgesLeaveAloneWhatIsMadeOrSaved) {
   EXPECT_TRUE(movies_->isHandedTo(kChess, url("Stuck.mp4"))) << "it is still there";
   EXPECT_EQ(nameOf(record("Handed.mp4", kOther)), "Handed.mp4") << "what aged out is forgotten";
 
-  disk_.failOn(Operation::Remove, pathInStore("Stuck.mp4"), 0);
+  disk_.failOn(Operation::Remove, files_.pathInStore("Stuck.mp4"), 0);
   EXPECT_EQ(movies_->deleteAllTempFiles(), 2 * 5);
   EXPECT_TRUE(paused->hasFile() && exists("Saved.mp4"));
   save = nullptr;
@@ -224,7 +226,7 @@ TEST_F(TemporaryMoviesTest, ManyThreadsNeverShareAPath) {
     const std::string bundleID = thread % 2 == 0 ? kChess : kOther;
     for (int i = 0; i < 200; ++i) {
       // Another thread may run it, after this one's end.
-      movies_->claimForRecording(pathInStore("Chess.mp4"), bundleID, [&, bundleID](const Claim& claim) {
+      movies_->claimForRecording(files_.pathInStore("Chess.mp4"), bundleID, [&, bundleID](const Claim& claim) {
         {
           std::lock_guard lock(mutex);
           EXPECT_TRUE(taken.insert(claim->path()).second) << claim->path();

@@ -27,7 +27,7 @@ class UnfinishedMoviesTest : public SupportTest {
 };
 
 TEST_F(UnfinishedMoviesTest, AreFinishedUnderANameThatNoRecordingTakes) {
-  _srSalvageUnfinishedMovies();
+  QVUnfinishedMovies(files_, *platform_.movieSalvage, localization_)._srSalvageUnfinishedMovies();
   ASSERT_EQ(salvage_.salvaged.size(), 1u);
   const std::string kept = salvage_.salvaged.front();
   EXPECT_TRUE(kept.starts_with("Chess_recovered_") && kept.ends_with(".mp4")) << kept;
@@ -36,7 +36,7 @@ TEST_F(UnfinishedMoviesTest, AreFinishedUnderANameThatNoRecordingTakes) {
 
   // The same application crashed at the same moment of a clock that had begun anew.
   add("Chess.mp4");
-  _srSalvageUnfinishedMovies();
+  QVUnfinishedMovies(files_, *platform_.movieSalvage, localization_)._srSalvageUnfinishedMovies();
   ASSERT_EQ(salvage_.salvaged.size(), 2u);
   EXPECT_NE(salvage_.salvaged.back(), kept);
 
@@ -44,18 +44,18 @@ TEST_F(UnfinishedMoviesTest, AreFinishedUnderANameThatNoRecordingTakes) {
   salvage_.states[kept] = MovieState::Unfinished;
   salvage_.length = platform::Error::posix(ENOSPC, "disk");
   const auto before = names();
-  _srSalvageUnfinishedMovies();
+  QVUnfinishedMovies(files_, *platform_.movieSalvage, localization_)._srSalvageUnfinishedMovies();
   EXPECT_EQ(salvage_.salvaged.back(), kept);
   EXPECT_EQ(names(), before);
 
   salvage_.length = platform::MediaTime::zero();
-  _srSalvageUnfinishedMovies();
+  QVUnfinishedMovies(files_, *platform_.movieSalvage, localization_)._srSalvageUnfinishedMovies();
   EXPECT_FALSE(disk_.itemExists(kStore + kept));
 }
 
 TEST_F(UnfinishedMoviesTest, AStoreThatCannotBeReadCostsALogLine) {
   disk_.failOn(fakes::FakeFileSystem::Operation::List, kStore, EIO);
-  _srSalvageUnfinishedMovies();
+  QVUnfinishedMovies(files_, *platform_.movieSalvage, localization_)._srSalvageUnfinishedMovies();
   EXPECT_EQ(log_.lines().size(), 1u);
   EXPECT_TRUE(salvage_.salvaged.empty());
 }

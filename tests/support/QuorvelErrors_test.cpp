@@ -23,7 +23,7 @@ TEST_F(ErrorsTest, TheFirstAndTheLastCodeHaveTheirKeyAndOthersAreUnknown) {
                                   {INT64_MAX, "RECORDING_ERROR_UNKNOWN"},
                                   {-5801, "RECORDING_ERROR_USER_DECLINED"},
                                   {-5818, "RECORDING_ERROR_MIXING_FAILURE"}}) {
-    const auto error = _qvUserErrorForCode(code);
+    const auto error = QuorvelErrors(texts_)._qvUserErrorForCode(code);
     EXPECT_EQ(error.domain, "com.tarnwick.Quorvel.QVRecordingErrorDomain");
     EXPECT_EQ(error.code, code);
     EXPECT_EQ(error.userInfo, (Dictionary{{kLocalizedDescriptionKey, Value(key)}}));
@@ -32,9 +32,10 @@ TEST_F(ErrorsTest, TheFirstAndTheLastCodeHaveTheirKeyAndOthersAreUnknown) {
 
 TEST_F(ErrorsTest, TheTextReplacesTheCallersAndOtherEntriesStay) {
   const Dictionary userInfo{{kLocalizedDescriptionKey, Value("mine")}, {"file", Value("a.mp4")}};
-  EXPECT_EQ(_qvUserErrorForCode(errorcode::kFailed, userInfo).userInfo, userInfo);  // no framework, no text
+  EXPECT_EQ(QuorvelErrors(texts_)._qvUserErrorForCode(errorcode::kFailed, userInfo).userInfo,
+            userInfo);  // no framework, no text
   addTable("en", R"("RECORDING_ERROR_FAILED" = "It failed.";)");
-  const auto error = _qvUserErrorForCode(errorcode::kFailed, userInfo);
+  const auto error = QuorvelErrors(texts_)._qvUserErrorForCode(errorcode::kFailed, userInfo);
   EXPECT_EQ(error.localizedDescription(), "It failed.");
   EXPECT_EQ(platform::valueForKey(error.userInfo, "file").asString(), "a.mp4");
 }

@@ -6,6 +6,8 @@
 #include <string>
 
 #include "platform/Platform.h"
+#include "support/QVBundleTexts.h"
+#include "support/QVTemporaryFiles.h"
 #include "tests/fakes/FakeBundles.h"
 #include "tests/fakes/FakeClock.h"
 #include "tests/fakes/FakeFileSystem.h"
@@ -28,9 +30,7 @@ class SupportTest : public testing::Test {
     platform_.fileSystem = &disk_;
     platform_.bundles = &bundles_;
     platform_.localization = &localization_;
-    platform::Platform::install(&platform_);
   }
-  ~SupportTest() override { platform::Platform::install(nullptr); }
 
   /// Gives the framework one localization with a table.
   void addTable(const std::string& localization, const std::string& content) {
@@ -54,6 +54,8 @@ class SupportTest : public testing::Test {
   fakes::LogRecorder log_;
   std::shared_ptr<fakes::FakeBundle> framework_;
   platform::Platform platform_;
+  const QVTemporaryFiles files_{platform_};
+  const QVBundleTexts texts_{platform_};
 };
 
 }  // namespace qv

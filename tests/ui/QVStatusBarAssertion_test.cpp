@@ -9,6 +9,7 @@ namespace {
 using namespace std::chrono_literals;
 
 struct CountingAssertion final : QVStatusBarAssertion {
+  using QVStatusBarAssertion::QVStatusBarAssertion;
   void updateStatusStringWithTimer(platform::TimerHandle&) override { ++ticks; }
   int ticks = 0;
 };
@@ -17,7 +18,7 @@ TEST(QVStatusBarAssertionTest, ASecondStartReplacesTheTimerAndItEndsWithTheObjec
   fakes::FakeDevice device;
   fakes::ManualTimers timers;
   device.platform.timers = &timers;
-  auto assertion = std::make_shared<CountingAssertion>();
+  auto assertion = std::make_shared<CountingAssertion>(device.platform, device.texts);
   assertion->startRepeatingTimer();
   EXPECT_EQ(assertion->timerStartDate(), std::nullopt) << "on the main queue, later";
   device.run();
@@ -54,7 +55,7 @@ TEST(QVStatusBarAssertionTest, DurationsHaveTwoUnits) {
 
 TEST(QVStatusBarAssertionTest, TheTextFollowsTheState) {
   fakes::FakeDevice device;  // without the framework's texts each key stands for its text
-  QVStatusBarAssertion assertion;
+  QVStatusBarAssertion assertion(device.platform, device.texts);
   EXPECT_EQ(assertion.qvLocalizedRecordingDuration(1, false), "RECORDING_STATUS_BAR");
   EXPECT_EQ(assertion.qvLocalizedRecordingDuration(1, true), "RECORDING_PAUSED_STATUS_BAR");
   assertion.broadcasting = true;

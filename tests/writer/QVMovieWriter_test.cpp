@@ -30,7 +30,7 @@ class MovieWriterTest : public testing::Test {
  protected:
   std::shared_ptr<QVMovieWriter> started(Size size = {1280, 720},
                                          std::optional<QVBroadcastConfiguration> configuration = std::nullopt) {
-    auto writer = std::make_shared<QVMovieWriter>(size, std::string(fakes::kStore) + "/Game.mp4");
+    auto writer = std::make_shared<QVMovieWriter>(device_.platform, size, std::string(fakes::kStore) + "/Game.mp4");
     writer->setBroadcastConfig(std::move(configuration));
     writer->startWritingHandler([this] { ++startsAnswered_; });
     device_.run();
@@ -289,9 +289,7 @@ class MixTest : public testing::Test {
   };
   Mix mix(const std::optional<URL>& movie) {
     Mix answer;
-    QVAudioMixUtility::mixAudioForMovie(movies_, movie, [&](const auto& mixed, const auto& error) {
-      answer = {mixed, error};
-    });
+    mixer_.mixAudioForMovie(movie, [&](const auto& mixed, const auto& error) { answer = {mixed, error}; });
     EXPECT_EQ(device_.exports.sessions.size(), mixes_) << "no movie is opened on the caller's thread";
     device_.run();
     mixes_ = device_.exports.sessions.size();
@@ -300,8 +298,9 @@ class MixTest : public testing::Test {
   [[nodiscard]] std::vector<std::string> store() { return device_.disk.contentsOfDirectory(fakes::kStore).value(); }
 
   fakes::FakeDevice device_;
-  const std::shared_ptr<QVTemporaryMovies> movies_ = QVTemporaryMovies::create();
-  const URL movie_ = URL::fileURL(pathInStore("Game.mp4"));
+  const std::shared_ptr<QVTemporaryMovies> movies_ = QVTemporaryMovies::create(device_.files);
+  const QVAudioMixUtility mixer_{device_.platform, movies_};
+  const URL movie_ = URL::fileURL(device_.files.pathInStore("Game.mp4"));
   size_t mixes_ = 0;
 };
 
@@ -326,7 +325,7 @@ TEST_F(MixTest, WhatFailsLeavesNothing) {
   device_.exports.holds = true;
   for (const auto status : {platform::ExportStatus::Cancelled, platform::ExportStatus::Failed}) {
     std::optional<platform::Error> error;
-    QVAudioMixUtility::mixAudioForMovie(movies_, movie_, [&](const auto& mixed, const auto& failure) {
+    mixer_.mixAudioForMovie(movie_, [&](const auto& mixed, const auto& failure) {
       EXPECT_FALSE(mixed);
       error = failure;
     });
