@@ -2,7 +2,8 @@
 
 #include <gtest/gtest.h>
 
-#include "tests/fakes/FakeLocalization.h"
+#include "platform/linux/ICULocalization.h"
+#include "platform/linux/JSONPreferenceStore.h"
 #include "tests/fakes/LogRecorder.h"
 #include "tests/fakes/ManualExecutor.h"
 #include "tests/linux/TemporaryRoot.h"
@@ -43,7 +44,8 @@ class AppStreamStoreTest : public testing::Test {
 
   fakes::LogRecorder log_;
   TemporaryRoot root_;
-  fakes::FakeLocalization localization_;
+  platform::JSONPreferenceStore preferences_{root_.path()};
+  platform::ICULocalization localization_{preferences_, [](const char*) { return std::string(); }};
   fakes::ManualExecutor executor_;
 };
 
@@ -54,7 +56,8 @@ TEST_F(AppStreamStoreTest, FindsAnApplicationInTheUsersLanguage) {
                                          "<categories><category>Game</category><category>BoardGame</category>"
                                          "</categories>") +
                                component("com.example.old.desktop", "<name>Old</name>")));
-  localization_.languages = {"pt-BR", "en"};
+  root_.write("/private/var/mobile/Library/Preferences/com.tarnwick.quorveld.json",
+              R"({"Languages": ["pt-BR", "en"]})");
   const auto answer = lookUp({"com.example.none", "com.example.chess", "com.example.old"});
   EXPECT_EQ(answer.error, std::nullopt);
   ASSERT_EQ(answer.response.results.size(), 2u);

@@ -103,7 +103,7 @@ DaemonTest::~DaemonTest() {
 }
 
 void DaemonTest::install(const std::string& name, const std::string& bundleID, pid_t pid) {
-  device_.bundles.addApplication(name, bundleID);
+  device_.bundles.addNamedApplication(name, bundleID);
   device_.bundles.setProcess(pid, "/Applications/" + name + "/bin/run");
   device_.applications.states[bundleID] = platform::kApplicationForeground;
   device_.applications.processes[bundleID] = pid;
@@ -114,8 +114,8 @@ TestClient DaemonTest::chat() { return {device_, "com.example.chat", 200}; }
 
 TestClient DaemonTest::namesake() {
   install("Game Again", "com.example.namesake", 150);
-  device_.bundles.addApplication("Game Again", "com.example.namesake")->info[platform::bundleinfo::kDisplayName] =
-      platform::Value("Game");
+  device_.bundles.addApplication("Game Again",
+                                 R"({"CFBundleIdentifier": "com.example.namesake", "CFBundleDisplayName": "Game"})");
   return {device_, "com.example.namesake", 150};
 }
 
@@ -124,9 +124,7 @@ TestClient DaemonTest::systemUI() {
   return {device_, "com.example.system", 300, {{"com.tarnwick.private.quorvel", platform::Value(true)}}};
 }
 
-void DaemonTest::suppressAlert() {
-  device_.preferences.set("com.tarnwick.quorveld", "QVSuppressAlert", platform::Value(false));
-}
+void DaemonTest::suppressAlert() { device_.setPreferences(R"({"QVSuppressAlert": false})"); }
 
 void DaemonTest::sendFrame(int64_t nanoseconds, uint64_t flags) {
   const auto& all = device_.screen.controllers;

@@ -75,11 +75,9 @@ TEST_F(BroadcastTest, SetUpFindsTheExtensionAndShowsItsImages) {
   general->extensionPointIdentifier = broadcastpoint::kGeneral;
   general->icons = {icon};
   device_.extensions.installed.push_back(general);
-  auto app = std::make_shared<fakes::FakeBundle>("/Applications/Game", "com.example.game");
-  app->info[platform::bundleinfo::kIconFile] = Value("Icon.png");
-  app->resources[""] = {"Icon.png"};
-  device_.bundles.add(app);
-  device_.disk.addFile(app->resourcePath() + "/Icon.png", "PNG");
+  device_.bundles.addApplication("Game",
+                                 R"({"CFBundleIdentifier": "com.example.game", "CFBundleIconFile": "Icon.png"})");
+  device_.disk.addFile("/Applications/Game/Resources/Icon.png", "PNG");
   EXPECT_EQ(setUp(), 0);
   const auto images = client_.request("getCurrentBroadcastImages")->values;
   EXPECT_EQ(images[0].asData(), (Data{'P', 'N', 'G'}));

@@ -20,15 +20,15 @@ TEST_F(LifecycleTest, SizesAreClampedByDeviceAndPreference) {
   device_.deviceInfo.idiom = platform::UserInterfaceIdiom::Tablet;
   device_.deviceInfo.integers["ChipID"] = 0x8960;
   EXPECT_EQ(clamped({2048, 1536}), (Size{1600, 1200}));
-  device_.preferences.set("com.tarnwick.quorveld", "QVFullResCapture", Value(true));
+  device_.setPreferences(R"({"QVFullResCapture": true})");
   EXPECT_EQ(clamped({3840, 2160}), (Size{3840, 2160}));
 }
 
 TEST_F(LifecycleTest, FileNamesHoldWhateverAnAppIsCalled) {
   const MovieNames names(device_.platform, device_.texts);
   const auto name = [&](const std::string& displayName) {
-    device_.bundles.addApplication("Game", "com.example.game")->info[platform::bundleinfo::kDisplayName] =
-        Value(displayName);
+    device_.bundles.addApplication(
+        "Game", R"({"CFBundleIdentifier": "com.example.game", "CFBundleDisplayName": ")" + displayName + R"("})");
     return names.applicationMoviePath("com.example.game").substr(std::string(fakes::kStore).size() + 1);
   };
   EXPECT_EQ(name("Comet Run"), "Comet Run.mp4");

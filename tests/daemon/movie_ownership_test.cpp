@@ -183,7 +183,7 @@ TEST_F(MovieOwnershipTest, ASaveThatTheLibraryForgetsCanBeTriedAgain) {
 }
 
 TEST_F(MovieOwnershipTest, AFileThatCannotBeRemovedIsToldAndKeepsNobodyWaiting) {
-  using Operation = fakes::FakeFileSystem::Operation;
+  using Operation = fakes::ScratchDisk::Operation;
   auto client = game();
   const std::string movie = recordMovie(client);
   device_.clock.setNow({1700000000});

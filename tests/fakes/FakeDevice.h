@@ -6,22 +6,22 @@
 #include <string>
 
 #include "platform/Platform.h"
+#include "platform/linux/ICULocalization.h"
+#include "platform/linux/JSONPreferenceStore.h"
 #include "support/QVBundleTexts.h"
 #include "support/QVTemporaryFiles.h"
-#include "tests/fakes/FakeBundles.h"
 #include "tests/fakes/FakeClock.h"
 #include "tests/fakes/FakeDeviceInfo.h"
 #include "tests/fakes/FakeExtensions.h"
-#include "tests/fakes/FakeFileSystem.h"
 #include "tests/fakes/FakeIPC.h"
-#include "tests/fakes/FakeLocalization.h"
 #include "tests/fakes/FakeMedia.h"
 #include "tests/fakes/FakeMovieSalvage.h"
-#include "tests/fakes/FakePreferences.h"
 #include "tests/fakes/FakeServices.h"
 #include "tests/fakes/LogRecorder.h"
 #include "tests/fakes/ManualExecutor.h"
 #include "tests/fakes/ManualTimers.h"
+#include "tests/fakes/ScratchBundles.h"
+#include "tests/fakes/ScratchDisk.h"
 
 namespace qv::fakes {
 
@@ -34,6 +34,10 @@ struct FakeDevice {
   FakeDevice(const FakeDevice&) = delete;
   FakeDevice& operator=(const FakeDevice&) = delete;
   void run() { executor.runUntilIdle(); }
+  /// The daemon's own preferences, as JSON.
+  void setPreferences(const std::string& json) {
+    disk.addFile("/private/var/mobile/Library/Preferences/com.tarnwick.quorveld.json", json);
+  }
 
   LogRecorder log;
   ManualExecutor executor;
@@ -45,16 +49,16 @@ struct FakeDevice {
   FakeScreenCapture screen;
   FakeDeviceCapture deviceCapture;
   FakeAppAudioTap tap;
-  FakeFileSystem disk;
+  ScratchDisk disk;
   FakeAssetWriterService movies{disk, clock};
   FakeExportService exports{disk, clock};
   FakeMovieSalvage salvage;
   FakeApplications applications;
   FakeUserAlerts alerts;
   FakeSounds sounds;
-  FakeBundleService bundles;
-  FakeLocalization localization;
-  FakePreferences preferences;
+  platform::JSONPreferenceStore preferences{disk.at("")};
+  platform::ICULocalization localization{preferences, [](const char*) { return std::string(); }};
+  ScratchBundles bundles{disk, "", localization};
   FakeDeviceInfo deviceInfo;
   FakePurgeableSpace purgeableSpace;
   FakePhotoLibrary photoLibrary{disk};

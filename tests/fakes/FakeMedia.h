@@ -15,7 +15,7 @@
 #include "platform/ExportSession.h"
 #include "platform/ScreenCapture.h"
 #include "tests/fakes/FakeClock.h"
-#include "tests/fakes/FakeFileSystem.h"
+#include "tests/fakes/ScratchDisk.h"
 
 namespace qv::fakes {
 
@@ -260,7 +260,7 @@ class FakeAppAudioTap final : public platform::AppAudioTapService {
 /// ("movie 3"): a test that finds a file so knows whose it is. As on a disk, no writer takes a path where a file is.
 class FakeAssetWriterService final : public platform::AssetWriterService {
  public:
-  FakeAssetWriterService(FakeFileSystem& disk, const FakeClock& clock) : disk_(disk), clock_(clock) {}
+  FakeAssetWriterService(ScratchDisk& disk, const FakeClock& clock) : disk_(disk), clock_(clock) {}
   void prepareForWriting() override {}
   struct Input final : platform::WriterInput {
     void setTransform(const platform::AffineTransform& to) override { transform = to; }
@@ -355,7 +355,7 @@ class FakeAssetWriterService final : public platform::AssetWriterService {
  private:
   void write(const Movie& movie) { disk_.addFile(movie.url.path(), movie.content, clock_.now()); }
 
-  FakeFileSystem& disk_;
+  ScratchDisk& disk_;
   const FakeClock& clock_;
 };
 
@@ -363,7 +363,7 @@ class FakeAssetWriterService final : public platform::AssetWriterService {
 /// there is one; it fails where a file is in its way, as on a disk.
 class FakeExportService final : public platform::ExportService {
  public:
-  FakeExportService(FakeFileSystem& disk, const FakeClock& clock) : disk_(disk), clock_(clock) {}
+  FakeExportService(ScratchDisk& disk, const FakeClock& clock) : disk_(disk), clock_(clock) {}
   struct Asset final : platform::MovieAsset {
     platform::MediaTime duration() const override { return length; }
     std::vector<int32_t> audioTrackIDs() const override { return {2, 3}; }
@@ -426,7 +426,7 @@ class FakeExportService final : public platform::ExportService {
   bool holds = false;
 
  private:
-  FakeFileSystem& disk_;
+  ScratchDisk& disk_;
   const FakeClock& clock_;
 };
 

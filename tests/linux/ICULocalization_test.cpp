@@ -6,7 +6,8 @@
 
 #include <map>
 
-#include "tests/fakes/FakePreferences.h"
+#include "platform/linux/JSONPreferenceStore.h"
+#include "tests/kit/ScratchFolder.h"
 
 namespace qv::platform {
 namespace {
@@ -19,7 +20,12 @@ class ICULocalizationTest : public testing::Test {
     ICULocalization localization(preferences_, [&](const char* name) { return environment[name]; });
     return localization.preferredLanguages();
   }
-  fakes::FakePreferences preferences_;
+  void prefer(const std::string& languages) {
+    root_.write("/private/var/mobile/Library/Preferences/com.tarnwick.quorveld.json",
+                R"({"Languages": )" + languages + "}");
+  }
+  kit::ScratchFolder root_;
+  JSONPreferenceStore preferences_{root_.path()};
   ICULocalization localization_{preferences_, [](const char*) { return std::string(); }};
 };
 
@@ -29,7 +35,7 @@ TEST_F(ICULocalizationTest, LanguagesComeFromTheEnvironmentOrThePreferences) {
   EXPECT_EQ(languages({{"LANG", "pt_BR.UTF-8"}}), Tags{"pt-BR"});
   EXPECT_EQ(languages({{"LANG", "de_DE"}, {"LC_ALL", "sr_RS.UTF-8@latin"}}), Tags{"sr-Latn-RS"});
   EXPECT_EQ(languages({{"LANG", "de_DE.UTF-8"}, {"LANGUAGE", "fr_CA:fr::de_DE"}}), (Tags{"fr-CA", "fr", "de-DE"}));
-  preferences_.set("com.tarnwick.quorveld", "Languages", Value(Array{Value("zh-Hant-TW"), Value(3), Value("ja")}));
+  prefer(R"(["zh-Hant-TW", 3, "ja"])");
   EXPECT_EQ(languages({{"LANG", "de_DE.UTF-8"}}), (Tags{"zh-Hant-TW", "ja"}));
 }
 
@@ -59,9 +65,9 @@ TEST_F(ICULocalizationTest, DatesAreLocalTimeInPlainDigits) {
   ::tzset();
   const Date date{1767268800.0};  // 12:00 UTC, 17:30 there
   EXPECT_EQ(localization_.formatDate(date, "MM-dd-yyyy HH:mm:ss"), "01-01-2026 17:30:00");
-  preferences_.set("com.tarnwick.quorveld", "Languages", Value(Array{Value("ar-EG")}));
+  prefer(R"(["ar-EG"])");
   EXPECT_EQ(localization_.formatDate(date, "MM-dd-yyyy HH:mm:ss"), "01-01-2026 17:30:00");
-  preferences_.set("com.tarnwick.quorveld", "Languages", Value(Array{Value("de")}));
+  prefer(R"(["de"])");
   EXPECT_EQ(localization_.formatDate(date, "EEEE, d. MMMM"), "Donnerstag, 1. Januar");
   ::setenv("TZ", "UTC", 1);
   ::tzset();

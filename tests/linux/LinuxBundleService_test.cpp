@@ -8,7 +8,8 @@
 
 #include <filesystem>
 
-#include "tests/fakes/FakeLocalization.h"
+#include "platform/linux/ICULocalization.h"
+#include "platform/linux/JSONPreferenceStore.h"
 #include "tests/fakes/LogRecorder.h"
 #include "tests/linux/TemporaryRoot.h"
 
@@ -31,7 +32,8 @@ class LinuxBundleServiceTest : public testing::Test {
 
   TemporaryRoot root_;
   fakes::LogRecorder log_;
-  fakes::FakeLocalization localization_;
+  JSONPreferenceStore preferences_{root_.path()};
+  ICULocalization localization_{preferences_, [](const char*) { return std::string(); }};
   LinuxBundleService bundles_;
 };
 
@@ -124,7 +126,7 @@ TEST_F(LinuxBundleServiceTest, ResourcesAndLocalizations) {
   EXPECT_EQ(flat->pathForResource("Localizable", "strings", "fr"), table);
   EXPECT_EQ(flat->pathForResource("Localizable", "strings", "en"), std::nullopt);
   EXPECT_EQ(flat->pathForResource("Info", "json", "../../../Chess/x"), std::nullopt);
-  localization_.languages = {"fr-CA"};
+  root_.write("/private/var/mobile/Library/Preferences/com.tarnwick.quorveld.json", R"({"Languages": ["fr-CA"]})");
   EXPECT_EQ(valueForKey(flat->localizedInfoDictionary(), "CFBundleDisplayName").asString(), "Échecs");
 
   const BundleRef french = bundles_.bundleAtPath(root_.path("/Applications/Chess/Resources/fr.lproj"));

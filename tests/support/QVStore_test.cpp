@@ -54,7 +54,7 @@ TEST_F(StoreTest, WhatTheCatalogueLacksIsEmptyAndTheNameThatOfTheInstalledApplic
   EXPECT_EQ(load().dictionary(), (Dictionary{{"QVStoreInfoBundleIDKey", Value("com.example.chess")},
                                              {"QVStoreInfoAuthorKey", Value("")},
                                              {"QVStoreInfoItemURLKey", Value("")}}));
-  bundles_.addApplication("Chess", "com.example.chess");
+  bundles_.addNamedApplication("Chess", "com.example.chess");
   results_ = {{std::nullopt, std::nullopt, "Example", std::vector<std::string>{}}};
   const QVStoreInfo info = load();
   EXPECT_EQ(info.appName, "Chess");

@@ -13,7 +13,7 @@ namespace {
 
 using fakes::FakeClock;
 using platform::URL;
-using Operation = fakes::FakeFileSystem::Operation;
+using Operation = fakes::ScratchDisk::Operation;
 using Claim = std::shared_ptr<MovieClaim>;
 using Names = std::vector<std::string>;
 

@@ -32,7 +32,7 @@ TEST_F(UnfinishedMoviesTest, AreFinishedUnderANameThatNoRecordingTakes) {
   const std::string kept = salvage_.salvaged.front();
   EXPECT_TRUE(kept.starts_with("Chess_recovered_") && kept.ends_with(".mp4")) << kept;
   EXPECT_EQ(kept.find(':'), std::string::npos);
-  EXPECT_EQ(names(), (std::vector<std::string>{kept, "Done.mp4", "Live.mp4", "text.mp4", "Chess.mp4.7-1.partial"}));
+  EXPECT_EQ(names(), (std::vector<std::string>{"Chess.mp4.7-1.partial", kept, "Done.mp4", "Live.mp4", "text.mp4"}));
 
   // The same application crashed at the same moment of a clock that had begun anew.
   add("Chess.mp4");
@@ -54,7 +54,7 @@ TEST_F(UnfinishedMoviesTest, AreFinishedUnderANameThatNoRecordingTakes) {
 }
 
 TEST_F(UnfinishedMoviesTest, AStoreThatCannotBeReadCostsALogLine) {
-  disk_.failOn(fakes::FakeFileSystem::Operation::List, kStore, EIO);
+  disk_.failOn(fakes::ScratchDisk::Operation::List, kStore, EIO);
   QVUnfinishedMovies(files_, *platform_.movieSalvage, localization_)._srSalvageUnfinishedMovies();
   EXPECT_EQ(log_.lines().size(), 1u);
   EXPECT_TRUE(salvage_.salvaged.empty());

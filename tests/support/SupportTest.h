@@ -6,14 +6,15 @@
 #include <string>
 
 #include "platform/Platform.h"
+#include "platform/linux/ICULocalization.h"
+#include "platform/linux/JSONPreferenceStore.h"
 #include "support/QVBundleTexts.h"
 #include "support/QVTemporaryFiles.h"
-#include "tests/fakes/FakeBundles.h"
 #include "tests/fakes/FakeClock.h"
-#include "tests/fakes/FakeFileSystem.h"
-#include "tests/fakes/FakeLocalization.h"
 #include "tests/fakes/LogRecorder.h"
 #include "tests/fakes/ManualExecutor.h"
+#include "tests/fakes/ScratchBundles.h"
+#include "tests/fakes/ScratchDisk.h"
 
 namespace qv {
 
@@ -34,25 +35,23 @@ class SupportTest : public testing::Test {
 
   /// Gives the framework one localization with a table.
   void addTable(const std::string& localization, const std::string& content) {
-    if (!framework_) framework_ = std::make_shared<fakes::FakeBundle>(kFramework);
-    framework_->resources[localization] = {"Localizable.strings"};
-    bundles_.add(framework_);
-    const std::string directory = framework_->resourcePath() + "/" + localization + ".lproj";
-    auto bundle = std::make_shared<fakes::FakeBundle>(directory);
-    bundle->hasResourceDirectory = false;
-    bundle->resources[""] = {"Localizable.strings"};
-    bundles_.add(bundle);
+    const std::string directory = std::string(kFramework) + "/Resources/" + localization + ".lproj";
     disk_.addFile(directory + "/Localizable.strings", content);
+  }
+
+  void setLanguages(const std::string& json) {
+    disk_.addFile("/root/private/var/mobile/Library/Preferences/com.tarnwick.quorveld.json",
+                  R"({"Languages": )" + json + "}");
   }
 
   fakes::FakeClock clock_;
   fakes::ManualExecutor global_;
   fakes::ManualExecutor background_;
-  fakes::FakeFileSystem disk_;
-  fakes::FakeBundleService bundles_;
-  fakes::FakeLocalization localization_;
+  fakes::ScratchDisk disk_;
+  platform::JSONPreferenceStore preferences_{disk_.at("/root")};
+  platform::ICULocalization localization_{preferences_, [](const char*) { return std::string(); }};
+  fakes::ScratchBundles bundles_{disk_, "/root", localization_};
   fakes::LogRecorder log_;
-  std::shared_ptr<fakes::FakeBundle> framework_;
   platform::Platform platform_;
   const QVTemporaryFiles files_{platform_};
   const QVBundleTexts texts_{platform_};

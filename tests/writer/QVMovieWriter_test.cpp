@@ -73,11 +73,11 @@ TEST_F(MovieWriterTest, EncoderSettingsFollowSizeDevicePreferenceAndConfiguratio
   device_.deviceInfo.idiom = platform::UserInterfaceIdiom::Tablet;
   started();
   EXPECT_EQ(bitRate(), 7000000);
-  device_.preferences.set("com.tarnwick.quorveld", "QVBitRateOverride", Value(int64_t{12000000}));
+  device_.setPreferences(R"({"QVBitRateOverride": 12000000})");
   started();
   EXPECT_EQ(bitRate(), 12000000);
   EXPECT_TRUE(device_.log.contains("bit rate set to 12000000"));
-  device_.preferences.set("com.tarnwick.quorveld", "QVBitRateOverride", Value("fast"));
+  device_.setPreferences(R"({"QVBitRateOverride": "fast"})");
   started({1280, 720}, QVBroadcastConfiguration{5, {{settings::kAverageBitRate, Value(int64_t{900000})}}});
   EXPECT_EQ(bitRate(), 900000);
   EXPECT_EQ(valueForKey(compression(), settings::kMaxKeyFrameInterval).asInteger(), 60);
@@ -85,19 +85,15 @@ TEST_F(MovieWriterTest, EncoderSettingsFollowSizeDevicePreferenceAndConfiguratio
 }
 
 TEST_F(MovieWriterTest, TakesOnlyABitRateAsOverride) {
-  for (const Value& usable : {Value(int32_t{12000000}), Value(uint64_t{12000000}), Value(12000000.0)}) {
-    device_.preferences.set("com.tarnwick.quorveld", "QVBitRateOverride", usable);
+  const auto override = [this](const std::string& value) {
+    device_.setPreferences(R"({"QVBitRateOverride": )" + value + "}");
     started();
-    EXPECT_EQ(bitRate(), 12000000);
-  }
+    return bitRate();
+  };
+  for (const char* usable : {"12000000", "12000000.0"}) EXPECT_EQ(override(usable), 12000000);
   EXPECT_EQ(device_.log.countContaining("QVBitRateOverride"), 0u);
-  const std::vector<Value> unusable{Value(true),        Value(1e30), Value(1.5),  Value(std::nan("")),
-                                    Value(int64_t{-5}), Value(0.0),  Value("12"), Value(UINT64_MAX)};
-  for (const Value& value : unusable) {
-    device_.preferences.set("com.tarnwick.quorveld", "QVBitRateOverride", value);
-    started();
-    EXPECT_EQ(bitRate(), 3000000);
-  }
+  const std::vector<const char*> unusable{"true", "1e30", "1.5", "-5", "0.0", "\"12\"", "18446744073709551615"};
+  for (const char* value : unusable) EXPECT_EQ(override(value), 3000000) << value;
   EXPECT_EQ(device_.log.count("QVBitRateOverride is no usable bit rate, ignored"), unusable.size());
 }
 
