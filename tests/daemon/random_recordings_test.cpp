@@ -11,7 +11,7 @@ constexpr int kSteps = 4000;
 #if defined(__SANITIZE_ADDRESS__) || defined(__SANITIZE_THREAD__)
 constexpr int kRuns = 6;
 #else
-constexpr int kRuns = 48;
+constexpr int kRuns = 24;
 #endif
 
 uint64_t numberFrom(const char* variable, uint64_t otherwise) {
