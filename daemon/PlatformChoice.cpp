@@ -13,6 +13,7 @@
 #include "platform/sdbus/SdBusIPC.h"
 #include "platform/threads/Log.h"
 #include "platform/x11/X11Platform.h"
+#include "support/QVDeviceLayout.h"
 #include "support/QVDiskSpace.h"
 #include "support/QVTemporaryFiles.h"
 
@@ -20,20 +21,36 @@ namespace qv {
 
 namespace logs = platform::logs;
 
+namespace {
+
+/// The screen readers that free desktops have. While one runs, a system recording is heard to begin and end.
+const std::set<std::string> kScreenReaders{"orca"};
+
+platform::LinuxDevice thisDevice() {
+  return {.root = platform::deviceRootFromEnvironment(),
+          .bundlePath = platform::bundlePathFromEnvironment(),
+          .preferences = kPreferencesDirectory,
+          .preferenceDomain = kPreferenceDomain,
+          .photoLibrary = kPhotoLibraryDirectory,
+          .metrics = kMetricsDirectory,
+          .screenReaders = kScreenReaders,
+          .watchedPath = kTempPath,
+          .watchedSpace = {
+              .thresholds = {kMinimumFreeSpaceForRecording, kMinimumFreeSpaceWhileRecording, kCriticalFreeSpace},
+              .criticalFor = kCriticalFor}};
+}
+
+}  // namespace
+
 struct PlatformChoice::Backends {
-  platform::LinuxPlatform linux{
-      platform::deviceRootFromEnvironment(),
-      platform::bundlePathFromEnvironment(),
-      {kTempPath,
-       {.thresholds = {kMinimumFreeSpaceForRecording, kMinimumFreeSpaceWhileRecording, kCriticalFreeSpace},
-        .criticalFor = kCriticalFor}}};
+  platform::LinuxPlatform linux{thisDevice()};
   platform::SdBusIPCService ipc{linux.peerResolver()};
-  platform::LinuxExtensionService extensions{
-      ipc,
-      linux.bundles(),
-      platform::systemTimers(),
-      platform::globalQueue(),
-      {.deviceRoot = platform::deviceRootFromEnvironment(), .launcherPath = platform::installedExtensionLauncher()}};
+  platform::LinuxExtensionService extensions{ipc,
+                                             linux.bundles(),
+                                             platform::systemTimers(),
+                                             platform::globalQueue(),
+                                             {.dataDirectory = platform::deviceRootFromEnvironment() + kDataDirectory,
+                                              .launcherPath = platform::installedExtensionLauncher()}};
   // What is recorded may fill the disk, and nothing else of the daemon does.
   platform::LogindKeepAlive keepAlive{
       {.busAddress = {}, .activityHandler = [this](bool isOpen) { linux.watchFreeSpace(isOpen); }}};
@@ -102,7 +119,6 @@ void PlatformChoice::chooseSound() {
   platform_.appAudioTap = &backends_->sound;
   platform_.deviceCapture = &backends_->sound;
   platform_.sounds = &backends_->sound;
-  platform_.screenReader = &backends_->sound;
 }
 
 }  // namespace qv

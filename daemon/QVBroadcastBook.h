@@ -45,6 +45,7 @@ class QVBroadcastBook : public std::enable_shared_from_this<QVBroadcastBook> {
   /// Of the broadcast that was set up last; PNG images, empty without.
   [[nodiscard]] const platform::Data& currentHostAppImage() const { return currentHostAppImage_; }
   [[nodiscard]] const platform::Data& currentExtensionAppImage() const { return currentExtensionAppImage_; }
+  /// Offered, not called by this daemon.
   [[nodiscard]] const std::string& currentExtensionDisplayName() const { return currentExtensionDisplayName_; }
   void clearPresentation();
 

@@ -101,9 +101,4 @@ void SoundChoice::play(uint32_t soundID) {
   (server != nullptr ? server->sounds() : headless_.sounds()).play(soundID);
 }
 
-bool SoundChoice::isRunning() {
-  platform::PulsePlatform* const server = pulse();
-  return (server != nullptr ? server->screenReader() : headless_.screenReader()).isRunning();
-}
-
 }  // namespace qv

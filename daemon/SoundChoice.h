@@ -5,7 +5,6 @@
 
 #include "platform/AppAudioTap.h"
 #include "platform/DeviceCapture.h"
-#include "platform/ScreenReader.h"
 #include "platform/Sounds.h"
 #include "platform/headless/HeadlessPlatform.h"
 #include "platform/pulse/PulsePlatform.h"
@@ -22,8 +21,7 @@ namespace qv {
 /// there is none it does not wait.
 class SoundChoice final : public platform::AppAudioTapService,
                           public platform::DeviceCaptureService,
-                          public platform::SystemSounds,
-                          public platform::ScreenReader {
+                          public platform::SystemSounds {
  public:
   explicit SoundChoice(platform::HeadlessPlatform& headless);
   ~SoundChoice() override;
@@ -35,7 +33,6 @@ class SoundChoice final : public platform::AppAudioTapService,
   std::shared_ptr<platform::AudioDataOutput> createAudioDataOutput() override;
   platform::AudioSession& audioSession() override;
   void play(uint32_t soundID) override;
-  [[nodiscard]] bool isRunning() override;
 
  private:
   class BothAudioSessions;

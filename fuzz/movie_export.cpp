@@ -15,9 +15,8 @@ constexpr int64_t kLongestMix = 5 * int64_t{mp4::kMovieTimescale};
 
 std::optional<Error> exportMovie(const std::string& from, const std::string& to, ExportPreset preset,
                                  MediaTimeRange range) {
-  std::atomic<double> progress{0};
   const std::atomic<bool> cancelled{false};
-  return ffmpeg::MovieExport({from, to, preset, range}, progress, cancelled).run();
+  return ffmpeg::MovieExport({from, to, preset, range}, cancelled).run();
 }
 
 }  // namespace

@@ -34,7 +34,7 @@ struct AudioMixInputParameters {
 /// already H.264, and re-encodes any other. Nothing is left at the output URL after a failure or a
 /// cancellation.
 ///
-/// Threading: configuration from one thread; `progress` and `cancel` from any; the completion comes
+/// Threading: configuration from one thread; `cancel` from any; the completion comes
 /// on a thread of the service's.
 class ExportSession {
  public:
@@ -45,8 +45,6 @@ class ExportSession {
   virtual void setAudioMix(std::vector<AudioMixInputParameters> mix) = 0;
   virtual void exportAsynchronously(std::function<void()> completion) = 0;
   virtual void cancel() = 0;
-  /// 0 to 1.
-  [[nodiscard]] virtual double progress() const = 0;
   [[nodiscard]] virtual ExportStatus status() const = 0;
   [[nodiscard]] virtual std::optional<Error> error() const = 0;
   [[nodiscard]] virtual const URL& outputURL() const = 0;

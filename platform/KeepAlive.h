@@ -11,7 +11,6 @@ class KeepAliveService {
   virtual ~KeepAliveService() = default;
   virtual void beginTransaction() = 0;
   virtual void endTransaction() = 0;
-  [[nodiscard]] virtual int openTransactionCount() const = 0;
 };
 
 }  // namespace qv::platform

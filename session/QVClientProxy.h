@@ -28,6 +28,7 @@ class QVClientProxy {
   void setConnection(const std::shared_ptr<platform::IPCConnection>& connection) { connection_.store(connection); }
   [[nodiscard]] const std::string& bundleIdentifier() const { return bundleIdentifier_; }
 
+  /// Offered, not called by this daemon.
   void updateScreenRecordingState(bool recording);
   void stopRecordingWithError(const std::optional<platform::Error>& error,
                               const std::optional<platform::URL>& movieURL);
@@ -43,6 +44,7 @@ class QVClientProxy {
   /// dropped, and messages keep their order.
   void captureTimelineDidChange(platform::Data pauses);
   void recordingLockInterrupted(const platform::Error& error);
+  /// Offered, not called by this daemon.
   void recordingTimerDidUpdate(const std::string& time);
 
  private:

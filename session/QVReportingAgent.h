@@ -30,6 +30,7 @@ class QVReportingAgent {
   void addVideoFrame() { ++videoFrameCount_; }
   void addAppAudioFrame() { ++appAudioFrameCount_; }
   void addMicFrame() { ++micFrameCount_; }
+  /// The counts so far. Offered, not called by this daemon.
   [[nodiscard]] int64_t videoFrameCount() const { return videoFrameCount_; }
   [[nodiscard]] int64_t appAudioFrameCount() const { return appAudioFrameCount_; }
   [[nodiscard]] int64_t micFrameCount() const { return micFrameCount_; }

@@ -4,7 +4,7 @@
 
 namespace qv {
 
-/// Whether the network is there.
+/// Whether the network is there. Offered, not called by this daemon.
 ///
 /// Threading: thread-safe.
 class QVReachability {

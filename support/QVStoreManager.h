@@ -10,7 +10,7 @@
 
 namespace qv {
 
-/// Looks applications up in the device's store catalogue.
+/// Looks applications up in the device's store catalogue. Offered, not called by this daemon.
 ///
 /// Threading: thread-safe.
 class QVStoreManager {

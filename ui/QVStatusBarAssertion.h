@@ -23,7 +23,7 @@ class QVStatusBarAssertionDelegate {
 
 /// The model of the indicator that tells the user that a recording or a broadcast is running: its state,
 /// its timer, its texts. The operations that show something do nothing, since a television has no status
-/// bar; a device that has one fills them in.
+/// bar; a device that has one fills them in. Offered, not called by this daemon.
 ///
 /// Threading: main queue only, except `startRepeatingTimer` and `stringWithTimeInterval`, which any thread may call.
 class QVStatusBarAssertion : public std::enable_shared_from_this<QVStatusBarAssertion> {

@@ -38,6 +38,7 @@ class QVMovieWriter : public std::enable_shared_from_this<QVMovieWriter> {
   [[nodiscard]] platform::URL outputURL() const { return platform::URL::fileURL(outputPath_); }
   [[nodiscard]] const std::string& outputPath() const { return outputPath_; }
   [[nodiscard]] platform::Size windowSize() const { return windowSize_; }
+  /// Offered, not called by this daemon.
   [[nodiscard]] platform::MediaTime trimVideoPresentationTime() const { return trimVideoPresentationTime_.load(); }
 
   /// Removes any file at the output path, sets the file writer up, then calls the handler, whether

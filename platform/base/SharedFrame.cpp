@@ -55,20 +55,8 @@ Result<std::shared_ptr<SharedFrame>> SharedFrame::adopt(SharedFileDescriptor mem
   return frame;
 }
 
-std::shared_ptr<const SharedFrame> SharedFrame::withAttachment(std::shared_ptr<const SharedFrame> frame,
-                                                               std::shared_ptr<void> attachment) {
-  std::shared_ptr<SharedFrame> view(new SharedFrame);
-  view->memory_ = frame->memory_;
-  view->layout_ = frame->layout_;
-  view->data_ = frame->data_;
-  view->ownsMapping_ = false;
-  view->attachment_ = std::make_shared<std::pair<std::shared_ptr<const SharedFrame>, std::shared_ptr<void>>>(
-      std::move(frame), std::move(attachment));
-  return view;
-}
-
 SharedFrame::~SharedFrame() {
-  if (ownsMapping_ && data_ != nullptr) ::munmap(data_, layout_.byteSize());
+  if (data_ != nullptr) ::munmap(data_, layout_.byteSize());
 }
 
 std::span<uint8_t> SharedFrame::mutableBytes() {

@@ -35,7 +35,7 @@ struct FrameLayout {
 ///
 /// A frame sent to another process goes with a lease: one end of a socket pair, whose closing,
 /// by release or by the receiver's death, ends the sender's hold on the frame. `attachment` is
-/// whatever must stay alive as long as the frame does (a pool slot, a received lease).
+/// whatever must stay alive as long as the frame does (a received lease).
 ///
 /// Threading: immutable once filled, so thread-safe.
 class SharedFrame {
@@ -45,9 +45,6 @@ class SharedFrame {
   /// Maps a received memory file read-only; fails when it is not sealed or too small.
   static Result<std::shared_ptr<SharedFrame>> adopt(SharedFileDescriptor memory, const FrameLayout& layout,
                                                     std::shared_ptr<void> attachment);
-  /// A frame that shares `memory`'s mapping and adds an attachment of its own.
-  static std::shared_ptr<const SharedFrame> withAttachment(std::shared_ptr<const SharedFrame> frame,
-                                                           std::shared_ptr<void> attachment);
   ~SharedFrame();
   SharedFrame(const SharedFrame&) = delete;
   SharedFrame& operator=(const SharedFrame&) = delete;
@@ -64,7 +61,6 @@ class SharedFrame {
   FrameLayout layout_;
   uint8_t* data_ = nullptr;
   bool writable_ = false;
-  bool ownsMapping_ = true;
   std::shared_ptr<const void> attachment_;
 };
 using SharedFrameRef = std::shared_ptr<const SharedFrame>;

@@ -33,7 +33,7 @@ std::optional<Error> FFmpegExportSession::run() {
   if (fileType_ != kFileTypeMPEG4) return Error::posix(ENOTSUP, fileType_);
   const std::string destination = outputURL_.path();
   if (destination.empty() || destination == asset->path()) return Error::posix(EINVAL, outputURL_.absoluteString());
-  return MovieExport({asset->path(), destination, preset_, range_}, progress_, cancelled_).run();
+  return MovieExport({asset->path(), destination, preset_, range_}, cancelled_).run();
 }
 
 void FFmpegExportSession::exportAsynchronously(std::function<void()> completion) {

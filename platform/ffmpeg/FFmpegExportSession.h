@@ -39,7 +39,6 @@ class FFmpegExportSession final : public ExportSession, public std::enable_share
   void setAudioMix(std::vector<AudioMixInputParameters>) override {}
   void exportAsynchronously(std::function<void()> completion) override;
   void cancel() override { cancelled_.store(true); }
-  [[nodiscard]] double progress() const override { return progress_.load(); }
   [[nodiscard]] ExportStatus status() const override { return status_.load(); }
   [[nodiscard]] std::optional<Error> error() const override;
   [[nodiscard]] const URL& outputURL() const override { return outputURL_; }
@@ -52,7 +51,6 @@ class FFmpegExportSession final : public ExportSession, public std::enable_share
   URL outputURL_;
   std::string fileType_;
   MediaTimeRange range_;
-  std::atomic<double> progress_{0};
   std::atomic<bool> cancelled_{false};
   std::atomic<ExportStatus> status_{ExportStatus::Unknown};
   mutable std::mutex mutex_;

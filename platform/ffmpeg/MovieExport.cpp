@@ -21,8 +21,8 @@ Error unreadable(const std::string& text) { return mp4::movieError(mp4::kMovieNo
 
 }  // namespace
 
-MovieExport::MovieExport(ExportPlan plan, std::atomic<double>& progress, const std::atomic<bool>& cancelled)
-    : plan_(std::move(plan)), progress_(progress), cancelled_(cancelled) {}
+MovieExport::MovieExport(ExportPlan plan, const std::atomic<bool>& cancelled)
+    : plan_(std::move(plan)), cancelled_(cancelled) {}
 
 std::optional<Error> MovieExport::run() {
   // In the same directory, so that the renaming moves nothing; a name of this run's alone.
@@ -36,7 +36,6 @@ std::optional<Error> MovieExport::run() {
     error = Error::posix(errno, plan_.destination);
   }
   if (error) (void)::unlink(path.c_str());
-  if (!error) progress_.store(1);
   return error;
 }
 
@@ -139,7 +138,6 @@ std::optional<Error> MovieExport::copyMedia() {
     if (!got) return got.error();
     if (!got.value()) break;
     auto error = handle(*packet);
-    reportProgress(*packet);
     av_packet_unref(packet.get());
     if (!error) error = writePending(false);
     if (error) return error;
@@ -183,14 +181,6 @@ std::optional<Error> MovieExport::writePending(bool all) {
   auto error = writer_->writeFragment(pending_);
   for (auto& samples : pending_) samples.clear();
   return error;
-}
-
-void MovieExport::reportProgress(const AVPacket& packet) {
-  if (packet.pts == AV_NOPTS_VALUE) return;
-  const double time = static_cast<double>(packet.pts) * av_q2d(packet.time_base) * mp4::kMovieTimescale;
-  const double length = static_cast<double>(range_.end - range_.start);
-  const double share = std::clamp((time - static_cast<double>(range_.start)) / length, 0.0, 0.99);
-  progress_.store(std::max(progress_.load(), share));
 }
 
 }  // namespace qv::platform::ffmpeg

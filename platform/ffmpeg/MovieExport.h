@@ -26,10 +26,10 @@ struct ExportPlan {
 
 /// One run of an export, from opening the source to the renaming of the complete result.
 ///
-/// Threading: confined to one thread; `progress` and `cancelled` (borrowed) are shared with others.
+/// Threading: confined to one thread; `cancelled` (borrowed) is shared with others.
 class MovieExport {
  public:
-  MovieExport(ExportPlan plan, std::atomic<double>& progress, const std::atomic<bool>& cancelled);
+  MovieExport(ExportPlan plan, const std::atomic<bool>& cancelled);
   /// Nothing where the result stands at the destination.
   std::optional<Error> run();
 
@@ -50,12 +50,10 @@ class MovieExport {
   std::optional<Error> handle(const AVPacket& packet);
   std::optional<Error> finishMedia();
   std::optional<Error> writePending(bool all);
-  void reportProgress(const AVPacket& packet);
   [[nodiscard]] bool isDone() const;
   [[nodiscard]] mp4::MovieTrack trackOf(const Output& output, uint32_t trackID) const;
 
   const ExportPlan plan_;
-  std::atomic<double>& progress_;
   const std::atomic<bool>& cancelled_;
   ExportRange range_;
   std::unique_ptr<MovieReader> reader_;

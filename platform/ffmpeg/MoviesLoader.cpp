@@ -37,7 +37,6 @@ class FailedExportSession final : public ExportSession {
   void setAudioMix(std::vector<AudioMixInputParameters>) override {}
   void exportAsynchronously(std::function<void()> completion) override { globalQueue().post(std::move(completion)); }
   void cancel() override {}
-  [[nodiscard]] double progress() const override { return 0; }
   [[nodiscard]] ExportStatus status() const override { return ExportStatus::Failed; }
   [[nodiscard]] std::optional<Error> error() const override { return error_; }
   [[nodiscard]] const URL& outputURL() const override { return outputURL_; }

@@ -42,12 +42,6 @@ class LoggedSounds final : public SystemSounds {
   void play(uint32_t soundID) override { QV_LOG_INFO(logs::kAudio, "headless sound %u", soundID); }
 };
 
-/// Threading: thread-safe.
-class AbsentScreenReader final : public ScreenReader {
- public:
-  bool isRunning() override { return false; }
-};
-
 }  // namespace
 
 HeadlessPlatform::HeadlessPlatform(HeadlessOptions options)
@@ -55,8 +49,7 @@ HeadlessPlatform::HeadlessPlatform(HeadlessOptions options)
       appAudioTap_(openApplicationAudio),
       applications_(std::move(options.processOfBundleIdentifier), std::move(options.frontmostApplication)),
       alerts_(std::move(options.alertPolicy)),
-      sounds_(std::make_unique<LoggedSounds>()),
-      screenReader_(std::make_unique<AbsentScreenReader>()) {}
+      sounds_(std::make_unique<LoggedSounds>()) {}
 
 HeadlessPlatform::~HeadlessPlatform() = default;
 

@@ -1,6 +1,5 @@
 #pragma once
 
-#include "platform/ScreenReader.h"
 #include "platform/Sounds.h"
 #include "platform/headless/HeadlessAlerts.h"
 #include "platform/headless/HeadlessApplications.h"
@@ -38,7 +37,6 @@ class HeadlessPlatform {
   RenderServer& renderServer() { return renderServer_; }
   UserAlertService& userAlerts() { return alerts_; }
   SystemSounds& sounds() { return *sounds_; }
-  ScreenReader& screenReader() { return *screenReader_; }
 
  private:
   HeadlessScreen screen_;
@@ -48,7 +46,6 @@ class HeadlessPlatform {
   HeadlessRenderServer renderServer_;
   HeadlessAlerts alerts_;
   const std::unique_ptr<SystemSounds> sounds_;
-  const std::unique_ptr<ScreenReader> screenReader_;
 };
 
 }  // namespace qv::platform

@@ -18,7 +18,6 @@ namespace qv::platform {
 namespace {
 
 constexpr const char kLauncher[] = "quorvel-extension-launcher";
-constexpr const char kDataDirectory[] = "/private/var/mobile";
 constexpr const char kContainers[] = "/Containers";
 constexpr int kStatusNotConfined = 126;  // of the launcher
 constexpr int kStatusNotRun = 127;
@@ -64,12 +63,11 @@ std::string installedExtensionLauncher() {
 Result<SpawnRequest> makeExtensionLaunch(const ExtensionRecord& extension, const ExtensionLaunchOptions& options,
                                          const ListenerEndpoint& requests, const ListenerEndpoint& auxiliary) {
   if (!isSafeFileStem(extension.identifier)) return Error::posix(EINVAL, extension.identifier);
-  const std::string dataDirectory = options.deviceRoot + kDataDirectory;
-  const std::string container = dataDirectory + kContainers + "/" + extension.identifier;
+  const std::string container = options.dataDirectory + kContainers + "/" + extension.identifier;
   if (auto error = makeContainer(container)) return *error;
   SpawnRequest launch;
   launch.program = options.launcherPath;
-  launch.arguments = {std::to_string(::getpid()), dataDirectory, extension.bundlePath, container,
+  launch.arguments = {std::to_string(::getpid()), options.dataDirectory, extension.bundlePath, container,
                       extension.executablePath};
   if (options.alwaysAnotherUser) launch.arguments.emplace_back("another-user");
   launch.environment = makeEnvironment(container);

@@ -10,7 +10,8 @@ namespace qv::platform {
 
 /// How extensions are launched on this device.
 struct ExtensionLaunchOptions {
-  std::string deviceRoot;    ///< as in Platform
+  /// The user's data, complete. An extension sees nothing of it but its container, in `Containers`.
+  std::string dataDirectory;
   std::string launcherPath;  ///< of quorvel-extension-launcher
   /// As root: runs extensions as users of their own even where the kernel confines well enough without.
   bool alwaysAnotherUser = false;
@@ -19,7 +20,7 @@ struct ExtensionLaunchOptions {
 /// Where the daemon's own installation has the launcher: beside the daemon, else in ../lib/quorveld.
 [[nodiscard]] std::string installedExtensionLauncher();
 
-/// Makes the extension's container where there is none yet, `<device root>/private/var/mobile/Containers/<identifier>`,
+/// Makes the extension's container where there is none yet, `<data directory>/Containers/<identifier>`,
 /// and puts together its launch: confinement, a minimal environment, its output in "stderr.log" of its container, and
 /// the two endpoints. Blocking.
 [[nodiscard]] Result<SpawnRequest> makeExtensionLaunch(const ExtensionRecord& extension,

@@ -1,21 +1,19 @@
 #include "platform/linux/FileCopy.h"
 
 #include <fcntl.h>
-#include <linux/fs.h>
 #include <stdio.h>
-#include <sys/ioctl.h>
+#include <sys/sendfile.h>
 #include <sys/stat.h>
+#include <unistd.h>
 
 #include <cerrno>
 #include <cstdlib>
-#include <memory>
-#include <vector>
 
 namespace qv::platform {
 namespace {
 
 constexpr mode_t kMode = 0644;
-constexpr size_t kChunk = size_t{1} << 20;
+constexpr size_t kChunk = size_t{64} << 20;  // bytes in one call
 
 /// Removes a file unless it was let go.
 class Unfinished {
@@ -33,44 +31,18 @@ class Unfinished {
   std::string path_;
 };
 
-/// Whether an error of copy_file_range means that another way may work.
-bool isUnsupported(int failure) {
-  return failure == EXDEV || failure == EINVAL || failure == ENOSYS || failure == EOPNOTSUPP || failure == EPERM ||
-         failure == ETXTBSY;
-}
-
-std::optional<Error> writeAll(int to, const char* data, size_t size) {
-  while (size > 0) {
-    const ssize_t count = ::write(to, data, size);
-    if (count < 0 && errno == EINTR) continue;
-    if (count < 0) return Error::posix(errno, "write");
-    data += count;
-    size -= static_cast<size_t>(count);
-  }
-  return std::nullopt;
-}
-
 /// From where both files stand to the end of `from`.
-std::optional<Error> readAndWrite(int from, int to) {
-  const std::unique_ptr<char[]> chunk(new char[kChunk]);
-  for (;;) {
-    const ssize_t count = ::read(from, chunk.get(), kChunk);
-    if (count < 0 && errno == EINTR) continue;
-    if (count < 0) return Error::posix(errno, "read");
-    if (count == 0) return std::nullopt;
-    if (auto error = writeAll(to, chunk.get(), static_cast<size_t>(count))) return error;
-  }
-}
-
 std::optional<Error> copyContent(int from, int to) {
-  if (::ioctl(to, FICLONE, from) == 0) return std::nullopt;
-  for (;;) {
-    const ssize_t count = ::copy_file_range(from, nullptr, to, nullptr, kChunk * 64, 0);
-    if (count > 0 || (count < 0 && errno == EINTR)) continue;
-    if (count < 0 && !isUnsupported(errno)) return Error::posix(errno, "copy_file_range");
-    // At its end, or refused somewhere: reading finds out which, and does the rest.
-    return readAndWrite(from, to);
-  }
+  ssize_t count = 0;
+  // Shares the blocks where the file system can. Not every pair of file systems is for this; sendfile copies what is
+  // left then, and tells what is wrong otherwise.
+  do {
+    count = ::copy_file_range(from, nullptr, to, nullptr, kChunk, 0);
+  } while (count > 0);
+  do {
+    count = ::sendfile(to, from, nullptr, kChunk);
+  } while (count > 0 || (count < 0 && errno == EINTR));
+  return count < 0 ? std::optional(Error::posix(errno, "copy")) : std::nullopt;
 }
 
 void flushDirectory(const std::string& path) {

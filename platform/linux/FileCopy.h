@@ -16,7 +16,7 @@ inline constexpr const char kUnfinishedCopyPrefix[] = ".quorvel-copy-";
 Result<FileDescriptor> openRegularFile(const std::string& path);
 
 /// Copies `source` (a regular file) into `directory`: shares the blocks where the file system can,
-/// copies inside the kernel where it can, reads and writes otherwise. The copy grows under a hidden
+/// copies inside the kernel otherwise. The copy grows under a hidden
 /// name, is flushed to the disk, and only then gets its name, which `nameForAttempt` yields (attempt
 /// 0, 1, …; the empty string gives up with EEXIST). Nothing that exists is replaced, and no
 /// half copy stays behind, short of a crash. The result is the name.

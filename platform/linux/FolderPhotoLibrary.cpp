@@ -49,8 +49,8 @@ struct FolderPhotoLibrary::Folder {
   }
 };
 
-FolderPhotoLibrary::FolderPhotoLibrary(const std::string& deviceRoot, Executor& executor)
-    : folder_(new Folder{deviceRoot + "/private/var/mobile/Media/Movies", {}}), executor_(executor) {}
+FolderPhotoLibrary::FolderPhotoLibrary(const std::string& directory, Executor& executor)
+    : folder_(new Folder{directory, {}}), executor_(executor) {}
 
 void FolderPhotoLibrary::createAsset(const URL& file, PhotoResourceType type,
                                      std::function<void(const std::optional<Error>&)> completion) {

@@ -8,14 +8,13 @@
 
 namespace qv::platform {
 
-/// A photo library that is a folder of movies: <device root>/private/var/mobile/Media/Movies/, made at
-/// the first use. A movie keeps its name; where that is taken, " 2", " 3", … stands before the
-/// extension. Only regular files are taken.
+/// A photo library that is a folder of movies, made at the first use. A movie keeps its name; where that is taken, "
+/// 2", " 3", … stands before the extension. Only regular files are taken.
 ///
 /// Threading: thread-safe; the copying and the completion run on the executor.
 class FolderPhotoLibrary final : public PhotoLibrary {
  public:
-  FolderPhotoLibrary(const std::string& deviceRoot, Executor& executor);
+  FolderPhotoLibrary(const std::string& directory, Executor& executor);
   void createAsset(const URL& file, PhotoResourceType type,
                    std::function<void(const std::optional<Error>&)> completion) override;
 

@@ -16,7 +16,6 @@
 namespace qv::platform {
 namespace {
 
-constexpr const char kDomain[] = "com.tarnwick.quorveld";
 constexpr const char kLanguagesKey[] = "Languages";
 constexpr const char kDefaultLanguage[] = "en";
 
@@ -79,8 +78,8 @@ icu::UnicodeString folded(const std::string& text) {
 
 }  // namespace
 
-ICULocalization::ICULocalization(PreferenceStore& preferences, Environment environment)
-    : preferences_(preferences), environment_(std::move(environment)) {}
+ICULocalization::ICULocalization(PreferenceStore& preferences, std::string preferenceDomain, Environment environment)
+    : preferences_(preferences), preferenceDomain_(std::move(preferenceDomain)), environment_(std::move(environment)) {}
 
 ICULocalization::Environment ICULocalization::processEnvironment() {
   return [](const char* name) -> std::string {
@@ -94,7 +93,7 @@ std::vector<std::string> ICULocalization::preferredLanguages() {
   const auto add = [&](std::string tag) {
     if (!tag.empty() && std::find(tags.begin(), tags.end(), tag) == tags.end()) tags.push_back(std::move(tag));
   };
-  const Value languages = preferences_.valueForKey(kDomain, kLanguagesKey);
+  const Value languages = preferences_.valueForKey(preferenceDomain_, kLanguagesKey);
   for (const Value& tag : languages.asArray()) add(tag.asString());
   if (!tags.empty()) return tags;
 

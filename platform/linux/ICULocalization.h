@@ -11,8 +11,8 @@ namespace qv::platform {
 
 /// Languages, dates and folding by ICU, whose data is touched at the first use only.
 ///
-/// The preferred languages are the array of tags "Languages" of the preference domain
-/// com.tarnwick.quorveld, so that a settings screen decides; without it those of the environment
+/// The preferred languages are the array of tags "Languages" of a preference domain, so that a settings screen decides;
+/// without it those of the environment
 /// (LANGUAGE, LC_ALL, LC_MESSAGES, LANG, as gettext reads them); without those "en".
 ///
 /// Threading: thread-safe.
@@ -20,7 +20,8 @@ class ICULocalization final : public Localization {
  public:
   using Environment = std::function<std::string(const char* name)>;
   /// `preferences` must outlive this. `environment` yields the empty string for what is not set.
-  explicit ICULocalization(PreferenceStore& preferences, Environment environment = processEnvironment());
+  ICULocalization(PreferenceStore& preferences, std::string preferenceDomain,
+                  Environment environment = processEnvironment());
 
   [[nodiscard]] std::vector<std::string> preferredLanguages() override;
   [[nodiscard]] std::vector<std::string> matchLocalizations(const std::vector<std::string>& available,
@@ -34,6 +35,7 @@ class ICULocalization final : public Localization {
   static Environment processEnvironment();
 
   PreferenceStore& preferences_;
+  const std::string preferenceDomain_;
   const Environment environment_;
 };
 

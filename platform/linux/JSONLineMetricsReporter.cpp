@@ -6,6 +6,7 @@
 
 #include <cerrno>
 #include <cstdio>
+#include <utility>
 
 #include "platform/base/FileDescriptor.h"
 #include "platform/linux/Json.h"
@@ -41,10 +42,8 @@ size_t sizeOf(const std::string& path) {
 
 }  // namespace
 
-JSONLineMetricsReporter::JSONLineMetricsReporter(const std::string& deviceRoot, const Clock& clock)
-    : directory_(deviceRoot + "/private/var/mobile/Library/Logs/Quorvel"),
-      path_(directory_ + "/metrics.jsonl"),
-      clock_(clock) {}
+JSONLineMetricsReporter::JSONLineMetricsReporter(std::string directory, const Clock& clock)
+    : directory_(std::move(directory)), path_(directory_ + "/metrics.jsonl"), clock_(clock) {}
 
 std::optional<Error> JSONLineMetricsReporter::sendMessage(const MetricsMessage& message) {
   const std::string line = lineFor(message, clock_.now());

@@ -8,15 +8,14 @@
 
 namespace qv::platform {
 
-/// Appends each message as one line of JSON to
-/// <device root>/private/var/mobile/Library/Logs/Quorvel/metrics.jsonl. A file that would grow over
+/// Appends each message as one line of JSON to <directory>/metrics.jsonl. A file that would grow over
 /// 1 MiB becomes metrics.jsonl.1, the older ones .2 to .4; the fourth goes. A line is whole or not
 /// there at all.
 ///
 /// Threading: thread-safe, blocking.
 class JSONLineMetricsReporter final : public MetricsReporter {
  public:
-  JSONLineMetricsReporter(const std::string& deviceRoot, const Clock& clock);
+  JSONLineMetricsReporter(std::string directory, const Clock& clock);
   std::optional<Error> sendMessage(const MetricsMessage& message) override;
 
  private:

@@ -8,12 +8,9 @@
 
 namespace qv::platform {
 
-JSONPreferenceStore::JSONPreferenceStore(const std::string& deviceRoot)
-    : directory_(deviceRoot + "/private/var/mobile/Library/Preferences/") {}
-
 Value JSONPreferenceStore::valueForKey(const std::string& domain, const std::string& key) {
   if (!isSafeFileStem(domain)) return {};
-  const std::string path = directory_ + domain + ".json";
+  const std::string path = directory_ + "/" + domain + ".json";
   const auto preferences = readJSONDictionary(path);
   if (preferences) return platform::valueForKey(preferences.value(), key);
   if (preferences.error().code != ENOENT) {

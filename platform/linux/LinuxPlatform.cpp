@@ -22,19 +22,20 @@ bool isRunning(const SharedFileDescriptor& process) {
 
 }  // namespace
 
-LinuxPlatform::LinuxPlatform(std::string deviceRoot, const std::string& bundlePath, WatchedSpace watchedSpace)
-    : deviceRoot_(std::move(deviceRoot)),
-      watchedPath_(deviceRoot_ + watchedSpace.path),
-      preferences_(deviceRoot_),
-      localization_(preferences_),
-      bundles_(deviceRoot_, bundlePath, localization_),
+LinuxPlatform::LinuxPlatform(const LinuxDevice& device)
+    : deviceRoot_(device.root),
+      watchedPath_(deviceRoot_ + device.watchedPath),
+      preferences_(deviceRoot_ + device.preferences),
+      localization_(preferences_, device.preferenceDomain),
+      bundles_(deviceRoot_, device.bundlePath, localization_),
       deviceInfo_(deviceRoot_),
       entitlements_(deviceRoot_),
-      purgeableSpace_(systemTimers(), globalBackgroundQueue(), std::move(watchedSpace.limits),
+      purgeableSpace_(systemTimers(), globalBackgroundQueue(), device.watchedSpace,
                       [this] { return watchedFreeSpace(); }),
-      photoLibrary_(deviceRoot_, globalQueue()),
-      metrics_(deviceRoot_, systemClock()),
-      reachability_(globalQueue()) {}
+      photoLibrary_(deviceRoot_ + device.photoLibrary, globalQueue()),
+      metrics_(deviceRoot_ + device.metrics, systemClock()),
+      reachability_(globalQueue()),
+      screenReader_(device.screenReaders) {}
 
 void LinuxPlatform::addTo(Platform& platform) {
   platform.deviceRoot = deviceRoot_;
@@ -47,6 +48,7 @@ void LinuxPlatform::addTo(Platform& platform) {
   platform.photoLibrary = &photoLibrary_;
   platform.metrics = &metrics_;
   platform.reachability = &reachability_;
+  platform.screenReader = &screenReader_;
 }
 
 std::optional<uint64_t> LinuxPlatform::watchedFreeSpace() {

@@ -2,6 +2,7 @@
 
 #include <cstdint>
 #include <optional>
+#include <set>
 #include <string>
 
 #include "platform/IPC.h"
@@ -15,19 +16,27 @@
 #include "platform/linux/JSONPreferenceStore.h"
 #include "platform/linux/LinuxBundleService.h"
 #include "platform/linux/PosixFileSystem.h"
+#include "platform/linux/ProcessScreenReader.h"
 #include "platform/linux/RouteReachability.h"
 
 namespace qv::platform {
 
-/// Which disk is watched, and for what.
-struct WatchedSpace {
-  std::string path;  ///< of a directory on it, without the device root
-  FreeSpaceLimits limits;
+/// Where things lie on the device. Directories without a separator at their end, under the root.
+struct LinuxDevice {
+  std::string root;        ///< as in Platform
+  std::string bundlePath;  ///< as in LinuxBundleService; complete
+  std::string preferences;
+  std::string preferenceDomain;  ///< that names the languages
+  std::string photoLibrary;
+  std::string metrics;
+  std::set<std::string> screenReaders{};  ///< names of their processes
+  std::string watchedPath;                ///< on the disk whose free space is watched
+  FreeSpaceLimits watchedSpace{};
 };
 
 /// The services that need nothing but Linux and files, for one device root. Making it reads nothing.
 ///
-///   LinuxPlatform linux(deviceRootFromEnvironment(), bundlePathFromEnvironment(), watchedSpace);
+///   LinuxPlatform linux(device);
 ///   Platform platform;
 ///   linux.addTo(platform);
 ///   sdbus.setPeerResolver(linux.peerResolver());
@@ -36,13 +45,12 @@ struct WatchedSpace {
 /// themselves.
 class LinuxPlatform {
  public:
-  /// `deviceRoot` as in Platform; `bundlePath` as in LinuxBundleService.
-  LinuxPlatform(std::string deviceRoot, const std::string& bundlePath, WatchedSpace watchedSpace);
+  explicit LinuxPlatform(const LinuxDevice& device);
   LinuxPlatform(const LinuxPlatform&) = delete;
   LinuxPlatform& operator=(const LinuxPlatform&) = delete;
 
   /// Sets the device root, fileSystem, bundles, localization, preferences, deviceInfo,
-  /// purgeableSpace, photoLibrary, metrics and reachability.
+  /// purgeableSpace, photoLibrary, metrics, reachability and screenReader.
   void addTo(Platform& platform);
   /// Fills in a peer's bundle identifier and entitlements. It borrows this object. A process that has
   /// ended, or whose executable lies in no bundle, keeps neither.
@@ -69,6 +77,7 @@ class LinuxPlatform {
   FolderPhotoLibrary photoLibrary_;
   JSONLineMetricsReporter metrics_;
   RouteReachabilityService reachability_;
+  ProcessScreenReader screenReader_;
 };
 
 /// QUORVEL_DEVICE_ROOT without trailing separators; empty on a device.

@@ -1,21 +1,20 @@
 #include "platform/linux/PosixFileSystem.h"
 
-#include <dirent.h>
 #include <fcntl.h>
 #include <sys/stat.h>
-#include <sys/statvfs.h>
 #include <unistd.h>
 
 #include <cerrno>
 #include <filesystem>
-#include <memory>
-#include <string_view>
 #include <system_error>
 
 #include "platform/linux/FileCopy.h"
 #include "platform/linux/SmallFile.h"
 
 namespace qv::platform {
+
+namespace fs = std::filesystem;
+
 namespace {
 
 Date dateFrom(const struct statx_timestamp& time) {
@@ -47,18 +46,13 @@ std::optional<Error> PosixFileSystem::createDirectory(const std::string& path) {
 }
 
 Result<std::vector<std::string>> PosixFileSystem::contentsOfDirectory(const std::string& path) {
-  const auto close = [](DIR* directory) { ::closedir(directory); };
-  const std::unique_ptr<DIR, decltype(close)> directory(::opendir(path.c_str()), close);
-  if (!directory) return Error::posix(errno, path);
   std::vector<std::string> names;
-  for (;;) {
-    errno = 0;
-    const dirent* entry = ::readdir(directory.get());
-    if (entry == nullptr && errno != 0) return Error::posix(errno, path);
-    if (entry == nullptr) return names;
-    const std::string_view name = entry->d_name;
-    if (name != "." && name != "..") names.emplace_back(name);
+  std::error_code failure;
+  for (fs::directory_iterator entry(path, failure), end; !failure && entry != end; entry.increment(failure)) {
+    names.push_back(entry->path().filename());
   }
+  if (failure) return Error::posix(failure.value(), path);
+  return names;
 }
 
 Result<FileAttributes> PosixFileSystem::attributesOfItem(const std::string& path) {
@@ -78,7 +72,7 @@ std::optional<Error> PosixFileSystem::removeItem(const std::string& path) {
   if (::unlink(path.c_str()) == 0) return std::nullopt;
   if (errno != EISDIR) return Error::posix(errno, path);
   std::error_code failure;
-  std::filesystem::remove_all(path, failure);
+  fs::remove_all(path, failure);
   if (failure) return Error::posix(failure.value(), path);
   return std::nullopt;
 }
@@ -89,9 +83,10 @@ std::optional<Error> PosixFileSystem::moveItem(const std::string& source, const 
 }
 
 Result<uint64_t> PosixFileSystem::freeSizeOfFileSystem(const std::string& path) {
-  struct statvfs info {};
-  if (::statvfs(path.c_str(), &info) != 0) return Error::posix(errno, path);
-  return uint64_t{info.f_bavail} * info.f_frsize;
+  std::error_code failure;
+  const fs::space_info space = fs::space(path, failure);
+  if (failure) return Error::posix(failure.value(), path);
+  return space.available;
 }
 
 Result<std::string> PosixFileSystem::readFile(const std::string& path) { return readSmallFile(path); }

@@ -5,6 +5,8 @@
 
 #include <algorithm>
 #include <cerrno>
+#include <filesystem>
+#include <system_error>
 
 namespace qv::platform {
 
@@ -32,16 +34,9 @@ Result<std::string> readSmallFile(const FileDescriptor& file) {
 }
 
 std::optional<Error> makeDirectories(const std::string& path) {
-  for (size_t slash = path.find('/', 1);; slash = path.find('/', slash + 1)) {
-    const std::string part = path.substr(0, slash);
-    if (::mkdir(part.c_str(), 0755) != 0 && errno != EEXIST) {
-      const int failure = errno;
-      struct stat info {};
-      // A read-only parent that exists is no obstacle.
-      if (::stat(part.c_str(), &info) != 0) return Error::posix(failure, part);
-    }
-    if (slash == std::string::npos) return std::nullopt;
-  }
+  std::error_code failure;
+  std::filesystem::create_directories(path, failure);
+  return failure ? std::optional(Error::posix(failure.value(), path)) : std::nullopt;
 }
 
 bool isSafeFileStem(std::string_view name) {

@@ -19,7 +19,7 @@ Result<std::string> readSmallFile(const std::string& path);
 /// The same of an open file, from where it stands.
 Result<std::string> readSmallFile(const FileDescriptor& file);
 
-/// Makes a directory and its parents, mode 0755; no failure where it is there already.
+/// Makes a directory and its parents; no failure where it is there already.
 std::optional<Error> makeDirectories(const std::string& path);
 
 /// Whether a name that came from outside is safe as the stem of a file's name: letters, digits, '.',

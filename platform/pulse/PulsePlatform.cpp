@@ -1,8 +1,6 @@
 #include "platform/pulse/PulsePlatform.h"
 
 #include <cerrno>
-#include <filesystem>
-#include <fstream>
 
 #include "platform/pulse/PulseMicrophone.h"
 #include "platform/pulse/PulseSession.h"
@@ -13,21 +11,6 @@ namespace qv::platform {
 namespace {
 
 constexpr std::chrono::milliseconds kConnectLimit{1000};
-
-/// Threading: thread-safe.
-class ProcessScreenReader final : public ScreenReader {
- public:
-  bool isRunning() override {
-    std::error_code error;
-    for (std::filesystem::directory_iterator entry("/proc", error), end; !error && entry != end;
-         entry.increment(error)) {
-      std::ifstream file(entry->path() / "comm");
-      std::string name;
-      if (std::getline(file, name) && name == "orca") return true;
-    }
-    return false;
-  }
-};
 
 }  // namespace
 
@@ -44,8 +27,7 @@ PulsePlatform::PulsePlatform(const std::string& server)
                       .open = [server](const PCMFormat& format) -> std::unique_ptr<PCMSource> {
                         return std::make_unique<PulseMicrophone>(server, format);
                       }}),
-      sounds_(std::make_unique<PulseSounds>(server)),
-      screenReader_(std::make_unique<ProcessScreenReader>()) {}
+      sounds_(std::make_unique<PulseSounds>(server)) {}
 
 PulsePlatform::~PulsePlatform() = default;
 

@@ -3,7 +3,6 @@
 #include <memory>
 #include <string>
 
-#include "platform/ScreenReader.h"
 #include "platform/Sounds.h"
 #include "platform/base/Result.h"
 #include "platform/sound/PacedDeviceCapture.h"
@@ -28,8 +27,6 @@ class PulsePlatform {
   AppAudioTapService& appAudioTap() { return appAudioTap_; }
   DeviceCaptureService& deviceCapture() { return deviceCapture_; }
   SystemSounds& sounds() { return *sounds_; }
-  /// Running when a process named "orca" is: the screen reader of the free desktops.
-  ScreenReader& screenReader() { return *screenReader_; }
 
  private:
   explicit PulsePlatform(const std::string& server);
@@ -37,7 +34,6 @@ class PulsePlatform {
   PacedTapService appAudioTap_;
   PacedDeviceCapture deviceCapture_;
   const std::unique_ptr<SystemSounds> sounds_;
-  const std::unique_ptr<ScreenReader> screenReader_;
 };
 
 }  // namespace qv::platform

@@ -41,7 +41,7 @@ class LogindKeepAlive final : public KeepAliveService, public SuspendMonitor {
 
   void beginTransaction() override;
   void endTransaction() override;
-  [[nodiscard]] int openTransactionCount() const override;
+  [[nodiscard]] int openTransactionCount() const;
   void setHandlers(SuspendHandlers handlers) override;
 
  private:

@@ -2,10 +2,9 @@
 
 #include <gtest/gtest.h>
 
-#include "platform/linux/ICULocalization.h"
-#include "platform/linux/JSONPreferenceStore.h"
 #include "tests/fakes/LogRecorder.h"
 #include "tests/fakes/ManualExecutor.h"
+#include "tests/fakes/ScratchPreferences.h"
 #include "tests/linux/TemporaryRoot.h"
 
 namespace qv::platform::appstream {
@@ -44,8 +43,8 @@ class AppStreamStoreTest : public testing::Test {
 
   fakes::LogRecorder log_;
   TemporaryRoot root_;
-  platform::JSONPreferenceStore preferences_{root_.path()};
-  platform::ICULocalization localization_{preferences_, [](const char*) { return std::string(); }};
+  fakes::ScratchPreferences preferences_{root_.path("/preferences")};
+  platform::Localization& localization_ = preferences_.localization;
   fakes::ManualExecutor executor_;
 };
 
@@ -56,8 +55,7 @@ TEST_F(AppStreamStoreTest, FindsAnApplicationInTheUsersLanguage) {
                                          "<categories><category>Game</category><category>BoardGame</category>"
                                          "</categories>") +
                                component("com.example.old.desktop", "<name>Old</name>")));
-  root_.write("/private/var/mobile/Library/Preferences/com.tarnwick.quorveld.json",
-              R"({"Languages": ["pt-BR", "en"]})");
+  preferences_.setLanguages(R"(["pt-BR", "en"])");
   const auto answer = lookUp({"com.example.none", "com.example.chess", "com.example.old"});
   EXPECT_EQ(answer.error, std::nullopt);
   ASSERT_EQ(answer.response.results.size(), 2u);

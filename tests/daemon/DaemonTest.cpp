@@ -124,7 +124,7 @@ TestClient DaemonTest::systemUI() {
   return {device_, "com.example.system", 300, {{"com.tarnwick.private.quorvel", platform::Value(true)}}};
 }
 
-void DaemonTest::suppressAlert() { device_.setPreferences(R"({"QVSuppressAlert": false})"); }
+void DaemonTest::suppressAlert() { device_.preferences.set(R"({"QVSuppressAlert": false})"); }
 
 void DaemonTest::sendFrame(int64_t nanoseconds, uint64_t flags) {
   const auto& all = device_.screen.controllers;

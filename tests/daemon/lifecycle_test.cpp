@@ -12,7 +12,7 @@ using LifecycleTest = QuietDaemonTest;
 
 TEST_F(LifecycleTest, SizesAreClampedByDeviceAndPreference) {
   const auto clamped = [this](Size size) {
-    return _maximumSizeWithSize(size, device_.preferences, device_.deviceInfo);
+    return _maximumSizeWithSize(size, device_.preferences.store, device_.deviceInfo);
   };
   EXPECT_EQ(clamped({3840, 2160}), (Size{1920, 1080}));
   EXPECT_EQ(clamped({1080, 2400}), (Size{864, 1920}));
@@ -20,7 +20,7 @@ TEST_F(LifecycleTest, SizesAreClampedByDeviceAndPreference) {
   device_.deviceInfo.idiom = platform::UserInterfaceIdiom::Tablet;
   device_.deviceInfo.integers["ChipID"] = 0x8960;
   EXPECT_EQ(clamped({2048, 1536}), (Size{1600, 1200}));
-  device_.setPreferences(R"({"QVFullResCapture": true})");
+  device_.preferences.set(R"({"QVFullResCapture": true})");
   EXPECT_EQ(clamped({3840, 2160}), (Size{3840, 2160}));
 }
 

@@ -23,8 +23,8 @@ FakeDevice::FakeDevice() {
   platform.screenReader = &sounds;
   platform.fileSystem = &disk;
   platform.bundles = &bundles;
-  platform.localization = &localization;
-  platform.preferences = &preferences;
+  platform.localization = &preferences.localization;
+  platform.preferences = &preferences.store;
   platform.deviceInfo = &deviceInfo;
   platform.purgeableSpace = &purgeableSpace;
   platform.photoLibrary = &photoLibrary;

@@ -6,8 +6,6 @@
 #include <string>
 
 #include "platform/Platform.h"
-#include "platform/linux/ICULocalization.h"
-#include "platform/linux/JSONPreferenceStore.h"
 #include "support/QVBundleTexts.h"
 #include "support/QVTemporaryFiles.h"
 #include "tests/fakes/FakeClock.h"
@@ -22,6 +20,7 @@
 #include "tests/fakes/ManualTimers.h"
 #include "tests/fakes/ScratchBundles.h"
 #include "tests/fakes/ScratchDisk.h"
+#include "tests/fakes/ScratchPreferences.h"
 
 namespace qv::fakes {
 
@@ -34,10 +33,6 @@ struct FakeDevice {
   FakeDevice(const FakeDevice&) = delete;
   FakeDevice& operator=(const FakeDevice&) = delete;
   void run() { executor.runUntilIdle(); }
-  /// The daemon's own preferences, as JSON.
-  void setPreferences(const std::string& json) {
-    disk.addFile("/private/var/mobile/Library/Preferences/com.tarnwick.quorveld.json", json);
-  }
 
   LogRecorder log;
   ManualExecutor executor;
@@ -56,9 +51,8 @@ struct FakeDevice {
   FakeApplications applications;
   FakeUserAlerts alerts;
   FakeSounds sounds;
-  platform::JSONPreferenceStore preferences{disk.at("")};
-  platform::ICULocalization localization{preferences, [](const char*) { return std::string(); }};
-  ScratchBundles bundles{disk, "", localization};
+  ScratchPreferences preferences{disk.at("/private/var/mobile/Library/Preferences")};
+  ScratchBundles bundles{disk, "", preferences.localization};
   FakeDeviceInfo deviceInfo;
   FakePurgeableSpace purgeableSpace;
   FakePhotoLibrary photoLibrary{disk};

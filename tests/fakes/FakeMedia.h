@@ -391,7 +391,6 @@ class FakeExportService final : public platform::ExportService {
       if (const auto completion = std::exchange(whenEnded, nullptr)) completion();
     }
     void cancel() override {}
-    double progress() const override { return 1; }
     platform::ExportStatus status() const override { return result; }
     std::optional<platform::Error> error() const override { return std::nullopt; }
     const platform::URL& outputURL() const override { return output; }

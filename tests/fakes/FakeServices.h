@@ -105,7 +105,6 @@ class FakeKeepAlive final : public platform::KeepAliveService {
  public:
   void beginTransaction() override { ++begun, ++count; }
   void endTransaction() override { --count; }
-  int openTransactionCount() const override { return count; }
   int begun = 0, count = 0;
 };
 

@@ -7,6 +7,7 @@
 #include "platform/linux/DeviceDescription.h"
 #include "platform/linux/EntitlementStore.h"
 #include "platform/linux/JSONPreferenceStore.h"
+#include "platform/linux/ProcessScreenReader.h"
 #include "tests/fakes/LogRecorder.h"
 #include "tests/linux/TemporaryRoot.h"
 
@@ -20,9 +21,9 @@ class DeviceFilesTest : public testing::Test {
 };
 
 TEST_F(DeviceFilesTest, PreferencesAreReadAtEachUse) {
-  JSONPreferenceStore store(root_.path());
+  JSONPreferenceStore store(root_.path("/Preferences"));
   const auto value = [&] { return store.valueForKey("com.tarnwick.quorveld", "QVFullResCapture"); };
-  const std::string path = "/private/var/mobile/Library/Preferences/com.tarnwick.quorveld.json";
+  const std::string path = "/Preferences/com.tarnwick.quorveld.json";
   EXPECT_TRUE(value().isNone());
   root_.write(path, R"({"QVFullResCapture": true})");
   EXPECT_EQ(value(), Value(true));
@@ -33,7 +34,7 @@ TEST_F(DeviceFilesTest, PreferencesAreReadAtEachUse) {
     EXPECT_TRUE(value().isNone());
     EXPECT_EQ(log_.countContaining("preferences"), 1u) << broken;
   }
-  root_.write("/private/var/mobile/Library/secret.json", R"({"QVFullResCapture": true})");
+  root_.write("/secret.json", R"({"QVFullResCapture": true})");
   EXPECT_TRUE(store.valueForKey("../secret", "QVFullResCapture").isNone());
 }
 
@@ -122,6 +123,12 @@ TEST_F(EntitlementsTest, FilesThatOthersCouldHaveWrittenGrantNothing) {
     ASSERT_EQ(::chown(file_.c_str(), 1, 1), 0);
     EXPECT_TRUE(entitlements().empty());
   }
+}
+
+TEST(ProcessScreenReaderTest, IsKnownByTheNameOfItsProcess) {
+  const std::string own = "linux_tests";
+  EXPECT_TRUE(ProcessScreenReader({"nobody-has-this", own}).isRunning());
+  EXPECT_FALSE(ProcessScreenReader({"nobody-has-this", own + "2"}).isRunning());
 }
 
 }  // namespace

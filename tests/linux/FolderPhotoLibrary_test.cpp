@@ -36,7 +36,7 @@ class FolderPhotoLibraryTest : public testing::Test {
   TemporaryRoot root_;
   fakes::LogRecorder log_;
   fakes::ManualExecutor executor_;
-  FolderPhotoLibrary library_{root_.path(), executor_};
+  FolderPhotoLibrary library_{root_.path(kFolder), executor_};
 };
 
 TEST_F(FolderPhotoLibraryTest, MoviesKeepTheirNamesAndReplaceNothing) {

@@ -6,7 +6,7 @@
 
 #include <map>
 
-#include "platform/linux/JSONPreferenceStore.h"
+#include "tests/fakes/ScratchPreferences.h"
 #include "tests/kit/ScratchFolder.h"
 
 namespace qv::platform {
@@ -17,16 +17,13 @@ using Tags = std::vector<std::string>;
 class ICULocalizationTest : public testing::Test {
  protected:
   Tags languages(std::map<std::string, std::string> environment) {
-    ICULocalization localization(preferences_, [&](const char* name) { return environment[name]; });
+    ICULocalization localization(preferences_.store, "com.tarnwick.quorveld",
+                                 [&](const char* name) { return environment[name]; });
     return localization.preferredLanguages();
   }
-  void prefer(const std::string& languages) {
-    root_.write("/private/var/mobile/Library/Preferences/com.tarnwick.quorveld.json",
-                R"({"Languages": )" + languages + "}");
-  }
   kit::ScratchFolder root_;
-  JSONPreferenceStore preferences_{root_.path()};
-  ICULocalization localization_{preferences_, [](const char*) { return std::string(); }};
+  fakes::ScratchPreferences preferences_{root_.path()};
+  ICULocalization& localization_ = preferences_.localization;
 };
 
 TEST_F(ICULocalizationTest, LanguagesComeFromTheEnvironmentOrThePreferences) {
@@ -35,7 +32,7 @@ TEST_F(ICULocalizationTest, LanguagesComeFromTheEnvironmentOrThePreferences) {
   EXPECT_EQ(languages({{"LANG", "pt_BR.UTF-8"}}), Tags{"pt-BR"});
   EXPECT_EQ(languages({{"LANG", "de_DE"}, {"LC_ALL", "sr_RS.UTF-8@latin"}}), Tags{"sr-Latn-RS"});
   EXPECT_EQ(languages({{"LANG", "de_DE.UTF-8"}, {"LANGUAGE", "fr_CA:fr::de_DE"}}), (Tags{"fr-CA", "fr", "de-DE"}));
-  prefer(R"(["zh-Hant-TW", 3, "ja"])");
+  preferences_.setLanguages(R"(["zh-Hant-TW", 3, "ja"])");
   EXPECT_EQ(languages({{"LANG", "de_DE.UTF-8"}}), (Tags{"zh-Hant-TW", "ja"}));
 }
 
@@ -65,9 +62,9 @@ TEST_F(ICULocalizationTest, DatesAreLocalTimeInPlainDigits) {
   ::tzset();
   const Date date{1767268800.0};  // 12:00 UTC, 17:30 there
   EXPECT_EQ(localization_.formatDate(date, "MM-dd-yyyy HH:mm:ss"), "01-01-2026 17:30:00");
-  prefer(R"(["ar-EG"])");
+  preferences_.setLanguages(R"(["ar-EG"])");
   EXPECT_EQ(localization_.formatDate(date, "MM-dd-yyyy HH:mm:ss"), "01-01-2026 17:30:00");
-  prefer(R"(["de"])");
+  preferences_.setLanguages(R"(["de"])");
   EXPECT_EQ(localization_.formatDate(date, "EEEE, d. MMMM"), "Donnerstag, 1. Januar");
   ::setenv("TZ", "UTC", 1);
   ::tzset();

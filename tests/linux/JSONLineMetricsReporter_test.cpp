@@ -11,7 +11,8 @@
 namespace qv::platform {
 namespace {
 
-const std::string kFile = "/private/var/mobile/Library/Logs/Quorvel/metrics.jsonl";
+const std::string kDirectory = "/Library/Logs/Quorvel";
+const std::string kFile = kDirectory + "/metrics.jsonl";
 
 class JSONLineMetricsReporterTest : public testing::Test {
  protected:
@@ -20,7 +21,7 @@ class JSONLineMetricsReporterTest : public testing::Test {
   }
   TemporaryRoot root_;
   fakes::FakeClock clock_;
-  JSONLineMetricsReporter reporter_{root_.path(), clock_};
+  JSONLineMetricsReporter reporter_{root_.path(kDirectory), clock_};
 };
 
 TEST_F(JSONLineMetricsReporterTest, EachMessageIsOneLine) {

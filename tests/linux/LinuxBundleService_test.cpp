@@ -8,9 +8,8 @@
 
 #include <filesystem>
 
-#include "platform/linux/ICULocalization.h"
-#include "platform/linux/JSONPreferenceStore.h"
 #include "tests/fakes/LogRecorder.h"
+#include "tests/fakes/ScratchPreferences.h"
 #include "tests/linux/TemporaryRoot.h"
 
 extern char** environ;
@@ -32,8 +31,8 @@ class LinuxBundleServiceTest : public testing::Test {
 
   TemporaryRoot root_;
   fakes::LogRecorder log_;
-  JSONPreferenceStore preferences_{root_.path()};
-  ICULocalization localization_{preferences_, [](const char*) { return std::string(); }};
+  fakes::ScratchPreferences preferences_{root_.path("/preferences")};
+  Localization& localization_ = preferences_.localization;
   LinuxBundleService bundles_;
 };
 
@@ -126,7 +125,7 @@ TEST_F(LinuxBundleServiceTest, ResourcesAndLocalizations) {
   EXPECT_EQ(flat->pathForResource("Localizable", "strings", "fr"), table);
   EXPECT_EQ(flat->pathForResource("Localizable", "strings", "en"), std::nullopt);
   EXPECT_EQ(flat->pathForResource("Info", "json", "../../../Chess/x"), std::nullopt);
-  root_.write("/private/var/mobile/Library/Preferences/com.tarnwick.quorveld.json", R"({"Languages": ["fr-CA"]})");
+  preferences_.setLanguages(R"(["fr-CA"])");
   EXPECT_EQ(valueForKey(flat->localizedInfoDictionary(), "CFBundleDisplayName").asString(), "Échecs");
 
   const BundleRef french = bundles_.bundleAtPath(root_.path("/Applications/Chess/Resources/fr.lproj"));

@@ -48,9 +48,10 @@ struct Flow {
 class LinuxExtensionServiceTest : public ::testing::Test {
  protected:
   explicit LinuxExtensionServiceTest(bool alwaysAnotherUser = false)
-      : service_(
-            ipc_, bundles_, timers_, globalQueue(),
-            {.deviceRoot = root_.path(), .launcherPath = EXTENSION_LAUNCHER, .alwaysAnotherUser = alwaysAnotherUser}) {
+      : service_(ipc_, bundles_, timers_, globalQueue(),
+                 {.dataDirectory = root_.path("/private/var/mobile"),
+                  .launcherPath = EXTENSION_LAUNCHER,
+                  .alwaysAnotherUser = alwaysAnotherUser}) {
     ::chmod(root_.path().c_str(), 0755);
     install(kUploadBundle, "com.example.game.upload");
   }
@@ -98,7 +99,7 @@ class LinuxExtensionServiceTest : public ::testing::Test {
 
   TemporaryRoot root_;
   JSONPreferenceStore preferences_{root_.path()};
-  ICULocalization localization_{preferences_};
+  ICULocalization localization_{preferences_, "com.example.test"};
   LinuxBundleService bundles_{root_.path(), "", localization_};
   SdBusIPCService ipc_;
   fakes::ManualTimers timers_;

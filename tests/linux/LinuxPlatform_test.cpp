@@ -13,7 +13,15 @@
 namespace qv::platform {
 namespace {
 
-const WatchedSpace kNoWatch{"/", {}};
+LinuxDevice device(const TemporaryRoot& root, const std::string& bundlePath = {}) {
+  return {.root = root.path(),
+          .bundlePath = bundlePath,
+          .preferences = "/Preferences",
+          .preferenceDomain = "com.tarnwick.quorveld",
+          .photoLibrary = "/Movies",
+          .metrics = "/Logs",
+          .watchedPath = "/"};
+}
 
 IPCPeer thisProcess() {
   IPCPeer peer;
@@ -27,8 +35,8 @@ TEST(LinuxPlatformTest, ErrorsSpeakTheUsersLanguageOnARealDisk) {
   const std::filesystem::path framework = root.path("/System/Library/Frameworks/Quorvel.framework");
   std::filesystem::create_directories(framework.parent_path());
   std::filesystem::copy(QV_FRAMEWORK_DIR, framework, std::filesystem::copy_options::recursive);
-  root.write("/private/var/mobile/Library/Preferences/com.tarnwick.quorveld.json", R"({"Languages": ["de-CH"]})");
-  LinuxPlatform linux_(root.path(), "", kNoWatch);
+  root.write("/Preferences/com.tarnwick.quorveld.json", R"({"Languages": ["de-CH"]})");
+  LinuxPlatform linux_(device(root));
   Platform platform;
   linux_.addTo(platform);
   const QVBundleTexts texts(platform);
@@ -49,7 +57,7 @@ TEST(LinuxPlatformTest, PeersAreKnownByTheBundleAroundTheirExecutable) {
   TemporaryRoot other;
   std::filesystem::copy_file(other.write("/Info.json", R"({"CFBundleIdentifier": "com.example.test"})"), info);
 
-  LinuxPlatform linux_(root.path(), directory.parent_path(), kNoWatch);
+  LinuxPlatform linux_(device(root, directory.parent_path()));
   IPCPeer peer = thisProcess();
   linux_.peerResolver()(peer);
   EXPECT_EQ(peer.bundleIdentifier, "com.example.test");
@@ -62,7 +70,7 @@ TEST(LinuxPlatformTest, PeersAreKnownByTheBundleAroundTheirExecutable) {
   std::filesystem::remove(info);
 
   IPCPeer outside = thisProcess();
-  LinuxPlatform(root.path(), "", kNoWatch).peerResolver()(outside);
+  LinuxPlatform(device(root)).peerResolver()(outside);
   EXPECT_EQ(outside.bundleIdentifier, std::nullopt);
   EXPECT_TRUE(outside.entitlements.empty());
 }

@@ -80,7 +80,8 @@ TEST(SharedFramePoolTest, FramesOutliveTheirPool) {
 TEST(SharedFrameLeaseTest, HoldsTheFrameUntilTheLastCopyIsClosed) {
   std::promise<void> released;
   auto attachment = std::shared_ptr<void>(nullptr, [&](void*) { released.set_value(); });
-  SharedFrameRef frame = SharedFrame::withAttachment(SharedFrame::create(kLayout).value(), std::move(attachment));
+  const SharedFrameRef pixels = SharedFrame::create(kLayout).value();
+  SharedFrameRef frame(std::move(attachment), pixels.get());
   const size_t before = outstandingSharedFrameLeases();
   auto lease = issueSharedFrameLease(std::move(frame));
   ASSERT_TRUE(lease);

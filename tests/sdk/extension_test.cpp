@@ -187,7 +187,7 @@ TEST_F(ExtensionLibrary, TakesSamplesAndTellsOfItsService) {
   std::memset(pixels->mutableBytes().data(), 0x55, 64);
   std::promise<void> returned;
   std::shared_ptr<void> hold(nullptr, [&](void*) { returned.set_value(); });
-  send(videoPayload(platform::SharedFrame::withAttachment(std::move(pixels), std::move(hold))));
+  send(videoPayload(platform::SharedFrameRef(std::move(hold), pixels.get())));
   send(audioPayload(2));
   // Malformed ones are answered all the same, or the daemon would wait for them.
   send(audioPayload(3));

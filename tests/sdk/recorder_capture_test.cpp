@@ -41,8 +41,8 @@ class RecorderCapture : public RecorderFixture {
     for (uint8_t& byte : frame->mutableBytes()) byte = fill;
     auto returned = std::make_shared<std::promise<void>>();
     auto future = returned->get_future();
-    std::shared_ptr<void> hold(nullptr, [returned](void*) { returned->set_value(); });
-    const QVSharedFrameObject object(SharedFrame::withAttachment(std::move(frame), std::move(hold)));
+    std::shared_ptr<void> hold(nullptr, [returned, frame](void*) { returned->set_value(); });
+    const QVSharedFrameObject object(platform::SharedFrameRef(std::move(hold), frame.get()));
     tellClient("captureHandlerWithSample", {object.encodeForIPC(), rawBytes(kTiming)});
     return future;
   }

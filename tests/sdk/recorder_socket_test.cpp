@@ -105,11 +105,10 @@ TEST_F(RecorderSocket, RecordsCapturesAndStops) {
   std::shared_ptr<void> hold(nullptr, [&](void*) { returned.set_value(true); });
   platform::SampleTimingInfo timing;
   timing.presentationTimeStamp = platform::MediaTime::make(3, 2);
-  daemonEnd()->call(
-      "captureHandlerWithSample",
-      {QVSharedFrameObject(platform::SharedFrame::withAttachment(std::move(pixels), std::move(hold))).encodeForIPC(),
-       platform::rawBytes(timing)},
-      {}, {});
+  daemonEnd()->call("captureHandlerWithSample",
+                    {QVSharedFrameObject(platform::SharedFrameRef(std::move(hold), pixels.get())).encodeForIPC(),
+                     platform::rawBytes(timing)},
+                    {}, {});
   hold.reset();
   auto frame = take(arrived);
   EXPECT_EQ(frame.pixels[63], 0x77);

@@ -27,7 +27,7 @@ TEST_F(ExtensionsTest, TheFrameworkIsFoundLateAndThenKept) {
 TEST_F(ExtensionsTest, TextsComeFromTheFirstBundleThatExists) {
   addTable("en", R"("K" = "en"; "ONLY_EN" = "en";)");
   addTable("fr", R"("K" = "fr";)");
-  setLanguages(R"(["fr-CA", "en"])");
+  preferences_.setLanguages(R"(["fr-CA", "en"])");
   EXPECT_EQ(texts_._qvLocalizedStringFromFrameworkBundleWithKey("K"), "fr");
   EXPECT_EQ(texts_._qvLocalizedStringFromFrameworkBundleWithKey("ONLY_EN"), "ONLY_EN")
       << "a key that lacks shows itself";
@@ -43,12 +43,12 @@ TEST_F(ExtensionsTest, TextsComeFromTheFirstBundleThatExists) {
 TEST_F(ExtensionsTest, TheFallbackDropsScriptAndRegion) {
   addTable("zh", "");
   addTable("pt", "");
-  setLanguages(R"(["zh-Hant-TW"])");
+  preferences_.setLanguages(R"(["zh-Hant-TW"])");
   ASSERT_TRUE(texts_.fallbackBundle());
   EXPECT_EQ(texts_.fallbackBundle()->path(), disk_.at(lproj("zh")));
-  setLanguages(R"(["pt-BR", "zh"])");
+  preferences_.setLanguages(R"(["pt-BR", "zh"])");
   EXPECT_EQ(texts_.fallbackBundle()->path(), disk_.at(lproj("pt")));
-  setLanguages(R"(["fr", "zh"])");
+  preferences_.setLanguages(R"(["fr", "zh"])");
   EXPECT_EQ(texts_.fallbackBundle(), nullptr);
 }
 

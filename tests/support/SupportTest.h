@@ -6,8 +6,6 @@
 #include <string>
 
 #include "platform/Platform.h"
-#include "platform/linux/ICULocalization.h"
-#include "platform/linux/JSONPreferenceStore.h"
 #include "support/QVBundleTexts.h"
 #include "support/QVTemporaryFiles.h"
 #include "tests/fakes/FakeClock.h"
@@ -15,6 +13,7 @@
 #include "tests/fakes/ManualExecutor.h"
 #include "tests/fakes/ScratchBundles.h"
 #include "tests/fakes/ScratchDisk.h"
+#include "tests/fakes/ScratchPreferences.h"
 
 namespace qv {
 
@@ -39,17 +38,12 @@ class SupportTest : public testing::Test {
     disk_.addFile(directory + "/Localizable.strings", content);
   }
 
-  void setLanguages(const std::string& json) {
-    disk_.addFile("/root/private/var/mobile/Library/Preferences/com.tarnwick.quorveld.json",
-                  R"({"Languages": )" + json + "}");
-  }
-
   fakes::FakeClock clock_;
   fakes::ManualExecutor global_;
   fakes::ManualExecutor background_;
   fakes::ScratchDisk disk_;
-  platform::JSONPreferenceStore preferences_{disk_.at("/root")};
-  platform::ICULocalization localization_{preferences_, [](const char*) { return std::string(); }};
+  fakes::ScratchPreferences preferences_{disk_.at("/root/preferences")};
+  platform::Localization& localization_ = preferences_.localization;
   fakes::ScratchBundles bundles_{disk_, "/root", localization_};
   fakes::LogRecorder log_;
   platform::Platform platform_;

@@ -73,11 +73,11 @@ TEST_F(MovieWriterTest, EncoderSettingsFollowSizeDevicePreferenceAndConfiguratio
   device_.deviceInfo.idiom = platform::UserInterfaceIdiom::Tablet;
   started();
   EXPECT_EQ(bitRate(), 7000000);
-  device_.setPreferences(R"({"QVBitRateOverride": 12000000})");
+  device_.preferences.set(R"({"QVBitRateOverride": 12000000})");
   started();
   EXPECT_EQ(bitRate(), 12000000);
   EXPECT_TRUE(device_.log.contains("bit rate set to 12000000"));
-  device_.setPreferences(R"({"QVBitRateOverride": "fast"})");
+  device_.preferences.set(R"({"QVBitRateOverride": "fast"})");
   started({1280, 720}, QVBroadcastConfiguration{5, {{settings::kAverageBitRate, Value(int64_t{900000})}}});
   EXPECT_EQ(bitRate(), 900000);
   EXPECT_EQ(valueForKey(compression(), settings::kMaxKeyFrameInterval).asInteger(), 60);
@@ -86,7 +86,7 @@ TEST_F(MovieWriterTest, EncoderSettingsFollowSizeDevicePreferenceAndConfiguratio
 
 TEST_F(MovieWriterTest, TakesOnlyABitRateAsOverride) {
   const auto override = [this](const std::string& value) {
-    device_.setPreferences(R"({"QVBitRateOverride": )" + value + "}");
+    device_.preferences.set(R"({"QVBitRateOverride": )" + value + "}");
     started();
     return bitRate();
   };

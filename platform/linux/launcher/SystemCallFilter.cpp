@@ -1,113 +1,77 @@
 #include "platform/linux/launcher/SystemCallFilter.h"
 
-#include <linux/audit.h>
-#include <linux/filter.h>
-#include <linux/seccomp.h>
 #include <sched.h>
-#include <sys/prctl.h>
+#include <seccomp.h>
 #include <sys/socket.h>
-#include <sys/syscall.h>
 #include <unistd.h>
 
+#include <algorithm>
 #include <cerrno>
-#include <cstddef>
 #include <cstdint>
+#include <memory>
 #include <system_error>
 #include <vector>
 
 namespace qv::platform::launcher {
 namespace {
 
-#if defined(__x86_64__)
-constexpr uint32_t kArchitecture = AUDIT_ARCH_X86_64;
-#elif defined(__aarch64__)
-constexpr uint32_t kArchitecture = AUDIT_ARCH_AARCH64;
-#elif defined(__arm__)
-constexpr uint32_t kArchitecture = AUDIT_ARCH_ARM;
-#elif defined(__riscv) && __riscv_xlen == 64
-constexpr uint32_t kArchitecture = AUDIT_ARCH_RISCV64;
-#else
-#error "the system calls of this architecture are not known here"
-#endif
+void check(int result) {
+  if (result < 0) throw std::system_error(-result, std::generic_category(), "system call filter");
+}
 
-/// The program, as it is put together. The system call's number stands in the accumulator between the parts.
+/// Allows what it does not refuse. A call of another architecture's table (x32 is one) does not exist.
 ///
 /// Threading: one thread.
 class Filter {
  public:
-  Filter() {
-    load(offsetof(seccomp_data, arch));
-    compare(kArchitecture, 1, 0);
-    refuse(ENOSYS);
-    load(offsetof(seccomp_data, nr));
-#if defined(__x86_64__)
-    // The same calls under other numbers.
-    add(BPF_JMP | BPF_JGE | BPF_K, 0x40000000, 0, 1);
-    refuse(ENOSYS);
-#endif
+  Filter() : context_(seccomp_init(SCMP_ACT_ALLOW)) {
+    if (!context_) check(-ENOMEM);
+    check(seccomp_attr_set(context_.get(), SCMP_FLTATR_ACT_BADARCH, SCMP_ACT_ERRNO(ENOSYS)));
   }
-  void deny(long call, int failure) {
-    compare(static_cast<uint32_t>(call), 0, 1);
-    refuse(failure);
+  void deny(int call, int failure) { check(seccomp_rule_add(context_.get(), actionFor(failure), call, 0)); }
+  /// Where the first argument has these bits, of those in `mask`. Its low half counts: it is an int in the kernel, and
+  /// what stands above that in the register is left to chance.
+  void denyBits(int call, int failure, uint32_t mask, uint32_t bits) {
+    check(seccomp_rule_add(context_.get(), actionFor(failure), call, 1, SCMP_A0(SCMP_CMP_MASKED_EQ, mask, bits)));
   }
-  /// Unless the first argument is one of `values`.
-  void denyUnlessArgument(long call, const std::vector<uint32_t>& values, int failure) {
-    const auto count = static_cast<uint8_t>(values.size());
-    compare(static_cast<uint32_t>(call), 0, static_cast<uint8_t>(count + 3));
-    loadArgument();
-    for (uint8_t i = 0; i < count; ++i) compare(values[i], static_cast<uint8_t>(count - i), 0);
-    refuse(failure);
-    load(offsetof(seccomp_data, nr));
-  }
-  /// Unless the bit `flag` is set in the first argument.
-  void denyUnlessFlag(long call, uint32_t flag, int failure) {
-    compare(static_cast<uint32_t>(call), 0, 4);
-    loadArgument();
-    add(BPF_JMP | BPF_JSET | BPF_K, flag, 1, 0);
-    refuse(failure);
-    load(offsetof(seccomp_data, nr));
-  }
-  void install() {
-    add(BPF_RET | BPF_K, SECCOMP_RET_ALLOW, 0, 0);
-    const sock_fprog program{static_cast<unsigned short>(code_.size()), code_.data()};
-    if (::prctl(PR_SET_SECCOMP, SECCOMP_MODE_FILTER, &program) != 0) {
-      throw std::system_error(errno, std::generic_category(), "system call filter");
+  /// Unless the first argument is one of `values`. A rule can only say what is refused: every beginning in bits that
+  /// none of them has.
+  void denyUnlessArgument(int call, const std::vector<uint32_t>& values, int failure, uint32_t mask = 0,
+                          uint32_t begin = 0) {
+    if (std::none_of(values.begin(), values.end(), [&](uint32_t value) { return (value & mask) == begin; })) {
+      denyBits(call, failure, mask, begin);
+    } else if (mask != ~0u) {
+      const uint32_t longer = mask >> 1 | 1u << 31;
+      denyUnlessArgument(call, values, failure, longer, begin);
+      denyUnlessArgument(call, values, failure, longer, begin | (longer ^ mask));
     }
   }
+  void install() { check(seccomp_load(context_.get())); }
 
  private:
-  void add(int operation, uint32_t operand, uint8_t ifTrue, uint8_t ifFalse) {
-    code_.push_back({static_cast<uint16_t>(operation), ifTrue, ifFalse, operand});
-  }
-  void load(size_t offset) { add(BPF_LD | BPF_W | BPF_ABS, static_cast<uint32_t>(offset), 0, 0); }
-  /// The low half, on the little-endian machines above; what is compared here is an int in the kernel.
-  void loadArgument() { load(offsetof(seccomp_data, args)); }
-  /// Skips so many instructions where the accumulator equals `value`, and so many otherwise.
-  void compare(uint32_t value, uint8_t ifEqual, uint8_t otherwise) {
-    add(BPF_JMP | BPF_JEQ | BPF_K, value, ifEqual, otherwise);
-  }
-  void refuse(int failure) { add(BPF_RET | BPF_K, SECCOMP_RET_ERRNO | static_cast<uint32_t>(failure), 0, 0); }
+  struct Release {
+    void operator()(void* context) const { seccomp_release(context); }
+  };
+  static uint32_t actionFor(int failure) { return SCMP_ACT_ERRNO(static_cast<uint32_t>(failure)); }
 
-  std::vector<sock_filter> code_;
+  const std::unique_ptr<void, Release> context_;
 };
 
 void denyProcesses(Filter& filter) {
-#ifdef SYS_fork
-  filter.deny(SYS_fork, EPERM);
-  filter.deny(SYS_vfork, EPERM);
-#endif
+  filter.deny(SCMP_SYS(fork), EPERM);
+  filter.deny(SCMP_SYS(vfork), EPERM);
   // Its flags stand in memory, out of a filter's reach; without it the C library takes `clone`.
-  filter.deny(SYS_clone3, ENOSYS);
-  filter.denyUnlessFlag(SYS_clone, CLONE_THREAD, EPERM);
+  filter.deny(SCMP_SYS(clone3), ENOSYS);
+  filter.denyBits(SCMP_SYS(clone), EPERM, CLONE_THREAD, 0);
 }
 
 void denySignalsToOthers(Filter& filter) {
   const std::vector<uint32_t> self{static_cast<uint32_t>(::getpid())};
-  for (const long call : {SYS_kill, SYS_tgkill, SYS_rt_sigqueueinfo, SYS_rt_tgsigqueueinfo}) {
+  for (const int call : {SCMP_SYS(kill), SCMP_SYS(tgkill), SCMP_SYS(rt_sigqueueinfo), SCMP_SYS(rt_tgsigqueueinfo)}) {
     filter.denyUnlessArgument(call, self, EPERM);
   }
-  filter.deny(SYS_tkill, EPERM);
-  filter.deny(SYS_pidfd_send_signal, EPERM);
+  filter.deny(SCMP_SYS(tkill), EPERM);
+  filter.deny(SCMP_SYS(pidfd_send_signal), EPERM);
 }
 
 }  // namespace
@@ -116,14 +80,15 @@ void installSystemCallFilter(int landlockVersion) {
   constexpr int kVersionWithTruncation = 3;
   constexpr int kVersionWithSignals = 6;
   Filter filter;
-  filter.denyUnlessArgument(SYS_socket, {AF_INET, AF_INET6, AF_NETLINK}, EACCES);
+  filter.denyUnlessArgument(SCMP_SYS(socket), {AF_INET, AF_INET6, AF_NETLINK}, EACCES);
   denyProcesses(filter);
-  for (const long call : {SYS_io_uring_setup, SYS_ptrace, SYS_unshare, SYS_setns, SYS_keyctl, SYS_add_key}) {
+  for (const int call : {SCMP_SYS(io_uring_setup), SCMP_SYS(ptrace), SCMP_SYS(unshare), SCMP_SYS(setns),
+                         SCMP_SYS(keyctl), SCMP_SYS(add_key)}) {
     filter.deny(call, EPERM);
   }
-  filter.deny(SYS_shmget, EACCES);
-  filter.deny(SYS_shmat, EACCES);
-  if (landlockVersion < kVersionWithTruncation) filter.deny(SYS_truncate, EACCES);
+  filter.deny(SCMP_SYS(shmget), EACCES);
+  filter.deny(SCMP_SYS(shmat), EACCES);
+  if (landlockVersion < kVersionWithTruncation) filter.deny(SCMP_SYS(truncate), EACCES);
   if (landlockVersion < kVersionWithSignals) denySignalsToOthers(filter);
   filter.install();
 }
