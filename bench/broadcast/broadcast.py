@@ -12,9 +12,9 @@ import sys
 import time
 
 ROOT = os.path.join(os.path.dirname(os.path.abspath(__file__)), "../..")
-sys.path.insert(0, os.path.join(ROOT, "scripts/stage"))
-import processes  # noqa: E402
-from stage import Stage  # noqa: E402
+sys.path.insert(0, os.path.join(ROOT, "scripts"))
+from stage import processes  # noqa: E402
+from stage.device import Stage  # noqa: E402
 
 IDENTIFIER = "com.example.quorvel.bench.{}.upload"
 SETTLING = 2.0  # seconds at both ends that are not measured
@@ -215,7 +215,7 @@ def main():
     parser.add_argument("--seconds", type=float, default=30, help="of samples; 0: none (default: %(default)g)")
     options = parser.parse_args()
     progress(load())
-    with Device(os.path.abspath(ROOT), os.path.abspath(options.build)) as stage:
+    with Device(options.build) as stage:
         table = Table()
         if options.seconds > 0:
             measure_samples(table, stage, options.seconds)

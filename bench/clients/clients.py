@@ -13,9 +13,10 @@ import sys
 import time
 
 ROOT = os.path.join(os.path.dirname(os.path.abspath(__file__)), "../..")
-sys.path.insert(0, os.path.join(ROOT, "scripts/stage"))
-import processes  # noqa: E402
-from stage import Game, Stage  # noqa: E402
+sys.path.insert(0, os.path.join(ROOT, "scripts"))
+from stage import processes  # noqa: E402
+from stage.applications import Game  # noqa: E402
+from stage.device import Stage  # noqa: E402
 
 QUERY_INTERVAL = 0.01  # seconds; of all clients together
 
@@ -98,7 +99,7 @@ def main():
     parser.add_argument("--build", default=os.path.join(ROOT, "build/release"))
     options = parser.parse_args()
     resource.setrlimit(resource.RLIMIT_NOFILE, (resource.getrlimit(resource.RLIMIT_NOFILE)[1],) * 2)
-    with Device(os.path.abspath(ROOT), os.path.abspath(options.build)) as stage:
+    with Device(options.build) as stage:
         crowd = Crowd(stage, os.path.join(stage.build, "bench/clients/bench_client"))
         try:
             crowd.add()  # whatever is made once for all

@@ -15,10 +15,11 @@ import time
 import urllib.parse
 from dataclasses import dataclass, field
 
-sys.path.insert(0, os.path.join(os.path.dirname(os.path.abspath(__file__)), "../../scripts/stage"))
-import processes
+sys.path.insert(0, os.path.join(os.path.dirname(os.path.abspath(__file__)), "../../scripts"))
 import table
-from stage import Game, Stage
+from stage import processes
+from stage.applications import Game
+from stage.device import Stage
 
 SETTLING = 1.0  # seconds at both ends of a recording that are not measured
 
@@ -243,10 +244,9 @@ def main():
     parser.add_argument("--modes", default=",".join(mode.name for mode in MODES), help="default: %(default)s")
     options = parser.parse_args()
     modes = [mode for mode in MODES if mode.name in options.modes.split(",")]
-    source = os.path.dirname(os.path.dirname(os.path.dirname(os.path.abspath(__file__))))
     idle_seconds = 10
 
-    with Stage(source, os.path.abspath(options.build)) as stage:
+    with Stage(options.build) as stage:
         bench = Bench(stage, options.seconds)
         load_before = os.getloadavg()[0]
         before = idle(stage.daemon.pid, idle_seconds)

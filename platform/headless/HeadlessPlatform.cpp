@@ -45,8 +45,9 @@ class LoggedSounds final : public SystemSounds {
 }  // namespace
 
 HeadlessPlatform::HeadlessPlatform(HeadlessOptions options)
-    : deviceCapture_(microphone(options.hasMicrophone)),
-      appAudioTap_(openApplicationAudio),
+    : screen_(*options.clock),
+      deviceCapture_(microphone(options.hasMicrophone), *options.clock),
+      appAudioTap_(openApplicationAudio, *options.clock),
       applications_(std::move(options.processOfBundleIdentifier), std::move(options.frontmostApplication)),
       alerts_(std::move(options.alertPolicy)),
       sounds_(std::make_unique<LoggedSounds>()) {}

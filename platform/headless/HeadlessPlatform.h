@@ -16,6 +16,7 @@ struct HeadlessOptions {
   HeadlessApplications::ProcessLookup processOfBundleIdentifier = nullptr;
   std::optional<std::string> frontmostApplication = std::nullopt;
   bool hasMicrophone = true;
+  PacedClock* clock = &monotonicClock();  ///< the host clock
 };
 
 /// A device without hardware: a screen with a picture that can be read back, applications and a

@@ -14,7 +14,6 @@ namespace qv::platform {
 namespace {
 
 using std::chrono::nanoseconds;
-using std::chrono::steady_clock;
 
 /// Rates beyond this are of no display.
 constexpr nanoseconds kShortestInterval = std::chrono::milliseconds(1);
@@ -121,6 +120,7 @@ struct Capture {
   const std::shared_ptr<HeadlessScreen::CloneState> clone;
   const std::shared_ptr<DelegateGate> gate;
   const std::shared_ptr<Picture> picture;
+  PacedClock& clock;
   const bool showsPicture = clone->showsPicture();
   bool hasBegun = false;
   int64_t next = 0;
@@ -128,7 +128,7 @@ struct Capture {
 };
 
 PacedThread::TimePoint Capture::step() {
-  const nanoseconds now = steady_clock::now().time_since_epoch();
+  const nanoseconds now = clock.now().time_since_epoch();
   if (!hasBegun) {
     hasBegun = true;
     deliver(now);
@@ -168,10 +168,12 @@ std::shared_ptr<SharedFrame> Capture::nextFrame(nanoseconds time) {
 /// Threading: as ScreenCaptureController.
 class HeadlessController final : public ScreenCaptureController {
  public:
-  HeadlessController(Size size, MediaTime interval, std::shared_ptr<HeadlessScreen::CloneState> clone)
+  HeadlessController(Size size, MediaTime interval, std::shared_ptr<HeadlessScreen::CloneState> clone,
+                     PacedClock& clock)
       : layout_{pixels(size.width), pixels(size.height), pixels(size.width) * 4, PixelFormat::BGRX},
         grid_(interval),
-        clone_(std::move(clone)) {}
+        clone_(std::move(clone)),
+        clock_(clock) {}
   ~HeadlessController() override { HeadlessController::stopCapture(); }
 
   void setDelegate(std::weak_ptr<ScreenCaptureControllerDelegate> delegate) override {
@@ -180,8 +182,8 @@ class HeadlessController final : public ScreenCaptureController {
   void startCapture() override {
     std::lock_guard lock(mutex_);
     if (thread_) return;
-    capture_ = std::shared_ptr<Capture>(new Capture{*this, layout_, grid_, clone_, gate_, picture_});
-    thread_ = std::make_unique<PacedThread>([capture = capture_] { return capture->step(); }, nullptr);
+    capture_ = std::shared_ptr<Capture>(new Capture{*this, layout_, grid_, clone_, gate_, picture_, clock_});
+    thread_ = std::make_unique<PacedThread>([capture = capture_] { return capture->step(); }, nullptr, clock_);
   }
   void stopCapture() override {
     std::unique_ptr<PacedThread> thread;
@@ -199,6 +201,7 @@ class HeadlessController final : public ScreenCaptureController {
   const FrameLayout layout_;
   const FrameGrid grid_;
   const std::shared_ptr<HeadlessScreen::CloneState> clone_;
+  PacedClock& clock_;
   const std::shared_ptr<DelegateGate> gate_ = std::make_shared<DelegateGate>();
   const std::shared_ptr<Picture> picture_ = std::make_shared<Picture>();
   std::mutex mutex_;
@@ -209,7 +212,7 @@ class HeadlessController final : public ScreenCaptureController {
 }  // namespace
 
 std::unique_ptr<ScreenCaptureController> HeadlessScreen::createController(Size size, MediaTime minimumInterval) {
-  return std::make_unique<HeadlessController>(size, minimumInterval, shared_);
+  return std::make_unique<HeadlessController>(size, minimumInterval, shared_, clock_);
 }
 
 }  // namespace qv::platform

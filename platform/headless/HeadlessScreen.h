@@ -3,6 +3,7 @@
 #include <atomic>
 
 #include "platform/ScreenCapture.h"
+#include "platform/threads/PacedClock.h"
 
 namespace qv::platform {
 
@@ -15,6 +16,8 @@ namespace qv::platform {
 /// Threading: thread-safe. One thread per controller that captures.
 class HeadlessScreen final : public ScreenCaptureService, public DisplayCloneService {
  public:
+  /// `clock` is the host clock.
+  explicit HeadlessScreen(PacedClock& clock) : clock_(clock) {}
   std::unique_ptr<ScreenCaptureController> createController(Size size, MediaTime minimumInterval) override;
   DisplayCloneService& displayClone() override { return *this; }
   void setMirroringMode(DisplayCloneMode mode) override { shared_->mode = mode; }
@@ -30,6 +33,7 @@ class HeadlessScreen final : public ScreenCaptureService, public DisplayCloneSer
   };
 
  private:
+  PacedClock& clock_;
   const std::shared_ptr<CloneState> shared_ = std::make_shared<CloneState>();
 };
 

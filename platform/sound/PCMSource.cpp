@@ -8,7 +8,6 @@ namespace qv::platform {
 namespace {
 
 using std::chrono::nanoseconds;
-using std::chrono::steady_clock;
 
 constexpr nanoseconds kTick = std::chrono::milliseconds(10);
 constexpr int64_t kNanosecondsPerSecond = 1'000'000'000;
@@ -52,8 +51,12 @@ AudioStreamDescription PCMFormat::description() const {
 }
 
 struct PCMPacer::Run {
-  Run(PCMFormat f, std::unique_ptr<PCMSource> s, Callbacks c)
-      : format(f), source(std::move(s)), callbacks(std::move(c)), samples(size_t{f.sampleRate} / 100 * f.channels) {}
+  Run(PCMFormat f, std::unique_ptr<PCMSource> s, Callbacks c, PacedClock& time)
+      : format(f),
+        source(std::move(s)),
+        callbacks(std::move(c)),
+        clock(time),
+        samples(size_t{f.sampleRate} / 100 * f.channels) {}
 
   PacedThread::TimePoint step();
   void finish();
@@ -64,7 +67,8 @@ struct PCMPacer::Run {
   const PCMFormat format;
   const std::unique_ptr<PCMSource> source;
   const Callbacks callbacks;
-  const nanoseconds origin = steady_clock::now().time_since_epoch();
+  PacedClock& clock;
+  const nanoseconds origin = clock.now().time_since_epoch();
   int64_t position = 0;
   int64_t ticks = 0;
   bool hasOpened = false;
@@ -78,7 +82,7 @@ PacedThread::TimePoint PCMPacer::Run::step() {
     hasOpened = true;
     callbacks.opened();
   }
-  const nanoseconds elapsed = steady_clock::now().time_since_epoch() - origin;
+  const nanoseconds elapsed = clock.now().time_since_epoch() - origin;
   const int64_t due = framesIn(elapsed - source->latency(), format.sampleRate);
   skipHoldUp(due);
   while (position < due && !isEnding()) renderBlock(std::min<int64_t>(due - position, format.sampleRate / 100));
@@ -115,9 +119,9 @@ void PCMPacer::Run::renderBlock(int64_t frames) {
   position += frames;
 }
 
-PCMPacer::PCMPacer(PCMFormat format, std::unique_ptr<PCMSource> source, Callbacks callbacks)
-    : run_(std::make_shared<Run>(format, std::move(source), std::move(callbacks))),
-      thread_([run = run_] { return run->step(); }, [run = run_] { run->finish(); }) {}
+PCMPacer::PCMPacer(PCMFormat format, std::unique_ptr<PCMSource> source, Callbacks callbacks, PacedClock& clock)
+    : run_(std::make_shared<Run>(format, std::move(source), std::move(callbacks), clock)),
+      thread_([run = run_] { return run->step(); }, [run = run_] { run->finish(); }, clock) {}
 
 PCMPacer::~PCMPacer() { run_->end = kNoRest; }
 
@@ -127,7 +131,7 @@ void PCMPacer::stop() {
     return;
   }
   int64_t open = kOpenEnd;
-  run_->end.compare_exchange_strong(open, nanoseconds(steady_clock::now().time_since_epoch()).count());
+  run_->end.compare_exchange_strong(open, nanoseconds(run_->clock.now().time_since_epoch()).count());
   thread_.stop();
 }
 

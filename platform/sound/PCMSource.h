@@ -65,7 +65,9 @@ class PCMPacer {
     std::function<void()> completed;  ///< after the last block of a stop that rendered the rest
     std::function<void()> closed;
   };
-  PCMPacer(PCMFormat format, std::unique_ptr<PCMSource> source, Callbacks callbacks);
+  /// `clock` is the host clock, and must outlive the pacer's thread.
+  PCMPacer(PCMFormat format, std::unique_ptr<PCMSource> source, Callbacks callbacks,
+           PacedClock& clock = monotonicClock());
   ~PCMPacer();
   void stop();
   void abandon();

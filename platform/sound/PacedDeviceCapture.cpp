@@ -95,7 +95,7 @@ class SampleAssembler {
 /// Threading: thread-safe. The pacer's thread never takes `mutex_`, so it may be stopped under it.
 class PacedCaptureSession final : public DeviceCaptureSession {
  public:
-  explicit PacedCaptureSession(const MicrophoneSource& microphone) : microphone_(microphone) {}
+  PacedCaptureSession(const MicrophoneSource& microphone, PacedClock& clock) : microphone_(microphone), clock_(clock) {}
   ~PacedCaptureSession() override {
     pacer_.reset();
     if (output_) output_->detach();
@@ -184,10 +184,11 @@ class PacedCaptureSession final : public DeviceCaptureSession {
                                   .sink = [assembler](const PCMBlock& block) { assembler->take(block); },
                                   .completed = [assembler] { assembler->flush(); },
                                   .closed = [] {}};
-    pacer_ = std::make_unique<PCMPacer>(kFormat, std::move(source), std::move(callbacks));
+    pacer_ = std::make_unique<PCMPacer>(kFormat, std::move(source), std::move(callbacks), clock_);
   }
 
   const MicrophoneSource microphone_;
+  PacedClock& clock_;
   SerialQueue thread_{"com.tarnwick.quorveld.capturesession"};
   mutable std::mutex mutex_;
   std::shared_ptr<CaptureDeviceInput> input_;
@@ -220,12 +221,12 @@ class PacedDeviceCapture::Session final : public AudioSession {
   std::function<void(uint32_t)> observer_;
 };
 
-PacedDeviceCapture::PacedDeviceCapture(MicrophoneSource microphone)
-    : microphone_(std::move(microphone)), audioSession_(std::make_unique<Session>()) {}
+PacedDeviceCapture::PacedDeviceCapture(MicrophoneSource microphone, PacedClock& clock)
+    : microphone_(std::move(microphone)), clock_(clock), audioSession_(std::make_unique<Session>()) {}
 PacedDeviceCapture::~PacedDeviceCapture() = default;
 
 std::shared_ptr<DeviceCaptureSession> PacedDeviceCapture::createSession() {
-  return std::make_shared<PacedCaptureSession>(microphone_);
+  return std::make_shared<PacedCaptureSession>(microphone_, clock_);
 }
 std::shared_ptr<CaptureDeviceInput> PacedDeviceCapture::createDefaultAudioInput() {
   if (!microphone_.isAvailable()) return nullptr;

@@ -24,7 +24,8 @@ struct MicrophoneSource {
 /// Threading: thread-safe. `open` is called in the thread that completes a session.
 class PacedDeviceCapture final : public DeviceCaptureService {
  public:
-  explicit PacedDeviceCapture(MicrophoneSource microphone);
+  /// `clock` is the host clock.
+  explicit PacedDeviceCapture(MicrophoneSource microphone, PacedClock& clock = monotonicClock());
   ~PacedDeviceCapture() override;
 
   std::shared_ptr<DeviceCaptureSession> createSession() override;
@@ -37,6 +38,7 @@ class PacedDeviceCapture final : public DeviceCaptureService {
  private:
   class Session;
   const MicrophoneSource microphone_;
+  PacedClock& clock_;
   const std::unique_ptr<Session> audioSession_;
 };
 

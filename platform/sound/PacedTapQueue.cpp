@@ -118,8 +118,9 @@ void Tap::handOverFront(std::unique_lock<std::mutex>& lock) {
 /// Threading: as AppAudioTapQueue.
 class PacedTapQueue final : public AppAudioTapQueue {
  public:
-  PacedTapQueue(const PCMFormat& format, AppAudioInputCallback callback, const TapSourceFactory& factory)
-      : factory_(factory), tap_(std::make_shared<Tap>(format, std::move(callback))) {}
+  PacedTapQueue(const PCMFormat& format, AppAudioInputCallback callback, const TapSourceFactory& factory,
+                PacedClock& clock)
+      : factory_(factory), clock_(clock), tap_(std::make_shared<Tap>(format, std::move(callback))) {}
   ~PacedTapQueue() override { dispose(); }
 
   int32_t setTappedProcess(int32_t processID) override {
@@ -155,6 +156,7 @@ class PacedTapQueue final : public AppAudioTapQueue {
 
  private:
   const TapSourceFactory factory_;
+  PacedClock& clock_;
   const std::shared_ptr<Tap> tap_;
   /// A callback may enqueue, stop or dispose while the owner does, so what they share is locked.
   std::shared_ptr<PCMPacer> currentPacer() {
@@ -218,7 +220,7 @@ int32_t PacedTapQueue::start() {
                                 .sink = [tap = tap_, run](const PCMBlock& block) { tap->take(run, block); },
                                 .completed = [tap = tap_, run] { tap->handOverRest(run); },
                                 .closed = [tap = tap_, run] { tap->setRunning(run, false); }};
-  pacer_ = std::make_shared<PCMPacer>(tap_->format, std::move(source), std::move(callbacks));
+  pacer_ = std::make_shared<PCMPacer>(tap_->format, std::move(source), std::move(callbacks), clock_);
   return 0;
 }
 
@@ -252,7 +254,7 @@ int32_t PacedTapService::createInputQueue(const AudioStreamDescription& descript
                                           uint32_t /*flags*/, std::unique_ptr<AppAudioTapQueue>& queue) {
   const auto format = PCMFormat::fromDescription(description);
   if (!format || !callback) return kTapFormatUnsupported;
-  queue = std::make_unique<PacedTapQueue>(*format, std::move(callback), factory_);
+  queue = std::make_unique<PacedTapQueue>(*format, std::move(callback), factory_, clock_);
   return 0;
 }
 

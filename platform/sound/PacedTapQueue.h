@@ -25,12 +25,15 @@ using TapSourceFactory = std::function<std::unique_ptr<PCMSource>(pid_t process,
 /// Threading: thread-safe. The factory is called in the thread that starts a queue.
 class PacedTapService final : public AppAudioTapService {
  public:
-  explicit PacedTapService(TapSourceFactory factory) : factory_(std::move(factory)) {}
+  /// `clock` is the host clock.
+  explicit PacedTapService(TapSourceFactory factory, PacedClock& clock = monotonicClock())
+      : factory_(std::move(factory)), clock_(clock) {}
   int32_t createInputQueue(const AudioStreamDescription& format, AppAudioInputCallback callback, uint32_t flags,
                            std::unique_ptr<AppAudioTapQueue>& queue) override;
 
  private:
   const TapSourceFactory factory_;
+  PacedClock& clock_;
 };
 
 }  // namespace qv::platform

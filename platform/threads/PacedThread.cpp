@@ -6,8 +6,10 @@
 namespace qv::platform {
 
 struct PacedThread::State {
+  explicit State(PacedClock& c) : clock(c) {}
   void run();
 
+  PacedClock& clock;
   std::mutex mutex;
   std::condition_variable changed;
   bool stopping = false;
@@ -22,7 +24,7 @@ void PacedThread::State::run() {
     lock.unlock();
     const TimePoint next = step();
     lock.lock();
-    changed.wait_until(lock, next, [this] { return stopping; });
+    clock.waitUntil(next, lock, changed, [this] { return stopping; });
   }
   lock.unlock();
   if (finish) finish();
@@ -33,8 +35,8 @@ void PacedThread::State::run() {
   changed.notify_all();
 }
 
-PacedThread::PacedThread(std::function<TimePoint()> step, std::function<void()> finish)
-    : state_(std::make_shared<State>()) {
+PacedThread::PacedThread(std::function<TimePoint()> step, std::function<void()> finish, PacedClock& clock)
+    : state_(std::make_shared<State>(clock)) {
   state_->step = std::move(step);
   state_->finish = std::move(finish);
   thread_ = std::thread([state = state_] { state->run(); });

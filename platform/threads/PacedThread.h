@@ -1,15 +1,16 @@
 #pragma once
 
-#include <chrono>
 #include <functional>
 #include <memory>
 #include <thread>
+
+#include "platform/threads/PacedClock.h"
 
 namespace qv::platform {
 
 /// A thread that runs a function again and again, each time at the moment that the function named.
 ///
-/// Moments are on CLOCK_MONOTONIC, so a run that took long does not delay the later ones. After the
+/// Moments are those of a clock, so a run that took long does not delay the later ones. After the
 /// stop `finish` runs once, on the thread, and both functions are let go.
 ///
 /// Threading: thread-safe. `stop` and the destructor return when the thread has run its last
@@ -17,10 +18,10 @@ namespace qv::platform {
 /// progress has returned, so functions hold what they use by shared ownership.
 class PacedThread {
  public:
-  using TimePoint = std::chrono::steady_clock::time_point;
+  using TimePoint = PacedClock::TimePoint;
 
-  /// `step` runs at once, and then whenever it asked for; `finish` may be empty.
-  PacedThread(std::function<TimePoint()> step, std::function<void()> finish);
+  /// `step` runs at once, and then whenever it asked for; `finish` may be empty. `clock` must outlive the thread.
+  PacedThread(std::function<TimePoint()> step, std::function<void()> finish, PacedClock& clock = monotonicClock());
   ~PacedThread();
   PacedThread(const PacedThread&) = delete;
   PacedThread& operator=(const PacedThread&) = delete;

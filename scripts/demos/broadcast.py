@@ -14,14 +14,12 @@ import signal
 import sys
 import time
 
-ROOT = os.path.dirname(os.path.dirname(os.path.dirname(os.path.abspath(__file__))))
-sys.path.insert(0, os.path.join(ROOT, "scripts/stage"))
-from processes import children  # noqa: E402
-from stage import Stage  # noqa: E402
-from testsignal import frame_times, free_port, worst_distance  # noqa: E402
+sys.path.insert(0, os.path.join(os.path.dirname(os.path.abspath(__file__)), ".."))
+from stage.device import Stage  # noqa: E402
+from stage.movie import frame_times, free_port, worst_distance  # noqa: E402
+from stage.processes import children, wait_until  # noqa: E402
 
 LIVE, CLIPS = "com.example.quorvel.game.live.upload", "com.example.quorvel.game.clips.upload"
-GAME = "examples/game/Game.app/bin/quorvel-example-game"
 INVALID_BROADCAST = -5808
 FRAME = 1 / 30
 WORST_SYNC = 0.06   # seconds
@@ -93,20 +91,11 @@ class Device(Stage):
         self.allow_recordings()  # consent is what scripts/demo shows
 
 
-def wait_until(what, check, seconds=20.0):
-    deadline = time.monotonic() + seconds
-    while not check():
-        if time.monotonic() > deadline:
-            sys.exit(f"demo: {what} did not come")
-        time.sleep(0.05)
-
-
 def play(stage, extension, info, script, *options):
     """The application, which broadcasts at once."""
-    arguments = [os.path.join(stage.build, GAME), "--size", "1280x720", "--broadcast", extension, *options]
     for key, value in info.items():
-        arguments += ["--broadcast-info", f"{key}={value}"]
-    return stage.start([*arguments, "--script", script])
+        options += "--broadcast-info", f"{key}={value}"
+    return stage.start_game("--broadcast", extension, *options, size="1280x720", script=script)
 
 
 def service(child):
@@ -243,7 +232,7 @@ def main():
     output = os.path.join(output, "broadcast")
     shutil.rmtree(output, ignore_errors=True)
     os.makedirs(output)
-    with Device(ROOT, build) as stage:
+    with Device(build) as stage:
         server = Server(stage)
         results = {"live": run_live(stage, server, output), "reconnect": run_reconnect(stage, server, output),
                    "clips": run_clips(stage, server, output), "crash": run_crash(stage, server)}

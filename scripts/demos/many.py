@@ -9,11 +9,11 @@ import os
 import shutil
 import sys
 import time
-import urllib.parse
 
-ROOT = os.path.dirname(os.path.dirname(os.path.dirname(os.path.abspath(__file__))))
-sys.path.insert(0, os.path.join(ROOT, "scripts/stage"))
-from stage import Application, Stage  # noqa: E402
+sys.path.insert(0, os.path.join(os.path.dirname(os.path.abspath(__file__)), ".."))
+from stage.applications import Application  # noqa: E402
+from stage.device import Stage  # noqa: E402
+from stage.movie import path_in  # noqa: E402
 
 INTERRUPTED = -5806
 SECONDS = 2  # each recording's length
@@ -62,7 +62,7 @@ def check_metrics(stage, count):
 
 def main():
     build, output = sys.argv[1:]
-    with Device(ROOT, build, screen=(1280, 720)) as stage:
+    with Device(build, screen=(1280, 720)) as stage:
         cast = [Application(stage, name) for name in ("First", "Second", "Third")]
         good, stopped = record_in_turn(stage, cast)
         for earlier in cast[:-1]:
@@ -70,7 +70,7 @@ def main():
             good = good and ends == 1
             print(f"{earlier.name} was told {ends} time{'s' if ends != 1 else ''}")
         good = check_metrics(stage, len(cast)) and good
-        recorded = urllib.parse.unquote(urllib.parse.urlparse(stopped.split("url=")[1].split()[0]).path)
+        recorded = path_in(stopped)
         os.makedirs(output, exist_ok=True)
         movie = os.path.join(output, os.path.basename(recorded))
         shutil.copyfile(recorded, movie)

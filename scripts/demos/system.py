@@ -5,19 +5,17 @@ which one is heard in the movie: they must agree, but for the seconds in which t
 usage: system.py BUILD_DIRECTORY OUTPUT_DIRECTORY
 """
 # build: quorveld quorveld-movies quorvel-example-game quorvel-example-system-ui
-import array
 import math
 import os
 import shutil
-import subprocess
 import sys
 import time
-import urllib.parse
 from collections import Counter
 
-ROOT = os.path.dirname(os.path.dirname(os.path.dirname(os.path.abspath(__file__))))
-sys.path.insert(0, os.path.join(ROOT, "scripts/stage"))
-from stage import Application, Stage  # noqa: E402
+sys.path.insert(0, os.path.join(os.path.dirname(os.path.abspath(__file__)), ".."))
+from stage.applications import Application  # noqa: E402
+from stage.device import Stage  # noqa: E402
+from stage.movie import level, path_in, run, sound  # noqa: E402
 
 RATE = 22050
 LOOKS = 20          # a second
@@ -30,7 +28,7 @@ CAST = {"Red": ("c00000", 440), "Blue": ("0000c0", 1000)}
 class Device(Stage):
     def prepare(self):
         self.allow_system_recordings()
-        self.write("etc/quorvel/device.json", {"idiom": "television", "RegionalBehaviorShutterClick": True})
+        self.write_device(RegionalBehaviorShutterClick=True)
 
 
 def record(stage):
@@ -52,40 +50,27 @@ def record(stage):
     ui.say("stop")
     line = ui.expect("stopped")[1]
     print("system UI: " + line)
-    return urllib.parse.unquote(urllib.parse.urlparse(line.split("url=")[1].split()[0]).path)
-
-
-def decode(movie, arguments):
-    return subprocess.run(["ffmpeg", "-nostdin", "-v", "error", "-i", movie, *arguments, "-"], capture_output=True,
-                          check=True, timeout=120).stdout
+    return path_in(line)
 
 
 def seen(movie):
     """The application whose colour each picture has, LOOKS a second."""
     # A corner without comets and flashes.
-    pixels = decode(movie, ["-map", "0:v", "-vf", f"fps={LOOKS},crop=iw/16:ih/40:0:0,scale=1:1:flags=area,format=rgb24",
-                            "-f", "rawvideo"])
+    pixels = run(["ffmpeg", "-nostdin", "-v", "error", "-i", movie, "-map", "0:v", "-vf",
+                  f"fps={LOOKS},crop=iw/16:ih/40:0:0,scale=1:1:flags=area,format=rgb24", "-f", "rawvideo", "-"])
     names = []
     for red, _, blue in zip(*[iter(pixels)] * 3):
         names.append("Red" if red > blue + 60 else "Blue" if blue > red + 60 else "nobody")
     return names
 
 
-def level(samples, frequency):
-    angle = 2 * math.pi * frequency / RATE
-    real = sum(sample * math.cos(angle * i) for i, sample in enumerate(samples))
-    imaginary = sum(sample * math.sin(angle * i) for i, sample in enumerate(samples))
-    return math.hypot(real, imaginary) / max(len(samples), 1)
-
-
 def heard(movie):
     """The application whose tone is there, LOOKS a second."""
-    samples = array.array("h", decode(movie, ["-map", "0:a:0", "-af", "aresample=async=1:first_pts=0", "-ac", "1",
-                                              "-ar", str(RATE), "-f", "s16le"]))
+    samples = sound(movie, rate=RATE)
     step = RATE // LOOKS
     names = []
     for start in range(0, len(samples) - step // 2, step):
-        levels = {name: level(samples[start:start + step], tone) for name, (_, tone) in CAST.items()}
+        levels = {name: level(samples[start:start + step], tone, RATE) / step for name, (_, tone) in CAST.items()}
         name = max(levels, key=levels.get)
         names.append(name if levels[name] > 500 else "nobody")
     return names
@@ -135,7 +120,7 @@ def check_switches(pictures, tones):
 
 def main():
     build, output = sys.argv[1:]
-    with Device(ROOT, build, screen=(1280, 720)) as stage:
+    with Device(build, screen=(1280, 720)) as stage:
         recorded = record(stage)
         dropped = stage.daemon.expect("movie finished:")[1]
         os.makedirs(output, exist_ok=True)

@@ -7,14 +7,13 @@ usage: trim.py BUILD_DIRECTORY OUTPUT_DIRECTORY
 # build: quorveld quorveld-movies quorveld-exports quorvel-example-game
 import os
 import shutil
-import subprocess
 import sys
 import time
-import urllib.parse
 
-ROOT = os.path.dirname(os.path.dirname(os.path.dirname(os.path.abspath(__file__))))
-sys.path.insert(0, os.path.join(ROOT, "scripts/stage"))
-from stage import Game, Stage  # noqa: E402
+sys.path.insert(0, os.path.join(os.path.dirname(os.path.abspath(__file__)), ".."))
+from stage import movie as movies  # noqa: E402
+from stage.applications import Game  # noqa: E402
+from stage.device import Stage  # noqa: E402
 
 WIDTH, HEIGHT, FPS = 1280, 720, 30
 SECONDS = 10
@@ -34,11 +33,10 @@ def record(stage):
     game.start()
     kept = os.path.join(stage.directory, "source.mp4")
     time.sleep(SECONDS)
-    growing = next(name for name in os.listdir(stage.movies) if name.endswith(".mp4"))
-    os.link(os.path.join(stage.movies, growing), kept)
+    os.link(stage.movie_files()[0], kept)
     line = game.ask("s", "stopRecordingWithStartTimeOffset", "stopped")[2]
     print("application: " + line)
-    return kept, urllib.parse.unquote(urllib.parse.urlparse(line.split("url=")[1].split()[0]).path)
+    return kept, movies.path_in(line)
 
 
 def number_in(cells):
@@ -51,21 +49,12 @@ def number_in(cells):
 
 def pictures(movie):
     """(time, number) of each, as ffmpeg shows them: each cell of the number is scaled to one pixel."""
-    times = subprocess.run(["ffprobe", "-v", "error", "-select_streams", "v", "-show_entries", "frame=pts_time", "-of",
-                            "csv=p=0", movie], capture_output=True, text=True, check=True, timeout=120).stdout.split()
-    pixels = subprocess.run(
-        ["ffmpeg", "-nostdin", "-v", "error", "-i", movie, "-map", "0:v", "-fps_mode", "passthrough", "-vf",
-         f"crop=iw:ih/20:0:ih-ih/20,scale={CELLS}:1:flags=area", "-f", "rawvideo", "-pix_fmt", "gray", "-"],
-        capture_output=True, check=True, timeout=120).stdout
-    numbers = [number_in(pixels[i:i + CELLS]) for i in range(0, len(pixels), CELLS)]
-    if len(numbers) != len(times) or None in numbers:
-        sys.exit(f"demo: of {len(times)} pictures {len(numbers)} were decoded, {numbers.count(None)} without a number")
-    return [(float(moment.strip(",")), number) for moment, number in zip(times, numbers)]
-
-
-def length_of(movie):
-    return float(subprocess.run(["ffprobe", "-v", "error", "-show_entries", "format=duration", "-of", "csv=p=0", movie],
-                                capture_output=True, text=True, check=True, timeout=60).stdout)
+    shown = [(moment, number_in(pixels)) for moment, pixels in
+             movies.pictures(movie, "crop=iw:ih/20:0:ih-ih/20", f"scale={CELLS}:1:flags=area", size=CELLS)]
+    without = sum(number is None for _, number in shown)
+    if without:
+        sys.exit(f"demo: {without} of {len(shown)} pictures have no number")
+    return shown
 
 
 def tell(name, shown, length):
@@ -74,8 +63,8 @@ def tell(name, shown, length):
 
 def compare(source, result):
     """Whether the result is the source from START to END before its end, picture by picture, each at its time."""
-    shown, length = pictures(source), length_of(source)
-    trimmed, trimmed_length = pictures(result), length_of(result)
+    shown, length = pictures(source), movies.duration(source)
+    trimmed, trimmed_length = pictures(result), movies.duration(result)
     tell("source", shown, length)
     tell("result", trimmed, trimmed_length)
     nexts = [moment for moment, _ in shown[1:]] + [length]
@@ -91,7 +80,7 @@ def compare(source, result):
 
 def main():
     build, output = sys.argv[1:]
-    with Device(ROOT, build, screen=(WIDTH, HEIGHT)) as stage:
+    with Device(build, screen=(WIDTH, HEIGHT)) as stage:
         kept, recorded = record(stage)
         os.makedirs(output, exist_ok=True)
         source = shutil.copyfile(kept, os.path.join(output, "trim-source.mp4"))

@@ -1,4 +1,4 @@
-"""Child processes whose lines are stamped as they arrive, and what /proc tells of a process."""
+"""Child processes whose lines are stamped as they arrive, waits, and what /proc tells of a process."""
 
 import os
 import signal
@@ -6,7 +6,25 @@ import subprocess
 import threading
 import time
 
+PATIENCE = 120  # seconds until a wait counts as hanging; nothing is asserted about speed
 TICKS_PER_SECOND = os.sysconf("SC_CLK_TCK")
+
+
+def check(condition, message):
+    """An assertion that python -O keeps."""
+    if not condition:
+        raise AssertionError(message)
+
+
+def wait_until(what, condition, seconds=PATIENCE, step=0.01):
+    """Tries until `condition` gives something true, and returns that."""
+    deadline = time.monotonic() + seconds
+    while True:
+        value = condition()
+        if value:
+            return value
+        check(time.monotonic() < deadline, f"waited in vain for {what}")
+        time.sleep(step)
 
 
 class Child:
@@ -22,7 +40,7 @@ class Child:
                                         **pipes)
         self.pid = self.process.pid
         self.lines = []
-        self.ended = False
+        self.has_said_all = False
         self.changed = threading.Condition()
         self.reader = threading.Thread(target=self._read, args=(getattr(self.process, stream),), daemon=True)
         self.reader.start()
@@ -34,7 +52,7 @@ class Child:
                 self.lines.append((now, line.rstrip("\n")))
                 self.changed.notify_all()
         with self.changed:
-            self.ended = True
+            self.has_said_all = True
             self.changed.notify_all()
 
     def say(self, line):
@@ -47,7 +65,7 @@ class Child:
         with self.changed:
             return len(self.lines)
 
-    def expect(self, text, since=0, seconds=20.0):
+    def expect(self, text, since=0, seconds=PATIENCE):
         """The first line since `since` that has `text`: (when, line)."""
         deadline = time.monotonic() + seconds
         with self.changed:
@@ -56,20 +74,37 @@ class Child:
                     if text in stamped[1]:
                         return stamped
                 left = deadline - time.monotonic()
-                if self.ended or left <= 0:
-                    tail = "\n  ".join(line for _, line in self.lines[-20:])
-                    raise RuntimeError(f"{self.name} did not say '{text}'; its last lines:\n  {tail}")
+                check(not self.has_said_all and left > 0, f"{self.name} did not say '{text}', but:\n{self.tail()}")
                 self.changed.wait(left)
 
-    def stop(self):
-        if self.process.poll() is None:
+    def output(self):
+        with self.changed:
+            return "".join(line + "\n" for _, line in self.lines)
+
+    def tail(self):
+        return "\n".join("  " + line for _, line in self.lines[-20:])
+
+    def is_running(self):
+        return self.process.poll() is None
+
+    def wait(self, seconds=5 * PATIENCE):
+        """Its exit code, when it has ended by itself and all that it said is here."""
+        code = self.process.wait(seconds)
+        self.reader.join(2)  # a child of its own may keep the pipe
+        return code
+
+    def kill(self):
+        self.process.kill()
+        return self.wait()
+
+    def stop(self, seconds=8):
+        if self.is_running():
             self.process.send_signal(signal.SIGTERM)
             try:
-                self.process.wait(8)
+                self.process.wait(seconds)
             except subprocess.TimeoutExpired:
                 self.process.kill()
-        self.process.wait()
-        self.reader.join(2)
+        return self.wait()
 
 
 def processor_seconds(pid):

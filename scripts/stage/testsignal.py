@@ -1,68 +1,37 @@
-"""Flashes and beeps: what the example application shows and plays at once, found again in a movie or a stream."""
+"""Reads the headless device's test picture, which platform/headless/TestSignal.h describes."""
 
-import array
-import math
-import socket
-import subprocess
-
-RATE = 8000
-BEEP_HZ = 1000
+COLUMNS, ROWS = 16, 9
+CHECK_MASK = 0xA5
+PERIOD = 1.0          # seconds from one flash and beep to the next
+FLASH_DURATION = 0.1  # seconds
+FRAME_INTERVAL = 1 / 60
 
 
-def run(arguments, seconds=120):
-    return subprocess.run(arguments, capture_output=True, timeout=seconds, check=True, stdin=subprocess.DEVNULL).stdout
+class Picture:
+    """Pixels of one byte (`pixel_size` 1: luma) or four (blue, green, red, unused)."""
 
+    def __init__(self, pixels, width, height, stride, pixel_size=1):
+        self.pixels, self.width, self.height, self.stride, self.pixel_size = pixels, width, height, stride, pixel_size
 
-def free_port():
-    with socket.socket() as probe:
-        probe.bind(("127.0.0.1", 0))
-        return probe.getsockname()[1]
+    def is_white(self, column, row, columns=1, rows=1):
+        """Whether the middle of a block of cells is: the mean of 4 x 4 pixels, green for luma."""
+        x = (2 * column + columns) * self.width // (2 * COLUMNS) - 2
+        y = (2 * row + rows) * self.height // (2 * ROWS) - 2
+        channel = 1 if self.pixel_size == 4 else 0
+        total = 0
+        for line in range(y, y + 4):
+            first = line * self.stride + x * self.pixel_size + channel
+            total += sum(self.pixels[first:first + 4 * self.pixel_size:self.pixel_size])
+        return total > 127 * 16
 
+    def number(self):
+        """The frame's number, or None where the check fails."""
+        code = 0
+        for cell in range(40):
+            code = code << 1 | self.is_white(1 + cell % 8, 1 + cell // 8)
+        number, checksum = code >> 8, code & 0xFF
+        folded = number ^ number >> 8 ^ number >> 16 ^ number >> 24
+        return number if checksum == (folded & 0xFF) ^ CHECK_MASK else None
 
-def rising(levels, threshold):
-    """The times at which the level comes up to the threshold; one that is up at the start does not count."""
-    edges, up = [], True
-    for moment, level in levels:
-        if level >= threshold and not up:
-            edges.append(moment)
-        up = level >= threshold
-    return edges
-
-
-def frame_times(movie):
-    text = run(["ffprobe", "-v", "error", "-select_streams", "v", "-of", "csv=p=0", "-show_entries", "frame=pts_time",
-                movie]).decode()
-    return [float(line.strip(",")) for line in text.split()]
-
-
-def flashes(movie):
-    levels = run(["ffmpeg", "-v", "error", "-copyts", "-i", movie, "-map", "0:v", "-vf",
-                  "scale=1:1:flags=area,format=gray", "-fps_mode", "passthrough", "-f", "rawvideo", "-"])
-    if not levels:
-        return []
-    return rising(zip(frame_times(movie), levels), (max(levels) + min(levels)) / 2)
-
-
-def beeps(movie):
-    samples = array.array("h", run(["ffmpeg", "-v", "error", "-copyts", "-i", movie, "-map", "0:a:0", "-af",
-                                    "aresample=async=1:first_pts=0", "-ac", "1", "-ar", str(RATE), "-f", "s16le",
-                                    "-"]))
-    window = 2 * RATE // BEEP_HZ
-    cosine = [math.cos(2 * math.pi * BEEP_HZ * i / RATE) for i in range(window)]
-    sine = [math.sin(2 * math.pi * BEEP_HZ * i / RATE) for i in range(window)]
-    levels = []
-    for at in range(0, len(samples) - window, window // 2):
-        piece = samples[at:at + window]
-        levels.append(((at + window / 2) / RATE, math.hypot(sum(a * b for a, b in zip(piece, cosine)),
-                                                           sum(a * b for a, b in zip(piece, sine)))))
-    top = max((level for _, level in levels), default=0)
-    return rising(levels, top / 2) if top > 100 else []
-
-
-def worst_distance(movie, margin=0.0):
-    """(flashes, the greatest distance in seconds from one to its beep); without those that `margin` leaves out at the
-    ends."""
-    times = frame_times(movie)
-    seen = [flash for flash in flashes(movie) if times[0] + margin < flash < times[-1] - margin]
-    heard = beeps(movie)
-    return seen, max((min((abs(beep - flash) for beep in heard), default=math.inf) for flash in seen), default=math.inf)
+    def shows_flash(self):
+        return self.is_white(10, 1, 5, 5)

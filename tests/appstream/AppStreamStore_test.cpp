@@ -5,7 +5,7 @@
 #include "tests/fakes/LogRecorder.h"
 #include "tests/fakes/ManualExecutor.h"
 #include "tests/fakes/ScratchPreferences.h"
-#include "tests/linux/TemporaryRoot.h"
+#include "tests/kit/ScratchFolder.h"
 
 namespace qv::platform::appstream {
 namespace {
@@ -42,7 +42,7 @@ class AppStreamStoreTest : public testing::Test {
   }
 
   fakes::LogRecorder log_;
-  TemporaryRoot root_;
+  kit::ScratchFolder root_;
   fakes::ScratchPreferences preferences_{root_.path("/preferences")};
   platform::Localization& localization_ = preferences_.localization;
   fakes::ManualExecutor executor_;

@@ -12,8 +12,9 @@ import dbus.connection
 import dbus.service
 from dbus.mainloop.glib import DBusGMainLoop
 
-from harness import PATIENCE, SOCKET
-from testsignal import Picture
+from stage.device import SOCKET
+from stage.processes import PATIENCE
+from stage.testsignal import Picture
 
 PATH = '/com/tarnwick/quorveld'
 NAME = 'com.tarnwick.quorveld'

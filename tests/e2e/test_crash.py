@@ -4,9 +4,9 @@ import os
 import random
 import time
 
-import movie
-from harness import Device, check, is_sanitized, main, wait_for_line, wait_until
-from testsignal import FRAME_INTERVAL
+from harness import Device, check, is_sanitized, main, wait_until
+from stage import movie
+from stage.testsignal import FRAME_INTERVAL
 
 SEED = 20240229
 SHORTEST, LONGEST = 1.7, 4.0  # seconds of media until the kill
@@ -20,19 +20,19 @@ def record_and_kill(device, length, killed_path=None):
     """The moments of the start and the kill. Pictures follow CLOCK_MONOTONIC, as time.monotonic() does. The file is
     moved to `killed_path`, or stays where a daemon that starts finds it."""
     daemon = device.start_daemon()
-    game = device.start_game('record 600; stop')
-    wait_for_line(game, 'started')
+    game = device.start_game(script='record 600; stop')
+    game.expect('started')
     started = time.monotonic()
-    wait_until(device.movie_files, 'the movie file')
+    wait_until('the movie file', device.movie_files)
     path, = device.movie_files()
-    wait_until(lambda: movie.fragment_count(path) >= FEWEST_FRAGMENTS and time.monotonic() >= started + length,
-               'the moment to kill', step=0.001)
+    wait_until('the moment to kill', lambda: movie.fragment_count(path) >= FEWEST_FRAGMENTS and
+               time.monotonic() >= started + length, step=0.001)
     killed = time.monotonic()
     daemon.kill()
     daemon.check_sanitizers()
-    wait_for_line(game, 'stopped')  # the client is told
-    game.kill()
-    game.wait()
+    device.end(daemon)
+    game.expect('stopped')  # the client is told
+    device.end(game)
     if killed_path:
         os.rename(path, killed_path)
     return started, killed
@@ -42,8 +42,7 @@ def judge(path, started, killed):
     """How much is missing, in seconds."""
     video, audio = movie.streams(path)[:2]
     movie.check_decodes(path)
-    frames = movie.video_frames(path)
-    movie.check_numbers(frames)
+    frames = movie.numbered_frames(path)
     check(frames[0].number == 0, f'the movie begins with picture {frames[0].number}')
     captured = killed - movie.host_time_of_start(frames, started)
     loss = captured - float(video['duration'])
@@ -58,7 +57,7 @@ def kill_at_random_moments(rounds):
     with Device() as device, concurrent.futures.ThreadPoolExecutor(1) as judges:
         losses = []
         for index in range(int(rounds)):
-            path = os.path.join(device.path, f'killed{index}.mp4')
+            path = os.path.join(device.directory, f'killed{index}.mp4')
             times = record_and_kill(device, moments.uniform(SHORTEST, LONGEST), path)
             losses.append(judges.submit(judge, path, *times))
         worst = max(loss.result() for loss in losses)
@@ -73,7 +72,7 @@ def salvage_at_the_next_start():
     with Device(log='notice') as device:
         started, killed = record_and_kill(device, SHORTEST)
         daemon = device.start_daemon()
-        check('finished an unfinished movie' in daemon.log(), daemon.log())
+        daemon.expect('finished an unfinished movie')
         kept, = device.movie_files()
         loss = judge(kept, started, killed)
         check(loss <= LARGEST_LOSS, f'{loss:.3f} s of the movie are lost')

@@ -18,7 +18,6 @@ APP_AUDIO, MICROPHONE = 2, 3  # buffer types
 
 def as_client(case):
     with Device() as device:
-        device.write('etc/quorvel/device.json', '{"audioCaptureDevice": true}')
         device.start_daemon()
         print(device.run_client(os.path.basename(__file__), 'client', case, device.movies), end='')
 
@@ -109,14 +108,14 @@ def microphone(client, _movies):
 
 
 def movie(client, movies):
-    from movie import check_decodes, streams  # pylint: disable=import-outside-toplevel
+    from stage.movie import check_decodes, streams  # pylint: disable=import-outside-toplevel
     check(client.refusal('stopRecordingWithHandler') == NOT_RECORDING, 'a stop without recording')
     check(client.start() == 0, 'the recording is refused')
     check(client.refusal('discardRecordingWithHandler') is not None, 'a running recording can be discarded')
 
     def recorded_a_second():
         return any(os.stat(os.path.join(movies, name)).st_size > 8000 for name in os.listdir(movies))
-    wait_until(recorded_a_second, 'the movie to grow')
+    wait_until('the movie to grow', recorded_a_second)
     url, code = client.stop()
     check(code == 0 and url.startswith('file:///'), f'the stop gives "{url}", {code}')
     path = urllib.parse.unquote(urllib.parse.urlparse(url).path)
@@ -138,8 +137,8 @@ def save_meets_start(client, movies):
     """A movie that is being saved when its application starts to record again is the one that is saved."""
     def record():
         check(client.start() == 0, 'the recording is refused')
-        wait_until(lambda: any(os.stat(os.path.join(movies, name)).st_size > 8000 for name in os.listdir(movies)
-                               if name == 'Test.mp4'), 'the movie to grow')
+        wait_until('the movie to grow', lambda: any(os.stat(os.path.join(movies, name)).st_size > 8000
+                                                    for name in os.listdir(movies) if name == 'Test.mp4'))
 
     for _ in range(3):
         record()
@@ -206,7 +205,7 @@ def bad_input(client, _movies):
     client.call('resumeRecordingWithWindowLayerContextID', 'u', foreign)
     client.run_until(lambda: client.received.stops, 'the recording to be stopped')
     check(int(client.received.stops[0][0]['code']) == NO_CONTEXT_MATCH, client.received.stops)
-    wait_until(lambda: not client.state()['isRecording'], 'the recording to be over')
+    wait_until('the recording to be over', lambda: not client.state()['isRecording'])
     check(client.start(capture=True) == 0, 'a sound request is refused after the nonsense')
     client.run_until(lambda: len(client.received.frames) > 5, 'frames')
     check(client.stop() == ('', 0), 'the stop fails')

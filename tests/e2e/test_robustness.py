@@ -3,8 +3,9 @@ import os
 import shutil
 import urllib.parse
 
-import movie
-from harness import PATIENCE, Device, check, main, wait_for_line, wait_until
+from harness import Device, check, main, wait_until
+from stage import movie
+from stage.device import Daemon
 
 INSUFFICIENT_STORAGE, FAILED_TO_SAVE = -5805, -5812
 STARTED = 'started microphone=0 camera=0'
@@ -14,42 +15,35 @@ def records(device):
     return 'error=0' in device.run_game('record 1; stop; discard; quit')
 
 
-def run_refused_game(device, script):
-    """The lines of a game whose recording is not what it asked for."""
-    game = device.start_game(script)
-    output, _ = game.communicate(timeout=PATIENCE)
-    check(game.returncode == 1, f'the game ended with {game.returncode}:\n{output}')
-    return output
-
-
 def second_daemon():
     """It must not take the place of the one that serves."""
     with Device() as device:
         first = device.start_daemon()
-        game = device.start_game('record 2; stop; quit')
-        wait_for_line(game, 'started')
-        second = device.start_daemon(expect_service=False)
-        code = second.wait_for_end()
+        game = device.start_game(script='record 2; stop; quit')
+        game.expect('started')
+        second = device.add(Daemon(device))
+        second.expect('the service cannot be opened')
+        code = second.wait()
         check(code > 0, f'the second daemon ended with {code}')
-        check('the service cannot be opened' in second.log(), f'it says nothing of the reason: {second.log()}')
-        wait_for_line(game, 'stopped url=file:')
-        game.wait(PATIENCE)
+        device.end(second)
+        game.expect('stopped url=file:')
+        game.wait()
         check(first.is_running() and records(device), 'the first daemon serves no longer')
 
 
 def client_dies_in_alert():
     """The start of a client that died during its alert is over; its successor's is its own."""
     with Device(alert='never', log='notice') as device:
-        device.write('etc/quorvel/device.json', '{"internalBuild": true}')
+        device.write_device(internalBuild=True)
         daemon = device.start_daemon()
-        for count in (1, 2):
-            game = device.start_game('record 1; stop; quit')
-            daemon.wait_for_log('QVRecordingManager:showAcknowledgementAlert', count)
+        for _ in range(2):
+            mark = daemon.mark()
+            game = device.start_game(script='record 1; stop; quit')
+            daemon.expect('QVRecordingManager:showAcknowledgementAlert', mark)
             game.kill()
-            game.wait()
-            daemon.wait_for_log('QVRecordingManager: applicationDisconnected', count)
+            daemon.expect('QVRecordingManager: applicationDisconnected', mark)
         # From now on nobody is asked, so that the next start can succeed.
-        device.write('com.tarnwick.quorveld.json', '{"QVSuppressAlert": true}', device.preferences)
+        device.write_preferences({'QVSuppressAlert': True})
         check(records(device), 'the next client is not served')
 
 
@@ -57,14 +51,13 @@ def client_dies_in_recording():
     """Its recording ends, its file goes away, and the next client is served."""
     with Device() as device:
         device.start_daemon()
-        game = device.start_game('record 600; stop')
-        wait_for_line(game, 'started')
-        wait_until(device.movie_files, 'the movie file')
+        game = device.start_game(script='record 600; stop')
+        game.expect('started')
+        wait_until('the movie file', device.movie_files)
         path, = device.movie_files()
-        wait_until(lambda: movie.fragment_count(path) >= 1, 'the movie to grow')
+        wait_until('the movie to grow', lambda: movie.fragment_count(path) >= 1)
         game.kill()
-        game.wait()
-        wait_until(lambda: not device.movie_files(), 'the movie of nobody to go away')
+        wait_until('the movie of nobody to go away', lambda: not device.movie_files())
         check(records(device), 'the next client is not served')
 
 
@@ -74,8 +67,8 @@ def disk_without_room():
         device.mount_disk(device.media, '120m')
         device.start_daemon()
         check(records(device), 'no recording with room enough')
-        device.write('ballast', bytes(30_000_000), device.media)
-        output = run_refused_game(device, 'record 1; stop; quit')
+        device.write(os.path.join(device.media, 'ballast'), bytes(30_000_000))
+        output = device.run_game('record 1; stop; quit', code=1)
         check(f'error code={INSUFFICIENT_STORAGE} ' in output, output)
         check(not device.movie_files(), 'the refused recording has a file')
         os.remove(os.path.join(device.media, 'ballast'))
@@ -104,14 +97,15 @@ def record_while_disk_fills(room):
     with Device() as device:
         device.mount_disk(device.media, '120m')
         device.start_daemon()
-        game = device.start_game('record 4; stop; quit')
-        wait_for_line(game, 'started')
-        wait_until(device.movie_files, 'the movie file')
+        game = device.start_game(script='record 4; stop; quit')
+        game.expect('started')
+        wait_until('the movie file', device.movie_files)
         path, = device.movie_files()
-        wait_until(lambda: movie.fragment_count(path) >= 1, 'the movie to grow')
+        wait_until('the movie to grow', lambda: movie.fragment_count(path) >= 1)
         ballast = os.path.join(device.media, 'ballast')
         fill_disk(ballast, room)
-        output, _ = game.communicate(timeout=PATIENCE)
+        game.wait()
+        output = game.output()
         path, = device.movie_files()
         check(f'stopped url=file://{urllib.parse.quote(path)} error={INSUFFICIENT_STORAGE}\n' in output, output)
         check(float(movie.streams(path)[0]['duration']) > 0.5, 'nothing is left of the recording')
@@ -128,7 +122,7 @@ def read_only_disk():
         device.mount_disk(device.movies, '200m')
         device.start_daemon()
         device.remount(device.movies, 'ro')
-        output = run_refused_game(device, 'record 1; stop; quit')
+        output = device.run_game('record 1; stop; quit', code=1)
         check(STARTED in output, f'the recording is refused:\n{output}')
         check(f'stopped url= error={FAILED_TO_SAVE}\n' in output, output)
         device.remount(device.movies, 'rw')
@@ -136,7 +130,7 @@ def read_only_disk():
 
 
 def check_refused_for_storage(device):
-    output = run_refused_game(device, 'record 1; stop; quit')
+    output = device.run_game('record 1; stop; quit', code=1)
     check(f'error code={INSUFFICIENT_STORAGE} ' in output, output)
     if os.path.isfile(device.movies):
         os.remove(device.movies)
@@ -146,14 +140,15 @@ def check_refused_for_storage(device):
 
 def no_place_for_movies():
     """A directory that does not exist has no free space."""
-    with Device(has_media_parent=False) as device:
+    with Device() as device:
+        os.rmdir(device.media)
         device.start_daemon()
         check_refused_for_storage(device)
 
 
 def movies_directory_is_a_file():
     with Device() as device:
-        device.write('Quorvel', 'not a directory', device.media)
+        device.write(device.movies, 'not a directory')
         device.start_daemon()
         check_refused_for_storage(device)
 
@@ -168,21 +163,24 @@ def broken_files():
     for content in BROKEN:
         with Device() as device:
             device.write('etc/quorvel/device.json', content)
-            device.write('com.tarnwick.quorveld.json', content, device.preferences)
+            device.write_preferences(content)
             for bundle in ('com.tarnwick.quorveld', 'com.example.quorvel.game'):
                 device.write(f'etc/quorvel/entitlements/{bundle}.json', content)
-            device.write('Info.json', content, device.framework)
+            device.write(os.path.join(device.framework, 'Info.json'), content)
             for directory, _, names in os.walk(os.path.join(device.framework, 'Resources')):
                 for name in names:
-                    device.write(name, content, directory)
+                    device.write(os.path.join(directory, name), content)
             daemon = device.start_daemon()
             check(records(device), f'no recording with files of {content[:30]!r}')
             check(daemon.is_running(), 'the daemon ended')
     with Device() as device:  # no files at all, and links and directories where files should be
         shutil.rmtree(device.framework)
-        os.makedirs(os.path.join(device.root, 'etc/quorvel/device.json'))
-        os.makedirs(device.preferences)
-        os.symlink('com.tarnwick.quorveld.json', os.path.join(device.preferences, 'com.tarnwick.quorveld.json'))
+        description = os.path.join(device.root, 'etc/quorvel/device.json')
+        os.remove(description)
+        os.makedirs(description)
+        preferences = os.path.join(device.media, 'Preferences')
+        os.makedirs(preferences)
+        os.symlink('com.tarnwick.quorveld.json', os.path.join(preferences, 'com.tarnwick.quorveld.json'))
         device.start_daemon()
         check(records(device), 'no recording without files')
 

@@ -1,24 +1,18 @@
 """System recordings on a real display and sound server, which go away in their midst and come back."""
-import os
-import sys
 import time
-import urllib.parse
 
-import movie
-from harness import check, main, setting
-
-sys.path.insert(0, os.path.join(os.path.dirname(os.path.abspath(__file__)), '../../scripts/stage'))
-from stage import Application, Stage  # noqa: E402
+from harness import BUILD, check, main
+from stage import movie
+from stage.applications import Application
+from stage.device import Stage
 
 MEDIA_SERVICES_FAILED = -5817
-BUILD = os.path.join(os.path.dirname(setting('QV_E2E_DAEMON')), '..')
-SOURCE = os.path.join(os.path.dirname(os.path.abspath(__file__)), '../..')
 TURN = 1.5  # seconds of recording on each side of an event
 
 
 class Device(Stage):
     def __init__(self):
-        super().__init__(SOURCE, BUILD, screen=(640, 360))
+        super().__init__(BUILD, screen=(640, 360))
 
     def prepare(self):
         self.allow_system_recordings()
@@ -37,7 +31,7 @@ def stop(ui):
     ui.say('stop')
     line = ui.expect('stopped', mark)[1]
     check('error=0' in line, f'the recording ended badly: {line}')
-    path = urllib.parse.unquote(urllib.parse.urlparse(line.split('url=')[1].split()[0]).path)
+    path = movie.path_in(line)
     movie.check_decodes(path)
     return path
 
@@ -101,9 +95,8 @@ def display_server():
         line = ui.expect('ended', mark)[1]
         check(f'error={MEDIA_SERVICES_FAILED}' in line, f'another error: {line}')
         device.daemon.expect('movie finished:')
-        kept = [os.path.join(device.movies, name) for name in os.listdir(device.movies)]
-        check(len(kept) == 1, f'kept: {kept}')
-        movie.check_decodes(kept[0])
+        kept, = device.movie_files()
+        movie.check_decodes(kept)
         device.start_display(device.environment['DISPLAY'])
         start(ui)
         check(movie.frame_times(stop(ui))[-1] > TURN / 2, 'the next recording is too short')

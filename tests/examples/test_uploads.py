@@ -14,10 +14,9 @@ import sys
 import tempfile
 import threading
 
-ROOT = os.path.dirname(os.path.dirname(os.path.dirname(os.path.abspath(__file__))))
-sys.path.insert(0, os.path.join(ROOT, "scripts/stage"))
-from processes import Child  # noqa: E402
-from testsignal import frame_times, free_port, run, worst_distance  # noqa: E402
+sys.path.insert(0, os.path.join(os.path.dirname(os.path.abspath(__file__)), "../../scripts"))
+from stage.processes import Child  # noqa: E402
+from stage.movie import frame_times, free_port, run, worst_distance  # noqa: E402
 
 
 class Server(http.server.BaseHTTPRequestHandler):

@@ -10,6 +10,7 @@
 #include "platform/ffmpeg/MoviesLoader.h"
 #include "tests/ffmpeg/MovieProbe.h"
 #include "tests/ffmpeg/SyntheticMedia.h"
+#include "tests/kit/ScratchFolder.h"
 
 namespace qv::platform::test {
 namespace {
@@ -21,7 +22,7 @@ constexpr uint32_t kPictures = 240;  // 8 s at 30 per second
 class ExportTest : public ::testing::Test {
  protected:
   static void SetUpTestSuite() {
-    scratch_ = new ScratchDirectory;
+    scratch_ = new kit::ScratchFolder;
     source_ = *scratch_ / "source.mp4";
     ffmpeg::FFmpegAssetWriterService writers;
     RecordingUnderTest recording(writers, source_, 320, 180, {0, 1, -1, 0, 0, 0});
@@ -42,19 +43,20 @@ class ExportTest : public ::testing::Test {
     made->setOutputFileType(kFileTypeMPEG4);
     return made;
   }
-  static void runToEnd(ExportSession& session) {
+  static void runToEnd(ExportSession& session, ExportStatus wanted = ExportStatus::Completed) {
     std::promise<void> done;
     session.exportAsynchronously([&] { done.set_value(); });
     done.get_future().wait();
+    EXPECT_EQ(session.status(), wanted) << (session.error() ? session.error()->description() : "");
   }
   static size_t filesIn(const std::string& directory) {
     return static_cast<size_t>(std::distance(std::filesystem::directory_iterator(directory), {}));
   }
 
-  static inline ScratchDirectory* scratch_ = nullptr;
+  static inline kit::ScratchFolder* scratch_ = nullptr;
   static inline std::string source_;
   ffmpeg::FFmpegExportService service_;
-  ScratchDirectory results_;
+  kit::ScratchFolder results_;
 };
 
 TEST_F(ExportTest, OpensAMovieAndFindsNothingInOthers) {
@@ -79,19 +81,12 @@ TEST_F(ExportTest, TrimsToTheFrameAndTheBeep) {
     auto trim = session(source_, path, ExportPreset::PassThrough);
     trim->setTimeRange({MediaTime::make(first, 30), MediaTime::make(count, 30)});
     runToEnd(*trim);
-    ASSERT_EQ(trim->status(), ExportStatus::Completed) << trim->error()->description();
 
-    const auto movie = probe(path);
-    EXPECT_EQ(movie.errors, "");
+    const auto movie = probeGood(path);
     ASSERT_EQ(movie.tracks.size(), 3u);
     EXPECT_EQ(movie.tracks[0].rotation, -90);
     for (const auto& track : movie.tracks) EXPECT_NEAR(track.duration, count / 30.0, 1e-4);
-    const auto pictures = decodePictures(path);
-    ASSERT_EQ(pictures.size(), count) << first;
-    for (uint32_t i = 0; i < count; ++i) {
-      EXPECT_EQ(pictures[i].number, first + i);
-      EXPECT_NEAR(pictures[i].time, i / 30.0, 1e-5);
-    }
+    expectPictures(path, first, count, 30);
     for (int track = 0; track < 2; ++track) {
       for (const double beep : beeps(decodeSound(path, track))) {
         const double inSource = beep + first / 30.0;
@@ -109,9 +104,7 @@ TEST_F(ExportTest, TrimsBetweenPictures) {
   auto trim = session(source_, path, ExportPreset::PassThrough);
   trim->setTimeRange({MediaTime::make(601, 300), MediaTime::make(900, 300)});  // 2.0033 s, a tenth into picture 60
   runToEnd(*trim);
-  ASSERT_EQ(trim->status(), ExportStatus::Completed);
-  const auto movie = probe(path);
-  EXPECT_EQ(movie.errors, "");
+  const auto movie = probeGood(path);
   EXPECT_NEAR(movie.duration, 3.0, 1e-4);
   const auto pictures = decodePictures(path);
   ASSERT_EQ(pictures.size(), 91u);
@@ -126,10 +119,8 @@ TEST_F(ExportTest, MixesTracksAtTheirLevelsAndCopiesThePicture) {
   auto mix = session(source_, path, ExportPreset::HighestQuality);
   mix->setAudioMix({{2}, {3}});
   runToEnd(*mix);
-  ASSERT_EQ(mix->status(), ExportStatus::Completed) << mix->error()->description();
 
-  const auto movie = probe(path);
-  EXPECT_EQ(movie.errors, "");
+  const auto movie = probeGood(path);
   ASSERT_EQ(movie.tracks.size(), 2u);
   EXPECT_EQ(movie.tracks[0].rotation, -90);
   for (const auto& track : movie.tracks) EXPECT_NEAR(track.duration, 8.0, 1e-4);
@@ -156,14 +147,11 @@ TEST_F(ExportTest, EncodesOtherCodecsAnewAndLeavesOutMissingSound) {
   const std::string other = results_ / "mpeg4.mp4";
   run("ffmpeg -v error -nostdin -i '" + source_ + "' -an -c:v mpeg4 -q:v 2 '" + other + "'");
   auto pass = session(other, results_ / "pass.mp4", ExportPreset::PassThrough);
-  runToEnd(*pass);
-  EXPECT_EQ(pass->status(), ExportStatus::Failed);
+  runToEnd(*pass, ExportStatus::Failed);
   const std::string path = results_ / "encoded.mp4";
   auto mix = session(other, path, ExportPreset::HighestQuality);
   runToEnd(*mix);
-  ASSERT_EQ(mix->status(), ExportStatus::Completed) << mix->error()->description();
-  const auto movie = probe(path);
-  EXPECT_EQ(movie.errors, "");
+  const auto movie = probeGood(path);
   ASSERT_EQ(movie.tracks.size(), 1u);
   EXPECT_EQ(movie.tracks[0].codec, "h264");
   EXPECT_EQ(decodePictures(path).size(), kPictures);
@@ -189,8 +177,7 @@ TEST_F(ExportTest, FailsWithoutLeavingAnything) {
     for (const char* name :
          {"short.mp4", "front.mp4", "empty.mp4", "text.mp4", "list.mp4", "directory.mp4", "missing.mp4"}) {
       auto bad = session(results_ / name, output, preset);
-      runToEnd(*bad);
-      EXPECT_EQ(bad->status(), ExportStatus::Failed) << name;
+      runToEnd(*bad, ExportStatus::Failed);
       EXPECT_TRUE(bad->error().has_value()) << name;
     }
     const MediaTime second = MediaTime::make(1, 1);
@@ -206,16 +193,13 @@ TEST_F(ExportTest, FailsWithoutLeavingAnything) {
     for (const auto& range : ranges) {
       auto bad = session(source_, output, preset);
       bad->setTimeRange(range);
-      runToEnd(*bad);
-      EXPECT_EQ(bad->status(), ExportStatus::Failed);
+      runToEnd(*bad, ExportStatus::Failed);
     }
     auto cancelled = session(source_, output, preset);
     cancelled->cancel();
-    runToEnd(*cancelled);
-    EXPECT_EQ(cancelled->status(), ExportStatus::Cancelled);
+    runToEnd(*cancelled, ExportStatus::Cancelled);
     auto unwritable = session(source_, results_ / "no/such/output.mp4", preset);
-    runToEnd(*unwritable);
-    EXPECT_EQ(unwritable->status(), ExportStatus::Failed);
+    runToEnd(*unwritable, ExportStatus::Failed);
   }
   EXPECT_EQ(filesIn(results_.path()), before);
 }
@@ -243,15 +227,12 @@ TEST_F(ExportTest, TakesMoviesWithoutATrackAndWithOddTimes) {
       const std::string path = results_ / "output.mp4";
       auto whole = session(source, path, preset);
       runToEnd(*whole);
-      ASSERT_EQ(whole->status(), ExportStatus::Completed) << odd.name << ": " << whole->error()->description();
-      const auto movie = probe(path);
-      EXPECT_EQ(movie.errors, "") << odd.name;
+      const auto movie = probeGood(path);
       EXPECT_EQ(movie.tracks.size(), preset == ExportPreset::PassThrough ? odd.tracks : odd.mixedTracks) << odd.name;
       EXPECT_NEAR(movie.duration, odd.duration, 0.05) << odd.name;
       auto part = session(source, path, preset);
       part->setTimeRange({MediaTime::make(27, 10), MediaTime::make(41, 10)});
       runToEnd(*part);
-      ASSERT_EQ(part->status(), ExportStatus::Completed) << odd.name << ": " << part->error()->description();
       EXPECT_EQ(probe(path).errors, "") << odd.name;
       EXPECT_NEAR(probe(path).duration, 4.1, 0.05) << odd.name;
     }
@@ -285,15 +266,14 @@ TEST_F(ExportTest, LoadsModulesOnFirstUseAndReportsMissingOnes) {
   EXPECT_EQ(loader.openMovie(URL::fileURL(source_))->duration().seconds(), 8.0);
   const std::string path = results_ / "recorded.mp4";
   RecordingUnderTest recording(loader, path);
-  for (uint32_t i = 0; i < 30; ++i) recording.appendPicture(picture(i, kStart + i / 30.0, kStart + i / 30.0));
+  recording.appendPictures(30, 30, kStart);
   recording.finish();
   EXPECT_EQ(probe(path).errors, "");
 
   ffmpeg::MoviesLoader missing(results_ / "none");
   EXPECT_FALSE(missing.createAssetWriter(URL::fileURL(results_ / "x.mp4"), kFileTypeMPEG4).hasValue());
   auto failing = missing.createExportSession(missing.openMovie(URL::fileURL(source_)), ExportPreset::PassThrough);
-  runToEnd(*failing);
-  EXPECT_EQ(failing->status(), ExportStatus::Failed);
+  runToEnd(*failing, ExportStatus::Failed);
 }
 
 }  // namespace

@@ -1,11 +1,12 @@
 #include "tests/ffmpeg/MovieProbe.h"
 
+#include <gtest/gtest.h>
+
 #include <algorithm>
 #include <cmath>
 #include <cstdio>
 #include <cstdlib>
 #include <cstring>
-#include <filesystem>
 #include <fstream>
 #include <nlohmann/json.hpp>
 #include <sstream>
@@ -91,6 +92,12 @@ ProbedMovie probe(const std::string& path) {
   return movie;
 }
 
+ProbedMovie probeGood(const std::string& path) {
+  auto movie = probe(path);
+  EXPECT_EQ(movie.errors, "") << path;
+  return movie;
+}
+
 std::vector<DecodedPicture> decodePictures(const std::string& path, Turning turning) {
   std::vector<DecodedPicture> pictures;
   std::istringstream lines(
@@ -152,14 +159,19 @@ std::vector<double> beeps(const std::vector<float>& sound) {
   return found;
 }
 
-ScratchDirectory::ScratchDirectory() {
-  char name[] = "/tmp/quorveld-movies-XXXXXX";
-  path_ = ::mkdtemp(name);
+void expectPictures(const std::string& path, uint32_t first, uint32_t count, double rate, Turning turning) {
+  const auto pictures = decodePictures(path, turning);
+  EXPECT_EQ(pictures.size(), count);
+  for (uint32_t i = 0; i < pictures.size(); ++i) {
+    EXPECT_EQ(pictures[i].number, first + i);
+    EXPECT_NEAR(pictures[i].time, i / rate, 1e-5);
+  }
 }
 
-ScratchDirectory::~ScratchDirectory() {
-  std::error_code ignored;
-  std::filesystem::remove_all(path_, ignored);
+void expectBeeps(const std::string& path, int track, const std::vector<double>& times) {
+  const auto heard = beeps(decodeSound(path, track));
+  ASSERT_EQ(heard.size(), times.size()) << "track " << track;
+  for (size_t i = 0; i < times.size(); ++i) EXPECT_NEAR(heard[i], times[i], 0.001) << "track " << track;
 }
 
 }  // namespace qv::platform::test

@@ -25,6 +25,8 @@ struct ProbedMovie {
   std::vector<ProbedTrack> tracks;
 };
 ProbedMovie probe(const std::string& path);
+/// Fails the test where a reader complains.
+ProbedMovie probeGood(const std::string& path);
 
 struct DecodedPicture {
   double time;
@@ -34,6 +36,11 @@ struct DecodedPicture {
 enum class Turning { AsCoded, AsShown };
 /// Every picture that is shown, its number read off the decoded pixels.
 std::vector<DecodedPicture> decodePictures(const std::string& path, Turning turning = Turning::AsCoded);
+/// Expects that many pictures with numbers from `first` on, at times from 0 on.
+void expectPictures(const std::string& path, uint32_t first, uint32_t count, double rate,
+                    Turning turning = Turning::AsCoded);
+/// Expects sound that begins at these times, on a millisecond.
+void expectBeeps(const std::string& path, int track, const std::vector<double>& times);
 struct PicturePacket {
   double time;
   size_t size;  ///< bytes
@@ -46,16 +53,5 @@ std::vector<float> decodeSound(const std::string& path, int track);
 std::vector<double> beeps(const std::vector<float>& sound);
 
 std::string run(const std::string& command);
-/// A directory that goes with this object.
-class ScratchDirectory {
- public:
-  ScratchDirectory();
-  ~ScratchDirectory();
-  [[nodiscard]] std::string operator/(const std::string& name) const { return path_ + "/" + name; }
-  [[nodiscard]] const std::string& path() const { return path_; }
-
- private:
-  std::string path_;
-};
 
 }  // namespace qv::platform::test

@@ -10,6 +10,7 @@
 #include "platform/mp4/MovieTrack.h"
 #include "tests/ffmpeg/MovieProbe.h"
 #include "tests/ffmpeg/SyntheticMedia.h"
+#include "tests/kit/ScratchFolder.h"
 
 namespace qv::platform::test {
 namespace {
@@ -77,7 +78,7 @@ class SalvageTest : public ::testing::Test {
     return reader ? static_cast<double>(reader.value()->duration()) / mp4::kMovieTimescale : 0;
   }
 
-  ScratchDirectory scratch_;
+  kit::ScratchFolder scratch_;
   const std::string path_ = scratch_ / "growing.mp4";
   mp4::MP4MovieSalvage salvage_;
 };

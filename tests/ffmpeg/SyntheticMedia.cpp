@@ -135,17 +135,17 @@ RecordingUnderTest::RecordingUnderTest(AssetWriterService& service, const std::s
 void RecordingUnderTest::appendPicture(const SampleBufferRef& sample) {
   if (!started_) writer_->startSessionAtSourceTime(sample->presentationTime());
   started_ = true;
-  while (!inputs_[0]->append(sample)) {
-    if (writer_->status() != AssetWriterStatus::Writing) return;
-    std::this_thread::yield();
-  }
+  append(inputs_[0], sample);
 }
 
-void RecordingUnderTest::appendSound(int track, const SampleBufferRef& sample) {
-  while (!inputs_[track]->append(sample)) {
-    if (writer_->status() != AssetWriterStatus::Writing) return;
-    std::this_thread::yield();
-  }
+void RecordingUnderTest::appendPictures(uint32_t count, double rate, double begin, uint32_t first) {
+  for (uint32_t i = 0; i < count; ++i) appendPicture(picture(first + i, begin + i / rate, begin + i / rate));
+}
+
+void RecordingUnderTest::appendSound(int track, const SampleBufferRef& sample) { append(inputs_[track], sample); }
+
+void RecordingUnderTest::append(const std::shared_ptr<WriterInput>& input, const SampleBufferRef& sample) {
+  while (!input->append(sample) && writer_->status() == AssetWriterStatus::Writing) std::this_thread::yield();
 }
 
 void RecordingUnderTest::finish() {

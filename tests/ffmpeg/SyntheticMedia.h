@@ -43,6 +43,8 @@ class RecordingUnderTest {
                      const AffineTransform& transform = {});
   RecordingUnderTest(AssetWriterService& service, const std::string& path, const Dictionary& videoSettings,
                      const AffineTransform& transform = {});
+  /// Numbered from `first` on, at regular times from `begin` on.
+  void appendPictures(uint32_t count, double rate, double begin = 0, uint32_t first = 0);
   /// Waits for room, so that no picture is dropped.
   void appendPicture(const SampleBufferRef& sample);
   void appendSound(int track, const SampleBufferRef& sample);
@@ -52,6 +54,8 @@ class RecordingUnderTest {
   void drop() { writer_.reset(); }
 
  private:
+  void append(const std::shared_ptr<WriterInput>& input, const SampleBufferRef& sample);
+
   std::unique_ptr<AssetWriter> writer_;
   std::shared_ptr<WriterInput> inputs_[3];
   bool started_ = false;

@@ -7,13 +7,14 @@
 #include "tests/fakes/LogRecorder.h"
 #include "tests/ffmpeg/MovieProbe.h"
 #include "tests/ffmpeg/SyntheticMedia.h"
+#include "tests/kit/ScratchFolder.h"
 
 namespace qv::platform::test {
 namespace {
 
 class VideoSettingsTest : public ::testing::Test {
  protected:
-  ScratchDirectory scratch_;
+  kit::ScratchFolder scratch_;
   ffmpeg::FFmpegAssetWriterService service_;
   const std::string path_ = scratch_ / "movie.mp4";
 };
@@ -32,8 +33,7 @@ TEST_F(VideoSettingsTest, FillsTracksOfEverySize) {
     for (uint32_t i = 0; i < 10; ++i) recording.appendPicture(picture(0xFFFF, i / 30.0, i / 30.0, c.width, c.height));
     recording.finish();
     EXPECT_EQ(recording.writer().status(), AssetWriterStatus::Completed);
-    const auto movie = probe(path_);
-    EXPECT_EQ(movie.errors, "");
+    const auto movie = probeGood(path_);
     ASSERT_EQ(movie.tracks.size(), 1u);
     EXPECT_EQ(movie.tracks[0].width, c.codedWidth);
     EXPECT_EQ(movie.tracks[0].height, c.codedHeight);
@@ -65,10 +65,9 @@ TEST_F(VideoSettingsTest, FollowsTheProfileAndTellsWhatItCannot) {
     properties.insert_or_assign("Quantity", Value(true));
     video.insert_or_assign(settings::kCompressionProperties, Value(properties));
     RecordingUnderTest recording(service_, path_, video);
-    for (uint32_t i = 0; i < 30; ++i) recording.appendPicture(picture(i, i / 30.0, i / 30.0));
+    recording.appendPictures(30, 30);
     recording.finish();
-    const auto movie = probe(path_);
-    EXPECT_EQ(movie.errors, "");
+    const auto movie = probeGood(path_);
     EXPECT_EQ(movie.tracks.at(0).profile, c.profile) << c.name;
     EXPECT_EQ(decodePictures(path_).size(), 30u);
     flushLog();

@@ -9,14 +9,14 @@
 #include "platform/linux/JSONPreferenceStore.h"
 #include "platform/linux/ProcessScreenReader.h"
 #include "tests/fakes/LogRecorder.h"
-#include "tests/linux/TemporaryRoot.h"
+#include "tests/kit/ScratchFolder.h"
 
 namespace qv::platform {
 namespace {
 
 class DeviceFilesTest : public testing::Test {
  protected:
-  TemporaryRoot root_;
+  kit::ScratchFolder root_;
   fakes::LogRecorder log_;
 };
 
@@ -38,43 +38,35 @@ TEST_F(DeviceFilesTest, PreferencesAreReadAtEachUse) {
   EXPECT_TRUE(store.valueForKey("../secret", "QVFullResCapture").isNone());
 }
 
-TEST_F(DeviceFilesTest, WithoutDescriptionItIsAPlainTelevisionBox) {
-  for (const char* content : {"", "{", "[]"}) {
-    if (*content != '\0') root_.write("/etc/quorvel/device.json", content);
+TEST_F(DeviceFilesTest, DescribesTheDeviceOrAPlainTelevisionBox) {
+  const struct {
+    const char* content;
+    UserInterfaceIdiom idiom;
+    int64_t chip;
+    bool hasCapture, isInternal, clicks;
+    size_t complaints;
+  } cases[] = {
+      {"", UserInterfaceIdiom::Television, 0, false, false, false, 0},
+      {"{", UserInterfaceIdiom::Television, 0, false, false, false, 1},
+      {"[]", UserInterfaceIdiom::Television, 0, false, false, false, 1},
+      {R"({"idiom": "tablet", "chipID": 32784, "audioCaptureDevice": true, "RegionalBehaviorShutterClick": true,
+           "internalBuild": true})",
+       UserInterfaceIdiom::Tablet, 32784, true, true, true, 0},
+      {R"({"idiom": "toaster", "chipID": "7", "audioCaptureDevice": 1, "internalBuild": "yes", "Name": {},
+           "RegionalBehaviorShutterClick": true})",
+       UserInterfaceIdiom::Television, 0, false, false, true, 5},
+  };
+  for (const auto& c : cases) {
+    if (*c.content != '\0') root_.write("/etc/quorvel/device.json", c.content);
     DeviceDescription device(root_.path());
-    EXPECT_EQ(device.userInterfaceIdiom(), UserInterfaceIdiom::Television);
-    EXPECT_EQ(device.integerProperty("ChipID"), 0);
-    EXPECT_FALSE(device.booleanProperty("RegionalBehaviorShutterClick"));
-    EXPECT_FALSE(device.hasAudioCaptureDevice());
-    EXPECT_FALSE(device.allowsInternalSecurityPolicies("com.tarnwick.quorveld"));
-    EXPECT_EQ(log_.countContaining("device description"), *content != '\0' ? 1u : 0u);
+    EXPECT_EQ(device.userInterfaceIdiom(), c.idiom) << c.content;
+    EXPECT_EQ(device.integerProperty("ChipID"), c.chip) << c.content;
+    EXPECT_EQ(device.hasAudioCaptureDevice(), c.hasCapture) << c.content;
+    EXPECT_EQ(device.allowsInternalSecurityPolicies("com.tarnwick.quorveld"), c.isInternal) << c.content;
+    EXPECT_EQ(device.booleanProperty("RegionalBehaviorShutterClick"), c.clicks) << c.content;
+    EXPECT_EQ(log_.lines().size(), c.complaints) << c.content;
     log_.clear();
   }
-}
-
-TEST_F(DeviceFilesTest, DescribesTheDevice) {
-  root_.write("/etc/quorvel/device.json", R"({"idiom": "tablet", "chipID": 32784, "audioCaptureDevice": true,
-      "RegionalBehaviorShutterClick": true, "internalBuild": true, "CoreCount": 4})");
-  DeviceDescription device(root_.path());
-  EXPECT_EQ(device.userInterfaceIdiom(), UserInterfaceIdiom::Tablet);
-  EXPECT_EQ(device.integerProperty("ChipID"), 32784);
-  EXPECT_EQ(device.integerProperty("CoreCount"), 4);
-  EXPECT_TRUE(device.booleanProperty("RegionalBehaviorShutterClick"));
-  EXPECT_TRUE(device.hasAudioCaptureDevice());
-  EXPECT_TRUE(device.allowsInternalSecurityPolicies("com.tarnwick.quorveld"));
-  EXPECT_TRUE(log_.lines().empty());
-}
-
-TEST_F(DeviceFilesTest, EntriesOfTheWrongTypeAreLeftOut) {
-  root_.write("/etc/quorvel/device.json", R"({"idiom": "toaster", "chipID": "7", "audioCaptureDevice": 1,
-      "internalBuild": "yes", "Name": {}, "RegionalBehaviorShutterClick": true})");
-  DeviceDescription device(root_.path());
-  EXPECT_EQ(device.userInterfaceIdiom(), UserInterfaceIdiom::Television);
-  EXPECT_EQ(device.integerProperty("ChipID"), 0);
-  EXPECT_FALSE(device.hasAudioCaptureDevice());
-  EXPECT_FALSE(device.allowsInternalSecurityPolicies(""));
-  EXPECT_TRUE(device.booleanProperty("RegionalBehaviorShutterClick"));
-  EXPECT_EQ(log_.countContaining("is ignored"), 5u);
 }
 
 class EntitlementsTest : public DeviceFilesTest {

@@ -9,7 +9,7 @@
 
 #include "tests/fakes/LogRecorder.h"
 #include "tests/fakes/ManualExecutor.h"
-#include "tests/linux/TemporaryRoot.h"
+#include "tests/kit/ScratchFolder.h"
 
 namespace qv::platform {
 namespace {
@@ -33,7 +33,7 @@ class FolderPhotoLibraryTest : public testing::Test {
   }
 
   static inline const std::string kFolder = "/private/var/mobile/Media/Movies";
-  TemporaryRoot root_;
+  kit::ScratchFolder root_;
   fakes::LogRecorder log_;
   fakes::ManualExecutor executor_;
   FolderPhotoLibrary library_{root_.path(kFolder), executor_};

@@ -6,7 +6,7 @@
 
 #include "platform/linux/Json.h"
 #include "tests/fakes/FakeClock.h"
-#include "tests/linux/TemporaryRoot.h"
+#include "tests/kit/ScratchFolder.h"
 
 namespace qv::platform {
 namespace {
@@ -19,7 +19,7 @@ class JSONLineMetricsReporterTest : public testing::Test {
   std::optional<Error> send(const std::string& text) {
     return reporter_.sendMessage({1, 1, 0, true, true, "Quorvel", "service", 3, 0, {{"text", Value(text)}}});
   }
-  TemporaryRoot root_;
+  kit::ScratchFolder root_;
   fakes::FakeClock clock_;
   JSONLineMetricsReporter reporter_{root_.path(kDirectory), clock_};
 };

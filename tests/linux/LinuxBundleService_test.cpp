@@ -1,18 +1,14 @@
 #include "platform/linux/LinuxBundleService.h"
 
 #include <gtest/gtest.h>
-#include <signal.h>
-#include <spawn.h>
-#include <sys/wait.h>
 #include <unistd.h>
 
 #include <filesystem>
 
 #include "tests/fakes/LogRecorder.h"
 #include "tests/fakes/ScratchPreferences.h"
-#include "tests/linux/TemporaryRoot.h"
-
-extern char** environ;
+#include "tests/kit/Process.h"
+#include "tests/kit/ScratchFolder.h"
 
 namespace qv::platform {
 namespace {
@@ -29,7 +25,7 @@ class LinuxBundleServiceTest : public testing::Test {
     return bundle ? bundle->bundleIdentifier() : "none";
   }
 
-  TemporaryRoot root_;
+  kit::ScratchFolder root_;
   fakes::LogRecorder log_;
   fakes::ScratchPreferences preferences_{root_.path("/preferences")};
   Localization& localization_ = preferences_.localization;
@@ -143,17 +139,14 @@ TEST_F(LinuxBundleServiceTest, AnExecutableIsBelievedOnlyWhileItStandsAtItsPath)
 
   const std::string program = root_.path("/program");
   std::filesystem::copy_file("/bin/sleep", program);
-  pid_t child = 0;
-  std::string argument = "60";
-  char* arguments[] = {const_cast<char*>(program.c_str()), argument.data(), nullptr};
-  ASSERT_EQ(::posix_spawn(&child, program.c_str(), nullptr, nullptr, arguments, environ), 0);
+  kit::Process process(program, {"60"});
+  const pid_t child = process.pid();
   EXPECT_EQ(bundles_.executablePathOfProcess(child), std::filesystem::canonical(program));
   std::filesystem::remove(program);
   EXPECT_EQ(bundles_.executablePathOfProcess(child), std::nullopt);
   root_.write("/program (deleted)", "what the kernel calls it now");
   EXPECT_EQ(bundles_.executablePathOfProcess(child), std::nullopt);
-  ::kill(child, SIGKILL);
-  ::waitpid(child, nullptr, 0);
+  process.kill();
   EXPECT_EQ(bundles_.executablePathOfProcess(child), std::nullopt);
 }
 

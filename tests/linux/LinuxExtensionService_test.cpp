@@ -6,15 +6,17 @@
 #include <unistd.h>
 
 #include <cerrno>
+#include <filesystem>
 
 #include "platform/linux/ICULocalization.h"
 #include "platform/linux/JSONPreferenceStore.h"
+#include "platform/sdbus/SdBusIPC.h"
 #include "platform/threads/Executor.h"
 #include "protocol/ExtensionRequests.h"
 #include "tests/fakes/LogRecorder.h"
 #include "tests/fakes/ManualTimers.h"
-#include "tests/linux/TemporaryRoot.h"
-#include "tests/sdbus/SdBusTest.h"
+#include "tests/kit/Events.h"
+#include "tests/kit/ScratchFolder.h"
 
 namespace qv::platform {
 namespace {
@@ -41,8 +43,8 @@ class TestContext final : public ExtensionHostContext {
 
 /// One request as its owner sees it.
 struct Flow {
-  test::Events<std::pair<ExtensionRequestID, int64_t>> began;  ///< and its error's code
-  test::Events<std::string> completed;                         ///< the first item's title, or the error
+  kit::Events<std::pair<ExtensionRequestID, int64_t>> began;  ///< and its error's code
+  kit::Events<std::string> completed;                         ///< the first item's title, or the error
 };
 
 class LinuxExtensionServiceTest : public ::testing::Test {
@@ -61,7 +63,7 @@ class LinuxExtensionServiceTest : public ::testing::Test {
     std::filesystem::copy_file(TEST_EXTENSION, root_.path(bundle + "/bin/up"));
   }
   std::vector<ExtensionRecordRef> find(const Dictionary& attributes = {{extensioninfo::kPointIdentifier, kPoint}}) {
-    test::Events<std::vector<ExtensionRecordRef>> found;
+    kit::Events<std::vector<ExtensionRecordRef>> found;
     service_.extensionsMatchingAttributes(
         attributes, [&](const std::vector<ExtensionRecordRef>& records, const auto&) { found.add(records); });
     return found.next();
@@ -97,7 +99,7 @@ class LinuxExtensionServiceTest : public ::testing::Test {
   }
   static std::string failure(int code) { return "error " + std::to_string(code); }
 
-  TemporaryRoot root_;
+  kit::ScratchFolder root_;
   JSONPreferenceStore preferences_{root_.path()};
   ICULocalization localization_{preferences_, "com.example.test"};
   LinuxBundleService bundles_{root_.path(), "", localization_};

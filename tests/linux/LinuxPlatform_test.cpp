@@ -8,12 +8,12 @@
 
 #include "support/QuorvelErrors.h"
 #include "tests/fakes/LogRecorder.h"
-#include "tests/linux/TemporaryRoot.h"
+#include "tests/kit/ScratchFolder.h"
 
 namespace qv::platform {
 namespace {
 
-LinuxDevice device(const TemporaryRoot& root, const std::string& bundlePath = {}) {
+LinuxDevice device(const kit::ScratchFolder& root, const std::string& bundlePath = {}) {
   return {.root = root.path(),
           .bundlePath = bundlePath,
           .preferences = "/Preferences",
@@ -31,7 +31,7 @@ IPCPeer thisProcess() {
 }
 
 TEST(LinuxPlatformTest, ErrorsSpeakTheUsersLanguageOnARealDisk) {
-  TemporaryRoot root;
+  kit::ScratchFolder root;
   const std::filesystem::path framework = root.path("/System/Library/Frameworks/Quorvel.framework");
   std::filesystem::create_directories(framework.parent_path());
   std::filesystem::copy(QV_FRAMEWORK_DIR, framework, std::filesystem::copy_options::recursive);
@@ -46,7 +46,7 @@ TEST(LinuxPlatformTest, ErrorsSpeakTheUsersLanguageOnARealDisk) {
 
 TEST(LinuxPlatformTest, PeersAreKnownByTheBundleAroundTheirExecutable) {
   fakes::LogRecorder log;
-  TemporaryRoot root;
+  kit::ScratchFolder root;
   const std::string entitlements = "/etc/quorvel/entitlements/com.example.test.json";
   root.write(entitlements, R"({"com.tarnwick.private.quorvel": true})");
   std::filesystem::permissions(root.path(entitlements), std::filesystem::perms(0644));
@@ -54,7 +54,7 @@ TEST(LinuxPlatformTest, PeersAreKnownByTheBundleAroundTheirExecutable) {
   // This test's own program becomes an application.
   const std::filesystem::path directory = std::filesystem::read_symlink("/proc/self/exe").parent_path();
   const std::filesystem::path info = directory / "Info.json";
-  TemporaryRoot other;
+  kit::ScratchFolder other;
   std::filesystem::copy_file(other.write("/Info.json", R"({"CFBundleIdentifier": "com.example.test"})"), info);
 
   LinuxPlatform linux_(device(root, directory.parent_path()));

@@ -8,7 +8,7 @@
 #include <set>
 
 #include "platform/linux/SmallFile.h"
-#include "tests/linux/TemporaryRoot.h"
+#include "tests/kit/ScratchFolder.h"
 
 namespace qv::platform {
 namespace {
@@ -16,7 +16,7 @@ namespace {
 class PosixFileSystemTest : public testing::Test {
  protected:
   static int64_t code(const std::optional<Error>& error) { return error ? error->code : 0; }
-  TemporaryRoot root_;
+  kit::ScratchFolder root_;
   PosixFileSystem disk_;
 };
 

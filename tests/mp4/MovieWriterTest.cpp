@@ -9,19 +9,13 @@
 #include "platform/mp4/BoxReader.h"
 #include "platform/mp4/MP4MovieSalvage.h"
 #include "platform/mp4/MovieWriter.h"
+#include "tests/kit/ScratchFolder.h"
 
 namespace qv::platform::mp4 {
 namespace {
 
 class MovieWriterTest : public ::testing::Test {
  protected:
-  MovieWriterTest() {
-    char name[] = "/tmp/quorveld-mp4-XXXXXX";
-    directory_ = ::mkdtemp(name);
-    path_ = directory_ + "/movie.mp4";
-  }
-  ~MovieWriterTest() override { std::filesystem::remove_all(directory_); }
-
   static MovieTrack pictureTrack() {
     MovieTrack track;
     track.width = 64;
@@ -49,8 +43,8 @@ class MovieWriterTest : public ::testing::Test {
   }
 
   MP4MovieSalvage salvage_;
-  std::string directory_;
-  std::string path_;
+  kit::ScratchFolder scratch_;
+  const std::string path_ = scratch_ / "movie.mp4";
 };
 
 TEST_F(MovieWriterTest, IndexesMediaBeyondFourGigabytes) {
@@ -109,9 +103,9 @@ TEST_F(MovieWriterTest, SalvagesOrRefusesDamagedFiles) {
 TEST_F(MovieWriterTest, LeavesAloneWhatIsNoPlainFileOrIsBeingWritten) {
   writeCrashed(2);
   const auto before = contents();
-  const std::string link = directory_ + "/link.mp4";
+  const std::string link = scratch_ / "link.mp4";
   std::filesystem::create_symlink(path_, link);
-  for (const std::string& path : {link, directory_, directory_ + "/none"}) {
+  for (const std::string& path : {link, scratch_.path(), scratch_ / "none"}) {
     EXPECT_FALSE(salvage_.stateOfMovie(path)) << path;
     EXPECT_FALSE(salvage_.salvageMovie(path)) << path;
   }

@@ -8,7 +8,6 @@
 #include <future>
 #include <memory>
 
-#include "platform/base/BufferQueue.h"
 #include "platform/threads/SharedFrameLease.h"
 
 namespace qv::platform {
@@ -90,18 +89,6 @@ TEST(SharedFrameLeaseTest, HoldsTheFrameUntilTheLastCopyIsClosed) {
   EXPECT_EQ(outstandingSharedFrameLeases(), before + 1);
   copy.reset();
   released.get_future().get();
-}
-
-TEST(BufferQueueTest, KeepsTheOrderAndRefusesNothing) {
-  BufferQueue queue;
-  EXPECT_FALSE(queue.enqueue(nullptr));
-  EXPECT_EQ(queue.dequeue(), nullptr);
-  const PixelBufferRef image;
-  for (const int64_t value : {3, 1, 2}) {
-    EXPECT_TRUE(queue.enqueue(SampleBuffer::makeVideo(image, MediaTime::make(value, 1), MediaTime::invalid())));
-  }
-  for (const int64_t value : {3, 1, 2}) EXPECT_EQ(queue.dequeue()->captureTime(), MediaTime::make(value, 1));
-  EXPECT_TRUE(queue.isEmpty());
 }
 
 }  // namespace

@@ -9,10 +9,17 @@
 
 #include "platform/pulse/PulsePlatform.h"
 #include "platform/threads/Clock.h"
-#include "tests/pulse/PulseFixture.h"
+#include "tests/kit/SoundRecorder.h"
+#include "tests/kit/SoundServer.h"
 
 namespace qv::platform {
 namespace {
+
+using kit::amplitudeOf;
+using kit::SoundRecorder;
+using kit::TestMicrophone;
+using kit::TestTap;
+using kit::TonePlayer;
 
 constexpr double kAmplitude = 8000;  // of a player's tone
 constexpr double kTolerance = 200;   // of an amplitude
@@ -20,189 +27,152 @@ constexpr size_t kTenth = 4410;
 
 /// 0.3 s in which each of the tones has its amplitude. A machine that is held up makes gaps, so ten are tried; where
 /// all fail, the last.
-std::vector<int16_t> nextSteady(Capture& capture, std::initializer_list<double> tones) {
+std::vector<int16_t> nextSteady(SoundRecorder& sound, std::initializer_list<double> tones) {
   std::vector<int16_t> samples;
   const auto isWhole = [&](double tone) { return std::abs(amplitudeOf(tone, samples) - kAmplitude) < kTolerance; };
   for (int attempt = 0; attempt < 10; ++attempt) {
-    samples = capture.next(3 * kTenth);
+    samples = sound.next(3 * kTenth);
     if (std::all_of(tones.begin(), tones.end(), isWhole)) break;
   }
   return samples;
 }
 
-class Microphone final : public CaptureOutputDelegate {
- public:
-  explicit Microphone(DeviceCaptureService& service)
-      : session_(service.createSession()),
-        input_(service.createDefaultAudioInput()),
-        output_(service.createAudioDataOutput()) {
-    output_->setSampleDelegate(this, &queue_);
-    if (session_->canAddInput(input_)) session_->addInput(input_);
-    session_->addOutput(output_);
-    session_->startRunning();
-  }
-  ~Microphone() override { session_->removeOutput(output_); }
-  void start() { session_->startRunning(); }
-  void stop() {
-    session_->stopRunning();
-    queue_.sync([] {});
-  }
-  void captureOutputDidOutputSampleBuffer(const CaptureOutput&, const SampleBufferRef& sample) override {
-    capture.add(static_cast<uint64_t>(sample->presentationTime().value), sample->data()->bytes().data(),
-                static_cast<size_t>(sample->numSamples()));
-  }
-  [[nodiscard]] bool hasInput() const { return input_ != nullptr; }
-  Capture capture;
-
- private:
-  SerialQueue queue_{"microphone"};
-  const std::shared_ptr<DeviceCaptureSession> session_;
-  const std::shared_ptr<CaptureDeviceInput> input_;
-  const std::shared_ptr<AudioDataOutput> output_;
-};
-
-class PulseTapTest : public PulseTest {
+class PulseTest : public kit::SoundServerTest {
  protected:
   void SetUp() override {
-    PulseTest::SetUp();
-    if (IsSkipped() || HasFatalFailure()) return;
-    auto platform = PulsePlatform::connect(server());
+    SoundServerTest::SetUp();
+    if (IsSkipped()) return;
+    auto platform = PulsePlatform::connect(server_->address());
     ASSERT_TRUE(platform);
     platform_ = std::move(platform.value());
   }
-  Capture capture_;
+  /// A player whose streams sound already.
+  std::unique_ptr<TonePlayer> play(const char* output, const char* frequencies, bool inChild = false) {
+    auto player = std::make_unique<TonePlayer>(*server_, inChild);
+    EXPECT_TRUE(player->open(output, frequencies));
+    EXPECT_GT(player->sound(), 0u);
+    return player;
+  }
+  std::unique_ptr<TestTap> tap(pid_t process) {
+    auto tap = std::make_unique<TestTap>(platform_->appAudioTap(), process);
+    EXPECT_EQ(tap->queue().start(), 0);
+    return tap;
+  }
+  static double milliseconds(uint64_t hostTime) { return static_cast<double>(hostTime) * 1e-6; }
   std::unique_ptr<PulsePlatform> platform_;
 };
 
-TEST_F(PulseTapTest, HearsOneProcessAloneAndSilenceWhileItPlaysNothing) {
-  TonePlayer first(server()), second(server());
-  ASSERT_EQ(first.tell("open appout 440"), "opened");
-  ASSERT_EQ(second.tell("open appout 1000"), "opened");
-  ASSERT_GT(second.sound(), 0u);
-  const auto queue = tap(platform_->appAudioTap(), first.pid(), capture_);
-  for (const int16_t sample : capture_.next(3 * kTenth)) ASSERT_EQ(sample, 0);
+TEST_F(PulseTest, HearsOneProcessAloneAndSilenceWhileItPlaysNothing) {
+  TonePlayer first(*server_);
+  ASSERT_TRUE(first.open("appout", "440"));
+  const auto second = play("appout", "1000");
+  const auto tapped = tap(first.pid());
+  for (const int16_t sample : tapped->sound.next(3 * kTenth)) ASSERT_EQ(sample, 0);
   ASSERT_GT(first.sound(), 0u);
-  ASSERT_TRUE(capture_.waitForTone(440));
-  const auto samples = nextSteady(capture_, {440});
+  ASSERT_TRUE(tapped->sound.waitForTone(440));
+  const auto samples = nextSteady(tapped->sound, {440});
   EXPECT_NEAR(amplitudeOf(440, samples), kAmplitude, kTolerance);
   EXPECT_LT(amplitudeOf(1000, samples), 10);
-  EXPECT_TRUE(capture_.isContinuous());
+  EXPECT_TRUE(tapped->sound.isContinuous());
 }
 
-TEST_F(PulseTapTest, PlacesALateStreamOnTheHostClock) {
-  TonePlayer player(server());
-  const auto queue = tap(platform_->appAudioTap(), player.pid(), capture_);
-  capture_.next(kTenth);
-  ASSERT_EQ(player.tell("open appout 440"), "opened");
+TEST_F(PulseTest, PlacesALateStreamOnTheHostClock) {
+  TonePlayer player(*server_);
+  const auto tapped = tap(player.pid());
+  tapped->sound.next(kTenth);
+  ASSERT_TRUE(player.open("appout", "440"));
   const uint64_t onset = player.sound();
-  ASSERT_TRUE(capture_.waitForTone(440));
-  EXPECT_NEAR(static_cast<double>(capture_.firstSound()) * 1e-6, static_cast<double>(onset) * 1e-6, 25)
-      << "milliseconds";
-  EXPECT_TRUE(capture_.isContinuous());
+  ASSERT_TRUE(tapped->sound.waitForTone(440));
+  EXPECT_NEAR(milliseconds(tapped->sound.firstSound()), milliseconds(onset), 25);
+  EXPECT_TRUE(tapped->sound.isContinuous());
 }
 
-TEST_F(PulseTapTest, SumsTheStreamsOfAProcessAndItsChildren) {
-  TonePlayer parent(server(), true);
-  ASSERT_EQ(parent.tell("open appout 440 1500"), "opened");
-  ASSERT_GT(parent.sound(), 0u);
-  const auto queue = tap(platform_->appAudioTap(), parent.pid(), capture_);
-  ASSERT_TRUE(capture_.waitForTone(440));
-  ASSERT_TRUE(capture_.waitForTone(1500));
-  const auto samples = nextSteady(capture_, {440, 1500});
+TEST_F(PulseTest, SumsTheStreamsOfAProcessAndItsChildren) {
+  const auto parent = play("appout", "440 1500", true);
+  const auto tapped = tap(parent->pid());
+  ASSERT_TRUE(tapped->sound.waitForTone(440));
+  ASSERT_TRUE(tapped->sound.waitForTone(1500));
+  const auto samples = nextSteady(tapped->sound, {440, 1500});
   EXPECT_NEAR(amplitudeOf(440, samples), kAmplitude, kTolerance);
   EXPECT_NEAR(amplitudeOf(1500, samples), kAmplitude, kTolerance);
 }
 
-TEST_F(PulseTapTest, FollowsAStreamToAnotherOutput) {
-  TonePlayer player(server());
-  ASSERT_EQ(player.tell("open appout 440"), "opened");
-  ASSERT_GT(player.sound(), 0u);
-  const auto queue = tap(platform_->appAudioTap(), player.pid(), capture_);
-  ASSERT_TRUE(capture_.waitForTone(440));
-  ASSERT_EQ(player.tell("move other"), "moved");
-  capture_.next(3 * kTenth);  // sound of before the move is still on its way
-  EXPECT_TRUE(capture_.waitForTone(440));
-  EXPECT_TRUE(capture_.isContinuous());
+TEST_F(PulseTest, FollowsAStreamToAnotherOutput) {
+  const auto player = play("appout", "440");
+  const auto tapped = tap(player->pid());
+  ASSERT_TRUE(tapped->sound.waitForTone(440));
+  ASSERT_TRUE(server_->moveStreams("other"));
+  tapped->sound.next(3 * kTenth);  // sound of before the move is still on its way
+  EXPECT_TRUE(tapped->sound.waitForTone(440));
+  EXPECT_TRUE(tapped->sound.isContinuous());
 }
 
-TEST_F(PulseTapTest, GoesOnWithoutTheServerAndFindsItAgain) {
-  Microphone microphone(platform_->deviceCapture());
-  ASSERT_TRUE(microphone.hasInput());
-  const auto queue = tap(platform_->appAudioTap(), ::getpid(), capture_);
+TEST_F(PulseTest, GoesOnWithoutTheServerAndFindsItAgain) {
+  TestMicrophone microphone(platform_->deviceCapture());
+  microphone.session->startRunning();
+  const auto tapped = tap(::getpid());  // the players are its children
   {
-    TonePlayer player(server());  // a child of this process
-    ASSERT_EQ(player.tell("open appout 440"), "opened");
-    ASSERT_GT(player.sound(), 0u);
-    ASSERT_TRUE(capture_.waitForTone(440));
-    killServer();
-    capture_.next(3 * kTenth);
-    for (const int16_t sample : capture_.next(3 * kTenth)) ASSERT_EQ(sample, 0);
+    const auto player = play("appout", "440");
+    ASSERT_TRUE(tapped->sound.waitForTone(440));
+    server_->kill();
+    tapped->sound.next(3 * kTenth);
+    for (const int16_t sample : tapped->sound.next(3 * kTenth)) ASSERT_EQ(sample, 0);
   }
-  startServer();
-  TonePlayer player(server());
-  ASSERT_EQ(player.tell("open micsrc 440"), "opened");
-  ASSERT_GT(player.sound(), 0u);
-  EXPECT_TRUE(capture_.waitForTone(440));
-  EXPECT_TRUE(microphone.capture.waitForTone(440));
-  EXPECT_TRUE(capture_.isContinuous());
-  EXPECT_TRUE(microphone.capture.isContinuous());
+  server_->start();
+  const auto player = play("micsrc", "440");
+  for (SoundRecorder* sound : {&tapped->sound, &microphone.sound}) {
+    EXPECT_TRUE(sound->waitForTone(440));
+    EXPECT_TRUE(sound->isContinuous());
+  }
 }
 
-TEST_F(PulseTapTest, MicrophoneHearsTheDefaultSourceOnTheHostClock) {
-  TonePlayer player(server());
-  ASSERT_EQ(player.tell("open micsrc 440"), "opened");
-  Microphone microphone(platform_->deviceCapture());
-  ASSERT_TRUE(microphone.hasInput());
-  for (const int16_t sample : microphone.capture.next(3 * kTenth)) ASSERT_EQ(sample, 0);
+TEST_F(PulseTest, MicrophoneHearsTheDefaultSourceOnTheHostClock) {
+  TonePlayer player(*server_);
+  ASSERT_TRUE(player.open("micsrc", "440"));
+  TestMicrophone microphone(platform_->deviceCapture());
+  microphone.session->startRunning();
+  for (const int16_t sample : microphone.sound.next(3 * kTenth)) ASSERT_EQ(sample, 0);
   const uint64_t onset = player.sound();
-  ASSERT_TRUE(microphone.capture.waitForTone(440));
-  const auto samples = nextSteady(microphone.capture, {440});
+  ASSERT_TRUE(microphone.sound.waitForTone(440));
+  const auto samples = nextSteady(microphone.sound, {440});
   EXPECT_NEAR(amplitudeOf(440, samples), kAmplitude, kTolerance);
   // A remapped source reports its own latency, not that of the output behind it.
-  EXPECT_NEAR(static_cast<double>(microphone.capture.firstSound()) * 1e-6, static_cast<double>(onset) * 1e-6, 80)
-      << "milliseconds";
+  EXPECT_NEAR(milliseconds(microphone.sound.firstSound()), milliseconds(onset), 80);
 }
 
 /// Sound is handed on 120 ms late only while it goes on.
-TEST_F(PulseTapTest, AStopHandsOverWhatWasPlayedAndHeardUpToIt) {
-  TonePlayer player(server()), speaker(server());
-  ASSERT_EQ(player.tell("open appout 440"), "opened");
-  ASSERT_EQ(speaker.tell("open micsrc 440"), "opened");
-  ASSERT_GT(player.sound(), 0u);
-  ASSERT_GT(speaker.sound(), 0u);
-  const auto queue = tap(platform_->appAudioTap(), player.pid(), capture_);
-  Microphone microphone(platform_->deviceCapture());
-  // All up to the stop is there, but for a frame; and whether the time that is handed on only at a stop has its tone.
-  const auto isWhole = [](Capture& capture, uint64_t stop) {
-    EXPECT_GE(capture.end() + 50'000, stop);
-    auto samples = capture.from(stop - 110'000'000);
+TEST_F(PulseTest, AStopHandsOverWhatWasPlayedAndHeardUpToIt) {
+  const auto player = play("appout", "440"), speaker = play("micsrc", "440");
+  const auto tapped = tap(player->pid());
+  TestMicrophone microphone(platform_->deviceCapture());
+  microphone.session->startRunning();
+  // Whether the time that is handed on only at a stop has its tone.
+  const auto isWhole = [](SoundRecorder& sound, const std::function<void()>& stop) {
+    EXPECT_TRUE(sound.waitForTone(440));
+    const auto stopped = static_cast<uint64_t>(systemClock().hostTime().value);
+    stop();
+    auto samples = sound.from(stopped - 110'000'000);
     samples.resize(kTenth / 2);
     return std::count_if(samples.begin(), samples.end(), [](int16_t s) { return std::abs(s) > 800; }) >
            static_cast<ptrdiff_t>(kTenth / 4);
   };
   // A server that the machine holds up just then delivers late.
   bool isTapWhole = false, isMicrophoneWhole = false;
-  for (int round = 0; round < 10 && !(isTapWhole && isMicrophoneWhole); ++round) {
-    ASSERT_TRUE(capture_.waitForTone(440));
-    ASSERT_TRUE(microphone.capture.waitForTone(440));
-    uint64_t stop = static_cast<uint64_t>(systemClock().hostTime().value);
-    ASSERT_EQ(queue->stop(), 0);
-    isTapWhole |= isWhole(capture_, stop);
-    stop = static_cast<uint64_t>(systemClock().hostTime().value);
-    microphone.stop();
-    isMicrophoneWhole |= isWhole(microphone.capture, stop);
-    ASSERT_EQ(queue->start(), 0);
-    microphone.start();
+  for (int round = 0; round < 10 && !(isTapWhole && isMicrophoneWhole) && !HasFailure(); ++round) {
+    isTapWhole |= isWhole(tapped->sound, [&] { tapped->queue().stop(); });
+    isMicrophoneWhole |= isWhole(microphone.sound, [&] { microphone.stop(); });
+    ASSERT_EQ(tapped->queue().start(), 0);
+    microphone.session->startRunning();
   }
   EXPECT_TRUE(isTapWhole);
   EXPECT_TRUE(isMicrophoneWhole);
 }
 
-TEST_F(PulseTapTest, PlaysTheSystemSounds) {
-  const auto queue = tap(platform_->appAudioTap(), ::getpid(), capture_);
+TEST_F(PulseTest, PlaysTheSystemSounds) {
+  const auto tapped = tap(::getpid());
   platform_->sounds().play(1117);
   double low = 0;
-  for (int tenth = 0; tenth < 100 && low < 500; ++tenth) low = amplitudeOf(880, capture_.next(kTenth));
+  for (int tenth = 0; tenth < 100 && low < 500; ++tenth) low = amplitudeOf(880, tapped->sound.next(kTenth));
   EXPECT_GE(low, 500);
 }
 

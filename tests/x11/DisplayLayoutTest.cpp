@@ -4,12 +4,14 @@
 #include "platform/x11/WindowLayout.h"
 #include "platform/x11/X11Platform.h"
 #include "tests/fakes/LogRecorder.h"
-#include "tests/x11/XServer.h"
+#include "tests/kit/Events.h"
+#include "tests/kit/XServer.h"
 
-namespace qv::platform::testing {
+namespace qv::platform {
 namespace {
 
-using namespace std::chrono_literals;
+using kit::WindowProcess;
+using kit::XServer;
 
 std::vector<int64_t> levelsOf(const DisplayLayout& layout) {
   std::vector<int64_t> levels;
@@ -37,37 +39,27 @@ TEST(WindowLayoutTest, ElementsAreTheApplicationsOfWhichTheUserSeesAnything) {
     EXPECT_FALSE(isTile(other, whole)) << other.right << " " << other.bottom;
 }
 
-/// What an observer is told, one after the other.
+/// What an observer is told: the levels, one layout after the other.
 class Observer final : public DisplayLayoutObserver {
  public:
   void layoutMonitorDidUpdateDisplayLayout(DisplayLayoutMonitor&, const DisplayLayout& layout) override {
-    std::lock_guard lock(mutex_);
-    layouts_.push_back(layout);
-    changed_.notify_all();
+    layouts_.add(levelsOf(layout));
   }
-  std::vector<int64_t> next() {
-    std::unique_lock lock(mutex_);
-    if (!changed_.wait_for(lock, 60s, [this] { return !layouts_.empty(); })) return {};
-    const auto levels = levelsOf(layouts_.front());
-    layouts_.erase(layouts_.begin());
-    return levels;
-  }
+  std::vector<int64_t> next() { return layouts_.next(); }
 
  private:
-  std::mutex mutex_;
-  std::condition_variable changed_;
-  std::vector<DisplayLayout> layouts_;
+  kit::Events<std::vector<int64_t>> layouts_;
 };
 
 /// With and without a window manager.
-class DisplayLayoutTest : public XServerTest, public ::testing::WithParamInterface<bool> {
+class DisplayLayoutTest : public kit::XServerTest, public ::testing::WithParamInterface<bool> {
  protected:
   void SetUp() override {
     XServerTest::SetUp();
     if (IsSkipped()) return;
-    if (GetParam() && !WindowManager::isInstalled()) GTEST_SKIP() << "openbox is not installed";
-    client_ = std::make_unique<XClient>(server_.display());
-    if (GetParam()) manager_ = std::make_unique<WindowManager>(server_.display());
+    if (GetParam() && !kit::isInstalled("openbox")) GTEST_SKIP() << "openbox is not installed";
+    client_ = std::make_unique<kit::XClient>(server_.display());
+    if (GetParam()) manager_ = std::make_unique<kit::WindowManager>(server_.display());
     X11Dependencies dependencies;
     dependencies.bundleIdentifierOfProcess = [this](pid_t) -> std::optional<std::string> {
       std::lock_guard lock(lookMutex_);
@@ -97,8 +89,8 @@ class DisplayLayoutTest : public XServerTest, public ::testing::WithParamInterfa
   static constexpr uint16_t kHalf = XServer::kWidth / 2;
   fakes::LogRecorder log_;
   XServer server_;
-  std::unique_ptr<XClient> client_;
-  std::unique_ptr<WindowManager> manager_;
+  std::unique_ptr<kit::XClient> client_;
+  std::unique_ptr<kit::WindowManager> manager_;
   std::unique_ptr<X11Platform> platform_;
   std::mutex lookMutex_;
   std::function<void()> duringNextLook_;  // guarded by lookMutex_
@@ -151,4 +143,4 @@ TEST_P(DisplayLayoutTest, AChangeDuringALookIsSeen) {
 }
 
 }  // namespace
-}  // namespace qv::platform::testing
+}  // namespace qv::platform

@@ -1,12 +1,16 @@
 #include <unistd.h>
 
 #include "platform/x11/X11Platform.h"
-#include "tests/x11/XServer.h"
+#include "tests/kit/XServer.h"
 
-namespace qv::platform::testing {
+namespace qv::platform {
 namespace {
 
-class RenderServerTest : public XServerTest {
+using kit::WindowProcess;
+using kit::XClient;
+using kit::XServer;
+
+class RenderServerTest : public kit::XServerTest {
  protected:
   std::unique_ptr<X11Platform> connect() {
     auto platform = X11Platform::connect(display(), {});
@@ -55,18 +59,13 @@ TEST_F(RenderServerTest, ConnectsAnewAfterTheServerCameBack) {
   auto& renderServer = platform.value()->renderServer();
   mortal.kill();
   EXPECT_EQ(renderServer.ownerOfContext(0x200001), std::nullopt);
-  ChildProcess again({"Xvfb", mortal.display(), "-screen", "0", "640x480x24", "-nolisten", "tcp", "-noreset"});
-  std::unique_ptr<XClient> client;
-  while (!client) {
-    try {
-      client = std::make_unique<XClient>(mortal.display());
-    } catch (const std::runtime_error&) {
-      ::usleep(20'000);  // there is nothing to wait on before the server listens
-    }
-  }
-  const auto window = client->show({});
+  kit::Process again(
+      "Xvfb", {mortal.display(), "-displayfd", "1", "-screen", "0", "640x480x24", "-nolisten", "tcp", "-noreset"});
+  EXPECT_EQ(":" + again.readLine(), mortal.display());
+  XClient client(mortal.display());
+  const auto window = client.show({});
   EXPECT_EQ(renderServer.ownerOfContext(window), ::getpid());
 }
 
 }  // namespace
-}  // namespace qv::platform::testing
+}  // namespace qv::platform

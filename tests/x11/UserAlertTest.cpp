@@ -3,42 +3,39 @@
 #include <future>
 
 #include "platform/x11/X11Platform.h"
-#include "tests/x11/XServer.h"
+#include "tests/kit/XServer.h"
 
-namespace qv::platform::testing {
+namespace qv::platform {
 namespace {
 
 using namespace std::chrono_literals;
+using kit::XServer;
 
-class UserAlertTest : public XServerTest {
+class UserAlertTest : public kit::XServerTest {
  protected:
   void SetUp() override {
     XServerTest::SetUp();
     if (IsSkipped()) return;
-    if (!hasProgram("zenity") || !hasProgram("xdotool")) GTEST_SKIP() << "zenity or xdotool is not installed";
+    if (!kit::isInstalled("zenity") || !kit::isInstalled("xdotool"))
+      GTEST_SKIP() << "zenity or xdotool is not installed";
     open(display());
   }
   void open(const std::string& name) {
     display_ = name;
     platform_ = std::move(X11Platform::connect(name, {}).value());
-    user_ = std::make_unique<XClient>(name);
+    user_ = std::make_unique<kit::XClient>(name);
   }
   std::unique_ptr<UserAlert> present(const UserAlertRequest& request) {
     answer_ = {};
     return platform_->alerts().present(request, [this](UserAlertAnswer answer) { answer_.set_value(answer); });
   }
-  void press(const std::vector<std::string>& keys) {
-    std::vector<std::string> arguments{"xdotool", "key", "--delay", "100"};
-    arguments.insert(arguments.end(), keys.begin(), keys.end());
-    ASSERT_EQ(ChildProcess(arguments, {"DISPLAY=" + display_}).wait(), 0);
-  }
   /// Presents the alert, presses keys once it has the keyboard, and tells the answer.
-  UserAlertAnswer answerByKeys(const UserAlertRequest& request, const std::vector<std::string>& keys) {
+  UserAlertAnswer answerByKeys(const UserAlertRequest& request, std::initializer_list<const char*> keys) {
     auto alert = present(request);
     EXPECT_TRUE(alert);
     auto answer = answer_.get_future();
     user_->waitForFocusedWindow(request.header);
-    press(keys);
+    EXPECT_TRUE(kit::pressKeys(display_, keys));
     if (answer.wait_for(30s) != std::future_status::ready) {
       ADD_FAILURE() << "no answer";
       return UserAlertAnswer::Cancelled;
@@ -48,26 +45,18 @@ class UserAlertTest : public XServerTest {
 
   const UserAlertRequest twoButtons_{
       "Record <b>Tom & Jerry</b>?", "A \\n text_with --everything", "_Allow & go", "", "Don't allow", ""};
-  const UserAlertRequest threeButtons_{"-Record?", "text", "Refuse", "With camera", "Without", ""};
   std::string display_;
   std::promise<UserAlertAnswer> answer_;
   std::unique_ptr<X11Platform> platform_;
-  std::unique_ptr<XClient> user_;
+  std::unique_ptr<kit::XClient> user_;
 };
 
-TEST_F(UserAlertTest, ReturnRefuses) {
+TEST_F(UserAlertTest, TextsArePlainAndTheSafeButtonHasTheKeyboard) {
   EXPECT_EQ(answerByKeys(twoButtons_, {"Return"}), UserAlertAnswer::Other);
-  EXPECT_EQ(answerByKeys(threeButtons_, {"Return"}), UserAlertAnswer::Default);
-}
-
-TEST_F(UserAlertTest, EveryButtonCanBeReached) {
   EXPECT_EQ(answerByKeys(twoButtons_, {"Right", "Return"}), UserAlertAnswer::Default);
-  EXPECT_EQ(answerByKeys(threeButtons_, {"Right", "Return"}), UserAlertAnswer::Alternate);
-  EXPECT_EQ(answerByKeys(threeButtons_, {"Right", "Right", "Return"}), UserAlertAnswer::Other);
 }
 
-TEST_F(UserAlertTest, EverythingElseCancels) {
-  EXPECT_EQ(answerByKeys(twoButtons_, {"Escape"}), UserAlertAnswer::Cancelled);
+TEST_F(UserAlertTest, AWindowThatIsDestroyedCancels) {
   auto alert = present(twoButtons_);
   const auto window = user_->waitForFocusedWindow(twoButtons_.header);
   user_->destroy(window);  // by another client; the program takes this for a confirmation
@@ -82,14 +71,14 @@ TEST_F(UserAlertTest, GivesTheKeyboardBack) {
 }
 
 TEST_F(UserAlertTest, TakesAndReturnsTheKeyboardUnderAWindowManager) {
-  if (!WindowManager::isInstalled()) GTEST_SKIP() << "openbox is not installed";
+  if (!kit::isInstalled("openbox")) GTEST_SKIP() << "openbox is not installed";
   XServer own;
   open(own.display());
-  const WindowProcess game(display_);
-  WindowManager manager(display_);
-  ASSERT_TRUE(activateWindow(display_, game.window()));
+  const kit::WindowProcess game(display_);
+  kit::WindowManager manager(display_);
+  ASSERT_TRUE(kit::activateWindow(display_, game.window()));
   user_->waitForFocus(game.window());
-  press({"a"});  // the user is busy with it
+  EXPECT_TRUE(kit::pressKeys(display_, {"a"}));  // the user is busy with it
   EXPECT_EQ(answerByKeys(twoButtons_, {"Right", "Return"}), UserAlertAnswer::Default);
   user_->waitForFocus(game.window());
 }
@@ -105,19 +94,6 @@ TEST_F(UserAlertTest, DestroyingTakesTheAlertAwayWithoutAnAnswer) {
   EXPECT_EQ(answer.wait_for(0s), std::future_status::timeout);
 }
 
-TEST_F(UserAlertTest, MayBeDestroyedByItsHandler) {
-  std::promise<std::unique_ptr<UserAlert>> handle;
-  auto alertInHandler = handle.get_future();
-  std::promise<void> done;
-  handle.set_value(platform_->alerts().present(threeButtons_, [&](UserAlertAnswer) {
-    alertInHandler.get().reset();
-    done.set_value();
-  }));
-  user_->waitForFocusedWindow(threeButtons_.header);
-  press({"Return"});
-  EXPECT_EQ(done.get_future().wait_for(30s), std::future_status::ready);
-}
-
 TEST_F(UserAlertTest, CannotBeShownWithoutDisplayButtonOrProgram) {
   EXPECT_FALSE(present({"title", "text", "", "", "", ""}));
   const std::string path = std::getenv("PATH");
@@ -131,4 +107,4 @@ TEST_F(UserAlertTest, CannotBeShownWithoutDisplayButtonOrProgram) {
 }
 
 }  // namespace
-}  // namespace qv::platform::testing
+}  // namespace qv::platform

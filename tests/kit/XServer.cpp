@@ -1,116 +1,20 @@
-#include "tests/x11/XServer.h"
-
-#include <fcntl.h>
-#include <poll.h>
-#include <signal.h>
-#include <spawn.h>
-#include <sys/wait.h>
-#include <unistd.h>
+#include "tests/kit/XServer.h"
 
 #include <cstdlib>
 #include <cstring>
-#include <sstream>
 #include <stdexcept>
-#include <utility>
 
-extern char** environ;
-
-namespace qv::platform::testing {
+namespace qv::kit {
 namespace {
 
 /// The server loses the damage of rectangles that end beyond 32767.
 constexpr uint16_t kWideEnough = 4096;
 
-std::vector<char*> pointers(const std::vector<std::string>& strings) {
-  std::vector<char*> result;
-  for (const auto& string : strings) result.push_back(const_cast<char*>(string.c_str()));
-  return result;
-}
-
 }  // namespace
 
-ChildProcess::ChildProcess(const std::vector<std::string>& arguments, const std::vector<std::string>& environment,
-                           int inheritedFd, int outputFd) {
-  posix_spawn_file_actions_t actions;
-  posix_spawn_file_actions_init(&actions);
-  posix_spawn_file_actions_addopen(&actions, 0, "/dev/null", O_RDONLY, 0);
-  if (outputFd >= 0)
-    posix_spawn_file_actions_adddup2(&actions, outputFd, 1);
-  else
-    posix_spawn_file_actions_addopen(&actions, 1, "/dev/null", O_WRONLY, 0);
-  posix_spawn_file_actions_addopen(&actions, 2, "/dev/null", O_WRONLY, 0);
-  if (inheritedFd >= 0) posix_spawn_file_actions_adddup2(&actions, inheritedFd, inheritedFd);
-  auto argv = pointers(arguments);
-  argv.push_back(nullptr);
-  auto envp = pointers(environment);
-  for (char** entry = environ; *entry != nullptr; ++entry)
-    if (std::strncmp(*entry, "DISPLAY=", 8) != 0) envp.push_back(*entry);
-  envp.push_back(nullptr);
-  const int failure = posix_spawnp(&pid_, argv[0], &actions, nullptr, argv.data(), envp.data());
-  posix_spawn_file_actions_destroy(&actions);
-  if (failure != 0) throw std::runtime_error("cannot start " + arguments[0]);
-}
-
-void ChildProcess::kill() {
-  if (pid_ <= 0) return;
-  ::kill(pid_, SIGKILL);
-  wait();
-}
-
-int ChildProcess::wait() {
-  int status = 0;
-  if (pid_ <= 0 || ::waitpid(pid_, &status, 0) != pid_) return -1;
-  pid_ = -1;
-  return WIFEXITED(status) ? WEXITSTATUS(status) : -1;
-}
-
-OutputPipe::OutputPipe() {
-  if (::pipe2(ends_, O_CLOEXEC) != 0) throw std::runtime_error("pipe");
-}
-
-OutputPipe::~OutputPipe() {
-  ::close(ends_[0]);
-  closeWriteEnd();
-}
-
-void OutputPipe::closeWriteEnd() {
-  if (ends_[1] >= 0) ::close(std::exchange(ends_[1], -1));
-}
-
-std::string OutputPipe::read(size_t size) {
-  closeWriteEnd();
-  std::string bytes;
-  bytes.resize(size);
-  size_t length = 0;
-  while (length < size) {
-    const ssize_t got = ::read(ends_[0], bytes.data() + length, size - length);
-    if (got <= 0) break;
-    length += static_cast<size_t>(got);
-  }
-  bytes.resize(length);
-  return bytes;
-}
-
-std::string OutputPipe::readLine() {
-  std::string line;
-  for (std::string next = read(1); !next.empty() && next != "\n"; next = read(1)) line += next;
-  return line;
-}
-
-bool hasProgram(const std::string& name) {
-  std::istringstream directories(std::getenv("PATH"));
-  for (std::string directory; std::getline(directories, directory, ':');)
-    if (::access((directory + "/" + name).c_str(), X_OK) == 0) return true;
-  return false;
-}
-
-XServer::XServer() {
-  OutputPipe output;
-  process_ = std::make_unique<ChildProcess>(
-      std::vector<std::string>{"Xvfb", "-displayfd", std::to_string(output.writeEnd()), "-screen", "0", "640x480x24",
-                               "-nolisten", "tcp", "-noreset"},
-      std::vector<std::string>{}, output.writeEnd());
-  const std::string number = output.readLine();
+XServer::XServer()
+    : process_("Xvfb", {"-displayfd", "1", "-screen", "0", "640x480x24", "-nolisten", "tcp", "-noreset"}) {
+  const std::string number = process_.readLine();
   if (number.empty()) throw std::runtime_error("the X server did not start");
   display_ = ":" + number;
 }
@@ -156,23 +60,20 @@ void XClient::fillRect(xcb_window_t window, uint32_t color, int16_t x, int16_t y
   sync();
 }
 
-void XClient::resize(xcb_window_t window, uint16_t width, uint16_t height) {
-  const uint32_t values[] = {width, height};
-  xcb_configure_window(connection_, window, XCB_CONFIG_WINDOW_WIDTH | XCB_CONFIG_WINDOW_HEIGHT, values);
+void XClient::configure(xcb_window_t window, uint16_t mask, std::initializer_list<uint32_t> values) {
+  xcb_configure_window(connection_, window, mask, values.begin());
   sync();
+}
+
+void XClient::resize(xcb_window_t window, uint16_t width, uint16_t height) {
+  configure(window, XCB_CONFIG_WINDOW_WIDTH | XCB_CONFIG_WINDOW_HEIGHT, {width, height});
 }
 
 void XClient::move(xcb_window_t window, int16_t x, int16_t y) {
-  const uint32_t values[] = {static_cast<uint32_t>(x), static_cast<uint32_t>(y)};
-  xcb_configure_window(connection_, window, XCB_CONFIG_WINDOW_X | XCB_CONFIG_WINDOW_Y, values);
-  sync();
+  configure(window, XCB_CONFIG_WINDOW_X | XCB_CONFIG_WINDOW_Y, {static_cast<uint32_t>(x), static_cast<uint32_t>(y)});
 }
 
-void XClient::raise(xcb_window_t window) {
-  const uint32_t value = XCB_STACK_MODE_ABOVE;
-  xcb_configure_window(connection_, window, XCB_CONFIG_WINDOW_STACK_MODE, &value);
-  sync();
-}
+void XClient::raise(xcb_window_t window) { configure(window, XCB_CONFIG_WINDOW_STACK_MODE, {XCB_STACK_MODE_ABOVE}); }
 
 void XClient::unmap(xcb_window_t window) {
   xcb_unmap_window(connection_, window);
@@ -282,47 +183,40 @@ void XClient::waitForFocus(xcb_window_t wanted) {
 }
 
 bool activateWindow(const std::string& display, xcb_window_t window) {
-  ChildProcess request({"timeout", "60", "xdotool", "windowactivate", "--sync", std::to_string(window)},
-                       {"DISPLAY=" + display});
+  Process request("timeout", {"60", "xdotool", "windowactivate", "--sync", std::to_string(window)},
+                  {"DISPLAY=" + display});
   return request.wait() == 0;
 }
 
-WindowManager::WindowManager(const std::string& display) : client_(display) {
-  // The command runs as the last thing before its main loop.
-  process_ = std::make_unique<ChildProcess>(std::vector<std::string>{"openbox", "--sm-disable", "--startup", "echo up"},
-                                            std::vector<std::string>{"DISPLAY=" + display}, -1, output_.writeEnd());
-  std::string line;  // it writes messages as well
-  do {
-    line = output_.readLine();
-    if (line.empty()) throw std::runtime_error("the window manager did not start");
-  } while (line != "up");
+bool pressKeys(const std::string& display, std::initializer_list<const char*> keys) {
+  std::vector<std::string> arguments{"key", "--delay", "100"};
+  arguments.insert(arguments.end(), keys.begin(), keys.end());
+  return Process("xdotool", arguments, {"DISPLAY=" + display}).wait() == 0;
+}
+
+WindowManager::WindowManager(const std::string& display)
+    : client_(display),
+      // The command runs as the last thing before its main loop.
+      process_("openbox", {"--sm-disable", "--startup", "echo up"}, {"DISPLAY=" + display}) {
+  if (!process_.awaitLine("up")) throw std::runtime_error("the window manager did not start");
   const std::string check = client_.property(client_.root(), "_NET_SUPPORTING_WM_CHECK");
   if (check.size() == sizeof window_) std::memcpy(&window_, check.data(), sizeof window_);
 }
 
 void WindowManager::kill() {
-  process_->kill();
+  process_.kill();
   client_.waitForEnd(window_);
 }
 
-WindowProcess::WindowProcess(const std::string& display) {
-  OutputPipe output;
-  process_ = std::make_unique<ChildProcess>(std::vector<std::string>{X11_TEST_WINDOW_PROGRAM, display},
-                                            std::vector<std::string>{}, -1, output.writeEnd());
-  pid_ = process_->pid();
-  const std::string id = output.read(sizeof window_);
+WindowProcess::WindowProcess(const std::string& display) : process_(TEST_WINDOW_PROGRAM, {display}) {
+  const std::string id = process_.read(sizeof window_);
   if (id.size() != sizeof window_) throw std::runtime_error("no window");
   std::memcpy(&window_, id.data(), sizeof window_);
 }
 
-void XServerTest::SetUpTestSuite() {
-  if (hasProgram("Xvfb")) server_ = std::make_unique<XServer>();
-}
-
-void XServerTest::TearDownTestSuite() { server_.reset(); }
-
 void XServerTest::SetUp() {
-  if (!server_) GTEST_SKIP() << "Xvfb is not installed";
+  if (!isInstalled("Xvfb")) GTEST_SKIP() << "Xvfb is not installed";
+  if (!server_) server_.emplace();
 }
 
-}  // namespace qv::platform::testing
+}  // namespace qv::kit

@@ -1,76 +1,38 @@
 #pragma once
 
 #include <gtest/gtest.h>
-#include <sys/types.h>
 #include <xcb/xcb.h>
 
-#include <condition_variable>
 #include <cstdint>
 #include <functional>
 #include <initializer_list>
 #include <memory>
-#include <mutex>
 #include <optional>
 #include <string>
-#include <vector>
 
-namespace qv::platform::testing {
+#include "tests/kit/Process.h"
 
-/// A child process of the test; killed and waited for at the end.
-class ChildProcess {
- public:
-  /// `inheritedFd` (if any) stays open in the child, `outputFd` (if any) becomes its output.
-  explicit ChildProcess(const std::vector<std::string>& arguments, const std::vector<std::string>& environment = {},
-                        int inheritedFd = -1, int outputFd = -1);
-  ~ChildProcess() { kill(); }
-  ChildProcess(const ChildProcess&) = delete;
-  ChildProcess& operator=(const ChildProcess&) = delete;
-  [[nodiscard]] pid_t pid() const { return pid_; }
-  /// Kills it and waits for its end.
-  void kill();
-  /// Waits for it to end by itself; its exit status, or -1.
-  int wait();
-
- private:
-  pid_t pid_ = -1;
-};
-
-/// A pipe for what a child process writes.
-class OutputPipe {
- public:
-  OutputPipe();
-  ~OutputPipe();
-  OutputPipe(const OutputPipe&) = delete;
-  OutputPipe& operator=(const OutputPipe&) = delete;
-  /// For the child; closed here with the first reading.
-  [[nodiscard]] int writeEnd() const { return ends_[1]; }
-  /// As many bytes; fewer where the child ended before.
-  std::string read(size_t size);
-  /// Up to the end of a line, without it.
-  std::string readLine();
-
- private:
-  void closeWriteEnd();
-  int ends_[2];
-};
-
-bool hasProgram(const std::string& name);
+namespace qv::kit {
 
 /// An X server without hardware, 640 x 480.
+///
+/// Threading: one thread.
 class XServer {
  public:
   static constexpr uint16_t kWidth = 640, kHeight = 480;
   XServer();
   [[nodiscard]] const std::string& display() const { return display_; }
-  void kill() { process_->kill(); }
+  void kill() { process_.kill(); }
 
  private:
-  std::unique_ptr<ChildProcess> process_;
+  Process process_;
   std::string display_;
 };
 
 /// A client of the X server, that shows windows of plain colours. Every call is complete in the
 /// server when it returns.
+///
+/// Threading: one thread.
 class XClient {
  public:
   explicit XClient(const std::string& display);
@@ -107,11 +69,11 @@ class XClient {
   /// Returns when this window, or one within it, has the focus.
   void waitForFocus(xcb_window_t wanted);
   void setCursor(xcb_window_t window, uint16_t side, uint32_t rgb);
-  [[nodiscard]] xcb_connection_t* connection() const { return connection_; }
   [[nodiscard]] xcb_window_t root() const { return screen_->root; }
   void sync();
 
  private:
+  void configure(xcb_window_t window, uint16_t mask, std::initializer_list<uint32_t> values);
   void waitForEvent();
   void select(xcb_window_t window, uint32_t mask);
   void selectFocusEvents();
@@ -124,48 +86,52 @@ class XClient {
 
 /// A window manager (openbox) on a display, that is up when the constructor returns. It takes no notice of what it is
 /// sent while it comes up until something else wakes it.
+///
+/// Threading: one thread.
 class WindowManager {
  public:
-  static bool isInstalled() { return hasProgram("openbox"); }
   explicit WindowManager(const std::string& display);
   /// Returns when it and its windows are gone.
   void kill();
 
  private:
   XClient client_;
-  OutputPipe output_;
-  std::unique_ptr<ChildProcess> process_;
+  Process process_;
   xcb_window_t window_ = XCB_NONE;
 };
 
 /// Lets the window manager activate a window, and waits until it has.
 bool activateWindow(const std::string& display, xcb_window_t window);
+/// Presses keys on a display, one after the other.
+bool pressKeys(const std::string& display, std::initializer_list<const char*> keys);
 
 /// A process of its own that shows one window, 200 x 200, until it is killed.
+///
+/// Threading: one thread.
 class WindowProcess {
  public:
   explicit WindowProcess(const std::string& display);
-  void kill() { process_->kill(); }
+  void kill() { process_.kill(); }
   [[nodiscard]] pid_t pid() const { return pid_; }
   [[nodiscard]] xcb_window_t window() const { return window_; }
 
  private:
-  std::unique_ptr<ChildProcess> process_;
-  pid_t pid_ = -1;
+  Process process_;
+  const pid_t pid_ = process_.pid();
   xcb_window_t window_ = 0;
 };
 
 /// Skips, visibly, where there is no X server to start. One server per suite.
+///
+/// Threading: one thread.
 class XServerTest : public ::testing::Test {
  protected:
-  static void SetUpTestSuite();
-  static void TearDownTestSuite();
+  static void TearDownTestSuite() { server_.reset(); }
   void SetUp() override;
-  static XServer& server() { return *server_; }
   static const std::string& display() { return server_->display(); }
 
  private:
-  static inline std::unique_ptr<XServer> server_;
+  static inline std::optional<XServer> server_;
 };
 
-}  // namespace qv::platform::testing
+}  // namespace qv::kit
