@@ -6,6 +6,8 @@
 #include <utility>
 #include <vector>
 
+#include "platform/threads/CallbackGate.h"
+#include "platform/threads/Guarded.h"
 #include "platform/threads/SerialQueue.h"
 
 namespace qv::platform {
@@ -13,21 +15,22 @@ namespace {
 
 /// Delivers reports to one handler.
 ///
-/// Threading: thread-safe. `calling_` is recursive because a handler may remove itself.
+/// Threading: thread-safe. Taking the handler away waits for a report in progress, except from within one.
 class ReportGate {
  public:
   void setHandler(std::function<void(const Dictionary&)> handler) {
-    std::lock_guard calling(calling_);
-    handler_ = std::move(handler);
+    handler_.store(std::move(handler));
+    gate_.awaitIdle();
   }
   void report(const Dictionary& report) {
-    std::lock_guard calling(calling_);
-    if (const auto handler = handler_) handler(report);
+    gate_.enter([&] {
+      if (const auto handler = handler_.load()) handler(report);
+    });
   }
 
  private:
-  std::recursive_mutex calling_;
-  std::function<void(const Dictionary&)> handler_;
+  CallbackGate gate_;
+  Guarded<std::function<void(const Dictionary&)>> handler_;
 };
 
 }  // namespace

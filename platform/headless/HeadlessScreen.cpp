@@ -2,10 +2,10 @@
 
 #include <algorithm>
 #include <cmath>
-#include <condition_variable>
 #include <mutex>
 
 #include "platform/headless/TestPattern.h"
+#include "platform/threads/CallbackGate.h"
 #include "platform/threads/Clock.h"
 #include "platform/threads/Log.h"
 #include "platform/threads/PacedThread.h"
@@ -47,51 +47,7 @@ struct FrameGrid {
   int64_t timescale;
 };
 
-/// Calls the delegate, one call at a time, in a way that can be waited for.
-///
-/// Threading: thread-safe.
-class DelegateGate {
- public:
-  void setDelegate(std::weak_ptr<ScreenCaptureControllerDelegate> delegate) {
-    std::unique_lock lock(mutex_);
-    delegate_ = std::move(delegate);
-    waitForCall(lock);
-  }
-  void wait() {
-    std::unique_lock lock(mutex_);
-    waitForCall(lock);
-  }
-  /// Whether a call would be made now.
-  bool isOpen() {
-    std::lock_guard lock(mutex_);
-    return !delegate_.expired() && !calling_;
-  }
-  template <typename Call>
-  void call(const Call& function) {
-    std::unique_lock lock(mutex_);
-    auto delegate = delegate_.lock();
-    if (!delegate || calling_) return;
-    calling_ = true;
-    caller_ = std::this_thread::get_id();
-    lock.unlock();
-    function(*delegate);
-    delegate.reset();
-    lock.lock();
-    calling_ = false;
-    ended_.notify_all();
-  }
-
- private:
-  void waitForCall(std::unique_lock<std::mutex>& lock) {
-    ended_.wait(lock, [this] { return !calling_ || caller_ == std::this_thread::get_id(); });
-  }
-
-  std::mutex mutex_;
-  std::condition_variable ended_;
-  std::weak_ptr<ScreenCaptureControllerDelegate> delegate_;
-  std::thread::id caller_;
-  bool calling_ = false;
-};
+using Gate = DelegateGate<ScreenCaptureControllerDelegate>;
 
 /// What a controller keeps from one start to the next.
 ///
@@ -104,11 +60,11 @@ struct Picture {
 
 /// One start to stop of a controller.
 ///
-/// Threading: its thread's own, but for the atomic.
+/// Threading: its thread's own.
 struct Capture {
   PacedThread::TimePoint step();
-  void deliver(nanoseconds time);
-  std::shared_ptr<SharedFrame> nextFrame(nanoseconds time);
+  void deliver(nanoseconds moment);
+  std::shared_ptr<SharedFrame> nextFrame(nanoseconds moment);
   void countFrame() {
     std::lock_guard lock(picture->mutex);
     ++picture->number;
@@ -118,13 +74,13 @@ struct Capture {
   const FrameLayout layout;
   const FrameGrid grid;
   const std::shared_ptr<HeadlessScreen::CloneState> clone;
-  const std::shared_ptr<DelegateGate> gate;
+  const std::shared_ptr<Gate> gate;
+  const CallbackGate::Time time;
   const std::shared_ptr<Picture> picture;
   PacedClock& clock;
   const bool showsPicture = clone->showsPicture();
   bool hasBegun = false;
   int64_t next = 0;
-  std::atomic<bool> stopped = false;
 };
 
 PacedThread::TimePoint Capture::step() {
@@ -142,27 +98,26 @@ PacedThread::TimePoint Capture::step() {
   return PacedThread::TimePoint(grid.timeOf(next));
 }
 
-void Capture::deliver(nanoseconds time) {
-  if (stopped || !gate->isOpen()) return;
-  const auto frame = nextFrame(time);
-  if (!frame) {
-    QV_LOG_DEBUG(logs::kScreen, "every frame is in use, picture left out");
-    return;
-  }
-  const auto image = std::make_shared<PixelBuffer>(frame);
-  const auto pts = mediaTimeFromHostTime(static_cast<uint64_t>(time.count()));
-  const auto sample =
-      SampleBuffer::makeVideo(image, pts, MediaTime::make(grid.value, static_cast<int32_t>(grid.timescale)));
-  gate->call([&](ScreenCaptureControllerDelegate& delegate) {
+void Capture::deliver(nanoseconds moment) {
+  gate->enter(time, [&](ScreenCaptureControllerDelegate& delegate) {
+    const auto frame = nextFrame(moment);
+    if (!frame) {
+      QV_LOG_DEBUG(logs::kScreen, "every frame is in use, picture left out");
+      return;
+    }
+    const auto image = std::make_shared<PixelBuffer>(frame);
+    const auto pts = mediaTimeFromHostTime(static_cast<uint64_t>(moment.count()));
+    const auto sample =
+        SampleBuffer::makeVideo(image, pts, MediaTime::make(grid.value, static_cast<int32_t>(grid.timescale)));
     countFrame();
     delegate.screenCaptureControllerDidReceiveSampleBuffer(controller, sample, 0);
   });
 }
 
-std::shared_ptr<SharedFrame> Capture::nextFrame(nanoseconds time) {
+std::shared_ptr<SharedFrame> Capture::nextFrame(nanoseconds moment) {
   std::lock_guard lock(picture->mutex);
   if (!showsPicture) return picture->pattern.paintBlack(layout);
-  return picture->pattern.paint(layout, picture->number, static_cast<uint64_t>(time.count()));
+  return picture->pattern.paint(layout, picture->number, static_cast<uint64_t>(moment.count()));
 }
 
 /// Threading: as ScreenCaptureController.
@@ -182,19 +137,21 @@ class HeadlessController final : public ScreenCaptureController {
   void startCapture() override {
     std::lock_guard lock(mutex_);
     if (thread_) return;
-    capture_ = std::shared_ptr<Capture>(new Capture{*this, layout_, grid_, clone_, gate_, picture_, clock_});
-    thread_ = std::make_unique<PacedThread>([capture = capture_] { return capture->step(); }, nullptr, clock_);
+    time_ = gate_->open();
+    const auto capture =
+        std::shared_ptr<Capture>(new Capture{*this, layout_, grid_, clone_, gate_, time_, picture_, clock_});
+    thread_ = std::make_unique<PacedThread>([capture] { return capture->step(); }, nullptr, clock_);
   }
+  /// The gate first: the thread may be waiting there for one that was stopped within its call.
   void stopCapture() override {
     std::unique_ptr<PacedThread> thread;
+    CallbackGate::Time time = 0;
     {
       std::lock_guard lock(mutex_);
-      if (capture_) capture_->stopped = true;
-      capture_.reset();
       thread = std::move(thread_);
+      time = time_;
     }
-    thread.reset();
-    gate_->wait();
+    gate_->close(time);
   }
 
  private:
@@ -202,10 +159,11 @@ class HeadlessController final : public ScreenCaptureController {
   const FrameGrid grid_;
   const std::shared_ptr<HeadlessScreen::CloneState> clone_;
   PacedClock& clock_;
-  const std::shared_ptr<DelegateGate> gate_ = std::make_shared<DelegateGate>();
+  const std::shared_ptr<Gate> gate_ = std::make_shared<Gate>();
   const std::shared_ptr<Picture> picture_ = std::make_shared<Picture>();
   std::mutex mutex_;
-  std::shared_ptr<Capture> capture_;
+  // Guarded by mutex_:
+  CallbackGate::Time time_ = gate_->open();  // of the thread, or of the last
   std::unique_ptr<PacedThread> thread_;
 };
 

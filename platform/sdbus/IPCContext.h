@@ -6,17 +6,17 @@
 #include <unordered_set>
 #include <utility>
 
-#include "platform/sdbus/IOThread.h"
 #include "platform/sdbus/SdBusIPC.h"
+#include "platform/threads/EventLoop.h"
 
 namespace qv::platform::sdbus {
 
-class BusLink;
+class BusDriver;
 struct ListenerState;
 
 /// What the connections and listeners of one service object share.
 ///
-/// Threading: `links`, `listeners` and `idleHandler` on the I/O thread; the rest is immutable or thread-safe.
+/// Threading: `drivers`, `listeners` and what ends the service on the I/O thread; the rest is immutable or thread-safe.
 struct IPCContext {
   IPCContext(IPCPeerResolver peerResolver, SdBusIPCOptions serviceOptions)
       : resolver(std::move(peerResolver)), options(std::move(serviceOptions)) {}
@@ -24,14 +24,15 @@ struct IPCContext {
   const IPCPeerResolver resolver;
   const SdBusIPCOptions options;
   /// Those that have a bus.
-  std::unordered_set<std::shared_ptr<BusLink>> links;
+  std::unordered_set<std::shared_ptr<BusDriver>> drivers;
   std::unordered_set<std::shared_ptr<ListenerState>> listeners;
-  /// Told once when `links` is empty; set while the service ends.
+  /// Told once when `drivers` is empty; set while the service ends.
   std::function<void()> idleHandler;
+  EventLoop::Timer closeTimer;
   void tellWhenIdle() {
-    if (links.empty() && idleHandler) std::exchange(idleHandler, nullptr)();
+    if (drivers.empty() && idleHandler) std::exchange(idleHandler, nullptr)();
   }
-  IOThread io;
+  EventLoop io;
 };
 
 }  // namespace qv::platform::sdbus

@@ -52,7 +52,13 @@ SdBusIPCService::~SdBusIPCService() {
     for (const auto& listener : std::vector(context->listeners.begin(), context->listeners.end())) {
       listener->stop();
     }
-    for (const auto& link : std::vector(context->links.begin(), context->links.end())) link->invalidate(true);
+    const auto drivers = [context] { return std::vector(context->drivers.begin(), context->drivers.end()); };
+    for (const auto& driver : drivers()) driver->endWithService();
+    // Peers that are slow are not waited for without end, as they are while the service lives.
+    const auto bound = std::chrono::milliseconds(context->options.drainMilliseconds);
+    context->closeTimer = context->io.after(bound, [drivers] {
+      for (const auto& driver : drivers()) driver->close();
+    });
     context->idleHandler = [idle] { idle->set_value(); };
     context->tellWhenIdle();
   });

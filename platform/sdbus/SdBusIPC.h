@@ -32,7 +32,8 @@ struct SdBusIPCOptions {
   size_t maximumUnansweredCalls = 1024;
   /// Connections that one listener holds at a time.
   size_t maximumConnections = 8192;
-  /// How long an invalidated connection stays open for the peer to take what was sent before.
+  /// An invalidated connection stays open while the peer takes what was sent before, and is closed when the peer has
+  /// taken nothing for so long. With the service it ends after that time in any case.
   int drainMilliseconds = 1000;
 };
 

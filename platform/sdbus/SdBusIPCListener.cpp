@@ -32,7 +32,7 @@ void ListenerState::start(FileDescriptor openedSocket, bool rendezvous) {
 
 void ListenerState::stop() {
   context->io.post([self = shared_from_this()] {
-    if (self->watch_ != 0) self->context->io.unwatch(std::exchange(self->watch_, 0), self->socket_.get());
+    self->watch_.end();
     self->socket_.reset();
     self->spare_.reset();
     self->context->listeners.erase(self);
@@ -84,16 +84,22 @@ void ListenerState::acceptOne(FileDescriptor connected) {
   auto link = std::make_shared<BusLink>(context, std::move(connected), BusLink::Role::Accepted);
   link->setAdmission(std::shared_ptr<void>(nullptr, [connections = connections_](void*) { --*connections; }));
   auto connection = SdBusIPCConnection::create(std::move(link), std::move(peer));
-  std::lock_guard lock(queueMutex);
+  std::lock_guard lock(mutex);
   if (!queue) return;
   queue->async([self = shared_from_this(), connection = std::move(connection)] {
-    std::lock_guard delegateLock(self->delegateMutex);
-    if (!self->listener || !self->delegate) return connection->invalidate();
-    if (!self->delegate->listenerShouldAcceptNewConnection(*self->listener, connection)) {
-      connection->setInvalidationHandler(nullptr);
-      connection->invalidate();
-    }
+    self->gate.enter([&] { self->offer(connection); });
   });
+}
+
+void ListenerState::offer(const std::shared_ptr<IPCConnection>& connection) {
+  std::unique_lock lock(mutex);
+  IPCListener* const offering = listener;
+  IPCListenerDelegate* const asked = delegate;
+  lock.unlock();
+  if (!offering || !asked) return connection->invalidate();
+  if (asked->listenerShouldAcceptNewConnection(*offering, connection)) return;
+  connection->setInvalidationHandler(nullptr);
+  connection->invalidate();
 }
 
 SdBusIPCListener::SdBusIPCListener(std::shared_ptr<IPCContext> context, std::string path)
@@ -111,10 +117,12 @@ SdBusIPCListener::SdBusIPCListener(std::shared_ptr<IPCContext> context, std::str
 SdBusIPCListener::~SdBusIPCListener() { invalidate(); }
 
 void SdBusIPCListener::setDelegate(IPCListenerDelegate* delegate, SerialQueue& queue) {
-  std::lock_guard lock(state_->delegateMutex);
-  state_->delegate = delegate;
-  std::lock_guard queueLock(state_->queueMutex);
-  state_->queue = std::make_shared<SerialQueue>("com.tarnwick.quorveld.listener", queue);
+  {
+    std::lock_guard lock(state_->mutex);
+    state_->delegate = delegate;
+    state_->queue = std::make_shared<SerialQueue>("com.tarnwick.quorveld.listener", queue);
+  }
+  state_->gate.awaitIdle();
 }
 
 std::optional<Error> SdBusIPCListener::resume() {
@@ -154,9 +162,12 @@ void SdBusIPCListener::invalidate() {
     rendezvous_.reset();
     endpoint_.reset();
   }
-  std::lock_guard lock(state_->delegateMutex);
-  state_->delegate = nullptr;
-  state_->listener = nullptr;
+  {
+    std::lock_guard lock(state_->mutex);
+    state_->delegate = nullptr;
+    state_->listener = nullptr;
+  }
+  state_->gate.awaitIdle();
 }
 
 ListenerEndpoint SdBusIPCListener::endpoint() const {

@@ -7,13 +7,14 @@
 
 #include "platform/IPC.h"
 #include "platform/sdbus/IPCContext.h"
+#include "platform/threads/CallbackGate.h"
 
 namespace qv::platform::sdbus {
 
 /// The part of a listener that the I/O thread and the delegate's queue hold.
 ///
-/// Threading: thread-safe; `delegateMutex` is held while the delegate is called, so that no call is
-/// in progress when the listener or its delegate has been taken away.
+/// Threading: thread-safe; the delegate is called through the gate, so that no call is in progress when the listener or
+/// its delegate has been taken away. `mutex` is never held during a call: the I/O thread waits for no delegate.
 struct ListenerState : std::enable_shared_from_this<ListenerState> {
   ListenerState(std::shared_ptr<IPCContext> sharedContext, IPCListener& owner)
       : context(std::move(sharedContext)), listener(&owner) {}
@@ -22,22 +23,24 @@ struct ListenerState : std::enable_shared_from_this<ListenerState> {
   void stop();
 
   const std::shared_ptr<IPCContext> context;
-  std::recursive_mutex delegateMutex;
+  CallbackGate gate;
+  std::mutex mutex;
+  // Guarded by mutex:
   IPCListener* listener;
   IPCListenerDelegate* delegate = nullptr;
-  std::mutex queueMutex;
-  std::shared_ptr<SerialQueue> queue;  ///< under `queueMutex`: the I/O thread never waits for a delegate
+  std::shared_ptr<SerialQueue> queue;
 
  private:
   void acceptAll();
   void acceptOne(FileDescriptor connected);
   [[nodiscard]] FileDescriptor acceptNext(bool& isEmpty);
   void refuseOne();
+  void offer(const std::shared_ptr<IPCConnection>& connection);
 
   // I/O thread:
   FileDescriptor socket_;
   bool isRendezvous_ = false;
-  IOThread::Token watch_ = 0;
+  EventLoop::Watch watch_;
   FileDescriptor spare_;  ///< given up for a moment to refuse a connection when descriptors ran out
   std::shared_ptr<std::atomic<size_t>> connections_ = std::make_shared<std::atomic<size_t>>(0);
 };

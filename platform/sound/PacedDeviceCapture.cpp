@@ -1,5 +1,6 @@
 #include "platform/sound/PacedDeviceCapture.h"
 
+#include "platform/threads/CallbackGate.h"
 #include "platform/threads/Clock.h"
 
 namespace qv::platform {
@@ -11,24 +12,27 @@ constexpr size_t kBytesPerSample = 2 * 1024;
 /// Threading: immutable.
 class MicrophoneInput final : public CaptureDeviceInput {};
 
-/// Threading: thread-safe. `delivery_` is held during a callback, so that whoever takes the
-/// delegate away waits for it.
+/// Threading: thread-safe. Whoever takes the delegate away waits for a callback in progress, except within one.
 class MicrophoneOutput final : public AudioDataOutput, public std::enable_shared_from_this<MicrophoneOutput> {
  public:
   void setSampleDelegate(CaptureOutputDelegate* delegate, SerialQueue* queue) override {
-    std::lock_guard delivery(delivery_);
-    std::lock_guard lock(mutex_);
-    delegate_ = delegate;
-    queue_ = queue;
+    {
+      std::lock_guard lock(mutex_);
+      delegate_ = delegate;
+      queue_ = queue;
+    }
+    gate_.awaitIdle();
   }
   void attach() {
     std::lock_guard lock(mutex_);
     attached_ = true;
   }
   void detach() {
-    std::lock_guard delivery(delivery_);
-    std::lock_guard lock(mutex_);
-    attached_ = false;
+    {
+      std::lock_guard lock(mutex_);
+      attached_ = false;
+    }
+    gate_.awaitIdle();
   }
   void send(SampleBufferRef sample) {
     std::lock_guard lock(mutex_);
@@ -38,16 +42,17 @@ class MicrophoneOutput final : public AudioDataOutput, public std::enable_shared
 
  private:
   void deliver(const SampleBufferRef& sample) {
-    std::lock_guard delivery(delivery_);
-    if (CaptureOutputDelegate* delegate = currentDelegate())
-      delegate->captureOutputDidOutputSampleBuffer(*this, sample);
+    gate_.enter([&] {
+      if (CaptureOutputDelegate* delegate = currentDelegate())
+        delegate->captureOutputDidOutputSampleBuffer(*this, sample);
+    });
   }
   CaptureOutputDelegate* currentDelegate() {
     std::lock_guard lock(mutex_);
     return attached_ ? delegate_ : nullptr;
   }
 
-  std::recursive_mutex delivery_;  // recursive: a callback may remove its output. Taken before mutex_.
+  CallbackGate gate_;
   std::mutex mutex_;
   CaptureOutputDelegate* delegate_ = nullptr;
   SerialQueue* queue_ = nullptr;

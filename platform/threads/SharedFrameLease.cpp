@@ -8,8 +8,8 @@
 #include <cerrno>
 #include <deque>
 #include <mutex>
-#include <thread>
 
+#include "platform/threads/EventLoop.h"
 #include "platform/threads/Log.h"
 #include "platform/threads/RareLog.h"
 
@@ -20,29 +20,27 @@ struct Lease {
   uint64_t number = 0;  ///< of its issue: descriptors are used again
   FileDescriptor end;
   SharedFrameRef frame;
+  EventLoop::Watch watch;  // last: it ends before the descriptor is closed
 };
 
-/// Never destroyed: its thread is detached and a lease may end at any time.
+/// Never destroyed: a lease may end at any time. A loop of its own, for what lets go of a frame may be slow.
+///
+/// Threading: thread-safe. Frames are let go of without the lock.
 class LeaseWatcher {
  public:
-  LeaseWatcher() : epoll_(::epoll_create1(EPOLL_CLOEXEC)) {
-    std::thread([this] { run(); }).detach();
-  }
-
   std::optional<Error> add(FileDescriptor end, SharedFrameRef frame) {
-    Lease oldest;  // let go of without the lock
+    Lease oldest;
     std::lock_guard lock(mutex_);
-    epoll_event event{};
-    event.events = EPOLLRDHUP;
-    event.data.u64 = ++last_;
-    if (::epoll_ctl(epoll_.get(), EPOLL_CTL_ADD, end.get(), &event) != 0) return Error::posix(errno, "epoll_ctl");
-    leases_.push_back({last_, std::move(end), std::move(frame)});
+    const uint64_t number = ++last_;
+    auto watch = loop_.watch(end.get(), EPOLLRDHUP, [this, number](uint32_t) { this->end(number); });
+    if (!watch) return Error::posix(ENOMEM, "lease");
+    leases_.push_back({number, std::move(end), std::move(frame), std::move(watch)});
     if (leases_.size() <= kMaximumSharedFrameLeases) return std::nullopt;
     oldest = std::move(leases_.front());
     leases_.pop_front();
-    if (const auto number = givenUp_.count()) {
+    if (const auto times = givenUp_.count()) {
       QV_LOG_ERROR(logs::kPlatform, "%llu frames were taken from who does not give them back",
-                   static_cast<unsigned long long>(*number));
+                   static_cast<unsigned long long>(*times));
     }
     return std::nullopt;
   }
@@ -53,29 +51,20 @@ class LeaseWatcher {
   }
 
  private:
-  void run() {
-    std::array<epoll_event, 16> events{};
-    for (;;) {
-      const int ready = ::epoll_wait(epoll_.get(), events.data(), static_cast<int>(events.size()), -1);
-      for (int i = 0; i < ready; ++i) end(events[static_cast<size_t>(i)].data.u64);
-    }
-  }
-
   void end(uint64_t number) {
     Lease ended;
     std::lock_guard lock(mutex_);
-    const auto it =
-        std::find_if(leases_.begin(), leases_.end(), [&](const Lease& lease) { return lease.number == number; });
+    const auto it = std::ranges::find(leases_, number, &Lease::number);
     if (it == leases_.end()) return;
     ended = std::move(*it);
     leases_.erase(it);
   }
 
-  FileDescriptor epoll_;
   RareLog givenUp_;
   std::mutex mutex_;
   uint64_t last_ = 0;
   std::deque<Lease> leases_;  ///< the oldest first; few
+  EventLoop loop_;
 };
 
 LeaseWatcher& watcher() {

@@ -13,7 +13,7 @@ namespace qv::platform {
 /// again and again. So at most kMaximumSharedFrameLeases are out: then the oldest is given up, and its holder's frame
 /// may change from there on.
 ///
-/// One thread of this process watches all leases; it sleeps while none ends.
+/// One thread of this process watches all leases; it begins with the first, and sleeps while none ends.
 ///
 /// Threading: thread-safe.
 Result<FileDescriptor> issueSharedFrameLease(SharedFrameRef frame);

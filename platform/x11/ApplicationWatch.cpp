@@ -1,9 +1,12 @@
 #include "platform/x11/ApplicationWatch.h"
 
 #include <poll.h>
+#include <sys/epoll.h>
 #include <sys/syscall.h>
 
 #include <algorithm>
+#include <future>
+#include <utility>
 
 #include "platform/Applications.h"
 #include "platform/threads/Log.h"
@@ -12,8 +15,6 @@ namespace qv::platform {
 namespace {
 
 constexpr std::chrono::milliseconds kCoalescing{50};
-constexpr std::chrono::milliseconds kReconnectInterval{1000};
-constexpr std::chrono::milliseconds kReplyLimit{2000};
 
 FileDescriptor openProcess(pid_t pid) { return FileDescriptor(static_cast<int>(::syscall(SYS_pidfd_open, pid, 0))); }
 
@@ -36,62 +37,43 @@ Dictionary applicationReport(const RunningApplication& application, uint32_t sta
 }
 
 ApplicationWatch::ApplicationWatch(std::string display, BundleLookup bundleOfProcess,
-                                   std::function<void(const Dictionary&)> handler, int stopFd)
-    : display_(std::move(display)),
-      bundleOfProcess_(std::move(bundleOfProcess)),
+                                   std::function<void(const Dictionary&)> handler)
+    : bundleOfProcess_(std::move(bundleOfProcess)),
       handler_(std::move(handler)),
-      stopFd_(stopFd) {}
+      desktop_(loop_, *this, std::move(display), kCoalescing) {}
 
 void ApplicationWatch::begin() {
-  connect();
-  std::vector<Dictionary> unreported;
-  if (connection_) {
-    const auto desktop = readDesktop(*connection_, true);
-    hasWindowManager_ = desktop.hasWindowManager;
-    learn(applicationsOf(desktop, bundleOfProcess_), unreported, unreported);
-  }
+  std::promise<void> begun;
+  loop_.post([this, &begun] {
+    desktop_.begin();
+    hasBegun_ = true;
+    begun.set_value();
+  });
+  begun.get_future().wait();
 }
 
-void ApplicationWatch::connect() {
-  auto opened = XcbConnection::open(display_, kReplyLimit);
-  if (!opened) return;
-  connection_ = std::move(opened.value());
+void ApplicationWatch::end(std::shared_ptr<ApplicationWatch> watch) {
+  watch->gate_.close();
+  if (!watch->loop_.isCurrent()) return;
+  EventLoop& loop = watch->loop_;
+  loop.post([watch = std::move(watch)] {});
+}
+
+void ApplicationWatch::desktopConnected(XcbConnection& connection) {
   const uint32_t mask =
       XCB_EVENT_MASK_SUBSTRUCTURE_NOTIFY | XCB_EVENT_MASK_PROPERTY_CHANGE | XCB_EVENT_MASK_FOCUS_CHANGE;
-  xcb_change_window_attributes(connection_->get(), connection_->root(), XCB_CW_EVENT_MASK, &mask);
-  activeWindowAtom_ = connection_->atom("_NET_ACTIVE_WINDOW");
-  managerAtom_ = connection_->atom("_NET_SUPPORTING_WM_CHECK");
-  clientListAtom_ = connection_->atom("_NET_CLIENT_LIST_STACKING");
+  xcb_change_window_attributes(connection.get(), connection.root(), XCB_CW_EVENT_MASK, &mask);
+  activeWindowAtom_ = connection.atom("_NET_ACTIVE_WINDOW");
+  managerAtom_ = connection.atom("_NET_SUPPORTING_WM_CHECK");
+  clientListAtom_ = connection.atom("_NET_CLIENT_LIST_STACKING");
+  if (hasBegun_) return desktop_.lookIn(kCoalescing);
+  const auto desktop = readDesktop(connection, true);
+  hasWindowManager_ = desktop.hasWindowManager;
+  std::vector<Dictionary> unreported;
+  learn(applicationsOf(desktop, bundleOfProcess_), unreported, unreported);
 }
 
-void ApplicationWatch::run() {
-  while (!isStopped()) {
-    if (!connection_) {
-      connect();
-      if (connection_) lookSoon();
-    }
-    if (connection_ && !lookAt_) handleEvents();
-    if (connection_ && connection_->isLost()) {
-      QV_LOG_INFO(logs::kPlatform, "application states: the X server has gone");
-      connection_.reset();
-      look();
-    }
-    for (const auto& [pid, known] : known_)
-      if (hasEnded(known.process)) lookAt_ = Clock::now();
-    if (lookAt_ && Clock::now() >= *lookAt_) {
-      look();
-      continue;
-    }
-    if (!sleep()) return;
-  }
-}
-
-void ApplicationWatch::handleEvents() {
-  while (auto event = connection_->pollEvent())
-    if (concerns(*event)) lookSoon();
-}
-
-bool ApplicationWatch::concerns(const xcb_generic_event_t& event) const {
+bool ApplicationWatch::desktopEventConcerns(const xcb_generic_event_t& event) {
   switch (event.response_type & 0x7F) {
     case XCB_PROPERTY_NOTIFY: {
       const xcb_atom_t atom = reinterpret_cast<const xcb_property_notify_event_t&>(event).atom;
@@ -113,20 +95,27 @@ bool ApplicationWatch::concerns(const xcb_generic_event_t& event) const {
   }
 }
 
-void ApplicationWatch::lookSoon() {
-  if (!lookAt_) lookAt_ = Clock::now() + kCoalescing;
+void ApplicationWatch::lookAtDesktop(XcbConnection& connection) {
+  auto desktop = readDesktop(connection, true);
+  if (connection.isLost()) desktop = {};
+  hasWindowManager_ = desktop.hasWindowManager;
+  reportChanges(desktop);
 }
 
-void ApplicationWatch::look() {
-  lookAt_.reset();
-  DesktopSnapshot desktop;
-  if (connection_) {
-    while (connection_->pollEvent()) {  // what they tell is read now
-    }
-    desktop = readDesktop(*connection_, true);
-    if (connection_->isLost()) desktop = {};
-    hasWindowManager_ = desktop.hasWindowManager;
+void ApplicationWatch::desktopWasLost() {
+  QV_LOG_INFO(logs::kPlatform, "application states: the X server has gone");
+  reportChanges({});
+}
+
+void ApplicationWatch::processEnded() {
+  if (desktop_.isConnected()) {
+    desktop_.lookIn(std::chrono::milliseconds(0));
+  } else {
+    reportChanges({});
   }
+}
+
+void ApplicationWatch::reportChanges(const DesktopSnapshot& desktop) {
   std::vector<Dictionary> losses, gains;
   learn(applicationsOf(desktop, bundleOfProcess_), losses, gains);
   if (report(losses)) report(gains);
@@ -135,7 +124,7 @@ void ApplicationWatch::look() {
 void ApplicationWatch::learn(std::vector<RunningApplication> present, std::vector<Dictionary>& losses,
                              std::vector<Dictionary>& gains) {
   for (auto known = known_.begin(); known != known_.end();) {
-    auto& [application, process, state] = known->second;
+    auto& [application, process, ended, state] = known->second;
     application.isFrontmost = false;
     if (hasEnded(process)) {
       losses.push_back(applicationReport(application, kApplicationTerminated));
@@ -158,36 +147,14 @@ void ApplicationWatch::learn(std::vector<RunningApplication> present, std::vecto
     if (!process.isValid() || hasEnded(process)) continue;
     const uint32_t state = applicationStateOf(application);
     (application.isFrontmost ? gains : losses).push_back(applicationReport(application, state));
-    known_[application.pid] = {application, std::move(process), state};
+    auto ended = loop_.watch(process.get(), EPOLLIN, [this](uint32_t) { processEnded(); });
+    known_[application.pid] = {application, std::move(process), std::move(ended), state};
   }
 }
 
+/// False when the watch was ended.
 bool ApplicationWatch::report(const std::vector<Dictionary>& reports) {
-  for (const auto& dictionary : reports) {
-    if (isStopped()) return false;
-    handler_(dictionary);
-  }
-  return true;
-}
-
-bool ApplicationWatch::isStopped() const {
-  pollfd readable{stopFd_, POLLIN, 0};
-  return ::poll(&readable, 1, 0) > 0;
-}
-
-bool ApplicationWatch::sleep() {
-  // While a look is due soon, further events do not wake the thread.
-  std::vector<pollfd> descriptors{{stopFd_, POLLIN, 0}};
-  for (const auto& [pid, known] : known_) descriptors.push_back({known.process.get(), POLLIN, 0});
-  if (connection_) xcb_flush(connection_->get());
-  if (connection_ && !lookAt_) descriptors.push_back({connection_->fd(), POLLIN, 0});
-  int timeout = connection_ ? -1 : static_cast<int>(kReconnectInterval.count());
-  if (lookAt_) {
-    const auto left = std::chrono::ceil<std::chrono::milliseconds>(*lookAt_ - Clock::now());
-    timeout = std::max(0, static_cast<int>(left.count()));
-  }
-  ::poll(descriptors.data(), descriptors.size(), timeout);
-  return (descriptors.front().revents & POLLIN) == 0;
+  return std::ranges::all_of(reports, [this](const Dictionary& one) { return gate_.enter([&] { handler_(one); }); });
 }
 
 }  // namespace qv::platform

@@ -1,11 +1,7 @@
 #include "platform/x11/X11Applications.h"
 
-#include <sys/eventfd.h>
-
-#include <algorithm>
-#include <future>
 #include <mutex>
-#include <thread>
+#include <utility>
 
 #include "platform/threads/SerialQueue.h"
 #include "platform/x11/ApplicationWatch.h"
@@ -49,51 +45,24 @@ class X11ApplicationStateMonitor final : public ApplicationStateMonitor {
   void setHandler(std::function<void(const Dictionary&)> handler) override;
 
  private:
-  /// One handler's time. Shared with the thread, which may outlive the monitor for a moment when
-  /// the handler removes itself.
-  struct Run {
-    FileDescriptor stopEvent{::eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK)};
-    std::thread thread;
-  };
-  static void end(std::shared_ptr<Run> run);
-
   const std::shared_ptr<QueryConnection> connection_;
   const BundleLookup bundleOfProcess_;
   SerialQueue infoQueue_{"com.tarnwick.quorveld.ApplicationInfoQueue"};
   std::mutex mutex_;
-  std::shared_ptr<Run> run_;  // guarded by mutex_
+  std::shared_ptr<ApplicationWatch> watch_;  // guarded by mutex_
 };
 
 void X11ApplicationStateMonitor::setHandler(std::function<void(const Dictionary&)> handler) {
-  std::shared_ptr<Run> run;
-  auto hasBegun = std::make_shared<std::promise<void>>();
+  std::shared_ptr<ApplicationWatch> watch;
   if (handler) {
-    run = std::make_shared<Run>();
-    run->thread = std::thread(
-        [run, display = connection_->display(), lookup = bundleOfProcess_, handler = std::move(handler), hasBegun] {
-          const ScopedSigpipeBlock noSigpipe;
-          ApplicationWatch watch(display, lookup, handler, run->stopEvent.get());
-          watch.begin();
-          hasBegun->set_value();
-          watch.run();
-        });
-    hasBegun->get_future().wait();
+    watch = std::make_shared<ApplicationWatch>(connection_->display(), bundleOfProcess_, std::move(handler));
+    watch->begin();
   }
-  std::shared_ptr<Run> former;
   {
     std::lock_guard lock(mutex_);
-    former = std::exchange(run_, std::move(run));
+    watch_.swap(watch);
   }
-  if (former) end(std::move(former));
-}
-
-void X11ApplicationStateMonitor::end(std::shared_ptr<Run> run) {
-  ::eventfd_write(run->stopEvent.get(), 1);
-  // From within its own report the thread cannot be waited for; it ends on its own right after.
-  if (run->thread.get_id() == std::this_thread::get_id())
-    run->thread.detach();
-  else
-    run->thread.join();
+  if (watch) ApplicationWatch::end(std::move(watch));
 }
 
 }  // namespace

@@ -5,10 +5,10 @@
 #include <mutex>
 #include <optional>
 #include <string>
-#include <thread>
 #include <vector>
 
-#include "platform/base/FileDescriptor.h"
+#include "platform/threads/EventLoop.h"
+#include "platform/x11/DesktopWatch.h"
 #include "platform/x11/ShownWindows.h"
 
 namespace qv::platform {
@@ -29,11 +29,10 @@ namespace qv::platform {
 ///
 /// Threading: thread-safe; no call waits for the server, except the destructor. Observers are called on the
 /// monitor's thread.
-class X11DisplayLayoutMonitor final : public DisplayLayoutMonitor {
+class X11DisplayLayoutMonitor final : public DisplayLayoutMonitor, private DesktopWatchClient {
  public:
   static constexpr std::chrono::milliseconds kSettling{400};
   X11DisplayLayoutMonitor(std::string display, BundleLookup bundleOfProcess);
-  ~X11DisplayLayoutMonitor() override;
 
   /// Adding one that observes already changes nothing.
   void addObserver(std::weak_ptr<DisplayLayoutObserver> observer) override;
@@ -42,30 +41,24 @@ class X11DisplayLayoutMonitor final : public DisplayLayoutMonitor {
   void invalidate() override;
 
  private:
-  using Time = std::chrono::steady_clock::time_point;
-  void wake();
-  void run();
-  bool connect();
-  void watchOnce();
-  [[nodiscard]] bool drainEvents();
-  void look();
+  void desktopConnected(XcbConnection& connection) override;
+  bool desktopEventConcerns(const xcb_generic_event_t& event) override;
+  void lookAtDesktop(XcbConnection& connection) override;
+  void desktopWasLost() override;
   void report(const DisplayLayout& layout);
-  void sleep(bool alsoForEvents, std::optional<Time> until);
+  void stopWatching();
 
-  const std::string display_;
   const BundleLookup bundleOfProcess_;
-  const FileDescriptor event_;
   std::mutex mutex_;
   // Guarded by mutex_:
   std::vector<std::pair<const DisplayLayoutObserver*, std::weak_ptr<DisplayLayoutObserver>>> observers_;
-  bool isInvalid_ = false, isEnding_ = false, isFresh_ = false;
-  std::thread thread_;
-  // The thread's:
-  std::unique_ptr<XcbConnection> connection_;
+  bool isInvalid_ = false;
+  // The loop's:
   xcb_atom_t clientListAtom_ = XCB_ATOM_NONE;
   int reported_ = 0;
   std::optional<int> settling_;
-  std::optional<Time> lookAt_;
+  DesktopWatch desktop_;
+  EventLoop loop_;  // last: nothing runs on it any more when the rest goes
 };
 
 }  // namespace qv::platform

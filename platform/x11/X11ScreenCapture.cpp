@@ -6,8 +6,8 @@
 #include <cmath>
 #include <thread>
 
+#include "platform/threads/CallbackGate.h"
 #include "platform/threads/Log.h"
-#include "platform/x11/CaptureGate.h"
 #include "platform/x11/CaptureLoop.h"
 
 namespace qv::platform {
@@ -41,34 +41,36 @@ class X11ScreenCaptureController final : public ScreenCaptureController {
   void stopCapture() override;
 
  private:
+  using Gate = DelegateGate<ScreenCaptureControllerDelegate>;
   /// One capture thread. What the thread uses is shared with it: it may outlive the controller
   /// for a moment when that is destroyed from within a callback.
   struct Run {
     FileDescriptor stopEvent{::eventfd(0, EFD_CLOEXEC | EFD_NONBLOCK)};
+    CallbackGate::Time time = 0;
     std::atomic<bool> hasEnded = false;
     std::thread thread;
   };
-  CaptureEvents eventsOf(uint64_t run);
+  CaptureEvents eventsOf(CallbackGate::Time time);
   static void end(std::shared_ptr<Run> run);
 
   const CaptureParameters parameters_;
   const std::shared_ptr<X11DisplayClone> clone_;
   Clock& clock_;
-  const std::shared_ptr<CaptureGate> gate_ = std::make_shared<CaptureGate>();
+  const std::shared_ptr<Gate> gate_ = std::make_shared<Gate>();
   std::mutex mutex_;
   std::shared_ptr<Run> run_;  // guarded by mutex_
 };
 
-CaptureEvents X11ScreenCaptureController::eventsOf(uint64_t run) {
+CaptureEvents X11ScreenCaptureController::eventsOf(CallbackGate::Time time) {
   CaptureEvents events;
-  events.sample = [this, gate = gate_, run](const SampleBufferRef& sample) {
-    return gate->enter(run, [&](auto& d) { d.screenCaptureControllerDidReceiveSampleBuffer(*this, sample, 0); });
+  events.sample = [this, gate = gate_, time](const SampleBufferRef& sample) {
+    return gate->enter(time, [&](auto& d) { d.screenCaptureControllerDidReceiveSampleBuffer(*this, sample, 0); });
   };
-  events.failed = [this, gate = gate_, run](int32_t status) {
-    gate->enter(run, [&](auto& d) { d.screenCaptureControllerDidFailWithStatus(*this, status); });
+  events.failed = [this, gate = gate_, time](int32_t status) {
+    gate->enter(time, [&](auto& d) { d.screenCaptureControllerDidFailWithStatus(*this, status); });
   };
-  events.serverLost = [this, gate = gate_, run] {
-    gate->enter(run, [&](auto& d) { d.screenCaptureControllerMediaServicesWereReset(*this); });
+  events.serverLost = [this, gate = gate_, time] {
+    gate->enter(time, [&](auto& d) { d.screenCaptureControllerMediaServicesWereReset(*this); });
   };
   return events;
 }
@@ -82,12 +84,13 @@ void X11ScreenCaptureController::startCapture() {
   parameters.mode = shown.mode;
   parameters.contexts = shown.contexts;
   run_ = std::make_shared<Run>();
-  run_->thread = std::thread([run = run_, gate = gate_, &clock = clock_, parameters = std::move(parameters),
-                              events = eventsOf(gate_->open())] {
-    const ScopedSigpipeBlock noSigpipe;
-    CaptureLoop(parameters, events, clock, run->stopEvent.get()).run();
-    run->hasEnded = true;
-  });
+  run_->time = gate_->open();
+  run_->thread = std::thread(
+      [run = run_, gate = gate_, &clock = clock_, parameters = std::move(parameters), events = eventsOf(run_->time)] {
+        const ScopedSigpipeBlock noSigpipe;
+        CaptureLoop(parameters, events, clock, run->stopEvent.get()).run();
+        run->hasEnded = true;
+      });
 }
 
 void X11ScreenCaptureController::stopCapture() {
@@ -96,9 +99,10 @@ void X11ScreenCaptureController::stopCapture() {
     std::lock_guard lock(mutex_);
     run = std::move(run_);
   }
-  if (run) ::eventfd_write(run->stopEvent.get(), 1);
-  gate_->close();
-  if (run) end(std::move(run));
+  if (!run) return gate_->awaitIdle();
+  ::eventfd_write(run->stopEvent.get(), 1);
+  gate_->close(run->time);
+  end(std::move(run));
 }
 
 void X11ScreenCaptureController::end(std::shared_ptr<Run> run) {

@@ -61,11 +61,11 @@ RecorderClient::RecorderClient(std::shared_ptr<platform::IPCService> ipc, platfo
                                platform::Executor& executor, quorvel::RecorderOptions options)
     : ipc_(std::move(ipc)),
       queue_(std::make_shared<platform::SerialQueue>("com.tarnwick.quorvel.client", executor)),
-      gate_(std::make_shared<CallbackGate>(std::move(options.executor), executor)),
-      session_(RecorderSession::create(*ipc_, timers, queue_, gate_, std::move(options.events))) {}
+      callbacks_(std::make_shared<ApplicationCallbacks>(std::move(options.executor), executor)),
+      session_(RecorderSession::create(*ipc_, timers, queue_, callbacks_, std::move(options.events))) {}
 
 RecorderClient::~RecorderClient() {
-  gate_->close();
+  callbacks_->close();
   const auto close = [this] { session_->link().close(); };
   // A handler whose executor runs it at once may destroy the recorder on our own queue.
   queue_->isOnQueue() ? close() : queue_->sync(close);
@@ -74,8 +74,8 @@ RecorderClient::~RecorderClient() {
 template <typename Result>
 void RecorderClient::request(const char* member, IPCArguments arguments, std::function<void(Result)> handler,
                              Result (*decode)(const IPCArguments&)) {
-  auto answer = [gate = gate_, handler = std::move(handler)](Result result) {
-    if (handler) gate->post([handler, result = std::move(result)]() mutable { handler(std::move(result)); });
+  auto answer = [callbacks = callbacks_, handler = std::move(handler)](Result result) {
+    if (handler) callbacks->post([handler, result = std::move(result)]() mutable { handler(std::move(result)); });
   };
   queue_->async(std::weak_ptr(session_), [member, arguments = std::move(arguments), answer = std::move(answer),
                                           decode](RecorderSession& session) mutable {
@@ -97,8 +97,8 @@ void RecorderClient::send(const char* member, IPCArguments arguments, FailureHan
 }
 
 RecorderClient::FailureHandler RecorderClient::failure(FailureHandler onFailure) const {
-  return [gate = gate_, onFailure = std::move(onFailure)](quorvel::Error error) {
-    if (onFailure) gate->post([onFailure, error = std::move(error)]() mutable { onFailure(std::move(error)); });
+  return [callbacks = callbacks_, onFailure = std::move(onFailure)](quorvel::Error error) {
+    if (onFailure) callbacks->post([onFailure, error = std::move(error)]() mutable { onFailure(std::move(error)); });
   };
 }
 
@@ -106,7 +106,7 @@ void RecorderClient::start(quorvel::StartOptions options, std::function<void(Sta
   // The endpoint is the caller's only during this call.
   auto arguments = startArguments(options);
   if (!arguments) {
-    gate_->post([handler = std::move(handler)] {
+    callbacks_->post([handler = std::move(handler)] {
       if (handler) handler({libraryError(quorvel::kErrorUnknown, "the listener endpoint is not a descriptor")});
     });
     return;
@@ -205,6 +205,6 @@ void RecorderClient::reportCameraUsage(int32_t cameraPosition, FailureHandler on
   send("reportCameraUsage", {cameraPosition}, std::move(onFailure));
 }
 
-uint64_t RecorderClient::droppedSamples() const { return gate_->droppedSamples(); }
+uint64_t RecorderClient::droppedSamples() const { return callbacks_->droppedSamples(); }
 
 }  // namespace qv::client

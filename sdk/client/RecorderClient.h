@@ -4,7 +4,7 @@
 
 #include "platform/IPC.h"
 #include "platform/threads/Timer.h"
-#include "sdk/client/CallbackGate.h"
+#include "sdk/client/ApplicationCallbacks.h"
 #include "sdk/client/quorvel/Recorder.h"
 
 namespace qv::client {
@@ -62,7 +62,7 @@ class RecorderClient final : public quorvel::Recorder {
 
   const std::shared_ptr<platform::IPCService> ipc_;
   const std::shared_ptr<platform::SerialQueue> queue_;
-  const std::shared_ptr<CallbackGate> gate_;
+  const std::shared_ptr<ApplicationCallbacks> callbacks_;
   const std::shared_ptr<RecorderSession> session_;
 };
 

@@ -33,8 +33,9 @@ const char* activationMember(bool active) { return active ? "clientDidBecomeActi
 
 std::shared_ptr<RecorderSession> RecorderSession::create(platform::IPCService& ipc, platform::TimerService& timers,
                                                          std::shared_ptr<platform::SerialQueue> queue,
-                                                         std::shared_ptr<CallbackGate> gate, quorvel::Events events) {
-  std::shared_ptr<RecorderSession> session(new RecorderSession(std::move(gate), std::move(events)));
+                                                         std::shared_ptr<ApplicationCallbacks> callbacks,
+                                                         quorvel::Events events) {
+  std::shared_ptr<RecorderSession> session(new RecorderSession(std::move(callbacks), std::move(events)));
   const std::weak_ptr<RecorderSession> weak = session;
   DaemonLink::Delegate delegate;
   delegate.connected = [weak] {
@@ -48,13 +49,13 @@ std::shared_ptr<RecorderSession> RecorderSession::create(platform::IPCService& i
   return session;
 }
 
-RecorderSession::RecorderSession(std::shared_ptr<CallbackGate> gate, quorvel::Events events)
-    : gate_(std::move(gate)), events_(std::move(events)) {}
+RecorderSession::RecorderSession(std::shared_ptr<ApplicationCallbacks> callbacks, quorvel::Events events)
+    : callbacks_(std::move(callbacks)), events_(std::move(events)) {}
 
 template <typename... Parameters, typename... Given>
 void RecorderSession::tell(const std::function<void(Parameters...)>& event, Given... arguments) {
   if (!event) return;
-  gate_->post([event, ... arguments = std::move(arguments)]() mutable { event(std::move(arguments)...); });
+  callbacks_->post([event, ... arguments = std::move(arguments)]() mutable { event(std::move(arguments)...); });
 }
 
 void RecorderSession::start(IPCArguments arguments, std::function<void(StartResult)> handler) {
@@ -132,15 +133,17 @@ void RecorderSession::daemonStopped(StopResult result) {
 void RecorderSession::receiveFrame(const IPCArguments& arguments) {
   auto frame = events_.videoFrame ? videoFrameFromWire(arguments) : std::nullopt;
   if (!frame) return;
-  gate_->postSample(CallbackGate::SampleKind::Video,
-                    [event = events_.videoFrame, frame = std::move(*frame)]() mutable { event(std::move(frame)); });
+  callbacks_->postSample(
+      ApplicationCallbacks::SampleKind::Video,
+      [event = events_.videoFrame, frame = std::move(*frame)]() mutable { event(std::move(frame)); });
 }
 
 void RecorderSession::receiveSound(const IPCArguments& arguments) {
   auto sample = events_.audioSample ? audioSampleFromWire(arguments) : std::nullopt;
   if (!sample || !sound_.place(*sample, pauses_)) return;
-  gate_->postSample(CallbackGate::SampleKind::Audio,
-                    [event = events_.audioSample, sample = std::move(*sample)]() mutable { event(std::move(sample)); });
+  callbacks_->postSample(
+      ApplicationCallbacks::SampleKind::Audio,
+      [event = events_.audioSample, sample = std::move(*sample)]() mutable { event(std::move(sample)); });
 }
 
 void RecorderSession::receive(std::string_view member, const IPCArguments& arguments) {

@@ -7,7 +7,7 @@
 #include <optional>
 #include <string>
 
-#include "sdk/client/CallbackGate.h"
+#include "sdk/client/ApplicationCallbacks.h"
 #include "sdk/client/DaemonLink.h"
 #include "sdk/common/SoundTimeline.h"
 
@@ -17,7 +17,7 @@ namespace qv::client {
 ///
 /// Follows whether a recording is in progress, so that the loss of the daemon is told as its end, and
 /// repeats the application's activation on each new connection. Brings the daemon's callbacks to
-/// the application through the gate.
+/// the application, as its callbacks run.
 ///
 /// Threading: on its queue only.
 class RecorderSession : public std::enable_shared_from_this<RecorderSession> {
@@ -25,10 +25,10 @@ class RecorderSession : public std::enable_shared_from_this<RecorderSession> {
   /// The session is not of use before it is in a shared pointer; hence not a constructor.
   static std::shared_ptr<RecorderSession> create(platform::IPCService& ipc, platform::TimerService& timers,
                                                  std::shared_ptr<platform::SerialQueue> queue,
-                                                 std::shared_ptr<CallbackGate> gate, quorvel::Events events);
+                                                 std::shared_ptr<ApplicationCallbacks> callbacks,
+                                                 quorvel::Events events);
 
   [[nodiscard]] DaemonLink& link() { return *link_; }
-  [[nodiscard]] CallbackGate& gate() { return *gate_; }
 
   void start(platform::IPCArguments arguments, std::function<void(quorvel::StartResult)> handler);
   void stop(const char* member, platform::IPCArguments arguments, std::function<void(quorvel::StopResult)> handler);
@@ -37,7 +37,7 @@ class RecorderSession : public std::enable_shared_from_this<RecorderSession> {
   void receive(std::string_view member, const platform::IPCArguments& arguments);
 
  private:
-  RecorderSession(std::shared_ptr<CallbackGate> gate, quorvel::Events events);
+  RecorderSession(std::shared_ptr<ApplicationCallbacks> callbacks, quorvel::Events events);
   void connected();
   void lost();
   void receiveFrame(const platform::IPCArguments& arguments);
@@ -48,7 +48,7 @@ class RecorderSession : public std::enable_shared_from_this<RecorderSession> {
   template <typename... Parameters, typename... Given>
   void tell(const std::function<void(Parameters...)>& event, Given... arguments);
 
-  const std::shared_ptr<CallbackGate> gate_;
+  const std::shared_ptr<ApplicationCallbacks> callbacks_;
   const quorvel::Events events_;
   std::shared_ptr<DaemonLink> link_;
   bool recording_ = false;

@@ -6,7 +6,16 @@
 namespace qv::platform::test {
 namespace {
 
-class ConnectionTest : public SdBusTest {};
+class ConnectionTest : public SdBusTest {
+ protected:
+  ConnectionTest() : SdBusTest(options()) {}
+  /// Every peer here reads: none is to be given up because the machine is busy.
+  static SdBusIPCOptions options() {
+    SdBusIPCOptions patient;
+    patient.drainMilliseconds = std::chrono::milliseconds(kNever).count();
+    return patient;
+  }
+};
 
 SharedFileDescriptor descriptorFor(const std::string& text) {
   int ends[2];

@@ -1,12 +1,11 @@
 #pragma once
 
 #include <atomic>
-#include <condition_variable>
 #include <cstdint>
 #include <functional>
 #include <memory>
-#include <mutex>
 
+#include "platform/threads/CallbackGate.h"
 #include "platform/threads/SerialQueue.h"
 
 namespace qv::client {
@@ -17,7 +16,7 @@ namespace qv::client {
 /// counted), so that frames go back to the daemon and memory does not grow.
 ///
 /// Threading: thread-safe.
-class CallbackGate : public std::enable_shared_from_this<CallbackGate> {
+class ApplicationCallbacks : public std::enable_shared_from_this<ApplicationCallbacks> {
  public:
   using Executor = std::function<void(std::function<void()>)>;
   enum class SampleKind { Video, Audio };
@@ -27,25 +26,18 @@ class CallbackGate : public std::enable_shared_from_this<CallbackGate> {
   static constexpr int kMaxWaitingAudio = 64;
 
   /// Without the application's `executor`, callbacks run on a serial queue of `threads`.
-  CallbackGate(Executor executor, platform::Executor& threads);
+  ApplicationCallbacks(Executor executor, platform::Executor& threads);
 
   void post(std::function<void()> callback);
   void postSample(SampleKind kind, std::function<void()> callback);
   /// No callback begins from here on, and none is running when this returns, unless called from one.
-  void close();
+  void close() { gate_.close(); }
   [[nodiscard]] uint64_t droppedSamples() const { return dropped_; }
 
  private:
-  void run(const std::function<void()>& callback);
-  [[nodiscard]] bool enter();
-  void leave();
-
   platform::SerialQueue queue_;
   const Executor executor_;
-  std::mutex mutex_;
-  std::condition_variable idle_;
-  bool closed_ = false;
-  int running_ = 0;
+  platform::CallbackGate gate_;
   std::atomic<int> waitingVideo_ = 0, waitingAudio_ = 0;
   std::atomic<uint64_t> dropped_ = 0;
 };

@@ -11,7 +11,7 @@
 
 namespace qv::platform {
 
-namespace sdbus {
+namespace logind {
 class LogindLink;
 }
 
@@ -46,7 +46,7 @@ class LogindKeepAlive final : public KeepAliveService, public SuspendMonitor {
 
  private:
   const std::function<void(bool)> activityHandler_;
-  const std::unique_ptr<sdbus::LogindLink> link_;
+  const std::unique_ptr<logind::LogindLink> link_;
   mutable std::mutex mutex_;
   int count_ = 0;
 };

@@ -17,7 +17,7 @@
 #include <vector>
 
 #include "platform/base/FileDescriptor.h"
-#include "tests/sdbus/SdBusTest.h"
+#include "tests/fakes/Events.h"
 
 namespace qv::platform::test {
 

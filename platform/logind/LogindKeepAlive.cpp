@@ -1,15 +1,15 @@
-#include "platform/sdbus/LogindKeepAlive.h"
+#include "platform/logind/LogindKeepAlive.h"
 
 #include <utility>
 
-#include "platform/sdbus/LogindLink.h"
+#include "platform/logind/LogindLink.h"
 #include "platform/threads/Log.h"
 
 namespace qv::platform {
 
 LogindKeepAlive::LogindKeepAlive(LogindKeepAliveOptions options)
     : activityHandler_(std::move(options.activityHandler)),
-      link_(std::make_unique<sdbus::LogindLink>(std::move(options.busAddress))) {}
+      link_(std::make_unique<logind::LogindLink>(std::move(options.busAddress))) {}
 
 LogindKeepAlive::~LogindKeepAlive() { link_->stop(); }
 

@@ -1,10 +1,10 @@
-#include "platform/sdbus/LogindKeepAlive.h"
+#include "platform/logind/LogindKeepAlive.h"
 
 #include <algorithm>
 #include <set>
 
 #include "tests/fakes/LogRecorder.h"
-#include "tests/sdbus/FakeLogind.h"
+#include "tests/logind/FakeLogind.h"
 
 namespace qv::platform::test {
 namespace {

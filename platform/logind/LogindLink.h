@@ -1,5 +1,7 @@
 #pragma once
 
+#include <systemd/sd-bus.h>
+
 #include <chrono>
 #include <memory>
 #include <mutex>
@@ -7,10 +9,9 @@
 
 #include "platform/SuspendMonitor.h"
 #include "platform/base/FileDescriptor.h"
-#include "platform/sdbus/Handles.h"
-#include "platform/sdbus/IOThread.h"
+#include "platform/threads/EventLoop.h"
 
-namespace qv::platform::sdbus {
+namespace qv::platform::logind {
 
 /// The daemon's side of org.freedesktop.login1: two inhibitors and the announcement of sleep, on a bus
 /// connection that exists between `open` and `close`.
@@ -19,7 +20,7 @@ namespace qv::platform::sdbus {
 /// television that nobody touches does not sleep in mid-recording. "sleep" is delayed only: whoever
 /// presses the button shall have it, by default 5 s later at most (InhibitDelayMaxSec of logind.conf).
 ///
-/// Threading: `open`, `close`, `stop` and `setHandlers` from any thread; the rest on the I/O thread.
+/// Threading: `open`, `close`, `stop` and `setHandlers` from any thread; the rest on the loop.
 class LogindLink {
  public:
   /// `busAddress`: empty for the system bus.
@@ -28,7 +29,7 @@ class LogindLink {
   void open();
   void close();
   /// Ends the thread; nothing happens after it. Not to be called by a handler.
-  void stop() { io_.stop(); }
+  void stop() { loop_.stop(); }
   void setHandlers(SuspendHandlers handlers);
 
  private:
@@ -54,14 +55,17 @@ class LogindLink {
   const std::string busAddress_;
   std::mutex mutex_;
   SuspendHandlers handlers_;  // guarded by mutex_
-  // I/O thread only:
-  BusHandle bus_;
-  IOThread::Token watch_ = 0, timer_ = 0;
-  int fd_ = -1;
+  // The loop's:
+  struct BusCloser {
+    void operator()(sd_bus* bus) const { sd_bus_close_unref(bus); }
+  };
+  std::unique_ptr<sd_bus, BusCloser> bus_;
+  EventLoop::Watch watch_;
+  EventLoop::Timer timer_;
   Inhibitor idle_{this, "idle", "block"}, sleep_{this, "sleep", "delay"};
   /// The time that the device had slept since it was booted, when the present sleep was announced.
   std::chrono::nanoseconds sleptBefore_{0};
-  IOThread io_;  // last: nothing runs on it any more when the rest goes
+  EventLoop loop_;  // last: nothing runs on it any more when the rest goes
 };
 
-}  // namespace qv::platform::sdbus
+}  // namespace qv::platform::logind

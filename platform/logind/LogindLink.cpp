@@ -1,4 +1,4 @@
-#include "platform/sdbus/LogindLink.h"
+#include "platform/logind/LogindLink.h"
 
 #include <fcntl.h>
 #include <poll.h>
@@ -11,7 +11,7 @@
 
 #include "platform/threads/Log.h"
 
-namespace qv::platform::sdbus {
+namespace qv::platform::logind {
 namespace {
 
 constexpr const char kService[] = "org.freedesktop.login1";
@@ -44,11 +44,11 @@ void tellMissing(const char* what, const char* why) {
 }  // namespace
 
 void LogindLink::open() {
-  io_.post([this] { connect(); });
+  loop_.post([this] { connect(); });
 }
 
 void LogindLink::close() {
-  io_.post([this] {
+  loop_.post([this] {
     release(idle_);
     release(sleep_);
     disconnect();
@@ -73,8 +73,7 @@ void LogindLink::connect() {
     bus_.reset();
     return tellMissing("system bus", std::strerror(-r));
   }
-  fd_ = sd_bus_get_fd(opened);
-  watch_ = io_.watch(fd_, EPOLLIN, [this](uint32_t) { process(); });
+  watch_ = loop_.watch(sd_bus_get_fd(opened), EPOLLIN, [this](uint32_t) { process(); });
   (void)sd_bus_match_signal_async(opened, nullptr, kService, kPath, kManager, "PrepareForSleep", onPrepareForSleep,
                                   nullptr, this);
   inhibit(idle_);
@@ -83,8 +82,8 @@ void LogindLink::connect() {
 }
 
 void LogindLink::disconnect() {
-  if (timer_ != 0) io_.cancel(std::exchange(timer_, 0));
-  if (watch_ != 0) io_.unwatch(std::exchange(watch_, 0), fd_);
+  timer_.end();
+  watch_.end();
   // What is still queued is not waited for.
   bus_.reset();
 }
@@ -98,21 +97,18 @@ void LogindLink::process() {
     tellMissing("system bus lost", std::strerror(-events));
     return disconnect();
   }
-  io_.modify(watch_, fd_, (events & POLLIN ? uint32_t{EPOLLIN} : 0) | (events & POLLOUT ? uint32_t{EPOLLOUT} : 0));
+  watch_.setEvents((events & POLLIN ? uint32_t{EPOLLIN} : 0) | (events & POLLOUT ? uint32_t{EPOLLOUT} : 0));
   watchTimeout();
 }
 
 /// sd-bus bounds the time of the authentication and of calls.
 void LogindLink::watchTimeout() {
-  if (timer_ != 0) io_.cancel(std::exchange(timer_, 0));
+  timer_.end();
   uint64_t due = UINT64_MAX;
   if (sd_bus_get_timeout(bus_.get(), &due) < 0 || due == UINT64_MAX) return;
   const auto left =
       std::chrono::ceil<std::chrono::milliseconds>(std::chrono::microseconds(due) - timeOf(CLOCK_MONOTONIC));
-  timer_ = io_.after(std::max(left, std::chrono::milliseconds(0)), [this] {
-    timer_ = 0;
-    process();
-  });
+  timer_ = loop_.after(std::max(left, std::chrono::milliseconds(0)), [this] { process(); });
 }
 
 void LogindLink::inhibit(Inhibitor& inhibitor) {
@@ -158,4 +154,4 @@ void LogindLink::prepareForSleep(bool starts) {
   if (told.willSleep) told.willSleep(hold);
 }
 
-}  // namespace qv::platform::sdbus
+}  // namespace qv::platform::logind
