@@ -31,37 +31,33 @@ Dictionary stateOf(const QVRecordingSession& session) {
 }  // namespace
 
 void QVRecordingManager::addApplicationRequests() {
-  using request::Plain;
   const auto withSession = [this](auto serve) {
     return [this, serve](const Caller& caller, const auto& request, const IPCReply&) {
       if (const Session session = sessions_->find(caller.bundleID())) serve(*session, request);
     };
   };
-  requests_.add<Plain>("clientDidBecomeActive", [this](const Caller& caller, const Plain&, const IPCReply&) {
+  requests_.add<request::DidBecomeActive>([this](const Caller& caller, const auto&, const IPCReply&) {
     QV_LOG(logs::kDaemon, "QVRecordingManager:clientDidBecomeActiveWithBundleID:");
     if (const Session session = sessions_->find(caller.bundleID())) clientDidBecomeActive(session);
   });
-  requests_.add<Plain>("clientDidResignActive", [this](const Caller& caller, const Plain&, const IPCReply&) {
+  requests_.add<request::DidResignActive>([this](const Caller& caller, const auto&, const IPCReply&) {
     QV_LOG(logs::kDaemon, "QVRecordingManager:clientDidResignActiveWithBundleID:");
     if (caller.bundleID()) exemptions_.noteBackground(*caller.bundleID(), platform_.clock->now());
   });
-  requests_.add<Plain>("synchronousGetCurrentState", [this](const Caller& caller, const Plain&, const IPCReply& reply) {
+  requests_.add<request::GetState>([this](const Caller& caller, const auto&, const IPCReply& reply) {
     const Session session = sessions_->find(caller.bundleID());
     reply({Value(session ? stateOf(*session) : Dictionary{})});
   });
-  requests_.add<request::Consent>("setHasUserConsentForCamera", withSession([](auto& session, const auto& request) {
-                                    session.setHasUserConsentForCamera(request.consent);
-                                  }));
-  requests_.add<request::Consent>("setHasUserConsentForMicrophone", withSession([](auto& session, const auto& request) {
-                                    session.setHasUserConsentForMicrophone(request.consent);
-                                  }));
-  requests_.add<request::SetBroadcastURL>("setBroadcastURL", withSession([](auto& session, const auto& request) {
-                                            const std::string& url = request.broadcastURL;
-                                            session.setBroadcastURL(url.empty() ? std::nullopt : std::optional(url));
-                                          }));
-  requests_.add<request::Enable>("setMicrophoneEnabledPersistent", withSession([](auto& session, const auto& request) {
-                                   session.setMicrophoneEnabledPersistent(request.enabled);
-                                 }));
+  requests_.add<request::SetCameraConsent>(
+      withSession([](auto& session, const auto& request) { session.setHasUserConsentForCamera(request.consent); }));
+  requests_.add<request::SetMicrophoneConsent>(
+      withSession([](auto& session, const auto& request) { session.setHasUserConsentForMicrophone(request.consent); }));
+  requests_.add<request::SetBroadcastURL>(withSession([](auto& session, const auto& request) {
+    const std::string& url = request.broadcastURL;
+    session.setBroadcastURL(url.empty() ? std::nullopt : std::optional(url));
+  }));
+  requests_.add<request::SetMicrophoneEnabledPersistent>(
+      withSession([](auto& session, const auto& request) { session.setMicrophoneEnabledPersistent(request.enabled); }));
 }
 
 /// Of a former recording, and told a second time: now the application can be expected to listen. What it records now
@@ -80,15 +76,13 @@ void QVRecordingManager::clientDidBecomeActive(const Session& session) {
 }
 
 void QVRecordingManager::addBroadcastRequests() {
-  using request::Plain;
-  requests_.add<request::SetupBroadcast>("setupBroadcastWithHostBundleID",
-                                         [this](const Caller& caller, const auto& request, const IPCReply& reply) {
-                                           setupBroadcast(caller, request, reply);
-                                         });
-  requests_.add<Plain>("getCurrentBroadcastImages", [this](const Caller&, const Plain&, const IPCReply& reply) {
+  requests_.add<request::SetupBroadcast>([this](const Caller& caller, const auto& request, const IPCReply& reply) {
+    setupBroadcast(caller, request, reply);
+  });
+  requests_.add<request::GetBroadcastImages>([this](const Caller&, const auto&, const IPCReply& reply) {
     reply({Value(broadcasts_->currentHostAppImage()), Value(broadcasts_->currentExtensionAppImage())});
   });
-  requests_.add<Plain>("getSystemBroadcastExtensionInfo", [this](const Caller&, const Plain&, const IPCReply& reply) {
+  requests_.add<request::GetBroadcastExtensions>([this](const Caller&, const auto&, const IPCReply& reply) {
     broadcasts_->getSystemBroadcastExtensionInfo(
         [reply, context = context_](platform::Array extensions, const std::optional<Error>& error) {
           reply({Value(std::move(extensions)), Value(context->errors.encoded(error))});

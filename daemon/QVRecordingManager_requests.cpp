@@ -27,30 +27,25 @@ void QVRecordingManager::handleCall(const std::shared_ptr<platform::IPCConnectio
 }
 
 void QVRecordingManager::addRecordingRequests() {
-  using request::Plain;
-  requests_.add<request::StartRecording>("startRecordingWindowLayerContextIDs",
-                                         [this](const Caller& caller, const auto& request, const IPCReply& reply) {
-                                           starts_.startRecordingWindowLayerContextIDs(caller, request, reply);
-                                         });
-  requests_.add<Plain>("stopRecordingWithHandler", [this](const Caller& caller, const Plain&, const IPCReply& reply) {
+  requests_.add<request::StartRecording>([this](const Caller& caller, const auto& request, const IPCReply& reply) {
+    starts_.startRecordingWindowLayerContextIDs(caller, request, reply);
+  });
+  requests_.add<request::Stop>([this](const Caller& caller, const auto&, const IPCReply& reply) {
     QV_LOG(logs::kDaemon, "QVRecordingManager: stopRecordingWithHandler:");
     requestStop(caller, 0, 0, reply);
   });
-  requests_.add<request::StopTrimmed>("stopRecordingWithStartClipDuration",
-                                      [this](const Caller& caller, const auto& request, const IPCReply& reply) {
-                                        requestStop(caller, request.startClipDuration, request.endClipDuration, reply);
-                                      });
-  requests_.add<request::SaveVideo>(
-      "saveVideoToCameraRoll", [this](const Caller& caller, const auto& request, const IPCReply& reply) {
-        handover_->saveVideoToCameraRoll(caller.bundleID().value_or(std::string()), request.movieURL,
-                                         [reply, context = context_](const std::optional<Error>& error) {
-                                           reply({Value(context->errors.encoded(error))});
-                                         });
-      });
-  requests_.add<Plain>(
-      "discardRecordingWithHandler",
-      [this](const Caller& caller, const Plain&, const IPCReply& reply) { discardRecording(caller, reply); });
-  requests_.add<Plain>("pauseRecording", [this](const Caller& caller, const Plain&, const IPCReply&) {
+  requests_.add<request::StopTrimmed>([this](const Caller& caller, const auto& request, const IPCReply& reply) {
+    requestStop(caller, request.startClipDuration, request.endClipDuration, reply);
+  });
+  requests_.add<request::SaveVideo>([this](const Caller& caller, const auto& request, const IPCReply& reply) {
+    handover_->saveVideoToCameraRoll(caller.bundleID().value_or(std::string()), request.movieURL,
+                                     [reply, context = context_](const std::optional<Error>& error) {
+                                       reply({Value(context->errors.encoded(error))});
+                                     });
+  });
+  requests_.add<request::Discard>(
+      [this](const Caller& caller, const auto&, const IPCReply& reply) { discardRecording(caller, reply); });
+  requests_.add<request::Pause>([this](const Caller& caller, const auto&, const IPCReply&) {
     QV_LOG(logs::kDaemon, "QVRecordingManager:pauseRecording");
     const Session session = sessions_->find(caller.bundleID());
     if (session && session->isRecording())
@@ -58,29 +53,24 @@ void QVRecordingManager::addRecordingRequests() {
         if (const auto self = weakSelf.lock()) self->pauseRecording(session);
       });
   });
-  requests_.add<request::Resume>(
-      "resumeRecordingWithWindowLayerContextID", [this](const Caller& caller, const auto& request, const IPCReply&) {
-        const Session session = sessions_->find(caller.bundleID());
-        if (!session || !session->isRecording()) return;
-        session->recording()->whenAnswered(
-            [this, caller, session, contextID = request.contextID] { resumeRecording(caller, session, contextID); });
-      });
-  requests_.add<request::Enable>(
-      "setMicrophoneEnabled", [this](const Caller& caller, const auto& request, const IPCReply&) {
-        QV_LOG(logs::kDaemon, "QVRecordingManager: setMicrophoneEnabled:%i", request.enabled ? 1 : 0);
-        const Session session = sessions_->find(caller.bundleID());
-        if (session && session->isRecording()) session->setMicrophoneEnabled(request.enabled);
-      });
-  requests_.add<request::UpdateProcessID>("updateProcessIDForAudioCaptureWithPID",
-                                          [this](const Caller& caller, const auto& request, const IPCReply&) {
-                                            updateProcessID(caller, request.processID);
-                                          });
-  requests_.add<request::ReportCameraUsage>("reportCameraUsage",
-                                            [this](const Caller& caller, const auto& request, const IPCReply&) {
-                                              const Session session = sessions_->find(caller.bundleID());
-                                              if (session && session->isRecording())
-                                                session->recording()->sessionReportCameraUsage(request.cameraPosition);
-                                            });
+  requests_.add<request::Resume>([this](const Caller& caller, const auto& request, const IPCReply&) {
+    const Session session = sessions_->find(caller.bundleID());
+    if (!session || !session->isRecording()) return;
+    session->recording()->whenAnswered(
+        [this, caller, session, contextID = request.contextID] { resumeRecording(caller, session, contextID); });
+  });
+  requests_.add<request::SetMicrophoneEnabled>([this](const Caller& caller, const auto& request, const IPCReply&) {
+    QV_LOG(logs::kDaemon, "QVRecordingManager: setMicrophoneEnabled:%i", request.enabled ? 1 : 0);
+    const Session session = sessions_->find(caller.bundleID());
+    if (session && session->isRecording()) session->setMicrophoneEnabled(request.enabled);
+  });
+  requests_.add<request::UpdateProcessID>([this](const Caller& caller, const auto& request, const IPCReply&) {
+    updateProcessID(caller, request.processID);
+  });
+  requests_.add<request::ReportCameraUsage>([this](const Caller& caller, const auto& request, const IPCReply&) {
+    const Session session = sessions_->find(caller.bundleID());
+    if (session && session->isRecording()) session->recording()->sessionReportCameraUsage(request.cameraPosition);
+  });
 }
 
 /// A stop that was sent together with its start comes after it: the start is answered first.

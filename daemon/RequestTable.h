@@ -7,7 +7,8 @@
 
 #include "daemon/Caller.h"
 #include "daemon/RequestErrors.h"
-#include "daemon/Requests.h"
+#include "platform/threads/Log.h"
+#include "protocol/QVDaemonProtocol.h"
 
 namespace qv {
 
@@ -16,28 +17,32 @@ namespace qv {
 /// Threading: filled before the first call; served on the sequence.
 class RequestTable {
  public:
-  template <typename Request>
+  template <DescribedCall Request>
   using Serve = std::function<void(const Caller&, const Request&, const platform::IPCReply&)>;
 
-  template <typename Request>
-  void add(std::string member, Serve<Request> serve) {
-    entries_.emplace(
-        std::move(member),
-        [serve = std::move(serve)](const Caller& caller, const NamedArguments& arguments,
-                                   const platform::IPCReply& reply) { serve(caller, Request(arguments), reply); });
+  template <DescribedCall Request>
+  void add(Serve<Request> serve) {
+    static_assert(request::All::contains<Request>, "or no client can call it");
+    entries_.emplace(Request::kMember,
+                     [serve = std::move(serve)](const Caller& caller, const platform::IPCArguments& arguments,
+                                                const platform::IPCReply& reply) {
+                       serve(caller, callOf<Request>(arguments), reply);
+                     });
   }
   void serve(const Caller& caller, const platform::IPCOperation& operation, const platform::IPCArguments& arguments,
              const platform::IPCReply& reply) const {
     const auto entry = entries_.find(operation.member);
     if (entry == entries_.end()) {
+      QV_LOG_ERROR(platform::logs::kDaemon, "nobody serves %s", operation.member.c_str());
       reply.fail(requesterror::kNotSupported, operation.member);
     } else {
-      entry->second(caller, NamedArguments(operation, arguments), reply);
+      entry->second(caller, arguments, reply);
     }
   }
 
  private:
-  std::map<std::string, std::function<void(const Caller&, const NamedArguments&, const platform::IPCReply&)>> entries_;
+  std::map<std::string, std::function<void(const Caller&, const platform::IPCArguments&, const platform::IPCReply&)>>
+      entries_;
 };
 
 }  // namespace qv

@@ -8,9 +8,9 @@
 #include "daemon/Caller.h"
 #include "daemon/ForegroundFollower.h"
 #include "daemon/QVBroadcastBook.h"
-#include "daemon/Requests.h"
 #include "daemon/SessionRegistry.h"
 #include "platform/UserAlert.h"
+#include "protocol/QVDaemonProtocol.h"
 #include "ui/QVAcknowledgementAlert.h"
 #include "ui/QVExemptionBook.h"
 

@@ -16,33 +16,14 @@ constexpr const char kAttachments[] = "attachments";
 }  // namespace
 
 const IPCInterface& extensionRequestProtocol() {
-  static const IPCInterface interface {
-    "com.tarnwick.quorveld.QVExtensionRequestProtocol", {
-      {
-        .member = "beginRequest", .arguments = {"t", "aa{sv}"}, .argumentNames = {"request", "items"},
-        .reply = std::vector<std::string>{}, .replyNames = {}
-      }
-    }
-  };
+  static const IPCInterface interface =
+      CallList<extensioncall::BeginRequest>::interface("com.tarnwick.quorveld.QVExtensionRequestProtocol");
   return interface;
 }
 
 const IPCInterface& extensionRequestHostProtocol() {
-  static const IPCInterface interface {
-    "com.tarnwick.quorveld.QVExtensionRequestHostProtocol", {
-      {.member = "completeRequest",
-       .arguments = {"t", "aa{sv}"},
-       .argumentNames = {"request", "items"},
-       .reply = std::nullopt,
-       .replyNames = {}},
-      {
-        .member = "openFile", .arguments = {"s"}, .argumentNames = {"token"}, .reply = std::vector<std::string>{"h"},
-        .replyNames = {
-          "file"
-        }
-      }
-    }
-  };
+  static const IPCInterface interface = CallList<extensioncall::CompleteRequest, extensioncall::OpenFile>::interface(
+      "com.tarnwick.quorveld.QVExtensionRequestHostProtocol");
   return interface;
 }
 

@@ -5,6 +5,7 @@
 #include "platform/Extensions.h"
 #include "platform/IPC.h"
 #include "platform/base/Value.h"
+#include "protocol/Calls.h"
 
 namespace qv {
 
@@ -14,10 +15,9 @@ namespace qv {
 inline constexpr const char kExtensionRequestsEndpointVariable[] = "QUORVEL_EXTENSION_REQUESTS";
 inline constexpr const char kExtensionAuxiliaryEndpointVariable[] = "QUORVEL_EXTENSION_AUXILIARY";
 
-/// Called on the extension: "beginRequest" (t request, aa{sv} items) -> (). It is answered when the request was taken.
+/// Called on the extension.
 const platform::IPCInterface& extensionRequestProtocol();
-/// Called on the daemon: "completeRequest" (t request, aa{sv} items), and "openFile" (s token) -> (h file), which fails
-/// with "com.tarnwick.quorveld.Error.NoSuchFile" for any token that is not this extension's to use.
+/// Called on the daemon.
 const platform::IPCInterface& extensionRequestHostProtocol();
 inline constexpr const char kNoSuchFileErrorName[] = "com.tarnwick.quorveld.Error.NoSuchFile";
 
@@ -25,5 +25,46 @@ inline constexpr const char kNoSuchFileErrorName[] = "com.tarnwick.quorveld.Erro
 /// attachments that are missing or of another type are left out.
 [[nodiscard]] platform::Value valueOfExtensionItems(const std::vector<platform::ExtensionItem>& items);
 [[nodiscard]] std::vector<platform::ExtensionItem> extensionItemsOfValue(const platform::Value& value);
+
+template <>
+struct WireType<std::vector<platform::ExtensionItem>> {
+  static constexpr const char kSignature[] = "aa{sv}";
+  static platform::Value to(const std::vector<platform::ExtensionItem>& items) { return valueOfExtensionItems(items); }
+  static std::vector<platform::ExtensionItem> from(const platform::Value& value) {
+    return extensionItemsOfValue(value);
+  }
+};
+
+namespace extensioncall {
+
+/// Answered when the request was taken.
+struct BeginRequest {
+  static constexpr const char kMember[] = "beginRequest";
+  static constexpr const char kReply[] = "";
+  platform::ExtensionRequestID request = 0;
+  std::vector<platform::ExtensionItem> items;
+  static constexpr auto arguments() {
+    return std::tuple{Argument{"request", &BeginRequest::request}, Argument{"items", &BeginRequest::items}};
+  }
+};
+
+struct CompleteRequest {
+  static constexpr const char kMember[] = "completeRequest";
+  platform::ExtensionRequestID request = 0;
+  std::vector<platform::ExtensionItem> items;
+  static constexpr auto arguments() {
+    return std::tuple{Argument{"request", &CompleteRequest::request}, Argument{"items", &CompleteRequest::items}};
+  }
+};
+
+/// Fails with kNoSuchFileErrorName for any token that is not this extension's to use.
+struct OpenFile {
+  static constexpr const char kMember[] = "openFile";
+  static constexpr const char kReply[] = "h file";
+  std::string token;
+  static constexpr auto arguments() { return std::tuple{Argument{"token", &OpenFile::token}}; }
+};
+
+}  // namespace extensioncall
 
 }  // namespace qv

@@ -5,43 +5,25 @@ namespace qv {
 using platform::IPCInterface;
 
 const IPCInterface& broadcastDaemonProtocol() {
-  static const IPCInterface interface {
-    "com.tarnwick.quorveld.QVBroadcastDaemonProtocol", {
-      {"ping", {}, {}, std::nullopt, {}}, {"updateServiceInfo", {"a{sv}"}, {"serviceInfo"}, std::nullopt, {}},
-          {"updateBroadcastURL", {"s"}, {"broadcastURL"}, std::nullopt, {}}, {
-        "finishBroadcastWithError", {"a{sv}"}, {"error"}, std::nullopt, {}
-      }
-    }
-  };
+  static const IPCInterface interface =
+      broadcastcall::All::interface("com.tarnwick.quorveld.QVBroadcastDaemonProtocol");
   return interface;
 }
 
 const IPCInterface& broadcastExtensionProtocol() {
-  static const IPCInterface interface {
-    "com.tarnwick.quorveld.QVBroadcastExtensionProtocol", {
-      {
-        "processPayload", {"a{sv}"}, {"payload"}, std::vector<std::string>{}, {}
-      }
-    }
-  };
+  static const IPCInterface interface =
+      CallList<broadcastcall::ProcessPayload>::interface("com.tarnwick.quorveld.QVBroadcastExtensionProtocol");
   return interface;
 }
 
 const IPCInterface& extensionVendorProtocol() {
-  static const IPCInterface interface {
-    "com.tarnwick.quorveld.QVExtensionVendorProtocol", {
-      {
-        "setEndpoint", {"h"}, {"endpoint"}, std::vector<std::string>{}, {}
-      }
-    }
-  };
+  static const IPCInterface interface =
+      CallList<broadcastcall::SetEndpoint>::interface("com.tarnwick.quorveld.QVExtensionVendorProtocol");
   return interface;
 }
 
 const IPCInterface& extensionHostProtocol() {
-  static const IPCInterface interface {
-    "com.tarnwick.quorveld.QVExtensionHostProtocol", {}
-  };
+  static const IPCInterface interface = CallList<>::interface("com.tarnwick.quorveld.QVExtensionHostProtocol");
   return interface;
 }
 

@@ -1,20 +1,58 @@
 #pragma once
 
-#include "platform/IPC.h"
+#include "protocol/Calls.h"
 
 /// The interfaces between the daemon and a broadcast upload extension, and the vocabulary of what they carry. The
 /// extension library speaks them too.
 namespace qv {
 
-/// Exported by the daemon to the extension: "ping" (), "updateServiceInfo" (a{sv}), "updateBroadcastURL" (s),
-/// "finishBroadcastWithError" (a{sv}). All one-way.
+/// Exported by the daemon to the extension. All operations are one-way.
 const platform::IPCInterface& broadcastDaemonProtocol();
-/// Exported by the extension: "processPayload" (a{sv}) -> (), answered when the payload was processed.
+/// Exported by the extension.
 const platform::IPCInterface& broadcastExtensionProtocol();
-/// Exported by the extension on the auxiliary connection of a request: "setEndpoint" (h) -> ().
+/// Exported by the extension on the auxiliary connection of a request.
 const platform::IPCInterface& extensionVendorProtocol();
 /// Exported by the daemon on that connection; it has no operations.
 const platform::IPCInterface& extensionHostProtocol();
+
+namespace broadcastcall {
+
+struct Ping : NoArguments {
+  static constexpr const char kMember[] = "ping";
+};
+struct UpdateServiceInfo {
+  static constexpr const char kMember[] = "updateServiceInfo";
+  platform::Dictionary serviceInfo;
+  static constexpr auto arguments() { return std::tuple{Argument{"serviceInfo", &UpdateServiceInfo::serviceInfo}}; }
+};
+struct UpdateBroadcastURL {
+  static constexpr const char kMember[] = "updateBroadcastURL";
+  platform::URL broadcastURL;
+  static constexpr auto arguments() { return std::tuple{Argument{"broadcastURL", &UpdateBroadcastURL::broadcastURL}}; }
+};
+struct FinishBroadcastWithError {
+  static constexpr const char kMember[] = "finishBroadcastWithError";
+  platform::Dictionary error;  ///< encoded
+  static constexpr auto arguments() { return std::tuple{Argument{"error", &FinishBroadcastWithError::error}}; }
+};
+using All = CallList<Ping, UpdateServiceInfo, UpdateBroadcastURL, FinishBroadcastWithError>;
+
+/// Answered when the payload was processed. SampleCoding.h makes and reads payloads.
+struct ProcessPayload {
+  static constexpr const char kMember[] = "processPayload";
+  static constexpr const char kReply[] = "";
+  platform::Dictionary payload;
+  static constexpr auto arguments() { return std::tuple{Argument{"payload", &ProcessPayload::payload}}; }
+};
+
+struct SetEndpoint {
+  static constexpr const char kMember[] = "setEndpoint";
+  static constexpr const char kReply[] = "";
+  platform::SharedFileDescriptor endpoint;
+  static constexpr auto arguments() { return std::tuple{Argument{"endpoint", &SetEndpoint::endpoint}}; }
+};
+
+}  // namespace broadcastcall
 
 /// How a broadcast's samples leave the daemon: as short movies, or one by one over the link.
 enum class BroadcastProcessMode : int64_t { MovieClips = 0, Samples = 1 };

@@ -4,7 +4,6 @@
 #include <memory>
 #include <mutex>
 
-#include "protocol/SampleType.h"
 #include "session/QVClientProxy.h"
 #include "session/RecordingOutput.h"
 

@@ -7,7 +7,7 @@
 #include "platform/IPC.h"
 #include "platform/threads/Guarded.h"
 #include "platform/threads/RareLog.h"
-#include "protocol/QVSharedFrameObject.h"
+#include "protocol/SampleCoding.h"
 #include "support/QuorvelErrors.h"
 
 namespace qv {
@@ -34,23 +34,17 @@ class QVClientProxy {
                               const std::optional<platform::URL>& movieURL);
   void updateBroadcastServiceInfo(const platform::Dictionary& serviceInfo);
   void updateBroadcastURL(const platform::URL& broadcastURL);
-  /// `timingData`: one raw SampleTimingInfo, 72 bytes.
-  void captureHandlerWithSample(const QVSharedFrameObject& sample, platform::Data timingData);
-  /// `absdData`: one raw AudioStreamDescription, 40 bytes. `bufferType`: 2 app audio, 3 microphone.
-  void captureHandlerWithAudioSample(platform::Data sample, platform::Data absdData, int64_t itemCount,
-                                     int64_t bufferType, platform::Data timingData);
-  /// `pauses`: one raw MediaTime, 24 bytes: the sum of the pauses before the samples that follow. To be sent from the
-  /// thread that sends them, before the first sample of each capture and before the first with another sum: it is never
-  /// dropped, and messages keep their order.
-  void captureTimelineDidChange(platform::Data pauses);
+  void captureHandlerWithSample(const PictureMessage& picture);
+  void captureHandlerWithAudioSample(SoundMessage sound);
+  /// The sum of the pauses before the samples that follow.
+  void captureTimelineDidChange(platform::MediaTime pauses);
   void recordingLockInterrupted(const platform::Error& error);
   /// Offered, not called by this daemon.
   void recordingTimerDidUpdate(const std::string& time);
 
  private:
   /// `failures` (may be nothing) counts those of a member that is sent all the time.
-  void send(const char* member, platform::IPCArguments arguments, const char* failureLine,
-            const std::shared_ptr<platform::RareLog>& failures = nullptr);
+  void send(OutgoingCall call, const char* failureLine, const std::shared_ptr<platform::RareLog>& failures = nullptr);
 
   const QuorvelErrors& errors_;
   const std::string bundleIdentifier_;

@@ -49,7 +49,7 @@ class SamplesOutput final : public RecordingOutput, public std::enable_shared_fr
   void _notifyExtensionOfAction(BroadcastAction action, std::function<void()> completion);
   /// The completion runs in any case: also when the extension fails, or has not answered in time.
   void notifyExtensionAndWait(BroadcastAction action, std::function<void()> completion);
-  void _notifyExtensionOfVideoSampleBuffer(const PlacedPicture& picture, SampleType type, uint32_t sampleOrientation);
+  void _notifyExtensionOfVideoSampleBuffer(const PlacedPicture& picture, uint32_t sampleOrientation);
   void _notifyExtensionOfAudioSampleBuffer(const PlacedSound& sound, SampleType type);
   void _notifyExtensionOfFrontmostProcessBundleID(const std::string& bundleID);
 

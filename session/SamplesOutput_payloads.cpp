@@ -1,15 +1,13 @@
 #include <utility>
 
-#include "platform/base/RawRecord.h"
 #include "platform/threads/Log.h"
+#include "protocol/SampleCoding.h"
 #include "session/PictureTransform.h"
 #include "session/SamplesOutput.h"
 
 namespace qv {
 
-using platform::Data;
 using platform::SampleBufferRef;
-using platform::Value;
 namespace logs = platform::logs;
 
 SamplesOutput::Link SamplesOutput::link() {
@@ -27,13 +25,12 @@ void SamplesOutput::_notifyExtensionOfAction(BroadcastAction action, std::functi
     return;
   }
   BroadcastPayload payload;
-  payload.entries = {{broadcastpayload::kActionType, Value(static_cast<int64_t>(action))},
-                     {broadcastpayload::kUserInfo, Value(plan_.info.extensionUserInfo)}};
+  payload.entries = payloadOf(ActionMessage{action, plan_.info.extensionUserInfo});
   to->processPayload(std::move(payload), [completion = std::move(completion)](PayloadOutcome) { completion(); });
 }
 
 bool SamplesOutput::appendVideo(const PlacedPicture& picture) {
-  _notifyExtensionOfVideoSampleBuffer(picture, SampleType::Video, orientationFromVellTransform(picture.transformFlags));
+  _notifyExtensionOfVideoSampleBuffer(picture, orientationFromVellTransform(picture.transformFlags));
   return true;
 }
 
@@ -49,18 +46,18 @@ void SamplesOutput::tellFrontmostApplication(const std::string& bundleID) {
   _notifyExtensionOfFrontmostProcessBundleID(bundleID);
 }
 
-void SamplesOutput::_notifyExtensionOfVideoSampleBuffer(const PlacedPicture& picture, SampleType type,
-                                                        uint32_t sampleOrientation) {
+void SamplesOutput::_notifyExtensionOfVideoSampleBuffer(const PlacedPicture& picture, uint32_t sampleOrientation) {
   const Link to = link();
   if (!to) return;
   const SampleBufferRef& sample = picture.sample;
   BroadcastPayload payload;
   payload.kind = BroadcastPayload::Kind::Video;
-  payload.entries = {{broadcastpayload::kVideoOrientation, Value(sampleOrientation)},
-                     {broadcastpayload::kSampleType, Value(static_cast<int64_t>(type))},
-                     {broadcastpayload::kTimingInfo, Value(rawBytes(sample->timing().front()))},
-                     {broadcastpayload::kPauses, Value(rawBytes(picture.pauses))}};
-  payload.frame.setSharedFrame(sample->image()->sharedFrame());
+  const PictureMessage message{.surface = sample->image()->sharedFrame(),
+                               .timing = sample->timing().front(),
+                               .pauses = picture.pauses,
+                               .orientation = sampleOrientation};
+  payload.entries = payloadOf(message);
+  payload.frame.setSharedFrame(message.surface);
   to->processPayload(std::move(payload), [](PayloadOutcome outcome) {
     if (outcome != PayloadOutcome::Answered) return;
     QV_LOG_DEBUG(logs::kSession, "quorveld sending video payload to broadcast extension...");
@@ -72,18 +69,13 @@ void SamplesOutput::_notifyExtensionOfAudioSampleBuffer(const PlacedSound& sound
   if (sound.sample->presentationTime() <= platform::MediaTime::zero()) return;
   const Link to = link();
   if (!to) return;
-  const SampleBufferRef& sample = sound.sample;
-  const auto bytes = sample->data()->bytes();
-  const platform::AudioStreamDescription& format = sample->audioFormat()->streamDescription;
+  SoundMessage message = makeSoundMessage(type, *sound.sample);
+  message.pauses = sound.pauses;
+  const double sampleRate = message.format.sampleRate;
   BroadcastPayload payload;
   payload.kind = type == SampleType::Microphone ? BroadcastPayload::Kind::Microphone : BroadcastPayload::Kind::AppAudio;
-  payload.duration = format.sampleRate > 0 ? static_cast<double>(sample->numSamples()) / format.sampleRate : 0;
-  payload.entries = {{broadcastpayload::kSampleType, Value(static_cast<int64_t>(type))},
-                     {broadcastpayload::kAudioBufferList, Value(Data(bytes.begin(), bytes.end()))},
-                     {broadcastpayload::kAudioFormatDescription, Value(rawBytes(format))},
-                     {broadcastpayload::kTimingInfo, Value(rawBytes(sample->timing().front()))},
-                     {broadcastpayload::kNumSamples, Value(sample->numSamples())},
-                     {broadcastpayload::kPauses, Value(rawBytes(sound.pauses))}};
+  payload.duration = sampleRate > 0 ? static_cast<double>(message.numSamples) / sampleRate : 0;
+  payload.entries = payloadOf(std::move(message));
   to->processPayload(std::move(payload), [](PayloadOutcome outcome) {
     if (outcome != PayloadOutcome::Answered) return;
     QV_LOG_DEBUG(logs::kSession, "quorveld sending audio payload to broadcast extension...");
@@ -94,7 +86,7 @@ void SamplesOutput::_notifyExtensionOfFrontmostProcessBundleID(const std::string
   const Link to = link();
   if (!to) return;
   BroadcastPayload payload;
-  payload.entries = {{broadcastpayload::kFrontmostApp, Value(bundleID)}};
+  payload.entries = payloadOf(FrontmostMessage{bundleID});
   to->processPayload(std::move(payload), [](PayloadOutcome outcome) {
     if (outcome != PayloadOutcome::Answered) return;
     QV_LOG(logs::kSession, "quorveld sending frontmost app bundleID to broadcast extension...");

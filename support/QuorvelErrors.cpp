@@ -4,8 +4,6 @@
 
 namespace qv {
 
-static_assert(errorcode::kUnknown == kFirstRecordingErrorCode && errorcode::kMixingFailure == kLastRecordingErrorCode);
-
 platform::Error QuorvelErrors::_qvUserErrorForCode(int64_t code,
                                                    const std::optional<platform::Dictionary>& userInfo) const {
   platform::Dictionary information = userInfo.value_or(platform::Dictionary{});

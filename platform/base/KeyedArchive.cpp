@@ -2,7 +2,9 @@
 
 #include <cerrno>
 #include <cstring>
-#include <optional>
+#include <type_traits>
+
+#include "platform/base/ValueTypes.h"
 
 namespace qv::platform {
 namespace {
@@ -20,7 +22,6 @@ class Encoder {
     const auto* bytes = reinterpret_cast<const uint8_t*>(&v);
     out_.insert(out_.end(), bytes, bytes + sizeof v);
   }
-  void tag(char c) { out_.push_back(static_cast<uint8_t>(c)); }
   void string(std::string_view text) {
     raw(static_cast<uint32_t>(text.size()));
     out_.insert(out_.end(), text.begin(), text.end());
@@ -33,30 +34,26 @@ class Encoder {
     }
   }
   void value(const Value& v) {
-    std::visit([this](const auto& content) { write(content); }, v.storage());
+    raw(typeOf(v).archiveTag);
+    v.visit([this](const auto& content) { write(content); });
   }
 
  private:
-  void write(std::monostate) { tag('n'); }
-  void write(const SharedFileDescriptor&) { tag('n'); }
-  void write(bool v) { tag('b'), raw(static_cast<uint8_t>(v)); }
-  void write(int32_t v) { tag('i'), raw(v); }
-  void write(uint32_t v) { tag('u'), raw(v); }
-  void write(int64_t v) { tag('x'), raw(v); }
-  void write(uint64_t v) { tag('t'), raw(v); }
-  void write(double v) { tag('d'), raw(v); }
-  void write(const std::string& v) { tag('s'), string(v); }
-  void write(const Data& v) {
-    tag('y'), raw(static_cast<uint32_t>(v.size()));
-    out_.insert(out_.end(), v.begin(), v.end());
-  }
+  void write(std::monostate) {}
+  void write(const SharedFileDescriptor&) {}
+  void write(bool v) { raw(static_cast<uint8_t>(v)); }
+  template <typename Number>
+  requires std::is_arithmetic_v<Number>
+  void write(Number v) { raw(v); }
+  void write(const std::string& v) { string(v); }
+  void write(const Data& v) { string({reinterpret_cast<const char*>(v.data()), v.size()}); }
   void write(const Array& v) {
-    tag('a'), raw(static_cast<uint32_t>(v.size()));
+    raw(static_cast<uint32_t>(v.size()));
     for (const Value& element : v) value(element);
   }
-  void write(const Dictionary& v) { tag('m'), dictionary(v); }
-  void write(const Date& v) { tag('D'), raw(v.secondsSince1970); }
-  void write(const URL& v) { tag('U'), string(v.absoluteString()); }
+  void write(const Dictionary& v) { dictionary(v); }
+  void write(const Date& v) { raw(v.secondsSince1970); }
+  void write(const URL& v) { string(v.absoluteString()); }
 
   Data& out_;
 };
@@ -96,61 +93,50 @@ class Decoder {
     return failed_ ? 0 : n;
   }
 
-  Dictionary dictionary(int depth) {
+  Dictionary dictionary() {
     Dictionary entries;
     const uint32_t n = count();
     for (uint32_t i = 0; i < n && !failed_; ++i) {
       std::string key(string());
-      entries.insert_or_assign(std::move(key), value(depth));
+      entries.insert_or_assign(std::move(key), value());
     }
     return entries;
   }
 
-  Value value(int depth) {
-    if (depth > kMaximumDepth) failed_ = true;
-    if (failed_) return {};
-    switch (static_cast<char>(raw<uint8_t>())) {
-      case 'n':
-        return {};
-      case 'b':
-        return Value(raw<uint8_t>() != 0);
-      case 'i':
-        return Value(raw<int32_t>());
-      case 'u':
-        return Value(raw<uint32_t>());
-      case 'x':
-        return Value(raw<int64_t>());
-      case 't':
-        return Value(raw<uint64_t>());
-      case 'd':
-        return Value(raw<double>());
-      case 's':
-        return Value(std::string(string()));
-      case 'y': {
-        const std::string_view content = string();
-        return Value(Data(content.begin(), content.end()));
-      }
-      case 'a': {
-        Array elements;
-        const uint32_t n = count();
-        for (uint32_t i = 0; i < n && !failed_; ++i) elements.push_back(value(depth + 1));
-        return Value(std::move(elements));
-      }
-      case 'm':
-        return Value(dictionary(depth + 1));
-      case 'D':
-        return Value(Date{raw<double>()});
-      case 'U':
-        return Value(URL(std::string(string())));
-      default:
-        failed_ = true;
-        return {};
-    }
+ private:
+  Value value() {
+    Value v;
+    if (depth_ > kMaximumDepth) failed_ = true;
+    if (failed_) return v;
+    const char tag = raw<char>();
+    ++depth_;
+    if (!readTagged(tag, v, [this]<typename Content>() { return read(std::type_identity<Content>()); })) failed_ = true;
+    --depth_;
+    return v;
   }
 
- private:
+  SharedFileDescriptor read(std::type_identity<SharedFileDescriptor>) { return {}; }
+  bool read(std::type_identity<bool>) { return raw<uint8_t>() != 0; }
+  template <typename Number>
+  requires std::is_arithmetic_v<Number> Number read(std::type_identity<Number>) { return raw<Number>(); }
+  std::string read(std::type_identity<std::string>) { return std::string(string()); }
+  Data read(std::type_identity<Data>) {
+    const std::string_view content = string();
+    return {content.begin(), content.end()};
+  }
+  Array read(std::type_identity<Array>) {
+    Array elements;
+    const uint32_t n = count();
+    for (uint32_t i = 0; i < n && !failed_; ++i) elements.push_back(value());
+    return elements;
+  }
+  Dictionary read(std::type_identity<Dictionary>) { return dictionary(); }
+  Date read(std::type_identity<Date>) { return {raw<double>()}; }
+  URL read(std::type_identity<URL>) { return URL(std::string(string())); }
+
   std::span<const uint8_t> rest_;
   bool failed_ = false;
+  int depth_ = 0;  // of the value that is read
 };
 
 }  // namespace
@@ -171,7 +157,7 @@ Result<Dictionary> decodeKeyedArchive(std::span<const uint8_t> bytes, std::strin
   }
   const std::string_view className = decoder.string();
   if (decoder.failed() || className != expectedClass) return Error::posix(EBADMSG, "unexpected root class");
-  Dictionary fields = decoder.dictionary(0);
+  Dictionary fields = decoder.dictionary();
   if (decoder.failed() || !decoder.atEnd()) return Error::posix(EBADMSG, "damaged keyed archive");
   return fields;
 }

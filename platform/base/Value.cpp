@@ -2,6 +2,7 @@
 
 #include <cmath>
 #include <limits>
+#include <type_traits>
 
 namespace qv::platform {
 namespace {
@@ -63,8 +64,7 @@ std::string URL::path() const {
 }
 
 bool Value::isNumber() const {
-  return getIf<bool>() || getIf<int32_t>() || getIf<uint32_t>() || getIf<int64_t>() || getIf<uint64_t>() ||
-         getIf<double>();
+  return visit([](const auto& content) { return std::is_arithmetic_v<std::decay_t<decltype(content)>>; });
 }
 
 bool Value::asBool(bool fallback) const {
@@ -73,22 +73,29 @@ bool Value::asBool(bool fallback) const {
 }
 
 int64_t Value::asInteger(int64_t fallback) const {
-  if (const auto* v = getIf<bool>()) return *v ? 1 : 0;
-  if (const auto* v = getIf<int32_t>()) return *v;
-  if (const auto* v = getIf<uint32_t>()) return *v;
-  if (const auto* v = getIf<int64_t>()) return *v;
-  if (const auto* v = getIf<uint64_t>()) {
-    return *v > uint64_t(std::numeric_limits<int64_t>::max()) ? std::numeric_limits<int64_t>::max()
-                                                              : static_cast<int64_t>(*v);
-  }
-  if (const auto* v = getIf<double>()) return integerFromDouble(*v);
-  return fallback;
+  return visit([fallback](const auto& content) {
+    using Content = std::decay_t<decltype(content)>;
+    constexpr int64_t kLargest = std::numeric_limits<int64_t>::max();
+    if constexpr (std::is_same_v<Content, double>) {
+      return integerFromDouble(content);
+    } else if constexpr (std::is_same_v<Content, uint64_t>) {
+      return content > uint64_t{kLargest} ? kLargest : static_cast<int64_t>(content);
+    } else if constexpr (std::is_arithmetic_v<Content>) {
+      return static_cast<int64_t>(content);
+    } else {
+      return fallback;
+    }
+  });
 }
 
 double Value::asDouble(double fallback) const {
-  if (const auto* v = getIf<double>()) return *v;
-  if (const auto* v = getIf<uint64_t>()) return static_cast<double>(*v);
-  return isNumber() ? static_cast<double>(asInteger()) : fallback;
+  return visit([fallback](const auto& content) {
+    if constexpr (std::is_arithmetic_v<std::decay_t<decltype(content)>>) {
+      return static_cast<double>(content);
+    } else {
+      return fallback;
+    }
+  });
 }
 
 std::string Value::asString(std::string fallback) const {

@@ -78,6 +78,11 @@ class Value {
     return std::get_if<T>(&storage_);
   }
   [[nodiscard]] const Storage& storage() const { return storage_; }
+  /// Calls `visitor` with the content; see Overloaded (ValueTypes.h).
+  template <typename Visitor>
+  decltype(auto) visit(Visitor&& visitor) const {
+    return std::visit(std::forward<Visitor>(visitor), storage_);
+  }
 
   [[nodiscard]] bool asBool(bool fallback = false) const;
   /// Doubles truncate toward zero; what does not fit saturates; texts are not numbers.

@@ -48,12 +48,11 @@ bool DaemonLink::ensureConnected() {
   return true;
 }
 
-void DaemonLink::request(std::string_view member, IPCArguments arguments, Completion completion,
-                         FailureHandler onFailure) {
+void DaemonLink::request(OutgoingCall call, Completion completion, FailureHandler onFailure) {
   if (!ensureConnected()) return onFailure(libraryError(quorvel::kErrorConnectionInvalid));
   const uint64_t identifier = ++lastRequest_;
   outstanding_[identifier] = std::move(onFailure);
-  const size_t replyCount = daemonProtocol().operation(member)->reply->size();
+  const size_t replyCount = daemonProtocol().operation(call.member)->reply->size();
   auto completed = [weak = weak_from_this(), identifier, replyCount,
                     completion = std::move(completion)](const IPCArguments& reply) {
     if (const auto self = weak.lock()) {
@@ -67,16 +66,16 @@ void DaemonLink::request(std::string_view member, IPCArguments arguments, Comple
     if (const auto self = weak.lock())
       self->endRequest(identifier, [&](const FailureHandler& fail) { fail(errorForFailedCall(error)); });
   };
-  connection_->call(member, std::move(arguments), std::move(completed), std::move(failed));
+  connection_->call(call.member, std::move(call.arguments), std::move(completed), std::move(failed));
 }
 
-void DaemonLink::send(std::string_view member, IPCArguments arguments, FailureHandler onFailure) {
+void DaemonLink::send(OutgoingCall call, FailureHandler onFailure) {
   if (!ensureConnected()) return onFailure(libraryError(quorvel::kErrorConnectionInvalid));
   auto failed = [weak = weak_from_this(), onFailure = std::move(onFailure)](const platform::Error& error) {
     const auto self = weak.lock();
     if (self && !self->closed_) onFailure(errorForFailedCall(error));
   };
-  connection_->call(member, std::move(arguments), {}, std::move(failed));
+  connection_->call(call.member, std::move(call.arguments), {}, std::move(failed));
 }
 
 void DaemonLink::endRequest(uint64_t identifier, const std::function<void(const FailureHandler&)>& end) {

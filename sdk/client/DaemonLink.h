@@ -5,11 +5,11 @@
 #include <functional>
 #include <map>
 #include <memory>
-#include <string_view>
 
 #include "platform/IPC.h"
 #include "platform/threads/SerialQueue.h"
 #include "platform/threads/Timer.h"
+#include "protocol/Calls.h"
 #include "sdk/client/quorvel/Recorder.h"
 
 namespace qv::client {
@@ -40,10 +40,9 @@ class DaemonLink : public std::enable_shared_from_this<DaemonLink> {
              std::shared_ptr<platform::IPCExportedObject> exported, Delegate delegate);
 
   /// For an operation with a reply; `completion` gets as many values as the operation's table says.
-  void request(std::string_view member, platform::IPCArguments arguments, Completion completion,
-               FailureHandler onFailure);
+  void request(OutgoingCall call, Completion completion, FailureHandler onFailure);
   /// For an operation without one.
-  void send(std::string_view member, platform::IPCArguments arguments, FailureHandler onFailure);
+  void send(OutgoingCall call, FailureHandler onFailure);
   void setKeepsConnected(bool keep);
   /// Ends the connection without a word; nothing is called any more.
   void close();

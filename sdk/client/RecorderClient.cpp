@@ -34,7 +34,7 @@ BroadcastImagesResult imagesFromWire(const IPCArguments& reply) {
 }
 
 BroadcastExtensionsResult extensionsFromWire(const IPCArguments& reply) {
-  BroadcastExtensionsResult result{errorFromWire(reply[1]), {}};
+  BroadcastExtensionsResult result{errorFromWire(reply[1].asDictionary()), {}};
   for (const platform::Value& extension : reply[0].asArray())
     result.extensions.push_back(extensionFromWire(extension.asDictionary()));
   return result;
@@ -49,7 +49,9 @@ StateResult currentStateFromWire(const IPCArguments& reply) {
 struct Outcome {
   std::optional<quorvel::Error> error;
 };
-Outcome outcomeFromWire(const IPCArguments& reply) { return {reply.empty() ? std::nullopt : errorFromWire(reply[0])}; }
+Outcome outcomeFromWire(const IPCArguments& reply) {
+  return {reply.empty() ? std::nullopt : errorFromWire(reply[0].asDictionary())};
+}
 std::function<void(Outcome)> outcomeHandler(quorvel::Recorder::CompletionHandler handler) {
   if (!handler) return {};
   return [handler = std::move(handler)](Outcome outcome) { handler(std::move(outcome.error)); };
@@ -72,28 +74,28 @@ RecorderClient::~RecorderClient() {
 }
 
 template <typename Result>
-void RecorderClient::request(const char* member, IPCArguments arguments, std::function<void(Result)> handler,
-                             Result (*decode)(const IPCArguments&)) {
+void RecorderClient::ask(OutgoingCall call, std::function<void(Result)> handler,
+                         Result (*decode)(const IPCArguments&)) {
   auto answer = [callbacks = callbacks_, handler = std::move(handler)](Result result) {
     if (handler) callbacks->post([handler, result = std::move(result)]() mutable { handler(std::move(result)); });
   };
-  queue_->async(std::weak_ptr(session_), [member, arguments = std::move(arguments), answer = std::move(answer),
-                                          decode](RecorderSession& session) mutable {
-    session.link().request(
-        member, std::move(arguments), [answer, decode](const IPCArguments& reply) { answer(decode(reply)); },
-        [answer](quorvel::Error error) {
-          Result result{};
-          result.error = std::move(error);
-          answer(std::move(result));
-        });
-  });
+  queue_->async(std::weak_ptr(session_),
+                [call = std::move(call), answer = std::move(answer), decode](RecorderSession& session) mutable {
+                  session.link().request(
+                      std::move(call), [answer, decode](const IPCArguments& reply) { answer(decode(reply)); },
+                      [answer](quorvel::Error error) {
+                        Result result{};
+                        result.error = std::move(error);
+                        answer(std::move(result));
+                      });
+                });
 }
 
-void RecorderClient::send(const char* member, IPCArguments arguments, FailureHandler onFailure) {
-  queue_->async(std::weak_ptr(session_), [member, arguments = std::move(arguments),
-                                          fail = failure(std::move(onFailure))](RecorderSession& session) mutable {
-    session.link().send(member, std::move(arguments), std::move(fail));
-  });
+void RecorderClient::send(OutgoingCall call, FailureHandler onFailure) {
+  queue_->async(std::weak_ptr(session_),
+                [call = std::move(call), fail = failure(std::move(onFailure))](RecorderSession& session) mutable {
+                  session.link().send(std::move(call), std::move(fail));
+                });
 }
 
 RecorderClient::FailureHandler RecorderClient::failure(FailureHandler onFailure) const {
@@ -104,56 +106,56 @@ RecorderClient::FailureHandler RecorderClient::failure(FailureHandler onFailure)
 
 void RecorderClient::start(quorvel::StartOptions options, std::function<void(StartResult)> handler) {
   // The endpoint is the caller's only during this call.
-  auto arguments = startArguments(options);
-  if (!arguments) {
+  auto start = startRequest(options);
+  if (!start) {
     callbacks_->post([handler = std::move(handler)] {
       if (handler) handler({libraryError(quorvel::kErrorUnknown, "the listener endpoint is not a descriptor")});
     });
     return;
   }
   queue_->async(std::weak_ptr(session_),
-                [arguments = std::move(*arguments), handler = std::move(handler)](RecorderSession& session) mutable {
-                  session.start(std::move(arguments), std::move(handler));
+                [start = std::move(*start), handler = std::move(handler)](RecorderSession& session) mutable {
+                  session.start(start, std::move(handler));
                 });
 }
 
 void RecorderClient::stop(std::function<void(StopResult)> handler) {
   queue_->async(std::weak_ptr(session_), [handler = std::move(handler)](RecorderSession& session) mutable {
-    session.stop("stopRecordingWithHandler", {}, std::move(handler));
+    session.stop(request::Stop{}, std::move(handler));
   });
 }
 
 void RecorderClient::stop(quorvel::StopOptions options, std::function<void(StopResult)> handler) {
   queue_->async(std::weak_ptr(session_), [options, handler = std::move(handler)](RecorderSession& session) mutable {
-    session.stop("stopRecordingWithStartClipDuration", {options.startClip.count(), options.endClip.count()},
-                 std::move(handler));
+    session.stop(request::StopTrimmed{options.startClip.count(), options.endClip.count()}, std::move(handler));
   });
 }
 
-void RecorderClient::pause(FailureHandler onFailure) { send("pauseRecording", {}, std::move(onFailure)); }
+void RecorderClient::pause(FailureHandler onFailure) { send(request::Pause{}, std::move(onFailure)); }
 
 void RecorderClient::resume(uint32_t window, FailureHandler onFailure) {
-  send("resumeRecordingWithWindowLayerContextID", {window}, std::move(onFailure));
+  send(request::Resume{window}, std::move(onFailure));
 }
 
 void RecorderClient::setMicrophoneEnabled(bool enabled, FailureHandler onFailure) {
-  send("setMicrophoneEnabled", {enabled}, std::move(onFailure));
+  send(request::SetMicrophoneEnabled{enabled}, std::move(onFailure));
 }
 
 void RecorderClient::updateProcessIDForAudioCapture(pid_t pid, FailureHandler onFailure) {
-  send("updateProcessIDForAudioCaptureWithPID", {static_cast<int32_t>(pid)}, std::move(onFailure));
+  send(request::UpdateProcessID{static_cast<int32_t>(pid)}, std::move(onFailure));
 }
 
 void RecorderClient::discard(CompletionHandler handler) {
-  request<Outcome>("discardRecordingWithHandler", {}, outcomeHandler(std::move(handler)), outcomeFromWire);
+  ask<Outcome>(request::Discard{}, outcomeHandler(std::move(handler)), outcomeFromWire);
 }
 
 void RecorderClient::saveVideoToCameraRoll(std::string movieURL, CompletionHandler handler) {
-  request<Outcome>("saveVideoToCameraRoll", {std::move(movieURL)}, outcomeHandler(std::move(handler)), outcomeFromWire);
+  ask<Outcome>(request::SaveVideo{platform::URL(std::move(movieURL))}, outcomeHandler(std::move(handler)),
+               outcomeFromWire);
 }
 
 void RecorderClient::currentState(std::function<void(StateResult)> handler) {
-  request<StateResult>("synchronousGetCurrentState", {}, std::move(handler), currentStateFromWire);
+  ask<StateResult>(request::GetState{}, std::move(handler), currentStateFromWire);
 }
 
 void RecorderClient::didBecomeActive(FailureHandler onFailure) { tellActive(true, std::move(onFailure)); }
@@ -171,38 +173,37 @@ void RecorderClient::keepConnected(bool keep) {
 }
 
 void RecorderClient::setupBroadcast(quorvel::BroadcastOptions options, CompletionHandler handler) {
-  request<Outcome>("setupBroadcastWithHostBundleID",
-                   {std::move(options.hostBundleID), std::move(options.extensionBundleID),
-                    std::move(options.configuration), toWire(options.userInfo)},
-                   outcomeHandler(std::move(handler)), outcomeFromWire);
+  ask<Outcome>(request::SetupBroadcast{std::move(options.hostBundleID), std::move(options.extensionBundleID),
+                                       std::move(options.configuration), toWire(options.userInfo)},
+               outcomeHandler(std::move(handler)), outcomeFromWire);
 }
 
 void RecorderClient::currentBroadcastImages(std::function<void(BroadcastImagesResult)> handler) {
-  request<BroadcastImagesResult>("getCurrentBroadcastImages", {}, std::move(handler), imagesFromWire);
+  ask<BroadcastImagesResult>(request::GetBroadcastImages{}, std::move(handler), imagesFromWire);
 }
 
 void RecorderClient::systemBroadcastExtensions(std::function<void(BroadcastExtensionsResult)> handler) {
-  request<BroadcastExtensionsResult>("getSystemBroadcastExtensionInfo", {}, std::move(handler), extensionsFromWire);
+  ask<BroadcastExtensionsResult>(request::GetBroadcastExtensions{}, std::move(handler), extensionsFromWire);
 }
 
 void RecorderClient::setBroadcastURL(std::string url, FailureHandler onFailure) {
-  send("setBroadcastURL", {std::move(url)}, std::move(onFailure));
+  send(request::SetBroadcastURL{std::move(url)}, std::move(onFailure));
 }
 
 void RecorderClient::setHasUserConsentForCamera(bool consent, FailureHandler onFailure) {
-  send("setHasUserConsentForCamera", {consent}, std::move(onFailure));
+  send(request::SetCameraConsent{consent}, std::move(onFailure));
 }
 
 void RecorderClient::setHasUserConsentForMicrophone(bool consent, FailureHandler onFailure) {
-  send("setHasUserConsentForMicrophone", {consent}, std::move(onFailure));
+  send(request::SetMicrophoneConsent{consent}, std::move(onFailure));
 }
 
 void RecorderClient::setMicrophoneEnabledPersistent(bool enabled, FailureHandler onFailure) {
-  send("setMicrophoneEnabledPersistent", {enabled}, std::move(onFailure));
+  send(request::SetMicrophoneEnabledPersistent{enabled}, std::move(onFailure));
 }
 
 void RecorderClient::reportCameraUsage(int32_t cameraPosition, FailureHandler onFailure) {
-  send("reportCameraUsage", {cameraPosition}, std::move(onFailure));
+  send(request::ReportCameraUsage{cameraPosition}, std::move(onFailure));
 }
 
 uint64_t RecorderClient::droppedSamples() const { return callbacks_->droppedSamples(); }

@@ -4,6 +4,7 @@
 
 #include "platform/IPC.h"
 #include "platform/threads/Timer.h"
+#include "protocol/Calls.h"
 #include "sdk/client/ApplicationCallbacks.h"
 #include "sdk/client/quorvel/Recorder.h"
 
@@ -55,10 +56,9 @@ class RecorderClient final : public quorvel::Recorder {
   /// Brings a failure to the application, where it asked for it.
   FailureHandler failure(FailureHandler onFailure) const;
   void tellActive(bool active, FailureHandler onFailure);
-  void send(const char* member, platform::IPCArguments arguments, FailureHandler onFailure);
+  void send(OutgoingCall call, FailureHandler onFailure);
   template <typename Result>
-  void request(const char* member, platform::IPCArguments arguments, std::function<void(Result)> handler,
-               Result (*decode)(const platform::IPCArguments&));
+  void ask(OutgoingCall call, std::function<void(Result)> handler, Result (*decode)(const platform::IPCArguments&));
 
   const std::shared_ptr<platform::IPCService> ipc_;
   const std::shared_ptr<platform::SerialQueue> queue_;

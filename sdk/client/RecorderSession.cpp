@@ -2,9 +2,10 @@
 
 #include <utility>
 
+#include "platform/base/ValueTypes.h"
 #include "sdk/client/RecordingErrors.h"
 #include "sdk/client/WireValues.h"
-#include "sdk/common/SampleCoding.h"
+#include "sdk/common/Samples.h"
 
 namespace qv::client {
 
@@ -27,7 +28,9 @@ class DaemonCalls final : public platform::IPCExportedObject {
   const std::weak_ptr<RecorderSession> session_;
 };
 
-const char* activationMember(bool active) { return active ? "clientDidBecomeActive" : "clientDidResignActive"; }
+OutgoingCall activation(bool active) {
+  return active ? OutgoingCall(request::DidBecomeActive{}) : OutgoingCall(request::DidResignActive{});
+}
 
 }  // namespace
 
@@ -58,7 +61,7 @@ void RecorderSession::tell(const std::function<void(Parameters...)>& event, Give
   callbacks_->post([event, ... arguments = std::move(arguments)]() mutable { event(std::move(arguments)...); });
 }
 
-void RecorderSession::start(IPCArguments arguments, std::function<void(StartResult)> handler) {
+void RecorderSession::start(const request::StartRecording& request, std::function<void(StartResult)> handler) {
   if (recording_) replaced_.push_back(recordingNumber_);
   auto finish = [weak = weak_from_this(), handler = std::move(handler)](StartResult result) {
     const auto self = weak.lock();
@@ -70,16 +73,16 @@ void RecorderSession::start(IPCArguments arguments, std::function<void(StartResu
     self->tell(handler, std::move(result));
   };
   link_->request(
-      "startRecordingWindowLayerContextIDs", std::move(arguments),
+      request,
       [finish](const IPCArguments& reply) {
-        finish({errorFromWire(reply[0]), reply[1].asBool(), reply[2].asBool()});
+        finish({errorFromWire(reply[0].asDictionary()), reply[1].asBool(), reply[2].asBool()});
       },
       [finish](quorvel::Error error) {
         finish({std::move(error), false, false});
       });
 }
 
-void RecorderSession::stop(const char* member, IPCArguments arguments, std::function<void(StopResult)> handler) {
+void RecorderSession::stop(OutgoingCall request, std::function<void(StopResult)> handler) {
   auto finish = [weak = weak_from_this(), handler = std::move(handler)](StopResult result) {
     const auto self = weak.lock();
     if (!self) return;
@@ -88,9 +91,9 @@ void RecorderSession::stop(const char* member, IPCArguments arguments, std::func
     self->tell(handler, std::move(result));
   };
   link_->request(
-      member, std::move(arguments),
+      std::move(request),
       [finish](const IPCArguments& reply) {
-        finish({errorFromWire(reply[1]), reply[0].asString()});
+        finish({errorFromWire(reply[1].asDictionary()), reply[0].asString()});
       },
       [finish](quorvel::Error error) {
         finish({std::move(error), {}});
@@ -98,14 +101,14 @@ void RecorderSession::stop(const char* member, IPCArguments arguments, std::func
 }
 
 void RecorderSession::tellActive(bool active, DaemonLink::FailureHandler onFailure) {
-  link_->send(activationMember(active), {}, std::move(onFailure));
+  link_->send(activation(active), std::move(onFailure));
   active_ = active;
 }
 
 void RecorderSession::connected() {
   pauses_ = {};
   sound_ = {};
-  if (active_) link_->send(activationMember(*active_), {}, [](const quorvel::Error&) {});
+  if (active_) link_->send(activation(*active_), [](const quorvel::Error&) {});
   tell(events_.connected);
 }
 
@@ -130,46 +133,50 @@ void RecorderSession::daemonStopped(StopResult result) {
   tell(events_.stopped, std::move(result));
 }
 
-void RecorderSession::receiveFrame(const IPCArguments& arguments) {
-  auto frame = events_.videoFrame ? videoFrameFromWire(arguments) : std::nullopt;
-  if (!frame) return;
+void RecorderSession::receiveFrame(const callback::CaptureHandlerWithSample& call) {
+  const auto picture = events_.videoFrame ? pictureOf(call) : std::nullopt;
+  if (!picture) return;
   callbacks_->postSample(
       ApplicationCallbacks::SampleKind::Video,
-      [event = events_.videoFrame, frame = std::move(*frame)]() mutable { event(std::move(frame)); });
+      [event = events_.videoFrame, frame = sdk::videoFrame(*picture)]() mutable { event(std::move(frame)); });
 }
 
-void RecorderSession::receiveSound(const IPCArguments& arguments) {
-  auto sample = events_.audioSample ? audioSampleFromWire(arguments) : std::nullopt;
-  if (!sample || !sound_.place(*sample, pauses_)) return;
+void RecorderSession::receiveSound(callback::CaptureHandlerWithAudioSample call) {
+  auto sound = events_.audioSample ? soundOf(std::move(call)) : std::nullopt;
+  if (!sound) return;
+  quorvel::AudioSample sample = sdk::audioSample(std::move(*sound));
+  if (!sound_.place(sample, pauses_)) return;
   callbacks_->postSample(
       ApplicationCallbacks::SampleKind::Audio,
-      [event = events_.audioSample, sample = std::move(*sample)]() mutable { event(std::move(sample)); });
+      [event = events_.audioSample, sample = std::move(sample)]() mutable { event(std::move(sample)); });
 }
 
 void RecorderSession::receive(std::string_view member, const IPCArguments& arguments) {
-  const platform::Value none;
-  const auto at = [&](size_t index) -> const platform::Value& {
-    return index < arguments.size() ? arguments[index] : none;
-  };
-  if (member == "captureHandlerWithSample") {
-    receiveFrame(arguments);
-  } else if (member == "captureHandlerWithAudioSample") {
-    receiveSound(arguments);
-  } else if (member == "captureTimelineDidChange") {
-    pauses_ = sdk::sampleTimeFromWire(at(0).asData()).value_or(pauses_);
-  } else if (member == "stopRecordingWithError") {
-    daemonStopped({errorFromWire(at(0)), at(1).asString()});
-  } else if (member == "updateScreenRecordingState") {
-    tell(events_.recordingStateChanged, at(0).asBool());
-  } else if (member == "updateBroadcastServiceInfo") {
-    tell(events_.broadcastServiceInfoChanged, fromWire(at(0).asDictionary()));
-  } else if (member == "updateBroadcastURL") {
-    tell(events_.broadcastURLChanged, at(0).asString());
-  } else if (member == "recordingLockInterrupted") {
-    tell(events_.recordingLockInterrupted, errorFromWire(at(0)).value_or(quorvel::Error{}));
-  } else if (member == "recordingTimerDidUpdate") {
-    tell(events_.recordingTimerChanged, at(0).asString());
-  }
+  callback::All::dispatch(
+      member, arguments,
+      platform::Overloaded{
+          [this](const callback::CaptureHandlerWithSample& call) { receiveFrame(call); },
+          [this](callback::CaptureHandlerWithAudioSample&& call) { receiveSound(std::move(call)); },
+          [this](const callback::CaptureTimelineDidChange& call) {
+            if (const auto pauses = pausesOf(call)) pauses_ = sdk::sampleTime(*pauses);
+          },
+          [this](const callback::StopRecordingWithError& call) {
+            daemonStopped({errorFromWire(call.error), call.movieURL.absoluteString()});
+          },
+          [this](const callback::UpdateScreenRecordingState& call) {
+            tell(events_.recordingStateChanged, call.recording);
+          },
+          [this](const callback::UpdateBroadcastServiceInfo& call) {
+            tell(events_.broadcastServiceInfoChanged, fromWire(call.serviceInfo));
+          },
+          [this](const callback::UpdateBroadcastURL& call) {
+            tell(events_.broadcastURLChanged, call.broadcastURL.absoluteString());
+          },
+          [this](const callback::RecordingLockInterrupted& call) {
+            tell(events_.recordingLockInterrupted, errorFromWire(call.error).value_or(quorvel::Error{}));
+          },
+          [this](const callback::RecordingTimerDidUpdate& call) { tell(events_.recordingTimerChanged, call.time); },
+      });
 }
 
 }  // namespace qv::client

@@ -7,6 +7,8 @@
 #include <optional>
 #include <string>
 
+#include "protocol/QVClientProtocol.h"
+#include "protocol/QVDaemonProtocol.h"
 #include "sdk/client/ApplicationCallbacks.h"
 #include "sdk/client/DaemonLink.h"
 #include "sdk/common/SoundTimeline.h"
@@ -30,8 +32,8 @@ class RecorderSession : public std::enable_shared_from_this<RecorderSession> {
 
   [[nodiscard]] DaemonLink& link() { return *link_; }
 
-  void start(platform::IPCArguments arguments, std::function<void(quorvel::StartResult)> handler);
-  void stop(const char* member, platform::IPCArguments arguments, std::function<void(quorvel::StopResult)> handler);
+  void start(const request::StartRecording& request, std::function<void(quorvel::StartResult)> handler);
+  void stop(OutgoingCall request, std::function<void(quorvel::StopResult)> handler);
   void tellActive(bool active, DaemonLink::FailureHandler onFailure);
   /// A call from the daemon.
   void receive(std::string_view member, const platform::IPCArguments& arguments);
@@ -40,8 +42,8 @@ class RecorderSession : public std::enable_shared_from_this<RecorderSession> {
   RecorderSession(std::shared_ptr<ApplicationCallbacks> callbacks, quorvel::Events events);
   void connected();
   void lost();
-  void receiveFrame(const platform::IPCArguments& arguments);
-  void receiveSound(const platform::IPCArguments& arguments);
+  void receiveFrame(const callback::CaptureHandlerWithSample& call);
+  void receiveSound(callback::CaptureHandlerWithAudioSample call);
   void daemonStopped(quorvel::StopResult result);
   /// Whether this tells the end of a recording in whose place another of ours already goes on.
   bool isWordOfReplaced(const quorvel::StopResult& result);

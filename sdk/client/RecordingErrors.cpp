@@ -1,10 +1,12 @@
 #include "sdk/client/RecordingErrors.h"
 
 #include "platform/IPC.h"
-#include "protocol/RecordingErrorKeys.h"
+#include "protocol/RecordingErrors.h"
 
-static_assert(quorvel::kErrorUnknown == qv::kFirstRecordingErrorCode &&
-              quorvel::kErrorMixingFailure == qv::kLastRecordingErrorCode);
+// Applications have the codes by names of their own.
+#define QV_RECORDING_ERROR(code, name, key) static_assert(quorvel::kError##name == (code));
+#include "protocol/RecordingErrors.def"
+#undef QV_RECORDING_ERROR
 
 namespace quorvel {
 

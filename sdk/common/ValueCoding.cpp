@@ -1,13 +1,14 @@
 #include "sdk/common/ValueCoding.h"
 
+#include <concepts>
 #include <type_traits>
 
+#include "platform/base/ValueTypes.h"
 #include "protocol/QVBroadcastConfiguration.h"
 
 namespace qv::sdk {
 
 using platform::Array;
-using platform::Data;
 
 platform::Value toWire(const quorvel::Value& value) {
   return std::visit(
@@ -35,20 +36,24 @@ platform::Dictionary toWire(const quorvel::Dictionary& dictionary) {
 }
 
 quorvel::Value fromWire(const platform::Value& value) {
-  if (const auto* flag = value.getIf<bool>()) return {*flag};
-  if (const auto* number = value.getIf<double>()) return {*number};
-  if (value.isNumber()) return {value.asInteger()};
-  if (const auto* text = value.getIf<std::string>()) return {*text};
-  if (const auto* url = value.getIf<platform::URL>()) return {url->absoluteString()};
-  if (const auto* date = value.getIf<platform::Date>()) return {date->secondsSince1970};
-  if (const auto* bytes = value.getIf<Data>()) return {*bytes};
-  if (const auto* dictionary = value.getIf<platform::Dictionary>()) return {fromWire(*dictionary)};
-  if (const auto* array = value.getIf<Array>()) {
-    quorvel::Value::Array items;
-    for (const platform::Value& item : *array) items.push_back(fromWire(item));
-    return {std::move(items)};
-  }
-  return {};
+  return value.visit(platform::Overloaded{
+      [](std::monostate) { return quorvel::Value{}; },
+      [](const platform::SharedFileDescriptor&) { return quorvel::Value{}; },
+      [](std::unsigned_integral auto number) { return quorvel::Value{platform::Value(number).asInteger()}; },
+      [](std::signed_integral auto number) { return quorvel::Value{int64_t{number}}; },
+      [](const platform::URL& url) { return quorvel::Value{url.absoluteString()}; },
+      [](const platform::Date& date) { return quorvel::Value{date.secondsSince1970}; },
+      [](const platform::Dictionary& dictionary) { return quorvel::Value{fromWire(dictionary)}; },
+      [](const Array& array) {
+        quorvel::Value::Array items;
+        for (const platform::Value& item : array) items.push_back(fromWire(item));
+        return quorvel::Value{std::move(items)};
+      },
+      [](bool flag) { return quorvel::Value{flag}; },
+      [](double number) { return quorvel::Value{number}; },
+      [](const std::string& text) { return quorvel::Value{text}; },
+      [](const platform::Data& bytes) { return quorvel::Value{bytes}; },
+  });
 }
 
 quorvel::Dictionary fromWire(const platform::Dictionary& dictionary) {

@@ -21,6 +21,12 @@ namespace {
 
 constexpr const char kRefusedErrorName[] = "com.tarnwick.quorveld.Error.NoBroadcast";
 
+void completeRequest(platform::IPCConnection& host, platform::ExtensionRequestID request,
+                     std::vector<platform::ExtensionItem> items) {
+  OutgoingCall call = extensioncall::CompleteRequest{request, std::move(items)};
+  host.call(call.member, std::move(call.arguments), {}, {});
+}
+
 /// The descriptor that an environment variable names. It is not for children of ours.
 ListenerEndpoint inheritedEndpoint(const char* variable) {
   const char* text = std::getenv(variable);
@@ -42,10 +48,10 @@ class ExtensionRuntime::Requests final : public platform::IPCExportedObject {
   void handleCall(const std::shared_ptr<platform::IPCConnection>&, const platform::IPCOperation&,
                   IPCArguments arguments, IPCReply reply) override {
     const auto process = process_.lock();
-    if (!process || arguments.size() != 2) return;
+    if (!process) return;
     reply({});
-    process->beginRequest(static_cast<platform::ExtensionRequestID>(arguments[0].asInteger()),
-                          extensionItemsOfValue(arguments[1]));
+    const auto call = callOf<extensioncall::BeginRequest>(arguments);
+    process->beginRequest(call.request, call.items);
   }
 
  private:
@@ -59,7 +65,7 @@ class ExtensionRuntime::Vendor final : public platform::IPCExportedObject {
   void handleCall(const std::shared_ptr<platform::IPCConnection>&, const platform::IPCOperation&,
                   IPCArguments arguments, IPCReply reply) override {
     const auto process = process_.lock();
-    if (process && arguments.size() == 1) process->setEndpoint(arguments[0], reply);
+    if (process) process->setEndpoint(callOf<broadcastcall::SetEndpoint>(arguments).endpoint, reply);
   }
 
  private:
@@ -121,18 +127,17 @@ bool ExtensionRuntime::finish(std::chrono::milliseconds longestWait) {
 ClipRequests::Host ExtensionRuntime::clipHost() {
   return {.openFile =
               [connection = requests_](const std::string& token, const auto& opened) {
+                OutgoingCall call = extensioncall::OpenFile{token};
                 connection->call(
-                    "openFile", {token},
+                    call.member, std::move(call.arguments),
                     [opened](const IPCArguments& reply) {
                       const auto* file = reply.empty() ? nullptr : reply[0].getIf<platform::SharedFileDescriptor>();
                       opened(file ? *file : nullptr);
                     },
                     [opened](const platform::Error&) { opened(nullptr); });
               },
-          .complete =
-              [connection = requests_](platform::ExtensionRequestID request, const auto& items) {
-                connection->call("completeRequest", {request, valueOfExtensionItems(items)}, {}, {});
-              }};
+          .complete = [connection = requests_](platform::ExtensionRequestID request,
+                                               const auto& items) { completeRequest(*connection, request, items); }};
 }
 
 /// A request without a clip launched us for a broadcast in sample mode. It stays open for as long as the process does.
@@ -141,14 +146,13 @@ void ExtensionRuntime::beginRequest(platform::ExtensionRequestID request,
   if (!ClipRequests::isClip(items)) return;
   if (clips_) return clips_->begin(request, items);
   QV_LOG_ERROR(platform::logs::kExtensions, "a clip came to an extension that takes samples");
-  requests_->call("completeRequest", {request, valueOfExtensionItems({})}, {}, {});
+  completeRequest(*requests_, request, {});
 }
 
-void ExtensionRuntime::setEndpoint(const platform::Value& endpoint, const IPCReply& reply) {
+void ExtensionRuntime::setEndpoint(platform::SharedFileDescriptor endpoint, const IPCReply& reply) {
   const auto* make = std::get_if<quorvel::SampleExtensionFactory>(&make_);
   if (make == nullptr) return reply.fail(kRefusedErrorName, "this extension takes clips");
-  const auto* rendezvous = endpoint.getIf<platform::SharedFileDescriptor>();
-  auto connection = ipc_.connect(ListenerEndpoint(rendezvous ? *rendezvous : nullptr));
+  auto connection = ipc_.connect(ListenerEndpoint(std::move(endpoint)));
   if (!connection) return reply.fail(kRefusedErrorName, connection.error().description());
   // A second broadcast in the same process takes the place of the first.
   if (broadcast_) std::exchange(broadcast_, nullptr)->close();

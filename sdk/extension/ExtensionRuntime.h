@@ -38,7 +38,7 @@ class ExtensionRuntime : public std::enable_shared_from_this<ExtensionRuntime> {
   class Vendor;
   ExtensionRuntime(platform::IPCService& ipc, Factory make);
   void beginRequest(platform::ExtensionRequestID request, const std::vector<platform::ExtensionItem>& items);
-  void setEndpoint(const platform::Value& endpoint, const platform::IPCReply& reply);
+  void setEndpoint(platform::SharedFileDescriptor endpoint, const platform::IPCReply& reply);
   [[nodiscard]] ClipRequests::Host clipHost();
 
   platform::IPCService& ipc_;

@@ -2,9 +2,9 @@
 
 #include <utility>
 
+#include "platform/base/ValueTypes.h"
 #include "platform/threads/Log.h"
-#include "protocol/QVBroadcastProtocols.h"
-#include "sdk/common/SampleCoding.h"
+#include "sdk/common/Samples.h"
 #include "sdk/common/ValueCoding.h"
 
 namespace quorvel {
@@ -16,11 +16,6 @@ SampleExtension::~SampleExtension() = default;
 
 namespace qv::extension {
 
-using platform::Dictionary;
-using platform::find;
-using platform::Value;
-using platform::valueForKey;
-
 /// The end that the daemon calls. It does not keep the link alive.
 class SampleLink::Payloads final : public platform::IPCExportedObject {
  public:
@@ -28,8 +23,8 @@ class SampleLink::Payloads final : public platform::IPCExportedObject {
   void handleCall(const std::shared_ptr<platform::IPCConnection>&, const platform::IPCOperation&,
                   platform::IPCArguments arguments, platform::IPCReply reply) override {
     const auto link = link_.lock();
-    if (!link || arguments.empty()) return;
-    link->processPayload(arguments[0].asDictionary());
+    if (!link) return;
+    link->processPayload(callOf<broadcastcall::ProcessPayload>(arguments).payload);
     reply({});
   }
 
@@ -72,25 +67,23 @@ void SampleLink::close() {
 
 // From the daemon -------------------------------------------------------------------------------------
 
-void SampleLink::processPayload(const Dictionary& payload) {
+void SampleLink::processPayload(const platform::Dictionary& payload) {
   if (!extension_) return;
-  bool isUnderstood = true;
-  if (const Value* action = find(payload, broadcastpayload::kActionType)) {
-    performAction(action->asInteger(), payload);
-  } else if (const Value* frontmost = find(payload, broadcastpayload::kFrontmostApp)) {
-    extension_->frontmostApplication(frontmost->asString());
-  } else if (valueForKey(payload, broadcastpayload::kSampleType).asInteger() == sdk::kVideoSample) {
-    isUnderstood = processVideo(payload);
-  } else {
-    isUnderstood = processAudio(payload);
-  }
-  if (!isUnderstood) QV_LOG_ERROR(platform::logs::kExtensions, "a payload that is none was dropped");
+  std::visit(
+      platform::Overloaded{
+          [](std::monostate) { QV_LOG_ERROR(platform::logs::kExtensions, "a payload that is none was dropped"); },
+          [this](const ActionMessage& message) { performAction(message); },
+          [this](FrontmostMessage&& message) { extension_->frontmostApplication(std::move(message.bundleID)); },
+          [this](const PictureMessage& message) { processVideo(message); },
+          [this](SoundMessage&& message) { processAudio(std::move(message)); },
+      },
+      broadcastMessageOf(payload));
 }
 
-void SampleLink::performAction(int64_t action, const Dictionary& payload) {
-  switch (static_cast<BroadcastAction>(action)) {
+void SampleLink::performAction(const ActionMessage& message) {
+  switch (message.action) {
     case BroadcastAction::Started:
-      return extension_->started(sdk::fromWire(valueForKey(payload, broadcastpayload::kUserInfo).asDictionary()));
+      return extension_->started(sdk::fromWire(message.userInfo));
     case BroadcastAction::Paused:
       return extension_->paused();
     case BroadcastAction::Resumed:
@@ -98,51 +91,39 @@ void SampleLink::performAction(int64_t action, const Dictionary& payload) {
     case BroadcastAction::Finished:
       return extension_->finished();
   }
-  QV_LOG_ERROR(platform::logs::kExtensions, "action %lld is unknown", static_cast<long long>(action));
+  QV_LOG_ERROR(platform::logs::kExtensions, "action %lld is unknown", static_cast<long long>(message.action));
 }
 
-bool SampleLink::processVideo(const Dictionary& payload) {
-  auto frame = sdk::videoFrameFromWire(valueForKey(payload, broadcastpayload::kSharedFrame),
-                                       valueForKey(payload, broadcastpayload::kTimingInfo).asData());
-  if (!frame) return false;
-  const int64_t code = valueForKey(payload, broadcastpayload::kVideoOrientation).asInteger(1);
-  const bool isKnown = code >= 1 && code <= 8;
-  extension_->processVideo(std::move(*frame), isKnown ? quorvel::Orientation(code) : quorvel::Orientation::Up);
-  return true;
+void SampleLink::processVideo(const PictureMessage& message) {
+  const bool isKnown = message.orientation >= 1 && message.orientation <= 8;
+  extension_->processVideo(sdk::videoFrame(message),
+                           isKnown ? quorvel::Orientation(message.orientation) : quorvel::Orientation::Up);
 }
 
-bool SampleLink::processAudio(const Dictionary& payload) {
-  const Value bytes = valueForKey(payload, broadcastpayload::kAudioBufferList);
-  const Value format = valueForKey(payload, broadcastpayload::kAudioFormatDescription);
-  const Value timing = valueForKey(payload, broadcastpayload::kTimingInfo);
-  const Value* sum = find(payload, broadcastpayload::kPauses);
-  const auto pauses = sum ? sdk::sampleTimeFromWire(sum->asData()) : quorvel::SampleTime(0);
-  auto sample =
-      sdk::audioSampleFromWire({.bytes = bytes.asData(),
-                                .format = format.asData(),
-                                .numSamples = valueForKey(payload, broadcastpayload::kNumSamples).asInteger(-1),
-                                .sampleType = valueForKey(payload, broadcastpayload::kSampleType).asInteger(),
-                                .timing = timing.asData()});
-  if (!sample || !pauses) return false;
-  if (timeline_.place(*sample, *pauses)) extension_->processAudio(std::move(*sample));
-  return true;
+void SampleLink::processAudio(SoundMessage message) {
+  const quorvel::SampleTime pauses = sdk::sampleTime(message.pauses);
+  quorvel::AudioSample sample = sdk::audioSample(std::move(message));
+  if (timeline_.place(sample, pauses)) extension_->processAudio(std::move(sample));
 }
 
 // To the daemon ---------------------------------------------------------------------------------------
 
-void SampleLink::ping() { connection_->call("ping", {}, {}, {}); }
+void SampleLink::send(OutgoingCall call) { connection_->call(call.member, std::move(call.arguments), {}, {}); }
+
+void SampleLink::ping() { send(broadcastcall::Ping{}); }
 
 void SampleLink::updateServiceInfo(quorvel::Dictionary serviceInfo) {
-  connection_->call("updateServiceInfo", {sdk::toWire(serviceInfo)}, {}, {});
+  send(broadcastcall::UpdateServiceInfo{sdk::toWire(serviceInfo)});
 }
 
 void SampleLink::updateBroadcastURL(std::string url) {
-  connection_->call("updateBroadcastURL", {platform::URL(std::move(url))}, {}, {});
+  send(broadcastcall::UpdateBroadcastURL{platform::URL(std::move(url))});
 }
 
 void SampleLink::finishBroadcastWithError(quorvel::Error error) {
-  const platform::Error wire{error.domain, error.code, {{platform::kLocalizedDescriptionKey, Value(error.text)}}};
-  connection_->call("finishBroadcastWithError", {platform::encodeError(wire)}, {}, {});
+  const platform::Error wire{
+      error.domain, error.code, {{platform::kLocalizedDescriptionKey, platform::Value(error.text)}}};
+  send(broadcastcall::FinishBroadcastWithError{platform::encodeError(wire)});
 }
 
 }  // namespace qv::extension

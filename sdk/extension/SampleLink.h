@@ -4,6 +4,7 @@
 #include <memory>
 
 #include "platform/IPC.h"
+#include "protocol/SampleCoding.h"
 #include "sdk/common/SoundTimeline.h"
 #include "sdk/extension/quorvel/BroadcastExtension.h"
 
@@ -38,9 +39,10 @@ class SampleLink final : public quorvel::Broadcast, public std::enable_shared_fr
   class Payloads;
   explicit SampleLink(std::shared_ptr<platform::IPCConnection> connection) : connection_(std::move(connection)) {}
   void processPayload(const platform::Dictionary& payload);
-  void performAction(int64_t action, const platform::Dictionary& payload);
-  [[nodiscard]] bool processVideo(const platform::Dictionary& payload);
-  [[nodiscard]] bool processAudio(const platform::Dictionary& payload);
+  void performAction(const ActionMessage& message);
+  void processVideo(const PictureMessage& message);
+  void processAudio(SoundMessage message);
+  void send(OutgoingCall call);
   void end();
 
   const std::shared_ptr<platform::IPCConnection> connection_;

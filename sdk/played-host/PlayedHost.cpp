@@ -23,15 +23,12 @@
 #include <thread>
 
 #include "platform/Extensions.h"
-#include "platform/base/RawRecord.h"
-#include "platform/base/SampleBuffer.h"
 #include "platform/process/SpawnedProcess.h"
 #include "platform/sdbus/SdBusIPC.h"
 #include "platform/threads/Clock.h"
 #include "protocol/ExtensionRequests.h"
 #include "protocol/QVBroadcastConfiguration.h"
-#include "protocol/QVBroadcastProtocols.h"
-#include "protocol/QVSharedFrameObject.h"
+#include "protocol/SampleCoding.h"
 
 namespace {
 
@@ -164,9 +161,9 @@ SpawnedProcess launch(const char* program, const Door& requests, const Door& aux
   std::exit(1);
 }
 
-Data timingOf(Time presentation) {
-  return rawBytes(SampleTimingInfo{{}, mediaTimeFromHostTime(static_cast<uint64_t>(presentation.count())), {}});
-}
+MediaTime mediaTime(Time time) { return mediaTimeFromHostTime(static_cast<uint64_t>(time.count())); }
+
+SampleTimingInfo timingOf(Time presentation) { return {{}, mediaTime(presentation), {}}; }
 
 /// A stream of pictures and sound in real time.
 class Film {
@@ -189,12 +186,11 @@ class Film {
  private:
   static Time now() { return std::chrono::steady_clock::now().time_since_epoch(); }
   [[nodiscard]] Time soundTime() const { return Time(1s) * soundPosition_ / kRate; }
-  [[nodiscard]] Data pauses() const { return rawBytes(mediaTimeFromHostTime(static_cast<uint64_t>(pauses_.count()))); }
   void pauseFor(Time duration) {
-    door_.callAndWait("processPayload", {Dictionary{{broadcastpayload::kActionType, int64_t{2}}}});
+    door_.callAndWait("processPayload", {payloadOf(ActionMessage{BroadcastAction::Paused, {}})});
     std::this_thread::sleep_for(duration);
     pauses_ += duration;
-    door_.callAndWait("processPayload", {Dictionary{{broadcastpayload::kActionType, int64_t{3}}}});
+    door_.callAndWait("processPayload", {payloadOf(ActionMessage{BroadcastAction::Resumed, {}})});
   }
   void sendPicture(Time at, int64_t number) {
     auto picture = *SharedFrame::create(kLayout);
@@ -202,11 +198,10 @@ class Film {
     const bool isFlash = at % 1s < kFlash;
     for (size_t i = 0; i < pixels.size(); ++i)
       pixels[i] = isFlash ? 0xff : static_cast<uint8_t>(i / 97 + static_cast<size_t>(number) * 3) & 0x3f;
-    send({{broadcastpayload::kVideoOrientation, orientation_},
-          {broadcastpayload::kSampleType, int64_t{1}},
-          {broadcastpayload::kSharedFrame, QVSharedFrameObject(std::move(picture)).encodeForIPC()},
-          {broadcastpayload::kTimingInfo, timingOf(start_ + at)},
-          {broadcastpayload::kPauses, pauses()}});
+    const PictureMessage message{picture, timingOf(start_ + at), mediaTime(pauses_), orientation_};
+    Dictionary payload = payloadOf(message);
+    payload[broadcastpayload::kSharedFrame] = QVSharedFrameObject(message.surface).encodeForIPC();
+    send(std::move(payload));
   }
   /// Its times go on through a pause, as a device's do.
   void sendSound() {
@@ -222,12 +217,8 @@ class Film {
     std::memcpy(bytes.data(), samples.data(), bytes.size());
     const AudioStreamDescription format{
         kRate, kAudioFormatLinearPCM, kAudioFormatFlagIsSignedInteger | kAudioFormatFlagIsPacked, 2, 1, 2, 1, 16, 0};
-    send({{broadcastpayload::kSampleType, int64_t{2}},
-          {broadcastpayload::kAudioBufferList, std::move(bytes)},
-          {broadcastpayload::kAudioFormatDescription, rawBytes(format)},
-          {broadcastpayload::kTimingInfo, timingOf(start_ + pauses_ + soundTime())},
-          {broadcastpayload::kNumSamples, int64_t{kRunOfSound}},
-          {broadcastpayload::kPauses, pauses()}});
+    send(payloadOf(SoundMessage{SampleType::AppAudio, std::move(bytes), format, kRunOfSound,
+                                timingOf(start_ + pauses_ + soundTime()), mediaTime(pauses_)}));
     soundPosition_ += kRunOfSound;
   }
   void send(Dictionary payload) {
@@ -247,8 +238,7 @@ void playSamples(IPCService& ipc, const std::shared_ptr<Calls>& calls, Door& req
   auxiliary.callAndWait("setEndpoint", {door.endpoint()});
   calls->ready.get_future().wait();
   const auto act = [&](BroadcastAction action) {
-    door.callAndWait("processPayload", {Dictionary{{broadcastpayload::kActionType, static_cast<int64_t>(action)},
-                                                   {broadcastpayload::kUserInfo, userInfo}}});
+    door.callAndWait("processPayload", {payloadOf(ActionMessage{action, userInfo})});
   };
   act(BroadcastAction::Started);
   const char* pause = std::getenv("PAUSE");

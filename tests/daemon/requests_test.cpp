@@ -24,6 +24,15 @@ TEST_F(RequestsTest, RequestsWithoutAnAnswerFailByName) {
   EXPECT_TRUE(client.isRecording());
 }
 
+TEST_F(RequestsTest, EveryRequestIsServed) {
+  auto client = game();
+  for (const auto& operation : daemonProtocol().operations) {
+    client.request(operation.member.c_str(), platform::IPCArguments(operation.arguments.size()));
+  }
+  EXPECT_EQ(device_.log.countContaining("nobody serves"), 0u);
+  EXPECT_FALSE(client.state().empty());
+}
+
 TEST_F(RequestsTest, StateHoldsWhatTheClientSet) {
   auto client = game();
   EXPECT_EQ(client.state().size(), 7u);

@@ -3,6 +3,8 @@
 #include <chrono>
 #include <optional>
 
+#include "platform/base/WireForm.h"
+
 namespace qv::fakes {
 
 using platform::Error;
@@ -34,15 +36,11 @@ Error errorReply(const std::string& name, const std::string& message) {
   return error;
 }
 
+/// The values as their signatures carry them, or nothing where one has no form in its.
 std::optional<IPCArguments> argumentsFor(const IPCArguments& values, const std::vector<std::string>& signatures) {
-  if (values.size() != signatures.size()) return std::nullopt;
-  IPCArguments result;
-  for (size_t i = 0; i < values.size(); ++i) {
-    auto value = valueForSignature(values[i], signatures[i]);
-    if (!value) return std::nullopt;
-    result.push_back(std::move(*value));
-  }
-  return result;
+  platform::ValueAssembly received;
+  if (platform::writeForms(received, signatures, values) < 0) return std::nullopt;
+  return received.take();
 }
 
 }  // namespace

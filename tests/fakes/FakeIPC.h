@@ -123,7 +123,4 @@ class RecordingExportedObject final : public platform::IPCExportedObject {
   std::deque<ReceivedCall> calls_;
 };
 
-/// The value as the type `signature` would carry it, or nothing where the value has no such form.
-std::optional<platform::Value> valueForSignature(const platform::Value& value, std::string_view signature);
-
 }  // namespace qv::fakes

@@ -1,5 +1,3 @@
-#include "platform/base/RawRecord.h"
-#include "platform/base/SampleBuffer.h"
 #include "session/QVClientProxy.h"
 #include "tests/fakes/LogRecorder.h"
 #include "tests/sdk/RecorderFixture.h"
@@ -18,8 +16,7 @@ TEST_F(ClientProxy, FailuresOfSamplesAreToldAsTheirNumberDoubles) {
   QVClientProxy proxy(errors, "com.example.game", connection);
   killDaemon();
   const fakes::LogRecorder log;
-  const platform::Data bytes(2);
-  for (int i = 0; i < 1000; ++i) proxy.captureHandlerWithAudioSample(bytes, bytes, 1, 2, bytes);
+  for (int i = 0; i < 1000; ++i) proxy.captureHandlerWithAudioSample({});
   for (int i = 0; i < 3; ++i) proxy.updateBroadcastURL(platform::URL("https://x"));
   run();
   const std::string sound = "QVClientProxy:captureHandlerWithAudioSample: error getting remote proxy: ";

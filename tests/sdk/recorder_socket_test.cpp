@@ -5,12 +5,9 @@
 #include <filesystem>
 #include <future>
 
-#include "platform/base/RawRecord.h"
-#include "platform/base/SampleBuffer.h"
 #include "platform/sdbus/SdBusIPC.h"
-#include "protocol/QVClientProtocol.h"
 #include "protocol/QVDaemonProtocol.h"
-#include "protocol/QVSharedFrameObject.h"
+#include "protocol/SampleCoding.h"
 #include "sdk/client/quorvel/Recorder.h"
 #include "tests/fakes/FakeIPC.h"
 
@@ -67,8 +64,8 @@ class RecorderSocket : public ::testing::Test, protected platform::IPCListenerDe
     daemonEnd_ = connection;
     return true;
   }
-  std::shared_ptr<IPCConnection> daemonEnd() {
-    return queue_.syncResult<std::shared_ptr<IPCConnection>>([this] { return daemonEnd_; });
+  void send(OutgoingCall call) {
+    queue_.sync([&] { daemonEnd_->call(call.member, std::move(call.arguments), {}, {}); });
   }
   void startRecording() {
     std::promise<quorvel::StartResult> started;
@@ -105,11 +102,7 @@ TEST_F(RecorderSocket, RecordsCapturesAndStops) {
   std::shared_ptr<void> hold(nullptr, [&](void*) { returned.set_value(true); });
   platform::SampleTimingInfo timing;
   timing.presentationTimeStamp = platform::MediaTime::make(3, 2);
-  daemonEnd()->call("captureHandlerWithSample",
-                    {QVSharedFrameObject(platform::SharedFrameRef(std::move(hold), pixels.get())).encodeForIPC(),
-                     platform::rawBytes(timing)},
-                    {}, {});
-  hold.reset();
+  send(captureCallOf(PictureMessage{platform::SharedFrameRef(std::move(hold), pixels.get()), timing}));
   auto frame = take(arrived);
   EXPECT_EQ(frame.pixels[63], 0x77);
   EXPECT_EQ(frame.presentationTime, 1500ms);
@@ -142,15 +135,12 @@ TEST_F(RecorderSocket, EachSampleIsPlacedByTheTimelineToldBeforeIt) {
   startRecording();
   const platform::AudioStreamDescription format{
       1000, platform::kAudioFormatLinearPCM, platform::kAudioFormatFlagIsSignedInteger, 2, 1, 2, 1, 16, 0};
-  const auto connection = daemonEnd();
   for (int64_t i = 0; i < kSamples; ++i) {
     // Captured every 11 ms, 10 of which are a pause; 1 ms long.
     platform::SampleTimingInfo timing{};
     timing.presentationTimeStamp = platform::MediaTime::make(11 * i, 1000);
-    connection->call("captureTimelineDidChange", {platform::rawBytes(platform::MediaTime::make(10 * i, 1000))}, {}, {});
-    connection->call(
-        "captureHandlerWithAudioSample",
-        {platform::Data{1, 2}, platform::rawBytes(format), int64_t{1}, int64_t{2}, platform::rawBytes(timing)}, {}, {});
+    send(timelineCallOf(platform::MediaTime::make(10 * i, 1000)));
+    send(captureCallOf(SoundMessage{SampleType::AppAudio, {1, 2}, format, 1, timing}));
   }
   ASSERT_TRUE(take(isComplete));
   for (int i = 0; i < kSamples; ++i) EXPECT_EQ(times[static_cast<size_t>(i)], i * 1ms);

@@ -49,7 +49,8 @@ class QUORVEL_API Broadcast {
   virtual void updateServiceInfo(Dictionary serviceInfo) = 0;
   /// Where the broadcast can be watched.
   virtual void updateBroadcastURL(std::string url) = 0;
-  /// The broadcast cannot go on: the recording ends, the application gets this error, and the process is killed soon.
+  /// The broadcast cannot go on: the recording ends, the application gets this error (domain, code and text as they
+  /// are), and the process is killed soon. Once; later ones are not heard.
   virtual void finishBroadcastWithError(Error error) = 0;
 
  protected:
@@ -79,15 +80,20 @@ class QUORVEL_API SampleExtension {
   virtual void started(Dictionary userInfo) = 0;
   /// No samples come until `resumed`.
   virtual void paused() {}
+  /// Samples come again, on the timeline that the comment of the class describes.
   virtual void resumed() {}
   /// Once, last. The process is killed as soon as this has returned: send what is left before, in a few seconds.
   virtual void finished() = 0;
+  /// A picture, where what is shown has changed (30 a second at most), and at least two a second of a screen that
+  /// stands still.
   virtual void processVideo(VideoFrame frame, Orientation orientation) = 0;
+  /// A run of the application's sound, or of the microphone's.
   virtual void processAudio(AudioSample sample) = 0;
   /// Once for a broadcast, the bundle identifier of the application in front: right after `started`, before any sample;
   /// where no application is in front then, with the first that comes to the front.
   virtual void frontmostApplication(std::string /*bundleID*/) {}
 };
+/// Makes the object of a broadcast, on the library's thread; the Broadcast outlives it. Never nothing.
 using SampleExtensionFactory = std::function<std::unique_ptr<SampleExtension>(Broadcast&)>;
 
 // Clip mode -------------------------------------------------------------------------------------------
@@ -98,12 +104,13 @@ struct Clip {
   /// Open for reading, at its start; seekable. Closed with the last copy of `holder`. There is no path: an extension
   /// may read this file only, and only through this descriptor.
   int file = -1;
-  std::string name;  ///< the file's name; ends in "_N.mp4", where N counts the clips of one broadcast from 1
-  bool isLast = false;
+  std::string name;     ///< the file's name; ends in "_N.mp4", where N counts the clips of one broadcast from 1
+  bool isLast = false;  ///< of the broadcast; the process is ended when it is done, two minutes after it at the latest
   Dictionary userInfo;  ///< what the application gave with the set-up of the broadcast
-  std::shared_ptr<const void> holder;
+  std::shared_ptr<const void> holder;  ///< keeps `file` open
 };
 
+/// What an extension has to say with the end of a clip; both may be empty.
 struct ClipResult {
   std::optional<BroadcastConfiguration> configuration = {};  ///< from the next clip on
   std::optional<Dictionary> serviceInfo = {};                ///< for the application
@@ -122,6 +129,7 @@ class QUORVEL_API ClipExtension {
   /// Further clips wait until this returns; their files stay on the disk meanwhile.
   virtual void processClip(Clip clip, ClipCompletion done) = 0;
 };
+/// Makes the one object of the process, on the library's thread. Never nothing.
 using ClipExtensionFactory = std::function<std::unique_ptr<ClipExtension>()>;
 
 // Running ---------------------------------------------------------------------------------------------
@@ -150,7 +158,7 @@ int runExtension() {
 /// Threading: thread-safe; not to be destroyed within a call of an extension's object.
 class QUORVEL_API BroadcastListener {
  public:
-  /// Nothing where the system is out of descriptors.
+  /// Nothing where the system is out of descriptors. `make` makes the object of each broadcast.
   static std::unique_ptr<BroadcastListener> create(SampleExtensionFactory make);
   virtual ~BroadcastListener();
   BroadcastListener(const BroadcastListener&) = delete;
