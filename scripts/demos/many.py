@@ -6,14 +6,13 @@ usage: many.py BUILD_DIRECTORY OUTPUT_DIRECTORY
 # build: quorveld quorveld-movies quorvel-example-game
 import json
 import os
-import shutil
 import sys
 import time
 
 sys.path.insert(0, os.path.join(os.path.dirname(os.path.abspath(__file__)), ".."))
 from stage.applications import Application  # noqa: E402
 from stage.device import Stage  # noqa: E402
-from stage.movie import path_in  # noqa: E402
+from stage.movie import keep, path_in, report  # noqa: E402
 
 INTERRUPTED = -5806
 SECONDS = 2  # each recording's length
@@ -70,13 +69,8 @@ def main():
             good = good and ends == 1
             print(f"{earlier.name} was told {ends} time{'s' if ends != 1 else ''}")
         good = check_metrics(stage, len(cast)) and good
-        recorded = path_in(stopped)
-        os.makedirs(output, exist_ok=True)
-        movie = os.path.join(output, os.path.basename(recorded))
-        shutil.copyfile(recorded, movie)
-    print("movie: " + movie)
-    sys.stdout.flush()
-    sys.exit(0 if good else 1)
+        movie = keep(path_in(stopped), output)
+    report(movie, good)
 
 
 main()

@@ -8,13 +8,12 @@ usage: recording.py BUILD_DIRECTORY OUTPUT_DIRECTORY
 import json
 import math
 import os
-import shutil
 import subprocess
 import sys
 
 sys.path.insert(0, os.path.join(os.path.dirname(os.path.abspath(__file__)), ".."))
 from stage.device import Stage  # noqa: E402
-from stage.movie import beeps, flashes, path_in, run  # noqa: E402
+from stage.movie import beeps, flashes, keep, path_in, report, run  # noqa: E402
 from stage.processes import wait_until  # noqa: E402
 
 # A flash needs a few pictures and its beep a few milliseconds to be found; and a resume may come amid a flash.
@@ -70,7 +69,7 @@ def run_application(stage):
     return movie
 
 
-def report(movie):
+def is_good(movie):
     information = json.loads(run(["ffprobe", "-v", "error", "-of", "json", "-show_streams", "-show_format", movie]))
     for stream in information["streams"]:
         size = f" {stream['width']}x{stream['height']}" if stream["codec_type"] == "video" else ""
@@ -102,13 +101,8 @@ def report(movie):
 def main():
     build, output = sys.argv[1:]
     with Demo(build) as stage:
-        recorded = run_application(stage)
-        os.makedirs(output, exist_ok=True)
-        movie = shutil.copyfile(recorded, os.path.join(output, os.path.basename(recorded)))
-    good = report(movie)
-    print("movie: " + movie)
-    sys.stdout.flush()
-    sys.exit(0 if good else 1)
+        movie = keep(run_application(stage), output)
+    report(movie, is_good(movie))
 
 
 main()

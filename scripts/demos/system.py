@@ -7,7 +7,6 @@ usage: system.py BUILD_DIRECTORY OUTPUT_DIRECTORY
 # build: quorveld quorveld-movies quorvel-example-game quorvel-example-system-ui
 import math
 import os
-import shutil
 import sys
 import time
 from collections import Counter
@@ -15,7 +14,7 @@ from collections import Counter
 sys.path.insert(0, os.path.join(os.path.dirname(os.path.abspath(__file__)), ".."))
 from stage.applications import Application  # noqa: E402
 from stage.device import Stage  # noqa: E402
-from stage.movie import level, path_in, run, sound  # noqa: E402
+from stage.movie import keep, level, path_in, report, run, sound  # noqa: E402
 
 RATE = 22050
 LOOKS = 20          # a second
@@ -123,16 +122,12 @@ def main():
     with Device(build, screen=(1280, 720)) as stage:
         recorded = record(stage)
         dropped = stage.daemon.expect("movie finished:")[1]
-        os.makedirs(output, exist_ok=True)
-        movie = os.path.join(output, os.path.basename(recorded))
-        shutil.copyfile(recorded, movie)
+        movie = keep(recorded, output)
     print("daemon: " + dropped[dropped.index("movie finished"):])
     pictures, tones = seen(movie), heard(movie)
     good = check_seconds(pictures, tones)
     good = check_switches(pictures, tones) and good
-    print("movie: " + movie)
-    sys.stdout.flush()
-    sys.exit(0 if good else 1)
+    report(movie, good)
 
 
 main()

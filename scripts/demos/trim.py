@@ -6,7 +6,6 @@ usage: trim.py BUILD_DIRECTORY OUTPUT_DIRECTORY
 """
 # build: quorveld quorveld-movies quorveld-exports quorvel-example-game
 import os
-import shutil
 import sys
 import time
 
@@ -31,7 +30,7 @@ def record(stage):
     """(what was recorded, what the application got)"""
     game = Game(stage, WIDTH, HEIGHT, FPS, "--numbered", "--trim", f"{START:g},{END:g}")
     game.start()
-    kept = os.path.join(stage.directory, "source.mp4")
+    kept = os.path.join(stage.directory, "trim-source.mp4")
     time.sleep(SECONDS)
     os.link(stage.movie_files()[0], kept)
     line = game.ask("s", "stopRecordingWithStartTimeOffset", "stopped")[2]
@@ -82,13 +81,8 @@ def main():
     build, output = sys.argv[1:]
     with Device(build, screen=(WIDTH, HEIGHT)) as stage:
         kept, recorded = record(stage)
-        os.makedirs(output, exist_ok=True)
-        source = shutil.copyfile(kept, os.path.join(output, "trim-source.mp4"))
-        movie = shutil.copyfile(recorded, os.path.join(output, os.path.basename(recorded)))
-    good = compare(source, movie)
-    print("movie: " + movie)
-    sys.stdout.flush()
-    sys.exit(0 if good else 1)
+        source, movie = movies.keep(kept, output), movies.keep(recorded, output)
+    movies.report(movie, compare(source, movie))
 
 
 main()

@@ -6,8 +6,10 @@ import array
 import json
 import math
 import os
+import shutil
 import socket
 import subprocess
+import sys
 import urllib.parse
 
 from stage.processes import check
@@ -39,6 +41,18 @@ def free_port():
 def path_in(line):
     """Of the movie whose URL an application prints as "url=..."; empty where there is none."""
     return urllib.parse.unquote(urllib.parse.urlparse(line.split("url=")[1].split(" error=")[0]).path)
+
+
+def keep(path, directory):
+    """A copy that outlives the stage."""
+    os.makedirs(directory, exist_ok=True)
+    return shutil.copyfile(path, os.path.join(directory, os.path.basename(path)))
+
+
+def report(path, is_good):
+    """The end of a demo."""
+    print("movie: " + path, flush=True)
+    sys.exit(0 if is_good else 1)
 
 
 def streams(path):

@@ -4,6 +4,7 @@
 #include "platform/headless/HeadlessPlatform.h"
 #include "platform/x11/X11Platform.h"
 #include "tests/contracts/Backends.h"
+#include "tests/kit/ApplicationReport.h"
 #include "tests/kit/Events.h"
 #include "tests/kit/XServer.h"
 
@@ -50,20 +51,13 @@ class X11Stage final : public ApplicationsStage {
                     .value());
 };
 
-/// What a report says of every backend's applications; those behind may be in different states.
-struct Report {
-  std::string bundleID;
-  int64_t process = 0;
-  bool isFrontmost = false;
-  bool operator==(const Report&) const = default;
-};
-std::ostream& operator<<(std::ostream& out, const Report& report) {
-  return out << report.bundleID << " " << report.process << (report.isFrontmost ? " in front" : "");
-}
-Report decode(const Dictionary& report) {
-  return {valueForKey(report, applicationstate::kBundleIDKey).asString(),
-          valueForKey(report, applicationstate::kProcessIDKey).asInteger(),
-          valueForKey(report, applicationstate::kIsFrontmostKey).asBool()};
+using Report = kit::ApplicationReport;
+
+/// Without the state: backends tell different ones of who is behind.
+Report decode(const Dictionary& dictionary) {
+  Report report = Report::decode(dictionary);
+  report.state = 0;
+  return report;
 }
 
 class ApplicationsContract : public ContractTest<ApplicationsStage> {
@@ -73,7 +67,7 @@ class ApplicationsContract : public ContractTest<ApplicationsStage> {
     if (stage_) monitor_ = stage_->applications().createStateMonitor();
   }
   Report report(const std::string& bundleID, bool isFrontmost) {
-    return {bundleID, stage_->processOf(bundleID), isFrontmost};
+    return {bundleID, stage_->processOf(bundleID), isFrontmost, 0};
   }
   Dictionary infoOf(const std::string& bundleID) {
     kit::Events<Dictionary> info;

@@ -8,7 +8,7 @@ HERE = os.path.dirname(os.path.abspath(__file__))
 SCRIPTS = os.path.join(HERE, "../../scripts")
 sys.path.insert(0, SCRIPTS)
 from stage import device  # noqa: E402
-from stage.processes import PATIENCE, check, wait_until  # noqa: E402, F401
+from stage.processes import check, wait_until  # noqa: E402, F401
 
 SKIPPED = 77    # the exit code that ctest shows as "Skipped"
 BUILD = os.environ.get('QV_BUILD') or sys.exit('QV_BUILD is not set; run the test with ctest')

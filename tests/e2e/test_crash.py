@@ -23,8 +23,7 @@ def record_and_kill(device, length, killed_path=None):
     game = device.start_game(script='record 600; stop')
     game.expect('started')
     started = time.monotonic()
-    wait_until('the movie file', device.movie_files)
-    path, = device.movie_files()
+    path, = wait_until('the movie file', device.movie_files)
     wait_until('the moment to kill', lambda: movie.fragment_count(path) >= FEWEST_FRAGMENTS and
                time.monotonic() >= started + length, step=0.001)
     killed = time.monotonic()

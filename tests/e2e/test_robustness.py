@@ -15,6 +15,13 @@ def records(device):
     return 'error=0' in device.run_game('record 1; stop; discard; quit')
 
 
+def wait_for_growth(device):
+    """The movie that is being recorded, with a fragment in it."""
+    path, = wait_until('the movie file', device.movie_files)
+    wait_until('the movie to grow', lambda: movie.fragment_count(path) >= 1)
+    return path
+
+
 def second_daemon():
     """It must not take the place of the one that serves."""
     with Device() as device:
@@ -53,9 +60,7 @@ def client_dies_in_recording():
         device.start_daemon()
         game = device.start_game(script='record 600; stop')
         game.expect('started')
-        wait_until('the movie file', device.movie_files)
-        path, = device.movie_files()
-        wait_until('the movie to grow', lambda: movie.fragment_count(path) >= 1)
+        path = wait_for_growth(device)
         game.kill()
         wait_until('the movie of nobody to go away', lambda: not device.movie_files())
         check(records(device), 'the next client is not served')
@@ -99,9 +104,7 @@ def record_while_disk_fills(room):
         device.start_daemon()
         game = device.start_game(script='record 4; stop; quit')
         game.expect('started')
-        wait_until('the movie file', device.movie_files)
-        path, = device.movie_files()
-        wait_until('the movie to grow', lambda: movie.fragment_count(path) >= 1)
+        path = wait_for_growth(device)
         ballast = os.path.join(device.media, 'ballast')
         fill_disk(ballast, room)
         game.wait()

@@ -107,20 +107,6 @@ TEST_F(AssetWriterTest, TurnsPicturesThatLieAcrossTheTrackAndTurnsThemBackWhenSh
   expectPictures(path_, 0xA50, 10, 10, Turning::AsShown);
 }
 
-TEST_F(AssetWriterTest, EndsAfterThePictureOfTheEndTime) {
-  RecordingUnderTest recording(service_, path_);
-  for (uint32_t i = 0; i < 120; ++i) {
-    const double now = kStart + i / 60.0;
-    recording.appendPicture(picture(i, now, now));
-    recording.appendSound(1, beepingSound(now, 735));
-  }
-  recording.writer().endSessionAtSourceTime(at(kStart + 59 / 60.0));
-  recording.finish();
-  const auto movie = probeGood(path_);
-  for (const auto& track : movie.tracks) EXPECT_NEAR(track.duration, 1.0, 1e-4) << track.type;
-  EXPECT_EQ(decodePictures(path_).size(), 60u);
-}
-
 TEST_F(AssetWriterTest, ReadsEveryPCMFormatAtItsLevel) {
   const BeepFormat formats[] = {{44100, 1, true, false, 0.5},
                                 {48000, 2, false, false, 0.5},

@@ -3,7 +3,6 @@
 #include <cmath>
 #include <filesystem>
 #include <fstream>
-#include <future>
 #include <random>
 
 #include "platform/ffmpeg/FFmpegMovies.h"
@@ -38,16 +37,7 @@ class ExportTest : public ::testing::Test {
 
   std::shared_ptr<ExportSession> session(const std::string& source, const std::string& destination,
                                          ExportPreset preset) {
-    auto made = service_.createExportSession(service_.openMovie(URL::fileURL(source)), preset);
-    made->setOutputURL(URL::fileURL(destination));
-    made->setOutputFileType(kFileTypeMPEG4);
-    return made;
-  }
-  static void runToEnd(ExportSession& session, ExportStatus wanted = ExportStatus::Completed) {
-    std::promise<void> done;
-    session.exportAsynchronously([&] { done.set_value(); });
-    done.get_future().wait();
-    EXPECT_EQ(session.status(), wanted) << (session.error() ? session.error()->description() : "");
+    return sessionFor(service_, source, destination, preset);
   }
   static size_t filesIn(const std::string& directory) {
     return static_cast<size_t>(std::distance(std::filesystem::directory_iterator(directory), {}));
@@ -235,28 +225,6 @@ TEST_F(ExportTest, TakesMoviesWithoutATrackAndWithOddTimes) {
       runToEnd(*part);
       EXPECT_EQ(probe(path).errors, "") << odd.name;
       EXPECT_NEAR(probe(path).duration, 4.1, 0.05) << odd.name;
-    }
-  }
-}
-
-/// A source that goes away, or is cut short, while it is read: the whole result, or an error and nothing.
-TEST_F(ExportTest, SurvivesTheLossOfItsSource) {
-  const std::string source = results_ / "source.mp4";
-  const std::string path = results_ / "output.mp4";
-  for (const bool removed : {true, false}) {
-    for (const auto preset : {ExportPreset::PassThrough, ExportPreset::HighestQuality}) {
-      std::filesystem::copy_file(source_, source, std::filesystem::copy_options::overwrite_existing);
-      auto copy = session(source, path, preset);
-      std::promise<void> done;
-      copy->exportAsynchronously([&] { done.set_value(); });
-      removed ? (void)std::filesystem::remove(source) : std::filesystem::resize_file(source, 40'000);
-      done.get_future().wait();
-      const bool completed = copy->status() == ExportStatus::Completed;
-      EXPECT_NE(completed, copy->error().has_value());
-      EXPECT_EQ(completed ? probe(path).errors : "", "");
-      EXPECT_EQ(std::filesystem::remove(path), completed);
-      std::filesystem::remove(source);
-      EXPECT_EQ(filesIn(results_.path()), 0u);
     }
   }
 }

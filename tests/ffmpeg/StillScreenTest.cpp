@@ -1,6 +1,5 @@
 #include <gtest/gtest.h>
 
-#include <future>
 #include <optional>
 
 #include "platform/ffmpeg/FFmpegMovies.h"
@@ -52,11 +51,7 @@ TEST_F(StillScreenTest, LastsUntilTheStopWithAllSoundBeforeIt) {
   for (const auto& track : finish(kStop).tracks) EXPECT_NEAR(track.duration, 3.43, 1.0 / 44100) << track.type;
   EXPECT_EQ(decodePictures(path_).size(), 7u);
   // By capture time: at 101, 102, 110 and 111.
-  for (const int track : {0, 1}) {
-    const auto heard = beeps(decodeSound(path_, track));
-    ASSERT_EQ(heard.size(), 4u);
-    EXPECT_NEAR(heard[3], 111 - kPause - kBegin, 0.001);
-  }
+  for (const int track : {0, 1}) expectBeeps(path_, track, {0.27, 1.27, 110 - kPause - kBegin, 111 - kPause - kBegin});
 }
 
 /// What the last picture lasts is kept by whatever is made of the movie.
@@ -65,33 +60,34 @@ TEST_F(StillScreenTest, IsExportedInItsWholeLength) {
   ffmpeg::FFmpegExportService exports;
   for (const ExportPreset preset : {ExportPreset::PassThrough, ExportPreset::HighestQuality}) {
     const std::string copy = scratch_ / "copy.mp4";
-    auto session = exports.createExportSession(exports.openMovie(URL::fileURL(path_)), preset);
-    session->setOutputURL(URL::fileURL(copy));
-    session->setOutputFileType(kFileTypeMPEG4);
     const double start = preset == ExportPreset::PassThrough ? 2.2 : 0;
+    const auto session = sessionFor(exports, path_, copy, preset);
     if (start > 0) session->setTimeRange({at(start), at(3.43 - start)});
-    std::promise<void> done;
-    session->exportAsynchronously([&] { done.set_value(); });
-    done.get_future().wait();
-    ASSERT_EQ(session->status(), ExportStatus::Completed);
+    runToEnd(*session);
     const auto movie = probeGood(copy);
     for (const auto& track : movie.tracks) EXPECT_NEAR(track.duration, 3.43 - start, 1e-3) << track.type;
   }
 }
 
-TEST_F(StillScreenTest, EndsExactlyWhereTheNextMovieBegins) {
-  // 4 ms after a picture, which is less than a frame.
-  for (const auto& track : finish(kBegin + 2.504).tracks) EXPECT_NEAR(track.duration, 2.504, 1.0 / 44100) << track.type;
-  EXPECT_EQ(decodePictures(path_).size(), 6u);
-}
+struct End {
+  const char* name;
+  std::optional<double> end;
+  double duration;
+  size_t pictures;
+};
+class EndsOfStillScreens : public StillScreenTest, public ::testing::WithParamInterface<End> {};
+INSTANTIATE_TEST_SUITE_P(, EndsOfStillScreens,
+                         ::testing::Values(
+                             // 4 ms after a picture, which is less than a frame.
+                             End{"WhereTheNextMovieBegins", 100.73 + 2.504, 2.504, 6},
+                             End{"WithTheLastSoundWhereNoneIsTold", std::nullopt, 4.43, 7},
+                             End{"NotBeforeTheFirstPictureWhichLastsAFrame", 95, 1 / 60.0, 1}),
+                         [](const auto& end) { return end.param.name; });
 
-TEST_F(StillScreenTest, LastsUntilTheLastSoundWhereNoEndIsTold) {
-  for (const auto& track : finish(std::nullopt).tracks) EXPECT_NEAR(track.duration, 4.43, 2.0 / 44100) << track.type;
-}
-
-TEST_F(StillScreenTest, ShowsThePictureOfItsEndForAFrameAndNeverEndsBeforeItsFirst) {
-  for (const auto& track : finish(kBegin - 5).tracks) EXPECT_NEAR(track.duration, 1 / 60.0, 1.0 / 44100) << track.type;
-  EXPECT_EQ(decodePictures(path_).size(), 1u);
+TEST_P(EndsOfStillScreens, AreOfPictureAndSound) {
+  for (const auto& track : finish(GetParam().end).tracks)
+    EXPECT_NEAR(track.duration, GetParam().duration, 2.0 / 44100) << track.type;
+  EXPECT_EQ(decodePictures(path_).size(), GetParam().pictures);
 }
 
 }  // namespace

@@ -154,4 +154,19 @@ void RecordingUnderTest::finish() {
   done.get_future().wait();
 }
 
+std::shared_ptr<ExportSession> sessionFor(ExportService& service, const std::string& source,
+                                          const std::string& destination, ExportPreset preset) {
+  auto session = service.createExportSession(service.openMovie(URL::fileURL(source)), preset);
+  session->setOutputURL(URL::fileURL(destination));
+  session->setOutputFileType(kFileTypeMPEG4);
+  return session;
+}
+
+void runToEnd(ExportSession& session, ExportStatus wanted) {
+  std::promise<void> done;
+  session.exportAsynchronously([&] { done.set_value(); });
+  done.get_future().wait();
+  EXPECT_EQ(session.status(), wanted) << (session.error() ? session.error()->description() : "");
+}
+
 }  // namespace qv::platform::test

@@ -6,6 +6,7 @@
 #include <vector>
 
 #include "platform/AssetWriter.h"
+#include "platform/ExportSession.h"
 #include "platform/base/SampleBuffer.h"
 
 namespace qv::platform::test {
@@ -60,5 +61,11 @@ class RecordingUnderTest {
   std::shared_ptr<WriterInput> inputs_[3];
   bool started_ = false;
 };
+
+/// An export of a whole movie, not begun.
+std::shared_ptr<ExportSession> sessionFor(ExportService& service, const std::string& source,
+                                          const std::string& destination, ExportPreset preset);
+/// Expects that it ends so.
+void runToEnd(ExportSession& session, ExportStatus wanted = ExportStatus::Completed);
 
 }  // namespace qv::platform::test

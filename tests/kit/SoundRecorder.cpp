@@ -71,6 +71,11 @@ size_t SoundRecorder::parts() {
   return starts_.size();
 }
 
+bool SoundRecorder::waitForParts(size_t count) {
+  std::unique_lock lock(mutex_);
+  return changed_.wait_for(lock, kNever, [&] { return starts_.size() >= count; });
+}
+
 uint64_t SoundRecorder::end() {
   std::lock_guard lock(mutex_);
   if (starts_.empty()) return 0;

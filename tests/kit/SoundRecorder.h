@@ -36,6 +36,7 @@ class SoundRecorder {
   [[nodiscard]] bool isContinuous();
   /// How many times something came.
   size_t parts();
+  bool waitForParts(size_t count);
 
  private:
   std::mutex mutex_;

@@ -3,7 +3,6 @@
 #include <cstdlib>
 #include <filesystem>
 #include <fstream>
-#include <random>
 
 #include "platform/mp4/AnnexB.h"
 #include "platform/mp4/BoxReader.h"
@@ -73,31 +72,6 @@ TEST_F(MovieWriterTest, IndexesMediaBeyondFourGigabytes) {
   offsets.skip(4);
   EXPECT_EQ(offsets.u32(), 1u);
   EXPECT_EQ(offsets.u64(), kFar);
-}
-
-/// Whatever a crash or a bad disk leaves, a salvage ends with an answer and reads nothing out of bounds.
-TEST_F(MovieWriterTest, SalvagesOrRefusesDamagedFiles) {
-  writeCrashed(3);
-  const auto good = contents();
-  std::mt19937 random(11);
-  int salvaged = 0;
-  for (int round = 0; round < 500; ++round) {
-    auto bytes = good;
-    if (round % 2 == 0) bytes.resize(random() % bytes.size());
-    for (unsigned i = random() % 4; i > 0 && !bytes.empty(); --i) {
-      bytes[random() % bytes.size()] = static_cast<uint8_t>(random());
-    }
-    std::ofstream(path_, std::ios::binary | std::ios::trunc)
-        .write(reinterpret_cast<const char*>(bytes.data()), std::ssize(bytes));
-    const auto length = salvage_.salvageMovie(path_);
-    if (length && length.value() > MediaTime::zero()) {
-      ++salvaged;
-      EXPECT_EQ(salvage_.stateOfMovie(path_).value(), MovieState::Finished);
-    } else {
-      EXPECT_EQ(contents(), bytes) << "a refused file is left untouched";
-    }
-  }
-  EXPECT_GT(salvaged, 50);
 }
 
 TEST_F(MovieWriterTest, LeavesAloneWhatIsNoPlainFileOrIsBeingWritten) {

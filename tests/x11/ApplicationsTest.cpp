@@ -2,34 +2,19 @@
 #include <mutex>
 
 #include "platform/x11/X11Platform.h"
+#include "tests/kit/ApplicationReport.h"
 #include "tests/kit/Events.h"
 #include "tests/kit/XServer.h"
 
 namespace qv::platform {
 namespace {
 
+using Report = kit::ApplicationReport;
 using kit::WindowProcess;
 using kit::XServer;
 
 constexpr char kGame[] = "com.example.game";
 constexpr char kFilm[] = "com.example.film";
-
-struct Report {
-  std::string bundleID;
-  int64_t pid = 0, state = 0;
-  bool isFrontmost = false;
-  bool operator==(const Report&) const = default;
-};
-std::ostream& operator<<(std::ostream& out, const Report& report) {
-  return out << report.bundleID << " state " << report.state << (report.isFrontmost ? " in front" : "");
-}
-
-Report decode(const Dictionary& dictionary) {
-  return {valueForKey(dictionary, applicationstate::kBundleIDKey).asString(),
-          valueForKey(dictionary, applicationstate::kProcessIDKey).asInteger(),
-          valueForKey(dictionary, applicationstate::kStateKey).asInteger(),
-          valueForKey(dictionary, applicationstate::kIsFrontmostKey).asBool()};
-}
 
 class ApplicationsTest : public kit::XServerTest {
  protected:
@@ -59,7 +44,7 @@ class ApplicationsTest : public kit::XServerTest {
     return process;
   }
   void watch() {
-    monitor_->setHandler([this](const Dictionary& report) { reports_.add(decode(report)); });
+    monitor_->setHandler([this](const Dictionary& report) { reports_.add(Report::decode(report)); });
   }
   uint32_t stateOf(const std::string& bundleID) { return monitor_->applicationStateForBundleIdentifier(bundleID); }
   std::optional<std::string> frontmost() { return platform_->applications().frontmostApplication(); }
@@ -99,19 +84,19 @@ TEST_F(ApplicationsTest, ReportsChangesWithoutWindowManager) {
   client_->focus(game->window());
   watch();
   client_->focus(film->window());
-  EXPECT_EQ(reports_.next(), (Report{kGame, game->pid(), kApplicationBackground, false}));
-  EXPECT_EQ(reports_.next(), (Report{kFilm, film->pid(), kApplicationForeground, true}));
+  EXPECT_EQ(reports_.next(), (Report{kGame, game->pid(), false, kApplicationBackground}));
+  EXPECT_EQ(reports_.next(), (Report{kFilm, film->pid(), true, kApplicationForeground}));
   auto second = std::make_unique<WindowProcess>(display_);  // of no bundle: nothing to report
   client_->unmap(second->window());
   const pid_t filmProcess = film->pid();
   film->kill();  // the focus goes to nobody: the topmost visible window counts
-  EXPECT_EQ(reports_.next(), (Report{kFilm, filmProcess, kApplicationTerminated, false}));
-  EXPECT_EQ(reports_.next(), (Report{kGame, game->pid(), kApplicationForeground, true}));
+  EXPECT_EQ(reports_.next(), (Report{kFilm, filmProcess, false, kApplicationTerminated}));
+  EXPECT_EQ(reports_.next(), (Report{kGame, game->pid(), true, kApplicationForeground}));
   EXPECT_EQ(stateOf(kFilm), kApplicationUnknown);
   auto third = launch("com.example.third");
   client_->raise(third->window());
-  EXPECT_EQ(reports_.next(), (Report{kGame, game->pid(), kApplicationBackground, false}));
-  EXPECT_EQ(reports_.next(), (Report{"com.example.third", third->pid(), kApplicationForeground, true}));
+  EXPECT_EQ(reports_.next(), (Report{kGame, game->pid(), false, kApplicationBackground}));
+  EXPECT_EQ(reports_.next(), (Report{"com.example.third", third->pid(), true, kApplicationForeground}));
 }
 
 TEST_F(ApplicationsTest, FollowsTheWindowManager) {
@@ -152,12 +137,12 @@ TEST_F(ApplicationsTest, NobodyIsInFrontOfALostServer) {
   EXPECT_EQ(frontmost(), kGame);
   watch();
   mortal.kill();
-  EXPECT_EQ(reports_.next(), (Report{kGame, game->pid(), kApplicationBackground, false}));
+  EXPECT_EQ(reports_.next(), (Report{kGame, game->pid(), false, kApplicationBackground}));
   EXPECT_EQ(frontmost(), std::nullopt);
   EXPECT_EQ(stateOf(kGame), kApplicationUnknown);
   const pid_t process = game->pid();
   game->kill();
-  EXPECT_EQ(reports_.next(), (Report{kGame, process, kApplicationTerminated, false}));
+  EXPECT_EQ(reports_.next(), (Report{kGame, process, false, kApplicationTerminated}));
 }
 
 }  // namespace
