@@ -18,11 +18,11 @@ TEST_F(ErrorsTest, TheFirstAndTheLastCodeHaveTheirKeyAndOthersAreUnknown) {
   addTable("en", "");
   for (const auto& [code, key] : {std::pair<int64_t, const char*>{-5800, "RECORDING_ERROR_UNKNOWN"},
                                   {0, "RECORDING_ERROR_UNKNOWN"},
-                                  {-5819, "RECORDING_ERROR_UNKNOWN"},
+                                  {kRecordingErrors.back().code - 1, "RECORDING_ERROR_UNKNOWN"},
                                   {INT64_MIN, "RECORDING_ERROR_UNKNOWN"},
                                   {INT64_MAX, "RECORDING_ERROR_UNKNOWN"},
                                   {-5801, "RECORDING_ERROR_USER_DECLINED"},
-                                  {-5818, "RECORDING_ERROR_MIXING_FAILURE"}}) {
+                                   {kRecordingErrors.back().code, kRecordingErrors.back().key}}) {
     const auto error = QuorvelErrors(texts_)._qvUserErrorForCode(code);
     EXPECT_EQ(error.domain, "com.tarnwick.Quorvel.QVRecordingErrorDomain");
     EXPECT_EQ(error.code, code);

@@ -177,8 +177,9 @@ class QUORVEL_API Recorder {
   // Recording
 
   /// Asks the user where needed, and starts; so it may take long. A broadcast asks nobody, and waits for its extension:
-  /// 20 s at most. The application must be in front, unless it records the system. Whatever records on the device is
-  /// ended, also where this start is refused later on.
+  /// 20 s at most. The application must be in front, unless it records the system. Once
+  /// windows, size and rights are found good, whatever records on the device is ended, also where this start is refused
+  /// later on.
   ///
   /// kErrorUserDeclined; kErrorFailedToStart: not in front, no bundle, a window that is not this application's, a size
   /// that is none, another start on its way; kErrorInsufficientStorage: 100 000 000 bytes free or less;
