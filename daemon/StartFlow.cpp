@@ -4,6 +4,7 @@
 
 #include "platform/threads/Log.h"
 #include "session/VideoSize.h"
+#include "support/QVDeviceLayout.h"
 #include "support/QVDiskSpace.h"
 #include "support/QuorvelErrors.h"
 
@@ -13,6 +14,7 @@ using platform::Error;
 namespace logs = platform::logs;
 
 namespace {
+/// The program that internal security policies are asked for.
 constexpr const char kDaemonDomain[] = "com.tarnwick.quorveld";
 constexpr int32_t kNoProcess = -1;
 }  // namespace
@@ -65,7 +67,7 @@ void StartFlow::continueAfterStops() {
 bool StartFlow::isAlertSuppressed() const {
   if (!services_.context.platform.deviceInfo->allowsInternalSecurityPolicies(kDaemonDomain)) return false;
   const bool suppressed =
-      !services_.context.platform.preferences->valueForKey(kDaemonDomain, "QVSuppressAlert").isNone();
+      !services_.context.platform.preferences->valueForKey(kPreferenceDomain, "QVSuppressAlert").isNone();
   QV_LOG(logs::kDaemon, "QVRecordingManager: suppressAlert=%d", suppressed ? 1 : 0);
   return suppressed;
 }

@@ -1,6 +1,7 @@
 #include "session/VideoSize.h"
 
 #include "platform/threads/Log.h"
+#include "support/QVDeviceLayout.h"
 
 namespace qv {
 
@@ -8,7 +9,6 @@ using platform::Size;
 namespace logs = platform::logs;
 
 namespace {
-constexpr const char kPreferenceDomain[] = "com.tarnwick.quorveld";
 constexpr double kMaximumSide = 1920.0;
 constexpr double kSmallTabletMaximumSide = 1600.0;
 constexpr int64_t kSmallTabletChip = 0x8960;

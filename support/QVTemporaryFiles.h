@@ -63,14 +63,14 @@ class QVTemporaryFiles {
   void _srRemoveFile(const platform::URL& file, FileCompletion completion) const;
   /// Calls the completion (may be empty) on the background queue, with nothing done.
   void answerInBackground(FileCompletion completion, std::optional<platform::Error> error) const;
-  /// Moves one file later on, on the global queue, in place of whatever is at the destination;
-  /// `completion` (may be empty) is called there.
+  /// Offered, not called by this daemon: moves one file later on, on the global queue, in place of whatever is at the
+  /// destination; `completion` (may be empty) is called there.
   void _srMoveFileFromURL(const platform::URL& from, const platform::URL& to, FileCompletion completion) const;
-  /// Removes later on, on the global queue, every entry of the store whose name begins with `prefix`,
-  /// without regard to case and diacritics.
+  /// Offered, not called by this daemon: removes later on, on the global queue, every entry of the store whose name
+  /// begins with `prefix`, without regard to case and diacritics.
   void _srDeleteFilesWithPrefix(const std::string& prefix) const;
 
-  /// Nothing where the attributes cannot be read.
+  /// Offered, not called by this daemon. Nothing where the attributes cannot be read.
   [[nodiscard]] std::optional<platform::Date> _srGetCreationDateForFile(const platform::URL& file) const;
 
  private:

@@ -1,6 +1,7 @@
 #include <cmath>
 
 #include "platform/threads/Log.h"
+#include "support/QVDeviceLayout.h"
 #include "writer/QVMovieWriter.h"
 
 namespace qv {
@@ -12,7 +13,6 @@ namespace settings = platform::settings;
 
 namespace {
 
-constexpr const char kPreferenceDomain[] = "com.tarnwick.quorveld";
 constexpr double kLargeSide = 1920.0;
 constexpr int64_t kTabletBitRate = 7'000'000;
 constexpr int64_t kLargeBitRate = 5'000'000;
