@@ -3,7 +3,7 @@
 
 #include <fstream>
 #include <map>
-#include <regex>
+#include <sstream>
 
 #include "protocol/QVClientProtocol.h"
 #include "protocol/QVDaemonProtocol.h"
@@ -14,6 +14,17 @@ namespace {
 
 using Cells = std::vector<std::string>;
 
+/// What stands before each `end`, without the spaces around it.
+Cells partsOf(const std::string& text, char end) {
+  Cells parts;
+  std::istringstream stream(text);
+  for (std::string part; std::getline(stream, part, end);) {
+    const size_t first = std::min(part.find_first_not_of(' '), part.size());
+    parts.push_back(part.substr(first, part.find_last_not_of(' ') + 1 - first));
+  }
+  return parts;
+}
+
 /// The rows of the tables below a heading.
 std::vector<Cells> rowsOf(const std::string& document, const std::string& heading) {
   std::ifstream file(std::string(QV_DOCS_DIR "/") + document);
@@ -22,11 +33,7 @@ std::vector<Cells> rowsOf(const std::string& document, const std::string& headin
   for (std::string line; std::getline(file, line);) {
     if (line.starts_with("## ")) isBelow = line == "## " + heading;
     if (!isBelow || !line.starts_with("| ")) continue;
-    static const std::regex kCell(R"(\| *([^|]*[^| ])? *(?=\|))");
-    Cells& cells = rows.emplace_back();
-    for (std::sregex_iterator cell(line.begin(), line.end(), kCell), end; cell != end; ++cell) {
-      cells.push_back((*cell)[1]);
-    }
+    rows.push_back(partsOf(line.substr(2), '|'));
   }
   return rows;
 }
@@ -35,10 +42,10 @@ std::vector<Cells> rowsOf(const std::string& document, const std::string& headin
 std::map<std::string, Cells> documentedOperations(const std::string& heading) {
   std::map<std::string, Cells> operations;
   for (const Cells& cells : rowsOf("protocol.md", heading)) {
-    static const std::regex kName("`(\\w+)`");
-    const std::string& names = cells.at(0);
-    for (std::sregex_iterator name(names.begin(), names.end(), kName), end; name != end; ++name) {
-      EXPECT_TRUE(operations.emplace((*name)[1], Cells{cells.at(1), cells.at(2)}).second) << "twice: " << (*name)[1];
+    for (const std::string& name : partsOf(cells.at(0), ',')) {
+      if (!name.starts_with("`")) continue;  // the head of the table
+      const std::string member = name.substr(1, name.size() - 2);
+      EXPECT_TRUE(operations.emplace(member, Cells{cells.at(1), cells.at(2)}).second) << "twice: " << name;
     }
   }
   return operations;
