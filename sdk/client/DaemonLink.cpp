@@ -6,7 +6,7 @@
 #include "platform/threads/Log.h"
 #include "protocol/QVClientProtocol.h"
 #include "protocol/QVDaemonProtocol.h"
-#include "sdk/client/RecordingErrors.h"
+#include "sdk/client/RecorderErrors.h"
 
 namespace qv::client {
 

@@ -4,7 +4,7 @@
 
 #include "platform/base/Value.h"
 #include "sdk/client/RecorderSession.h"
-#include "sdk/client/RecordingErrors.h"
+#include "sdk/client/RecorderErrors.h"
 #include "sdk/client/WireValues.h"
 
 namespace quorvel {

@@ -3,7 +3,7 @@
 #include <utility>
 
 #include "platform/base/ValueTypes.h"
-#include "sdk/client/RecordingErrors.h"
+#include "sdk/client/RecorderErrors.h"
 #include "sdk/client/WireValues.h"
 #include "sdk/common/Samples.h"
 

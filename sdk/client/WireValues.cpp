@@ -2,7 +2,7 @@
 
 #include <fcntl.h>
 
-#include "sdk/client/RecordingErrors.h"
+#include "sdk/client/RecorderErrors.h"
 
 namespace qv::client {
 

@@ -17,9 +17,11 @@
 #include <vector>
 
 #include "platform/base/FileDescriptor.h"
-#include "tests/fakes/Events.h"
+#include "tests/kit/Events.h"
 
 namespace qv::platform::test {
+
+using kit::Events;
 
 /// A message bus of the test's own.
 class PrivateBus {

@@ -13,10 +13,13 @@
 #include <vector>
 
 #include "platform/sdbus/SdBusIPC.h"
-#include "tests/fakes/Events.h"
+#include "tests/kit/Events.h"
 #include "tests/sdbus/TestInterface.h"
 
 namespace qv::platform::test {
+
+using kit::Events;
+using kit::kNever;
 
 struct Call {
   std::string member;

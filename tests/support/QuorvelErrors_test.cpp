@@ -22,7 +22,7 @@ TEST_F(ErrorsTest, TheFirstAndTheLastCodeHaveTheirKeyAndOthersAreUnknown) {
                                   {INT64_MIN, "RECORDING_ERROR_UNKNOWN"},
                                   {INT64_MAX, "RECORDING_ERROR_UNKNOWN"},
                                   {-5801, "RECORDING_ERROR_USER_DECLINED"},
-                                   {kRecordingErrors.back().code, kRecordingErrors.back().key}}) {
+                                  {kRecordingErrors.back().code, kRecordingErrors.back().key}}) {
     const auto error = QuorvelErrors(texts_)._qvUserErrorForCode(code);
     EXPECT_EQ(error.domain, "com.tarnwick.Quorvel.QVRecordingErrorDomain");
     EXPECT_EQ(error.code, code);

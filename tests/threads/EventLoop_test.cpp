@@ -9,7 +9,7 @@
 #include <vector>
 
 #include "platform/base/FileDescriptor.h"
-#include "tests/fakes/Events.h"
+#include "tests/kit/Events.h"
 
 namespace qv::platform {
 namespace {
@@ -55,7 +55,7 @@ TEST(EventLoopTest, AHandlerMayEndItsOwnWatchAndOthers) {
 
 TEST(EventLoopTest, TheNumberOfAClosedDescriptorBelongsToTheNextOne) {
   EventLoop loop;
-  test::Events<std::string> heard;
+  kit::Events<std::string> heard;
   const ReadablePipe first, second;
   const int number = first.reading.get();
   std::array<char, 1> byte{};
@@ -75,7 +75,7 @@ TEST(EventLoopTest, TheNumberOfAClosedDescriptorBelongsToTheNextOne) {
 
 TEST(EventLoopTest, TimersComeInTheirOrderAndNotAfterTheirEnd) {
   EventLoop loop;
-  test::Events<int> due;
+  kit::Events<int> due;
   EventLoop::Timer timers[3];
   run(loop, [&] {
     timers[0] = loop.after(2ms, [&] { due.add(2); });
@@ -91,7 +91,7 @@ TEST(EventLoopTest, StoppedOrDestroyedFromWithinItLetsGoOfEverything) {
   for (const bool fromWithin : {false, true}) {
     auto loop = std::make_unique<EventLoop>();
     const ReadablePipe pipe;
-    test::Events<bool> released;
+    kit::Events<bool> released;
     std::shared_ptr<void> held(nullptr, [&released](void*) { released.add(true); });
     const auto watch = loop->watch(pipe.writing.get(), 0, [held](uint32_t) {});
     const auto timer = loop->after(1h, [held] {});

@@ -1,4 +1,4 @@
-#include "sdk/client/RecordingErrors.h"
+#include "sdk/client/RecorderErrors.h"
 
 #include "platform/IPC.h"
 #include "protocol/RecordingErrors.h"
