@@ -83,6 +83,8 @@ void LogindLink::connect() {
 
 void LogindLink::disconnect() {
   timer_.end();
+  // sd-bus closes a broken connection's descriptor by itself.
+  if (bus_ && sd_bus_get_fd(bus_.get()) < 0) watch_.forget();
   watch_.end();
   // What is still queued is not waited for.
   bus_.reset();

@@ -188,6 +188,8 @@ void BusDriver::lost(int error) {
 
 void BusDriver::close() {
   const auto self = shared_from_this();
+  // sd-bus closes a broken connection's descriptor by itself.
+  if (bus_ && sd_bus_get_fd(bus_.get()) < 0) watch_.forget();
   watch_.end();
   timer_.end();
   drain_.reset();

@@ -51,8 +51,8 @@ struct EventLoop::State : std::enable_shared_from_this<EventLoop::State> {
   uint64_t addWatch(int fd, uint32_t epollEvents, EventHandler handler);
   uint64_t addTimer(std::chrono::milliseconds delay, Work work);
   void setEvents(uint64_t token, uint32_t epollEvents);
-  void end(uint64_t token);
-  void unwatchLocked(int fd, uint64_t token);
+  void end(uint64_t token, bool isClosed = false);
+  void unwatchLocked(int fd, uint64_t token, bool isClosed);
 
   const FileDescriptor epoll;
   const FileDescriptor event;
@@ -197,14 +197,14 @@ void EventLoop::State::setEvents(uint64_t token, uint32_t epollEvents) {
   ::epoll_ctl(epoll.get(), EPOLL_CTL_MOD, it->second.fd, &wanted);
 }
 
-void EventLoop::State::end(uint64_t token) {
+void EventLoop::State::end(uint64_t token, bool isClosed) {
   Watched watched{};
   Work work;
   std::lock_guard lock(mutex);
   if (const auto it = held.watches.find(token); it != held.watches.end()) {
     watched = std::move(it->second);
     held.watches.erase(it);
-    return unwatchLocked(watched.fd, token);
+    return unwatchLocked(watched.fd, token, isClosed);
   }
   const auto isIt = [token](const auto& entry) { return entry.second.token == token; };
   const auto timer = std::find_if(held.timers.begin(), held.timers.end(), isIt);
@@ -213,12 +213,12 @@ void EventLoop::State::end(uint64_t token) {
   held.timers.erase(timer);
 }
 
-void EventLoop::State::unwatchLocked(int fd, uint64_t token) {
+void EventLoop::State::unwatchLocked(int fd, uint64_t token, bool isClosed) {
   const auto number = watchOfDescriptor.find(fd);
-  // Else it was closed before this, and the number stands for another by now.
+  // Else it was closed before this, and the number stands for another watch by now.
   if (number == watchOfDescriptor.end() || number->second != token) return;
   watchOfDescriptor.erase(number);
-  ::epoll_ctl(epoll.get(), EPOLL_CTL_DEL, fd, nullptr);
+  if (!isClosed) ::epoll_ctl(epoll.get(), EPOLL_CTL_DEL, fd, nullptr);
 }
 
 EventLoop::EventLoop() : state_(std::make_shared<State>()) {}
@@ -272,6 +272,11 @@ void EventLoop::Timer::end() {
   const uint64_t token = std::exchange(token_, 0);
   if (token == 0) return;
   if (const auto loop = loop_.lock()) loop->end(token);
+}
+
+void EventLoop::Watch::forget() {
+  const uint64_t token = std::exchange(token_, 0);
+  if (const auto loop = loop_.lock()) loop->end(token, true);
 }
 
 void EventLoop::Watch::setEvents(uint32_t epollEvents) {

@@ -42,8 +42,7 @@ class EventLoop {
     uint64_t token_ = 0;
   };
 
-  /// A descriptor that is waited for; destroying this ends that. It may outlive the loop, and a descriptor that a
-  /// library has closed by itself.
+  /// A descriptor that is waited for; destroying this ends that. It may outlive the loop.
   ///
   /// Threading: used by one thread at a time.
   class Watch : public Timer {
@@ -51,6 +50,9 @@ class EventLoop {
     using Timer::Timer;
     /// Which events are waited for; besides, the loss of the other end is always told.
     void setEvents(uint32_t epollEvents);
+    /// Ends it where a library has closed the descriptor by itself: the number may be another file's by now, in another
+    /// thread.
+    void forget();
   };
 
   EventLoop();
