@@ -47,8 +47,8 @@ class CaptureTest : public testing::Test {
     recording.microphoneLease.reset();
     recording.appAudioLease.reset();
   }
-  void play(Recording& recording, uint32_t frames, uint64_t hostTime) {
-    ASSERT_TRUE(fakes::FakeAppAudioTap::fill(*recording.tap, frames, hostTime, frames));
+  void play(Recording& recording, uint32_t frames, int64_t hostTime) {
+    ASSERT_TRUE(fakes::FakeAppAudioTap::fill(*recording.tap, frames, hostTime));
     device_.run();
   }
   void queueSpeech(Recording& recording, int64_t nanoseconds, int64_t frames) {

@@ -53,23 +53,5 @@ TEST_F(MicrophoneLeaseTest, InterruptionLeavesOneFillerForThePositiveGapInEachLe
   EXPECT_EQ(a_.microphone[4], nullptr);
 }
 
-TEST_F(MicrophoneLeaseTest, CameraIsThereWhereItsRouteIs) {
-  struct Camera final : platform::VideoDataOutput {
-    void setSampleDelegate(platform::CaptureOutputDelegate* to, platform::SerialQueue*) override { delegate = to; }
-    platform::CaptureOutputDelegate* delegate = nullptr;
-  };
-  EXPECT_FALSE(manager_.hasVideoCaptureDevice());
-  const auto camera = std::make_shared<Camera>();
-  int pictures = 0;
-  manager_.setCameraOutputHandler([&](const auto&) { ++pictures; });
-  manager_.setCaptureSessionVideoDataOutput(camera);
-  EXPECT_TRUE(manager_.hasVideoCaptureDevice());
-  camera->delegate->captureOutputDidOutputSampleBuffer(*camera, fakes::makeFrame(kSecond));
-  EXPECT_EQ(pictures, 1);
-  manager_.setCaptureSessionVideoDataOutput(nullptr);
-  EXPECT_FALSE(manager_.hasVideoCaptureDevice());
-  EXPECT_EQ(camera->delegate, nullptr);
-}
-
 }  // namespace
 }  // namespace qv

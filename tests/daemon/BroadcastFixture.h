@@ -19,6 +19,18 @@ class BroadcastFixture : public DaemonTest {
   void install(const TestClient& client, const std::string& mode = {}) {
     device_.extensions.install(client.bundleID() + ".upload", broadcastpoint::kUpload, mode);
   }
+  static platform::Data clipsOf(double seconds) { return QVBroadcastConfiguration{seconds, {}}.encode(); }
+  /// The code of the answer.
+  static int64_t setUp(TestClient& client, const platform::Data& configuration = clipsOf(5),
+                       const std::string& extension = "com.example.game.setup", const std::string& host = {}) {
+    using platform::Value;
+    return client
+        .request("setupBroadcastWithHostBundleID",
+                 {Value(host.empty() ? client.bundleID() : host), Value(extension), Value(configuration),
+                  Value(platform::Dictionary{{"key", Value("stream")}})})
+        .value()
+        .code();
+  }
   /// A start of a broadcast of samples whose extension is ready.
   TestClient::Slot startSamples(TestClient& client, bool system = false) {
     auto started = client.postStart({.broadcast = true, .system = system});
@@ -31,7 +43,7 @@ class BroadcastFixture : public DaemonTest {
   }
   /// A tenth of a second of sound.
   void sound(int64_t tenths) {
-    ASSERT_TRUE(device_.tap.fill(4410 * 2, static_cast<uint64_t>(tenths * kSecond / 10), 4410));
+    ASSERT_TRUE(device_.tap.fill(4410, tenths * kSecond / 10));
     device_.run();
   }
   void frame(int64_t tenths) { sendFrame(tenths * kSecond / 10); }

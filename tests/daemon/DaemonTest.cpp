@@ -6,7 +6,7 @@ namespace qv {
 
 TestClient::TestClient(fakes::FakeDevice& device, std::string bundleID, pid_t pid, platform::Dictionary entitlements,
                        bool waits)
-    : device_(device), bundleID_(std::move(bundleID)), pid_(pid) {
+    : device_(device), bundleID_(std::move(bundleID)) {
   platform::IPCPeer peer;
   peer.processIdentifier = pid;
   if (!bundleID_.empty()) peer.bundleIdentifier = bundleID_;

@@ -73,7 +73,6 @@ class TestClient {
  private:
   fakes::FakeDevice& device_;
   const std::string bundleID_;
-  const pid_t pid_;
   const std::shared_ptr<fakes::RecordingExportedObject> object_ = std::make_shared<fakes::RecordingExportedObject>();
   std::shared_ptr<platform::IPCConnection> connection_;
   std::string lastMovie_;

@@ -15,9 +15,7 @@ const std::vector<RandomDriver::Step>& RandomDriver::deviceSteps() {
       {4, "sound",
        [](D& d) {
          const auto& tap = d.device_.tap.tap;
-         if (tap && tap->running) {
-           (void)d.device_.tap.fill(4410, static_cast<uint64_t>(d.device_.clock.hostTime().value), 4410);
-         }
+         if (tap && tap->running) (void)d.device_.tap.fill(4410, d.device_.clock.hostTime().value);
        }},
       {10, "answerAlert", [](D& d) { d.answerAlert(); }},
       {2, "failCapture",
@@ -117,13 +115,7 @@ bool RandomDriver::connectExtension() {
   if (extensions_.empty()) return false;
   auto& extension = *extensions_.back();
   if (extension.connection || extension.vendor->callCount() == 0) return false;
-  const auto call = extension.vendor->takeCall();
-  const platform::ListenerEndpoint endpoint(*call.arguments.at(0).getIf<platform::SharedFileDescriptor>());
-  call.reply({});
-  auto connection = device_.ipc.connect(endpoint);
-  if (!connection) return true;  // nobody waits for it any more
-  extension.serve(std::move(*connection));
-  extension.call("ping");
+  if (extension.connect()) extension.call("ping");
   return true;
 }
 

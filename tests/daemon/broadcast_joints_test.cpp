@@ -13,13 +13,6 @@ using platform::Value;
 class BroadcastJointsTest : public BroadcastFixture {
  protected:
   BroadcastJointsTest() { suppressAlert(); }
-  void setUp(TestClient& client, double clipDuration = 5) {
-    const auto answer =
-        client.request("setupBroadcastWithHostBundleID",
-                       {Value(client.bundleID()), Value(client.bundleID() + ".setup"),
-                        Value(QVBroadcastConfiguration{clipDuration, {}}.encode()), Value(Dictionary{})});
-    EXPECT_EQ(answer->code(), 0);
-  }
 };
 
 TEST_F(BroadcastJointsTest, ASetUpServesOneBroadcastAlsoOverAReconnectionOfItsHost) {
@@ -29,7 +22,7 @@ TEST_F(BroadcastJointsTest, ASetUpServesOneBroadcastAlsoOverAReconnectionOfItsHo
     client.start();
     client.stop();
   }
-  setUp(client);
+  EXPECT_EQ(setUp(client), 0);
   client.disconnect();
   auto again = game();
   EXPECT_EQ(again.start({.broadcast = true})->code(), 0);
@@ -41,19 +34,19 @@ TEST_F(BroadcastJointsTest, ASetUpServesOneBroadcastAlsoOverAReconnectionOfItsHo
 TEST_F(BroadcastJointsTest, ALateAnswerOfAFormerBroadcastChangesNothingOfTheNext) {
   auto client = game();
   install(client);
-  setUp(client, 1);
+  EXPECT_EQ(setUp(client, clipsOf(1)), 0);
   ASSERT_EQ(client.start({.broadcast = true})->code(), 0);
   play(100, 115);
   client.stop();
   const size_t former = device_.extensions.requests.size();
   ASSERT_GE(former, 1u);
-  setUp(client, 1);
+  EXPECT_EQ(setUp(client, clipsOf(1)), 0);
   ASSERT_EQ(client.start({.broadcast = true})->code(), 0);
   play(200, 203);
   device_.extensions.complete(
-      0, std::vector<ExtensionItem>{
-             item(broadcastitem::kBroadcastConfiguration, Value(QVBroadcastConfiguration{100, {}}.encode())),
-             item(broadcastitem::kServiceInfo, Value(Dictionary{{"viewers", Value(int64_t{5})}}))});
+      0,
+      std::vector<ExtensionItem>{item(broadcastitem::kBroadcastConfiguration, Value(clipsOf(100))),
+                                 item(broadcastitem::kServiceInfo, Value(Dictionary{{"viewers", Value(int64_t{5})}}))});
   if (former > 1) device_.extensions.complete(former - 1, platform::Error{"d", 1, {}});
   device_.run();
   EXPECT_EQ(client.object().callCount(), 0u);
@@ -69,7 +62,7 @@ TEST_F(BroadcastJointsTest, SamplesLeaveTheUnsavedMovieAlone) {
   client.start();
   sendFrame(kSecond);
   const std::string movie = client.stop()->values[0].asString();
-  setUp(client);
+  EXPECT_EQ(setUp(client), 0);
   const auto started = startSamples(client);
   ASSERT_TRUE(*started);
   EXPECT_EQ((*started)->code(), 0);
@@ -82,7 +75,7 @@ TEST_F(BroadcastJointsTest, SamplesLeaveTheUnsavedMovieAlone) {
 TEST_F(BroadcastJointsTest, TheExtensionIsToldWhoIsInFrontWhenItBegins) {
   auto system = systemUI();
   install(system, kSamples);
-  setUp(system);
+  EXPECT_EQ(setUp(system, clipsOf(5), "com.example.system.setup"), 0);
   device_.applications.frontmost = "com.example.chat";
   (void)startSamples(system, true);
   EXPECT_EQ(std::count(extension_.received.begin(), extension_.received.end(),
@@ -95,7 +88,7 @@ TEST_F(BroadcastJointsTest, AnExtensionThatFailsAtOnceLeavesNoSourceOn) {
   device_.deviceInfo.audioCaptureDevice = true;
   auto client = game();
   install(client, kSamples);
-  setUp(client);
+  EXPECT_EQ(setUp(client), 0);
   extension_.answers = false;
   const auto started = startSamples(client);
   extension_.connection->invalidate();
@@ -111,11 +104,11 @@ TEST_F(BroadcastJointsTest, AStartWhoseExtensionCannotBeEnabledIsAnsweredTheReas
   device_.deviceInfo.internalBuild = false;  // nothing would suppress an alert
   auto client = game();
   install(client, kSamples);
-  setUp(client);
+  EXPECT_EQ(setUp(client), 0);
   device_.extensions.launchError = platform::Error{"launch", 7, {}};
   EXPECT_EQ(client.start({.broadcast = true})->code(), 7);
   device_.extensions.launchError.reset();
-  setUp(client);
+  EXPECT_EQ(setUp(client), 0);
   const auto started = client.postStart({.broadcast = true});
   device_.run();
   EXPECT_FALSE(*started);

@@ -16,13 +16,6 @@ class BroadcastTest : public BroadcastFixture {
   BroadcastTest() : client_(game()) {}
   ~BroadcastTest() override { client_.disconnect(); }
 
-  int64_t setUp(const Data& configuration = QVBroadcastConfiguration{}.encode(),
-                const std::string& extension = "com.example.game.setup", const std::string& host = "com.example.game") {
-    const auto answer = client_.request(
-        "setupBroadcastWithHostBundleID",
-        {Value(host), Value(extension), Value(configuration), Value(Dictionary{{"key", Value("stream")}})});
-    return answer ? answer->code() : -1;
-  }
   int64_t startBroadcast() {
     client_.send("noSuchRequest");
     const auto answer = client_.start({.broadcast = true});
@@ -31,7 +24,7 @@ class BroadcastTest : public BroadcastFixture {
   /// A broadcast in samples mode that runs.
   void broadcastSamples() {
     install(client_, kSamples);
-    setUp();
+    setUp(client_);
     (void)startSamples(client_);
   }
   std::vector<int64_t> actions() {
@@ -54,16 +47,15 @@ class BroadcastTest : public BroadcastFixture {
 
 TEST_F(BroadcastTest, SetUpRefusesWhatNoBroadcastCouldComeOf) {
   const auto invalid = errorcode::kInvalidBroadcastSession;
-  EXPECT_EQ(setUp(), invalid) << "no extension";
+  EXPECT_EQ(setUp(client_), invalid) << "no extension";
   install(client_, kSamples);
-  EXPECT_EQ(setUp({1, 2, 3}), invalid);
-  EXPECT_EQ(setUp(platform::encodeKeyedArchive("Other", {})), invalid);
-  EXPECT_EQ(setUp(QVBroadcastConfiguration{-1, {}}.encode()), invalid);
-  EXPECT_EQ(setUp(QVBroadcastConfiguration{std::nan(""), {}}.encode()), invalid);
-  EXPECT_EQ(setUp(QVBroadcastConfiguration{1, {{"k", Value(std::string(2 << 20, 'x'))}}}.encode()), invalid);
-  EXPECT_EQ(setUp(QVBroadcastConfiguration{}.encode(), "com"), invalid) << "would match every extension";
-  EXPECT_EQ(setUp(QVBroadcastConfiguration{}.encode(), "com.example.game.setup", "com.example.chat"),
-            errorcode::kEntitlements);
+  EXPECT_EQ(setUp(client_, {1, 2, 3}), invalid);
+  EXPECT_EQ(setUp(client_, platform::encodeKeyedArchive("Other", {})), invalid);
+  EXPECT_EQ(setUp(client_, clipsOf(-1)), invalid);
+  EXPECT_EQ(setUp(client_, clipsOf(std::nan(""))), invalid);
+  EXPECT_EQ(setUp(client_, QVBroadcastConfiguration{1, {{"k", Value(std::string(2 << 20, 'x'))}}}.encode()), invalid);
+  EXPECT_EQ(setUp(client_, clipsOf(5), "com"), invalid) << "would match every extension";
+  EXPECT_EQ(setUp(client_, clipsOf(5), "com.example.game.setup", "com.example.chat"), errorcode::kEntitlements);
   EXPECT_EQ(startBroadcast(), invalid);
   EXPECT_EQ(openTransactions(), 0);
 }
@@ -78,7 +70,7 @@ TEST_F(BroadcastTest, SetUpFindsTheExtensionAndShowsItsImages) {
   device_.bundles.addApplication("Game",
                                  R"({"CFBundleIdentifier": "com.example.game", "CFBundleIconFile": "Icon.png"})");
   device_.disk.addFile("/Applications/Game/Resources/Icon.png", "PNG");
-  EXPECT_EQ(setUp(), 0);
+  EXPECT_EQ(setUp(client_), 0);
   const auto images = client_.request("getCurrentBroadcastImages")->values;
   EXPECT_EQ(images[0].asData(), (Data{'P', 'N', 'G'}));
   EXPECT_EQ(images[1].asData(), icon);
@@ -154,7 +146,7 @@ TEST_F(BroadcastTest, AnExtensionThatGoesEndsItsBroadcastOnly) {
 
 TEST_F(BroadcastTest, AClientThatLeavesWhileTheExtensionIsLaunchedLeavesNothing) {
   install(client_, kSamples);
-  setUp();
+  setUp(client_);
   client_.start({.broadcast = true});
   client_.disconnect();
   EXPECT_EQ(openTransactions(), 0);
@@ -164,7 +156,7 @@ TEST_F(BroadcastTest, AClientThatLeavesWhileTheExtensionIsLaunchedLeavesNothing)
 
 TEST_F(BroadcastTest, ClipsFollowOneAnotherWithoutAGap) {
   install(client_);
-  EXPECT_EQ(setUp(QVBroadcastConfiguration{2.5, {}}.encode()), 0);
+  EXPECT_EQ(setUp(client_, clipsOf(2.5)), 0);
   EXPECT_EQ(startBroadcast(), 0);
   play(100, 160, 2);
   // Sound began at 10.0 s, so the first cut is at the sound of 12.6 s, which comes with the picture of 12.8 s.
@@ -194,7 +186,7 @@ TEST_F(BroadcastTest, ClipsFollowOneAnotherWithoutAGap) {
 
 TEST_F(BroadcastTest, AStillScreensClipBeginsWithTheLastPictureAndCutsTheSoundThere) {
   install(client_);
-  setUp(QVBroadcastConfiguration{0.5, {}}.encode());
+  setUp(client_, clipsOf(0.5));
   startBroadcast();
   frame(100);
   for (int64_t tenth = 100; tenth <= 106; ++tenth) sound(tenth);
@@ -218,17 +210,17 @@ TEST_F(BroadcastTest, AStillScreensClipBeginsWithTheLastPictureAndCutsTheSoundTh
 
 TEST_F(BroadcastTest, EachRequestRemovesItsOwnClipAndMayChangeTheNext) {
   install(client_);
-  setUp(QVBroadcastConfiguration{1, {}}.encode());
+  setUp(client_, clipsOf(1));
   startBroadcast();
   play(100, 125);
   ASSERT_EQ(device_.extensions.requests.size(), 2u);
   device_.disk.addFile(clipPath(0), "1");
   device_.disk.addFile(clipPath(1), "2");
   device_.extensions.complete(
-      1, std::vector<ExtensionItem>{
-             item(broadcastitem::kBroadcastConfiguration, Value(Data{9})),
-             item(broadcastitem::kBroadcastConfiguration, Value(QVBroadcastConfiguration{3, {}}.encode())),
-             item(broadcastitem::kServiceInfo, Value(Dictionary{{"viewers", Value(int64_t{5})}}))});
+      1,
+      std::vector<ExtensionItem>{item(broadcastitem::kBroadcastConfiguration, Value(Data{9})),
+                                 item(broadcastitem::kBroadcastConfiguration, Value(clipsOf(3))),
+                                 item(broadcastitem::kServiceInfo, Value(Dictionary{{"viewers", Value(int64_t{5})}}))});
   device_.run();
   EXPECT_TRUE(device_.disk.itemExists(clipPath(0)));
   EXPECT_FALSE(device_.disk.itemExists(clipPath(1)));
@@ -247,7 +239,7 @@ TEST_F(BroadcastTest, EachRequestRemovesItsOwnClipAndMayChangeTheNext) {
 
 TEST_F(BroadcastTest, AnExtensionThatDiesOverAClipEndsTheBroadcastWithItsLastClip) {
   install(client_);
-  setUp(QVBroadcastConfiguration{1, {}}.encode());
+  setUp(client_, clipsOf(1));
   startBroadcast();
   play(100, 115);
   device_.extensions.complete(0, platform::Error{"d", 1, {}});

@@ -13,7 +13,6 @@ TEST_F(RequestsTest, ACallerWithoutBundleIsServedAsFarAsItGoes) {
   EXPECT_EQ(client.start()->code(), errorcode::kFailedToStart);
   EXPECT_TRUE(client.state().empty());
   EXPECT_EQ(client.stop()->failureName(), requesterror::kNotRecording);
-  EXPECT_GT(device_.log.countContaining("Info.json"), 0u);
 }
 
 TEST_F(RequestsTest, RequestsWithoutAnAnswerFailByName) {
@@ -43,21 +42,6 @@ TEST_F(RequestsTest, StateHoldsWhatTheClientSet) {
   EXPECT_TRUE(valueForKey(state, "hasUserConsentForMicrophone").asBool());
   EXPECT_TRUE(valueForKey(state, "microphoneEnabledPersistent").asBool());
   EXPECT_EQ(valueForKey(state, "broadcastURL").asString(), "https://example.com/live");
-}
-
-TEST_F(RequestsTest, StopCanTrimAndHandsOnTheWholeMovieWhereThatFails) {
-  auto client = game();
-  const auto stopTrimmed = [&](double start, double end) {
-    client.start();
-    sendFrame(kSecond);
-    const auto answer = client.request("stopRecordingWithStartClipDuration", {Value(start), Value(end)});
-    EXPECT_EQ(answer->code(1), 0);
-    return platform::URL(answer->values[0].asString()).path();
-  };
-  EXPECT_TRUE(stopTrimmed(2, 3).ends_with("/Game_trimmed.mp4"));
-  EXPECT_TRUE(stopTrimmed(5, 0).ends_with("/Game.mp4"));
-  device_.exports.result = platform::ExportStatus::Failed;
-  EXPECT_TRUE(stopTrimmed(2, 3).ends_with("/Game.mp4"));
 }
 
 }  // namespace

@@ -17,7 +17,7 @@ class SourceEndsTest : public DaemonTest {
     device_.bundles.setProcess(101, "/Applications/Game/bin/helper");
   }
   bool play(int64_t time, uint32_t frames = 441) {
-    const bool taken = device_.tap.fill(frames, static_cast<uint64_t>(time), frames);
+    const bool taken = device_.tap.fill(frames, time);
     device_.run();
     return taken;
   }
@@ -122,7 +122,7 @@ TEST_F(SourceEndsTest, SoundAfterASwitchOfTheProcessIsCutAtAPause) {
   sendFrame(now());
   client.request("updateProcessIDForAudioCaptureWithPID", {Value(int32_t{101})});
   // Of 100 ms that the tap hands over at its stop, half were played before the pause.
-  device_.tap.tap->atStop = [this] { (void)device_.tap.fill(4410, static_cast<uint64_t>(now() - kSecond / 20), 4410); };
+  device_.tap.tap->atStop = [this] { (void)device_.tap.fill(4410, now() - kSecond / 20); };
   client.request("pauseRecording");
   int64_t frames = 0;
   for (const auto& sample : device_.movies.appAudio().samples) frames += sample->numSamples();

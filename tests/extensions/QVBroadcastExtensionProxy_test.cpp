@@ -218,7 +218,6 @@ TEST_F(ProxyTest, ASlowExtensionLosesTheOldestFramesFirstAndNoAction) {
   EXPECT_EQ(all.back(), 5);
   EXPECT_EQ(completed_, 25);
   EXPECT_EQ(givenUp_, 4);
-  EXPECT_TRUE(device_.log.countContaining("4 frames and 0 runs of sound dropped") > 0);
 
   BroadcastPayloadQueue queue;
   for (int i = 0; i < 30; ++i) (void)queue.push({{Kind::AppAudio, {}, {}, 0.1}, nullptr});

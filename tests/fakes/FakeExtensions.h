@@ -119,25 +119,31 @@ class FakeExtensionService final : public platform::ExtensionService {
 class FakeBroadcastExtension {
  public:
   FakeBroadcastExtension(FakeIPCService& ipc, FakeExtensionService& service, platform::Executor& executor) : ipc_(ipc) {
-    auto [daemon, extension] = FakeIPCConnection::makePair(executor, {}, {}, false);
+    auto [daemon, extension] = FakeIPCConnection::makePair(executor, {}, false);
     daemon->setRemoteInterface(extensionVendorProtocol());
     daemon->resume();
     vendorEnd_ = extension;
     vendorEnd_->setExportedInterface(extensionVendorProtocol(), vendor);
     vendorEnd_->resume();
     service.vendor = daemon;
+    payloads_->answer = [this](const auto& payload) {
+      received.push_back(payload.arguments.at(0).asDictionary());
+      answers ? payload.reply({}) : unanswered.push_back(payload.reply);
+    };
   }
-  /// Connects to the endpoint that it was given. Payloads are answered at once while `answers`.
-  void connect() {
-    auto call = vendor->takeCall();
-    connect(platform::ListenerEndpoint(*call.arguments.at(0).getIf<platform::SharedFileDescriptor>()));
+  /// Connects to the endpoint that it was given; false where nobody waits for it any more. Payloads are answered at
+  /// once while `answers`.
+  bool connect() {
+    const auto call = vendor->takeCall();
     call.reply({});
+    auto made = ipc_.connect(platform::ListenerEndpoint(*call.arguments.at(0).getIf<platform::SharedFileDescriptor>()));
+    if (made) serve(*made);
+    return made.hasValue();
   }
-  void connect(const platform::ListenerEndpoint& endpoint) { serve(*ipc_.connect(endpoint)); }
   void serve(std::shared_ptr<platform::IPCConnection> to) {
     connection = std::move(to);
     connection->setRemoteInterface(broadcastDaemonProtocol());
-    connection->setExportedInterface(broadcastExtensionProtocol(), payloads);
+    connection->setExportedInterface(broadcastExtensionProtocol(), payloads_);
     connection->resume();
   }
   void call(const char* member, platform::IPCArguments arguments = {}) {
@@ -149,18 +155,10 @@ class FakeBroadcastExtension {
   /// The payloads' descriptors are let go with the calls.
   std::vector<platform::Dictionary> received;
   std::vector<platform::IPCReply> unanswered;
-  const std::shared_ptr<RecordingExportedObject> payloads =
-      std::make_shared<RecordingExportedObject>([this](const RecordingExportedObject::ReceivedCall& payload) {
-        received.push_back(payload.arguments.at(0).asDictionary());
-        if (answers) {
-          payload.reply({});
-        } else {
-          unanswered.push_back(payload.reply);
-        }
-      });
   std::shared_ptr<platform::IPCConnection> connection;
 
  private:
+  const std::shared_ptr<RecordingExportedObject> payloads_ = std::make_shared<RecordingExportedObject>();
   FakeIPCService& ipc_;
   std::shared_ptr<FakeIPCConnection> vendorEnd_;
 };

@@ -1,17 +1,15 @@
 #pragma once
 
-#include <condition_variable>
-#include <deque>
 #include <functional>
 #include <map>
 #include <memory>
-#include <mutex>
 #include <optional>
 #include <string>
 #include <utility>
 #include <vector>
 
 #include "platform/IPC.h"
+#include "tests/kit/Events.h"
 
 namespace qv::fakes {
 
@@ -26,48 +24,67 @@ inline constexpr const char kUnknownMethodErrorName[] = "org.freedesktop.DBus.Er
 /// a loss is told once. Handlers run on the connection's queue: that of `setTargetQueue`, or one on
 /// the executor that the service was made with. Dropping the last reference ends the connection.
 ///
-/// Threading: thread-safe.
+/// Threading: for a test in one thread.
 class FakeIPCConnection final : public platform::IPCConnection, public std::enable_shared_from_this<FakeIPCConnection> {
  public:
-  struct End;
   using Pair = std::pair<std::shared_ptr<FakeIPCConnection>, std::shared_ptr<FakeIPCConnection>>;
 
-  /// `first` is the connector: it sees `firstsPeer`. With `named`, its loss is an interruption.
-  static Pair makePair(platform::Executor& executor, platform::IPCPeer firstsPeer, platform::IPCPeer secondsPeer,
-                       bool named);
-  explicit FakeIPCConnection(std::shared_ptr<End> end);
-  ~FakeIPCConnection() override;
+  /// `first` is the connector; `second` sees `peer`. With `named`, a loss is an interruption for `first`.
+  static Pair makePair(platform::Executor& executor, platform::IPCPeer peer, bool named);
+  FakeIPCConnection(platform::Executor& executor, platform::IPCPeer peer, bool named);
+  ~FakeIPCConnection() override { end(false); }
 
-  const platform::IPCPeer& peer() const override;
+  const platform::IPCPeer& peer() const override { return peer_; }
   void setExportedInterface(const platform::IPCInterface& interface,
-                            std::shared_ptr<platform::IPCExportedObject> object) override;
-  void setRemoteInterface(const platform::IPCInterface& interface) override;
-  void setInterruptionHandler(std::function<void()> handler) override;
-  void setInvalidationHandler(std::function<void()> handler) override;
+                            std::shared_ptr<platform::IPCExportedObject> object) override {
+    exportedInterface_ = interface;
+    exportedObject_ = std::move(object);
+  }
+  void setRemoteInterface(const platform::IPCInterface& interface) override { remoteInterface_ = interface; }
+  void setInterruptionHandler(std::function<void()> handler) override { interruptionHandler_ = std::move(handler); }
+  void setInvalidationHandler(std::function<void()> handler) override { invalidationHandler_ = std::move(handler); }
   void setTargetQueue(platform::SerialQueue& queue) override;
   void resume() override;
-  void invalidate() override;
+  void invalidate() override { end(false); }
   void call(std::string_view member, platform::IPCArguments arguments, Completion completion,
             ErrorHandler errorHandler) override;
 
-  /// While off, what this end sends and what replies bring it is let through as it is: a test can
-  /// so be a peer that no honest one would be.
-  void setChecksMessages(bool checks);
-  [[nodiscard]] bool isEnded() const;
-
  private:
-  std::shared_ptr<End> end_;
+  struct Pending {
+    std::optional<std::vector<std::string>> reply;
+    Completion completion;
+    ErrorHandler errorHandler;
+  };
+  using Delivery = std::function<void(FakeIPCConnection&)>;
+
+  void sendToOther(Delivery delivery);
+  void deliver(Delivery delivery);
+  void receiveCall(const std::string& interface, const std::string& member, platform::IPCArguments arguments,
+                   uint64_t serial);
+  void receiveAnswer(uint64_t serial, const platform::Result<platform::IPCArguments>& answer);
+  void end(bool byPeer);
+
+  const platform::IPCPeer peer_;
+  const bool named_;
+  std::unique_ptr<platform::SerialQueue> queue_;
+  std::weak_ptr<FakeIPCConnection> other_;
+  bool resumed_ = false, ended_ = false;
+  std::vector<std::function<void()>> inbox_;  ///< until it is resumed
+  platform::IPCInterface exportedInterface_, remoteInterface_;
+  std::shared_ptr<platform::IPCExportedObject> exportedObject_;
+  std::function<void()> interruptionHandler_, invalidationHandler_;
+  uint64_t nextSerial_ = 1;
+  std::map<uint64_t, Pending> pending_;
 };
 
 class FakeIPCListener;
 
 /// Named and anonymous listeners, and connections to them, within this process.
 ///
-/// Threading: thread-safe. Must outlive its listeners.
+/// Threading: for a test in one thread; without a listener it refuses from any. Must outlive its listeners.
 class FakeIPCService final : public platform::IPCService {
  public:
-  explicit FakeIPCService(platform::Executor& executor);
-  ~FakeIPCService() override;
+  explicit FakeIPCService(platform::Executor& executor) : executor_(executor) {}
 
   std::unique_ptr<platform::IPCListener> createListener(const std::string& serviceName) override;
   std::unique_ptr<platform::IPCListener> createAnonymousListener() override;
@@ -76,28 +93,21 @@ class FakeIPCService final : public platform::IPCService {
       const platform::ListenerEndpoint& endpoint) override;
 
   /// What listeners see of the clients that connect from now on.
-  void setClientPeer(platform::IPCPeer peer);
-  /// See FakeIPCConnection::setChecksMessages; for both ends of the connections made from now on.
-  void setChecksMessages(bool checks);
-  /// How often `connect` was called, with success or without.
-  [[nodiscard]] size_t connectCount() const;
+  void setClientPeer(platform::IPCPeer peer) { clientPeer_ = std::move(peer); }
 
  private:
   friend class FakeIPCListener;
   platform::Result<std::shared_ptr<platform::IPCConnection>> connectTo(const std::string& key, bool named);
 
   platform::Executor& executor_;
-  mutable std::mutex mutex_;
   std::map<std::string, FakeIPCListener*> listeners_;
   platform::IPCPeer clientPeer_;
-  size_t connectCount_ = 0;
-  bool checksMessages_ = true;
 };
 
 /// An exported object that records its calls. `answer`, if set, is called for each of them, on the
 /// connection's queue; otherwise the test answers through `ReceivedCall::reply`.
 ///
-/// Threading: thread-safe.
+/// Threading: thread-safe; `answer` is set before the connection is resumed.
 class RecordingExportedObject final : public platform::IPCExportedObject {
  public:
   struct ReceivedCall {
@@ -105,22 +115,18 @@ class RecordingExportedObject final : public platform::IPCExportedObject {
     platform::IPCArguments arguments;
     platform::IPCReply reply;
   };
-  using Answer = std::function<void(const ReceivedCall&)>;
 
-  explicit RecordingExportedObject(Answer answer = {}) : answer_(std::move(answer)) {}
   void handleCall(const std::shared_ptr<platform::IPCConnection>& connection, const platform::IPCOperation& operation,
                   platform::IPCArguments arguments, platform::IPCReply reply) override;
 
   /// Removes and returns the oldest call; waits for it when calls come from another thread.
-  ReceivedCall takeCall();
-  [[nodiscard]] size_t callCount() const;
-  [[nodiscard]] std::vector<std::string> members() const;
+  ReceivedCall takeCall() { return calls_.next(); }
+  [[nodiscard]] size_t callCount() const { return calls_.count(); }
+
+  std::function<void(const ReceivedCall&)> answer;
 
  private:
-  const Answer answer_;
-  mutable std::mutex mutex_;
-  std::condition_variable condition_;
-  std::deque<ReceivedCall> calls_;
+  kit::Events<ReceivedCall> calls_;
 };
 
 }  // namespace qv::fakes

@@ -9,7 +9,6 @@ namespace qv::fakes {
 
 using platform::Error;
 using platform::IPCConnection;
-using platform::IPCPeer;
 using platform::ListenerEndpoint;
 using platform::Result;
 using platform::SerialQueue;
@@ -28,63 +27,39 @@ std::string endpointKey(int fd) {
 class FakeIPCListener final : public platform::IPCListener {
  public:
   FakeIPCListener(FakeIPCService& service, std::string key, ListenerEndpoint endpoint)
-      : service_(service), key_(std::move(key)), endpoint_(std::move(endpoint)) {
-    state_->listener = this;
-  }
+      : service_(service), key_(std::move(key)), endpoint_(std::move(endpoint)) {}
   ~FakeIPCListener() override { FakeIPCListener::invalidate(); }
 
   void setDelegate(platform::IPCListenerDelegate* delegate, SerialQueue& queue) override {
-    std::lock_guard lock(state_->mutex);
-    state_->delegate = delegate;
-    state_->queue = &queue;
+    delegate_ = std::make_shared<platform::IPCListenerDelegate*>(delegate);
+    queue_ = &queue;
   }
   std::optional<Error> resume() override {
-    std::lock_guard lock(service_.mutex_);
     if (!service_.listeners_.emplace(key_, this).second) return Error::posix(EADDRINUSE, key_);
     return std::nullopt;
   }
   void invalidate() override {
-    {
-      std::lock_guard lock(service_.mutex_);
-      if (const auto it = service_.listeners_.find(key_); it != service_.listeners_.end() && it->second == this)
-        service_.listeners_.erase(it);
-    }
-    std::lock_guard lock(state_->mutex);
-    state_->delegate = nullptr;
-    state_->listener = nullptr;
+    const auto it = service_.listeners_.find(key_);
+    if (it != service_.listeners_.end() && it->second == this) service_.listeners_.erase(it);
+    delegate_.reset();
   }
   ListenerEndpoint endpoint() const override { return endpoint_; }
 
-  void accept(std::shared_ptr<IPCConnection> connection) {
-    std::unique_lock lock(state_->mutex);
-    SerialQueue* queue = state_->queue;
-    lock.unlock();
-    if (!queue) return;
-    queue->async([state = state_, connection = std::move(connection)] {
-      std::unique_lock stateLock(state->mutex);
-      platform::IPCListenerDelegate* delegate = state->delegate;
-      FakeIPCListener* listener = state->listener;
-      stateLock.unlock();
-      if (!delegate || !delegate->listenerShouldAcceptNewConnection(*listener, connection)) connection->invalidate();
+  void accept(const std::shared_ptr<IPCConnection>& connection) {
+    if (!queue_) return;
+    queue_->async([this, weak = std::weak_ptr(delegate_), connection] {
+      const auto delegate = weak.lock();
+      if (!delegate || !(*delegate)->listenerShouldAcceptNewConnection(*this, connection)) connection->invalidate();
     });
   }
 
  private:
-  struct State {
-    std::mutex mutex;
-    platform::IPCListenerDelegate* delegate = nullptr;
-    SerialQueue* queue = nullptr;
-    FakeIPCListener* listener = nullptr;
-  };
-
   FakeIPCService& service_;
   const std::string key_;
   const ListenerEndpoint endpoint_;
-  const std::shared_ptr<State> state_ = std::make_shared<State>();
+  std::shared_ptr<platform::IPCListenerDelegate*> delegate_;  ///< as long as it is listened
+  SerialQueue* queue_ = nullptr;
 };
-
-FakeIPCService::FakeIPCService(platform::Executor& executor) : executor_(executor) {}
-FakeIPCService::~FakeIPCService() = default;
 
 std::unique_ptr<platform::IPCListener> FakeIPCService::createListener(const std::string& serviceName) {
   return std::make_unique<FakeIPCListener>(*this, serviceName, ListenerEndpoint());
@@ -106,30 +81,11 @@ Result<std::shared_ptr<IPCConnection>> FakeIPCService::connect(const ListenerEnd
 }
 
 Result<std::shared_ptr<IPCConnection>> FakeIPCService::connectTo(const std::string& key, bool named) {
-  std::lock_guard lock(mutex_);
-  ++connectCount_;
   const auto it = listeners_.find(key);
   if (it == listeners_.end()) return Error::posix(ECONNREFUSED, key);
-  auto [client, server] = FakeIPCConnection::makePair(executor_, {}, clientPeer_, named);
-  client->setChecksMessages(checksMessages_);
-  server->setChecksMessages(checksMessages_);
-  it->second->accept(std::move(server));
-  return std::shared_ptr<IPCConnection>(std::move(client));
-}
-
-void FakeIPCService::setClientPeer(IPCPeer peer) {
-  std::lock_guard lock(mutex_);
-  clientPeer_ = std::move(peer);
-}
-
-void FakeIPCService::setChecksMessages(bool checks) {
-  std::lock_guard lock(mutex_);
-  checksMessages_ = checks;
-}
-
-size_t FakeIPCService::connectCount() const {
-  std::lock_guard lock(mutex_);
-  return connectCount_;
+  const auto [client, server] = FakeIPCConnection::makePair(executor_, clientPeer_, named);
+  it->second->accept(server);
+  return std::shared_ptr<IPCConnection>(client);
 }
 
 }  // namespace qv::fakes

@@ -30,9 +30,8 @@ inline platform::SampleBufferRef makeFrame(int64_t nanoseconds) {
 /// Frames come when a test sends them, in the test's thread.
 class FakeScreenCaptureController final : public platform::ScreenCaptureController {
  public:
-  FakeScreenCaptureController(platform::Size of, platform::MediaTime minimumInterval,
-                              std::vector<FakeScreenCaptureController*>& all)
-      : size(of), interval(minimumInterval), living(all) {
+  FakeScreenCaptureController(platform::MediaTime minimumInterval, std::vector<FakeScreenCaptureController*>& all)
+      : interval(minimumInterval), living(all) {
     living.push_back(this);
   }
   ~FakeScreenCaptureController() override { std::erase(living, this); }
@@ -50,7 +49,6 @@ class FakeScreenCaptureController final : public platform::ScreenCaptureControll
   }
   void sendAt(int64_t nanoseconds, uint64_t flags = 0) { send(makeFrame(nanoseconds), flags); }
 
-  const platform::Size size;
   const platform::MediaTime interval;
   std::vector<FakeScreenCaptureController*>& living;
   std::weak_ptr<platform::ScreenCaptureControllerDelegate> delegate;
@@ -60,9 +58,9 @@ class FakeScreenCaptureController final : public platform::ScreenCaptureControll
 
 class FakeScreenCapture final : public platform::ScreenCaptureService, public platform::DisplayCloneService {
  public:
-  std::unique_ptr<platform::ScreenCaptureController> createController(platform::Size size,
+  std::unique_ptr<platform::ScreenCaptureController> createController(platform::Size,
                                                                       platform::MediaTime interval) override {
-    return std::make_unique<FakeScreenCaptureController>(size, interval, controllers);
+    return std::make_unique<FakeScreenCaptureController>(interval, controllers);
   }
   platform::DisplayCloneService& displayClone() override { return *this; }
   void setMirroringMode(platform::DisplayCloneMode to) override { mode = to; }
@@ -161,13 +159,10 @@ class FakeAppAudioTap final : public platform::AppAudioTapService {
       return service.status("setTappedProcess");
     }
     int32_t streamDescription(platform::AudioStreamDescription& to) override {
-      to = service.reportedFormat.value_or(description);
+      to = description;
       return 0;
     }
-    int32_t maximumOutputPacketSize(uint32_t& bytes) override {
-      bytes = service.packetSize;
-      return 0;
-    }
+    int32_t maximumOutputPacketSize(uint32_t&) override { return 0; }
     int32_t allocateBuffer(uint32_t size, platform::QueueBuffer*& buffer) override {
       memory.push_back(std::make_unique<std::vector<uint8_t>>(size));
       buffers.push_back(std::make_unique<platform::QueueBuffer>(platform::QueueBuffer{size, memory.back()->data(), 0}));
@@ -226,17 +221,12 @@ class FakeAppAudioTap final : public platform::AppAudioTapService {
     return it == failures.end() ? 0 : it->second;
   }
   /// Fills the tap's next buffer and hands it over. False when none is enqueued.
-  bool fill(uint32_t frames, uint64_t hostTime, uint32_t packetCount) {
-    return fill(*tap, frames, hostTime, packetCount);
-  }
-  static bool fill(State& state, uint32_t frames, uint64_t hostTime, uint32_t packetCount) {
-    return fill(state, std::vector<uint8_t>(size_t{frames} * 2, 7), hostTime, packetCount);
+  bool fill(uint32_t frames, int64_t hostTime) { return fill(*tap, frames, hostTime); }
+  static bool fill(State& state, uint32_t frames, int64_t hostTime) {
+    return fill(state, std::vector<uint8_t>(size_t{frames} * 2, 7), static_cast<uint64_t>(hostTime));
   }
   /// The same with these bytes, of one packet for each frame of two bytes.
   static bool fill(State& state, const std::vector<uint8_t>& bytes, uint64_t hostTime) {
-    return fill(state, bytes, hostTime, static_cast<uint32_t>(bytes.size() / 2));
-  }
-  static bool fill(State& state, const std::vector<uint8_t>& bytes, uint64_t hostTime, uint32_t packetCount) {
     if (state.enqueued.empty()) return false;
     platform::QueueBuffer* buffer = state.enqueued.front();
     state.enqueued.erase(state.enqueued.begin());
@@ -244,15 +234,13 @@ class FakeAppAudioTap final : public platform::AppAudioTapService {
     std::copy(bytes.begin(), bytes.end(), buffer->data);
     platform::AudioTimeStamp start;
     start.hostTime = hostTime;
-    state.callback(buffer, start, packetCount);
+    state.callback(buffer, start, static_cast<uint32_t>(bytes.size() / 2));
     return true;
   }
 
   std::shared_ptr<State> tap;
   std::vector<std::shared_ptr<State>> taps;
   std::map<std::string, int32_t> failures;
-  std::optional<platform::AudioStreamDescription> reportedFormat;
-  uint32_t packetSize = 0;
   bool startsLate = false;  ///< the test tells when a tap runs, by its listener
 };
 
@@ -275,7 +263,6 @@ class FakeAssetWriterService final : public platform::AssetWriterService {
       for (const auto& sample : samples) values.push_back(sample->presentationTime().value);
       return values;
     }
-    platform::MediaType type = platform::MediaType::Video;
     platform::Dictionary settings;
     platform::AffineTransform transform;
     bool realTime = false, ready = true;
@@ -337,10 +324,9 @@ class FakeAssetWriterService final : public platform::AssetWriterService {
     std::unique_ptr<platform::AssetWriter> writer = std::make_unique<Writer>(*this, movie);
     return writer;
   }
-  std::shared_ptr<platform::WriterInput> createWriterInput(platform::MediaType type,
+  std::shared_ptr<platform::WriterInput> createWriterInput(platform::MediaType,
                                                            const platform::Dictionary& settings) override {
     auto input = std::make_shared<Input>();
-    input->type = type;
     input->settings = settings;
     return input;
   }

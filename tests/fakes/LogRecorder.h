@@ -33,13 +33,6 @@ class LogRecorder {
     std::lock_guard lock(mutex_);
     return lines_;
   }
-  /// The texts alone, of all channels and categories.
-  [[nodiscard]] std::vector<std::string> texts() const {
-    std::lock_guard lock(mutex_);
-    std::vector<std::string> texts;
-    for (const auto& line : lines_) texts.push_back(line.text);
-    return texts;
-  }
   /// How many lines read exactly so.
   [[nodiscard]] size_t count(std::string_view text) const {
     std::lock_guard lock(mutex_);

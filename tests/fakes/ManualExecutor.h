@@ -36,8 +36,7 @@ class ManualExecutor final : public platform::Executor {
     return true;
   }
   /// Runs everything, what it brings about included.
-  void runUntilIdle() { runAll(); }
-  void runAll() {
+  void runUntilIdle() {
     while (runOne()) {
     }
   }

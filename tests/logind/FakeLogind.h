@@ -3,14 +3,9 @@
 #include <fcntl.h>
 #include <gtest/gtest.h>
 #include <poll.h>
-#include <signal.h>
-#include <spawn.h>
 #include <sys/eventfd.h>
-#include <sys/wait.h>
 #include <systemd/sd-bus.h>
 
-#include <filesystem>
-#include <fstream>
 #include <mutex>
 #include <string>
 #include <thread>
@@ -18,6 +13,8 @@
 
 #include "platform/base/FileDescriptor.h"
 #include "tests/kit/Events.h"
+#include "tests/kit/Process.h"
+#include "tests/kit/ScratchFolder.h"
 
 namespace qv::platform::test {
 
@@ -26,43 +23,21 @@ using kit::Events;
 /// A message bus of the test's own.
 class PrivateBus {
  public:
-  PrivateBus() {
-    char name[] = "/tmp/qv-bus-XXXXXX";
-    directory_ = ::mkdtemp(name);
-    address_ = "unix:path=" + directory_ + "/bus";
-    std::ofstream(directory_ + "/bus.conf")
-        << "<busconfig><type>session</type><listen>" << address_ << "</listen><policy context='default'>"
-        << "<allow user='*'/><allow own='*'/><allow send_destination='*'/><allow eavesdrop='true'/>"
-        << "</policy></busconfig>";
-    int ready[2];
-    EXPECT_EQ(::pipe(ready), 0);
-    std::vector<std::string> arguments{"dbus-daemon",
-                                       "--nofork",
-                                       "--nopidfile",
-                                       "--nosyslog",
-                                       "--config-file=" + directory_ + "/bus.conf",
-                                       "--print-address=" + std::to_string(ready[1])};
-    std::vector<char*> argv;
-    for (auto& argument : arguments) argv.push_back(argument.data());
-    argv.push_back(nullptr);
-    EXPECT_EQ(::posix_spawnp(&process_, "dbus-daemon", nullptr, nullptr, argv.data(), environ), 0);
-    ::close(ready[1]);
-    char byte = 0;
-    EXPECT_EQ(::read(ready[0], &byte, 1), 1) << "the bus did not come up";
-    ::close(ready[0]);
+  PrivateBus()
+      : program_("dbus-daemon", {"--nofork", "--nopidfile", "--nosyslog", "--print-address=1",
+                                 "--config-file=" + folder_.write("/bus.conf", configuration())}) {
+    EXPECT_NE(program_.readLine(), "") << "the bus did not come up";
   }
-  ~PrivateBus() {
-    ::kill(process_, SIGKILL);
-    ::waitpid(process_, nullptr, 0);
-    std::filesystem::remove_all(directory_);
-  }
-  PrivateBus(const PrivateBus&) = delete;
-  PrivateBus& operator=(const PrivateBus&) = delete;
-  [[nodiscard]] const std::string& address() const { return address_; }
+  [[nodiscard]] std::string address() const { return "unix:path=" + folder_.path("/bus"); }
 
  private:
-  std::string directory_, address_;
-  pid_t process_ = -1;
+  [[nodiscard]] std::string configuration() const {
+    return "<busconfig><type>session</type><listen>" + address() + "</listen><policy context='default'>" +
+           "<allow user='*'/><allow own='*'/><allow send_destination='*'/><allow eavesdrop='true'/>" +
+           "</policy></busconfig>";
+  }
+  const kit::ScratchFolder folder_;
+  kit::Process program_;
 };
 
 /// org.freedesktop.login1 as far as inhibitors go. Tells "idle block" when one is taken, and "idle released"
@@ -89,7 +64,7 @@ class FakeLogind {
     sd_bus_close_unref(bus_);
   }
   void announceSleep(bool starts) { post(starts ? Command::Sleep : Command::Wake); }
-  Events<std::string> events;
+  kit::Events<std::string> events;
 
  private:
   enum class Command { Quit, Sleep, Wake };

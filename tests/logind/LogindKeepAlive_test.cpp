@@ -19,7 +19,7 @@ class LogindKeepAliveTest : public ::testing::Test {
   const std::set<std::string> taken_{"idle block", "sleep delay"}, released_{"idle released", "sleep released"};
   PrivateBus bus_;
   FakeLogind logind_{bus_.address()};
-  Events<bool> activity_;
+  kit::Events<bool> activity_;
   LogindKeepAlive keepAlive_{
       {.busAddress = bus_.address(), .activityHandler = [this](bool isOpen) { activity_.add(isOpen); }}};
 };
@@ -41,8 +41,8 @@ TEST_F(LogindKeepAliveTest, InhibitorsAreHeldFromTheFirstTransactionToTheLast) {
 }
 
 TEST_F(LogindKeepAliveTest, SleepWaitsUntilTheHoldIsLetGoOf) {
-  Events<std::shared_ptr<void>> holds;
-  Events<std::chrono::nanoseconds> wakes;
+  kit::Events<std::shared_ptr<void>> holds;
+  kit::Events<std::chrono::nanoseconds> wakes;
   keepAlive_.setHandlers({.willSleep = [&](std::shared_ptr<void> hold) { holds.add(std::move(hold)); },
                           .didWake = [&](std::chrono::nanoseconds asleep) { wakes.add(asleep); }});
   keepAlive_.beginTransaction();

@@ -8,20 +8,14 @@ import unittest
 
 SCRIPTS = sys.argv.pop(1)
 
-# One a floor: (file, what it includes, what is said).
+# Some floors: (file, what it includes, what is said).
 BREACHES = (
     ("platform/base/C.h", "platform/threads/B.h", "not below it in the picture"),
-    ("platform/threads/D.h", "platform/IPC.h", "not below it in the picture"),
     ("platform/process/E.h", "platform/IPC.h", "not below it in the picture"),
     ("platform/F.h", "platform/process/B.h", "not below it in the picture"),
-    ("platform/sound/G.h", "protocol/B.h", "not below it in the picture"),
     ("platform/pulse/A.cpp", "platform/x11/B.h", "names a backend"),
     ("platform/mp4/A.cpp", "support/B.h", "not below it in the picture"),
     ("protocol/H.h", "support/B.h", "not below it in the picture"),
-    ("support/A.cpp", "writer/B.h", "not below it in the picture"),
-    ("extensions/A.cpp", "writer/B.h", "not below it in the picture"),
-    ("capture/A.cpp", "protocol/B.h", "not below it in the picture"),
-    ("writer/A.cpp", "capture/B.h", "not below it in the picture"),
     ("ui/A.cpp", "session/B.h", "not below it in the picture"),
     ("session/A.cpp", "daemon/B.h", "not below it in the picture"),
     ("daemon/A.cpp", "platform/linux/B.h", "names a backend"),

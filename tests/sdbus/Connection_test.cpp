@@ -25,16 +25,8 @@ SharedFileDescriptor descriptorFor(const std::string& text) {
   return shareFileDescriptor(FileDescriptor(ends[0]));
 }
 
-std::string readAll(const SharedFileDescriptor& descriptor) {
-  char buffer[64];
-  const ssize_t size = ::read(descriptor->get(), buffer, sizeof buffer);
-  return size > 0 ? std::string(buffer, static_cast<size_t>(size)) : std::string();
-}
-
 TEST_F(ConnectionTest, CarriesEveryTypeThereAndBack) {
-  delegate_.object->serve = echo();
-  listen();
-  const auto client = connectClient();
+  const auto client = connectEcho();
   const IPCArguments sent{Value(true),
                           Value(int32_t{-5}),
                           Value(uint32_t{4000000000u}),
@@ -57,10 +49,8 @@ TEST_F(ConnectionTest, CarriesEveryTypeThereAndBack) {
   EXPECT_EQ(valuesOf(call(*client, "echo", {nested})), IPCArguments{nested});
 }
 
-TEST_F(ConnectionTest, SendsNoneAsTheEmptyValueOfItsType) {
-  delegate_.object->serve = echo();
-  listen();
-  const auto client = connectClient();
+TEST_F(ConnectionTest, SendsNoneAsTheEmptyValueOfItsTypeAndTextsAsUTF8) {
+  const auto client = connectEcho();
   const IPCArguments back = valuesOf(call(*client, "everything", IPCArguments(13)));
   ASSERT_EQ(back.size(), 13u);
   EXPECT_EQ(back[0], Value(false));
@@ -69,35 +59,25 @@ TEST_F(ConnectionTest, SendsNoneAsTheEmptyValueOfItsType) {
   EXPECT_EQ(back[10], Value(Array{Value(0.0), Value(0.0)}));
   // An entry that is none is an absent key.
   EXPECT_EQ(valuesOf(call(*client, "echo", {Value(Dictionary{{"gone", Value()}})})), IPCArguments{Value(Dictionary{})});
-}
-
-TEST_F(ConnectionTest, RepairsTextsThatAreNotUTF8) {
-  delegate_.object->serve = echo();
-  listen();
-  const auto client = connectClient();
   EXPECT_EQ(valuesOf(call(*client, "echo", {Value(std::string("a\xFF\0b\xED\xA0\x80", 7))})),
             IPCArguments{Value("a\xEF\xBF\xBD\xEF\xBF\xBD"
                                "b\xEF\xBF\xBD\xEF\xBF\xBD\xEF\xBF\xBD")});
 }
 
 TEST_F(ConnectionTest, CarriesDescriptorsBothWays) {
-  delegate_.object->serve = echo();
-  listen();
-  const auto client = connectClient();
+  const auto client = connectEcho();
   const Value payload(Dictionary{{"frame", Value(Array{Value(descriptorFor("pixels")), Value(uint32_t{16})})}});
   const IPCArguments back = valuesOf(call(*client, "echo", {payload}));
   ASSERT_EQ(back.size(), 1u);
   const Array frame = valueForKey(back[0].asDictionary(), "frame").asArray();
   ASSERT_EQ(frame.size(), 2u);
   ASSERT_TRUE(frame[0].getIf<SharedFileDescriptor>());
-  EXPECT_EQ(readAll(*frame[0].getIf<SharedFileDescriptor>()), "pixels");
-  EXPECT_EQ(codeOf(call(*client, "everything",
-                        [] {
-                          IPCArguments arguments(13);
-                          arguments[12] = Value(Array{Value(SharedFileDescriptor())});
-                          return arguments;
-                        }())),
-            code(IPCErrorCode::InvalidArguments));
+  char text[7] = {};
+  EXPECT_EQ(::read((*frame[0].getIf<SharedFileDescriptor>())->get(), text, sizeof text), 6);
+  EXPECT_STREQ(text, "pixels");
+  IPCArguments none(13);
+  none[12] = Value(Array{Value(SharedFileDescriptor())});
+  EXPECT_EQ(codeOf(call(*client, "everything", none)), code(IPCErrorCode::InvalidArguments));
 }
 
 TEST_F(ConnectionTest, TheServerCallsItsClientWhileARequestIsOpen) {
@@ -105,9 +85,10 @@ TEST_F(ConnectionTest, TheServerCallsItsClientWhileARequestIsOpen) {
   const auto client = connectClient();
   Events<std::string> order;
   client->call("nothing", {}, [&](const IPCArguments&) { order.add("reply"); }, {});
-  const Call request = delegate_.object->calls.next();
-  request.connection->call("notify", {Value(uint32_t{3})}, {}, {});
-  const Call callback = clientObject_->calls.next();
+  const Call request = delegate_.object->takeCall();
+  const auto server = delegate_.connections.next();
+  server->call("notify", {Value(uint32_t{3})}, {}, {});
+  const Call callback = clientObject_->takeCall();
   EXPECT_EQ(callback.member, "notify");
   EXPECT_EQ(callback.arguments, IPCArguments{Value(uint32_t{3})});
   EXPECT_TRUE(order.isEmpty());
@@ -116,7 +97,7 @@ TEST_F(ConnectionTest, TheServerCallsItsClientWhileARequestIsOpen) {
 }
 
 TEST_F(ConnectionTest, ACallIsAnsweredOnceAndAnUnansweredOneFails) {
-  delegate_.object->serve = [](const Call& served) {
+  delegate_.object->answer = [](const Call& served) {
     if (served.arguments[0].asBool()) {
       served.reply({Value("first")});
       served.reply({Value("second")});
@@ -133,7 +114,7 @@ TEST_F(ConnectionTest, ACallIsAnsweredOnceAndAnUnansweredOneFails) {
 }
 
 TEST_F(ConnectionTest, AnAnswerThatDoesNotFitFailsTheCallOnly) {
-  delegate_.object->serve = [](const Call& served) {
+  delegate_.object->answer = [](const Call& served) {
     if (served.member == "everything") return served.reply({Value("one value instead of many")});
     served.reply(served.arguments);
   };
@@ -144,9 +125,7 @@ TEST_F(ConnectionTest, AnAnswerThatDoesNotFitFailsTheCallOnly) {
 }
 
 TEST_F(ConnectionTest, WrongCallsFailAtTheCaller) {
-  delegate_.object->serve = echo();
-  listen();
-  const auto client = connectClient();
+  const auto client = connectEcho();
   EXPECT_EQ(codeOf(call(*client, "noSuchThing", {})), code(IPCErrorCode::UnknownOperation));
   EXPECT_EQ(codeOf(call(*client, "echo", {})), code(IPCErrorCode::InvalidArguments));
   EXPECT_EQ(codeOf(call(*client, "notify", {Value("text")})), code(IPCErrorCode::InvalidArguments));
@@ -158,7 +137,7 @@ TEST_F(ConnectionTest, WrongCallsFailAtTheCaller) {
 }
 
 TEST_F(ConnectionTest, AnOperationThatThePeerLacksFailsAndTheConnectionStays) {
-  delegate_.object->serve = echo();
+  delegate_.object->answer = echo;
   listen();
   const auto client = makeClient();
   IPCInterface newer = testInterface();
@@ -185,7 +164,7 @@ TEST_F(ConnectionTest, InvalidationIsToldOnceAndFailsOpenCalls) {
   const auto client = connectClient();
   Events<int64_t> failures;
   client->call("nothing", {}, {}, [&](const Error& error) { failures.add(error.code); });
-  const Call open = delegate_.object->calls.next();
+  const Call open = delegate_.object->takeCall();
   client->invalidate();
   client->invalidate();
   EXPECT_EQ(failures.next(), code(IPCErrorCode::ConnectionInvalid));
@@ -193,7 +172,8 @@ TEST_F(ConnectionTest, InvalidationIsToldOnceAndFailsOpenCalls) {
   EXPECT_EQ(delegate_.ended.next(), "invalidated");
   EXPECT_EQ(codeOf(call(*client, "nothing", {})), code(IPCErrorCode::ConnectionInvalid));
   open.reply({});
-  EXPECT_EQ(codeOf(call(*open.connection, "notify", {Value(uint32_t{1})})), code(IPCErrorCode::ConnectionInvalid));
+  EXPECT_EQ(codeOf(call(*delegate_.connections.next(), "notify", {Value(uint32_t{1})})),
+            code(IPCErrorCode::ConnectionInvalid));
   EXPECT_TRUE(clientEnded_.isEmpty());
   EXPECT_TRUE(delegate_.ended.isEmpty());
   EXPECT_TRUE(failures.isEmpty());
@@ -213,17 +193,20 @@ TEST_F(ConnectionTest, ClearedHandlersAreNotCalled) {
   EXPECT_TRUE(clientEnded_.isEmpty());
 }
 
-TEST_F(ConnectionTest, ALostNamedServiceIsAnInterruptionAndCanBeConnectedAnew) {
-  delegate_.object->serve = echo();
+TEST_F(ConnectionTest, ALostNamedServiceFailsOpenCallsThenInterruptsAndCanBeConnectedAnew) {
   listen();
   const auto client = connectClient();
-  EXPECT_EQ(valuesOf(call(*client, "nothing", {})), IPCArguments{});
+  client->call("nothing", {}, {}, [this](const Error&) { clientEnded_.add("failed"); });
+  const Call open = delegate_.object->takeCall();
   delegate_.connections.next()->invalidate();
+  EXPECT_EQ(clientEnded_.next(), "failed");
   EXPECT_EQ(clientEnded_.next(), "interrupted");
   EXPECT_EQ(codeOf(call(*client, "nothing", {})), code(IPCErrorCode::ConnectionInvalid));
   client->invalidate();
   const auto again = connectClient();
-  EXPECT_EQ(valuesOf(call(*again, "nothing", {})), IPCArguments{});
+  again->call("nothing", {}, [this](const IPCArguments&) { clientEnded_.add("answered"); }, {});
+  delegate_.object->takeCall().reply({});
+  EXPECT_EQ(clientEnded_.next(), "answered");
   EXPECT_TRUE(clientEnded_.isEmpty());
 }
 
@@ -239,7 +222,7 @@ TEST_F(ConnectionTest, TheLastMessagesBeforeAnInvalidationArrive) {
       server->call("sample", {Value(i), Value(Data(100))}, {}, {});
     }
     client->invalidate();
-    for (uint32_t i = 0; i < kMessages; ++i) EXPECT_EQ(delegate_.object->calls.next().arguments[0], Value(i));
+    for (uint32_t i = 0; i < kMessages; ++i) EXPECT_EQ(delegate_.object->takeCall().arguments[0], Value(i));
     EXPECT_EQ(delegate_.ended.next(), "invalidated");
   }
 }
@@ -249,7 +232,7 @@ TEST_F(ConnectionTest, DroppingTheLastReferenceEndsTheConnectionSilently) {
   auto client = connectClient();
   Events<int64_t> failures;
   client->call("nothing", {}, {}, [&](const Error& error) { failures.add(error.code); });
-  const Call open = delegate_.object->calls.next();  // dropped, it would be answered
+  const Call open = delegate_.object->takeCall();  // dropped, it would be answered
   client.reset();
   EXPECT_EQ(failures.next(), code(IPCErrorCode::ConnectionInvalid));
   EXPECT_EQ(delegate_.ended.next(), "invalidated");
@@ -257,12 +240,9 @@ TEST_F(ConnectionTest, DroppingTheLastReferenceEndsTheConnectionSilently) {
 }
 
 TEST_F(ConnectionTest, HandlersRunOnTheTargetQueueOneAtATime) {
-  std::atomic<int> running{0};
-  std::atomic<int> handled{0};
+  std::atomic<int> running{0}, handled{0};
   Events<bool> done;
-  SerialQueue serverQueue("server");
-  delegate_.object->serve = echo();
-  clientObject_->serve = [&](const Call&) {
+  clientObject_->answer = [&](const Call&) {
     EXPECT_TRUE(queue_->isOnQueue());
     EXPECT_EQ(++running, 1);
     --running;

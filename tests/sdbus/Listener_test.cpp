@@ -53,9 +53,7 @@ TEST_F(ListenerTest, ASocketThatADeadDaemonLeftIsReplacedButNoOtherFile) {
     path.copy(address.sun_path, sizeof address.sun_path - 1);
     ASSERT_EQ(::bind(stale.get(), reinterpret_cast<sockaddr*>(&address), sizeof address), 0);
   }
-  delegate_.object->serve = echo();
-  listen();
-  EXPECT_EQ(valuesOf(call(*connectClient(), "nothing", {})), IPCArguments{});
+  EXPECT_EQ(valuesOf(call(*connectEcho(), "nothing", {})), IPCArguments{});
   std::ofstream(directory_ + "/other.service") << "precious";
   EXPECT_TRUE(server_->createListener("other.service")->resume());
   EXPECT_TRUE(std::filesystem::exists(directory_ + "/other.service"));
@@ -80,13 +78,13 @@ TEST_F(ListenerTest, ARefusedClientLosesItsConnection) {
 TEST_F(ListenerTest, AnEndpointTravelsInAMessageAndLeadsBack) {
   listen();
   const auto client = connectClient();
-  FakeDelegate extension;
-  extension.object->serve = echo();
+  fakes::AcceptingDelegate extension(testInterface(), testInterface());
+  extension.object->answer = echo;
   auto anonymous = client_->createAnonymousListener();
   anonymous->setDelegate(&extension, *queue_);
   ASSERT_FALSE(anonymous->resume());
   client->call("echo", {Value(Array{Value(anonymous->endpoint().rendezvous())})}, {}, {});
-  const Call received = delegate_.object->calls.next();
+  const Call received = delegate_.object->takeCall();
   const Array items = received.arguments[0].asArray();
   ASSERT_EQ(items.size(), 1u);
   auto connection = server_->connect(ListenerEndpoint(*items[0].getIf<SharedFileDescriptor>()));
@@ -109,8 +107,8 @@ TEST_F(ListenerTest, AnEndpointTravelsInAMessageAndLeadsBack) {
 }
 
 TEST_F(ListenerTest, WhatComesThroughARendezvousMustBeAStreamPair) {
-  FakeDelegate extension;
-  extension.object->serve = echo();
+  fakes::AcceptingDelegate extension(testInterface(), testInterface());
+  extension.object->answer = echo;
   auto anonymous = server_->createAnonymousListener();
   anonymous->setDelegate(&extension, *queue_);
   ASSERT_FALSE(anonymous->resume());
@@ -144,7 +142,7 @@ TEST_F(ListenerTest, WhatComesThroughARendezvousMustBeAStreamPair) {
 }
 
 TEST_F(ListenerTest, AThousandClientsAreServed) {
-  delegate_.object->serve = echo();
+  delegate_.object->answer = echo;
   listen();
   std::vector<std::shared_ptr<IPCConnection>> clients;
   Events<bool> answered;

@@ -1,7 +1,4 @@
 #include <fcntl.h>
-#include <signal.h>
-#include <spawn.h>
-#include <sys/wait.h>
 
 #include <future>
 
@@ -21,40 +18,6 @@ SdBusIPCOptions smallBounds() {
   return options;
 }
 
-/// A process that ends with the test at the latest.
-class PeerProcess {
- public:
-  PeerProcess(const std::string& directory, const char* mode) {
-    int ends[2];
-    EXPECT_EQ(::pipe2(ends, O_CLOEXEC), 0);
-    output_ = FileDescriptor(ends[0]);
-    const FileDescriptor writing(ends[1]);
-    posix_spawn_file_actions_t actions;
-    posix_spawn_file_actions_init(&actions);
-    posix_spawn_file_actions_adddup2(&actions, writing.get(), STDOUT_FILENO);
-    std::string path = SDBUS_TEST_PEER;
-    std::string folder = directory;
-    std::string role = mode;
-    char* arguments[] = {path.data(), folder.data(), role.data(), nullptr};
-    EXPECT_EQ(::posix_spawn(&pid, path.c_str(), &actions, nullptr, arguments, environ), 0);
-    posix_spawn_file_actions_destroy(&actions);
-  }
-  ~PeerProcess() { kill(); }
-  void awaitReady() {
-    char line[6];
-    EXPECT_EQ(::read(output_.get(), line, sizeof line), 6);
-  }
-  void kill() {
-    if (pid <= 0) return;
-    ::kill(pid, SIGKILL);
-    ::waitpid(std::exchange(pid, -1), nullptr, 0);
-  }
-  pid_t pid = -1;
-
- private:
-  FileDescriptor output_;
-};
-
 class PeersTest : public SdBusTest {
  protected:
   PeersTest() : SdBusTest(smallBounds()) {}
@@ -72,33 +35,19 @@ class PeersTest : public SdBusTest {
   }
 };
 
-TEST_F(PeersTest, AKilledClientIsOneInvalidation) {
+TEST_F(PeersTest, AClientThatDiesIsOneInvalidation) {
   listen();
-  PeerProcess peer(directory_, "client");
-  const auto server = delegate_.connections.next();
-  EXPECT_EQ(server->processIdentifier(), peer.pid);
-  EXPECT_EQ(delegate_.object->calls.next().arguments, IPCArguments{Value(uint32_t{42})});
-  peer.kill();
-  EXPECT_EQ(delegate_.ended.next(), "invalidated");
+  auto peer = std::make_unique<RawPeer>(socketPath());
+  const auto server = admit(*peer);
   Events<int64_t> failures;
   sendNumbered(*server, "notify", 1, failures);
+  EXPECT_TRUE(peer->readUntil("notify"));
+  peer.reset();
+  EXPECT_EQ(delegate_.ended.next(), "invalidated");
+  EXPECT_EQ(failures.next(), code(IPCErrorCode::ConnectionInvalid));
+  sendNumbered(*server, "notify", 2, failures);
   EXPECT_EQ(failures.next(), code(IPCErrorCode::ConnectionInvalid));
   EXPECT_TRUE(delegate_.ended.isEmpty());
-}
-
-TEST_F(PeersTest, AKilledDaemonFailsOpenCallsThenInterrupts) {
-  PeerProcess peer(directory_, "server");
-  peer.awaitReady();
-  const auto client = connectClient();
-  Events<std::string> order;
-  client->call("nothing", {}, {}, [&](const Error&) { order.add("failed"); });
-  EXPECT_EQ(clientObject_->calls.next().member, "notify");
-  client->setInterruptionHandler([&] { order.add("interrupted"); });
-  peer.kill();
-  EXPECT_EQ(order.next(), "failed");
-  EXPECT_EQ(order.next(), "interrupted");
-  EXPECT_TRUE(order.isEmpty());
-  EXPECT_TRUE(clientEnded_.isEmpty());
 }
 
 TEST_F(PeersTest, APeerThatNeverReadsLosesMediaFirstAndIsThenCutOff) {
@@ -120,22 +69,31 @@ TEST_F(PeersTest, APeerThatNeverReadsLosesMediaFirstAndIsThenCutOff) {
   EXPECT_TRUE(delegate_.ended.isEmpty());
 }
 
-TEST_F(PeersTest, AFrameThatWasAnsweredMakesRoomForAnother) {
-  clientObject_->serve = [](const Call&) {};
+TEST_F(PeersTest, FramesThatThePeerHasNotAnsweredAreBounded) {
+  clientObject_->answer = [](const Call&) {};
   listen();
-  const auto client = connectClient();
-  const auto server = delegate_.connections.next();
   const auto memory = shareFileDescriptor(FileDescriptor(::open("/dev/null", O_RDONLY | O_CLOEXEC)));
   const Value one(uint32_t{1});
   const IPCArguments frame{Value(Array{Value(memory), Value(memory), one, one, one, one}), Value(Data(72))};
-  for (int i = 0; i < 6; ++i) EXPECT_EQ(valuesOf(call(*server, "frame", frame)), IPCArguments{});
+  const auto client = connectClient();
+  const auto answered = delegate_.connections.next();
+  for (int i = 0; i < 6; ++i) EXPECT_EQ(valuesOf(call(*answered, "frame", frame)), IPCArguments{});
+  RawPeer deaf(socketPath());
+  const auto unanswered = admit(deaf);
+  Events<int64_t> failures;
+  for (int i = 0; i < 5; ++i) {
+    unanswered->call("frame", frame, {}, [&failures](const Error& error) { failures.add(error.code); });
+  }
+  EXPECT_EQ(failures.next(), code(IPCErrorCode::MessageDropped));
+  unanswered->invalidate();
+  for (int i = 0; i < 4; ++i) EXPECT_EQ(failures.next(), code(IPCErrorCode::ConnectionInvalid));
 }
 
 TEST_F(PeersTest, APeerThatAsksWithoutEndIsNotReadFurtherThanItIsServed) {
   std::promise<void> opened;
   const auto gate = opened.get_future().share();
   std::atomic<size_t> handled{0};
-  delegate_.object->serve = [&handled, gate](const Call&) {
+  delegate_.object->answer = [&handled, gate](const Call&) {
     gate.wait();
     ++handled;
   };
@@ -168,16 +126,14 @@ TEST_F(PeersTest, CallsBeyondTheBoundOfUnansweredOnesAreRefused) {
     client->call("nothing", {}, {}, [&](const Error& error) { failures.add(error.code); });
   }
   EXPECT_EQ(failures.next(), code(IPCErrorCode::RemoteError));
-  for (int i = 0; i < 8; ++i) open.push_back(delegate_.object->calls.next());
+  for (int i = 0; i < 8; ++i) open.push_back(delegate_.object->takeCall());
   EXPECT_TRUE(failures.isEmpty());
   client->invalidate();
   for (int i = 0; i < 8; ++i) EXPECT_EQ(failures.next(), code(IPCErrorCode::ConnectionInvalid));
 }
 
 TEST_F(PeersTest, GarbageEndsItsConnectionOnly) {
-  delegate_.object->serve = echo();
-  listen();
-  const auto client = connectClient();
+  const auto client = connectEcho();
   const auto honest = delegate_.connections.next();
   using namespace std::string_literals;
   {

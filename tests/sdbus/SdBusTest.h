@@ -2,86 +2,33 @@
 
 #include <gtest/gtest.h>
 
-#include <cstdlib>
-#include <filesystem>
 #include <functional>
 #include <memory>
-#include <mutex>
 #include <string>
 #include <thread>
 #include <variant>
 #include <vector>
 
 #include "platform/sdbus/SdBusIPC.h"
+#include "tests/fakes/AcceptingDelegate.h"
 #include "tests/kit/Events.h"
+#include "tests/kit/ScratchFolder.h"
 #include "tests/sdbus/TestInterface.h"
 
 namespace qv::platform::test {
 
+using fakes::RecordingExportedObject;
 using kit::Events;
 using kit::kNever;
-
-struct Call {
-  std::string member;
-  IPCArguments arguments;
-  IPCReply reply;
-  std::shared_ptr<IPCConnection> connection;
-};
-
-/// An exported object that records calls, or serves them by `serve`.
-class FakeObject final : public IPCExportedObject {
- public:
-  void handleCall(const std::shared_ptr<IPCConnection>& connection, const IPCOperation& operation,
-                  IPCArguments arguments, IPCReply reply) override {
-    if (serve) {
-      serve({operation.member, std::move(arguments), std::move(reply), connection});
-    } else {
-      calls.add({operation.member, std::move(arguments), std::move(reply), connection});
-    }
-  }
-  std::function<void(Call)> serve;  ///< set before the connection is resumed
-  Events<Call> calls;
-};
-
-/// Accepts every connection, with `object` exported, and keeps it.
-class FakeDelegate final : public IPCListenerDelegate {
- public:
-  bool listenerShouldAcceptNewConnection(IPCListener&, const std::shared_ptr<IPCConnection>& connection) override {
-    if (!accepts) {
-      refused.add(true);
-      return false;
-    }
-    connection->setExportedInterface(testInterface(), object);
-    connection->setRemoteInterface(testInterface());
-    connection->setInvalidationHandler([events = events_] { events->add("invalidated"); });
-    connection->setInterruptionHandler([events = events_] { events->add("interrupted"); });
-    connection->resume();
-    connections.add(connection);
-    return true;
-  }
-  bool accepts = true;
-  std::shared_ptr<FakeObject> object = std::make_shared<FakeObject>();
-  Events<std::shared_ptr<IPCConnection>> connections;
-  Events<bool> refused;
-
- private:
-  /// The connections' queues may be behind, and outlive this.
-  const std::shared_ptr<Events<std::string>> events_ = std::make_shared<Events<std::string>>();
-
- public:
-  Events<std::string>& ended = *events_;
-};
+using Call = RecordingExportedObject::ReceivedCall;
 
 /// A daemon's service object and a client's, talking over a socket in a directory of the test's own.
 class SdBusTest : public ::testing::Test {
  protected:
   explicit SdBusTest(SdBusIPCOptions options = {}) {
-    char name[] = "/tmp/qv-sdbus-XXXXXX";
-    directory_ = ::mkdtemp(name);
     options.runtimeDirectory = directory_;
     server_ = std::make_unique<SdBusIPCService>(resolver(), options);
     client_ = std::make_unique<SdBusIPCService>(IPCPeerResolver(), options);
-    queue_ = std::make_unique<SerialQueue>("test");
   }
   ~SdBusTest() override {
     listener_.reset();
@@ -89,7 +36,6 @@ class SdBusTest : public ::testing::Test {
     server_.reset();
     // Whatever is still queued for the fakes runs while they live.
     queue_->sync([] {});
-    std::filesystem::remove_all(directory_);
   }
 
   static IPCPeerResolver resolver() {
@@ -146,14 +92,19 @@ class SdBusTest : public ::testing::Test {
     const auto* error = std::get_if<Error>(&outcome);
     return error ? error->code : 0;
   }
-  static std::function<void(Call)> echo() {
-    return [](const Call& served) { served.reply(served.arguments); };
+  static void echo(const Call& served) { served.reply(served.arguments); }
+  /// A client of a service that echoes.
+  std::shared_ptr<IPCConnection> connectEcho() {
+    delegate_.object->answer = echo;
+    listen();
+    return connectClient();
   }
 
-  std::string directory_;
-  std::unique_ptr<SerialQueue> queue_;
-  FakeDelegate delegate_;
-  std::shared_ptr<FakeObject> clientObject_ = std::make_shared<FakeObject>();
+  const kit::ScratchFolder folder_;
+  const std::string directory_ = folder_.path();
+  const std::unique_ptr<SerialQueue> queue_ = std::make_unique<SerialQueue>("test");
+  fakes::AcceptingDelegate delegate_{testInterface(), testInterface()};
+  const std::shared_ptr<RecordingExportedObject> clientObject_ = std::make_shared<RecordingExportedObject>();
   Events<std::string> clientEnded_;
   std::unique_ptr<SdBusIPCService> server_;
   std::unique_ptr<SdBusIPCService> client_;

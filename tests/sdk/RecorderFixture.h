@@ -71,7 +71,7 @@ class RecorderFixture : public ::testing::Test, protected platform::IPCListenerD
     return true;
   }
 
-  void run() { executor_.runAll(); }
+  void run() { executor_.runUntilIdle(); }
   void note(std::string event) { log_.push_back(std::move(event)); }
   /// What happened since the last time.
   std::vector<std::string> takeLog() {

@@ -12,12 +12,11 @@
 #include "protocol/SampleCoding.h"
 #include "sdk/extension/ExtensionRuntime.h"
 #include "sdk/extension/ListenerBroadcasts.h"
-#include "tests/fakes/FakeIPC.h"
+#include "tests/fakes/AcceptingDelegate.h"
 
 namespace qv::extension {
 namespace {
 
-using fakes::RecordingExportedObject;
 using platform::Array;
 using platform::Dictionary;
 using platform::ExtensionItem;
@@ -39,17 +38,17 @@ platform::SampleTimingInfo timingAt(int64_t milliseconds) {
 }
 
 /// A listener of the host's, with the one connection that came.
-class Accepting : public platform::IPCListenerDelegate {
+class Accepting {
  public:
   Accepting(platform::IPCService& ipc, const platform::IPCInterface& exported, const platform::IPCInterface& remote)
-      : exported_(exported), remote_(remote), listener_(ipc.createAnonymousListener()) {
-    listener_->setDelegate(this, queue_);
+      : delegate_(exported, remote), listener_(ipc.createAnonymousListener()) {
+    listener_->setDelegate(&delegate_, queue_);
     EXPECT_FALSE(listener_->resume());
   }
-  ~Accepting() override { listener_->invalidate(); }
+  ~Accepting() { listener_->invalidate(); }
   [[nodiscard]] platform::ListenerEndpoint endpoint() const { return listener_->endpoint(); }
   IPCConnection& connection() {
-    if (!connection_) connection_ = valueOf(accepted_.get_future());
+    if (!connection_) connection_ = delegate_.connections.next();
     return *connection_;
   }
   /// Calls and waits: the reply, or nothing for an error.
@@ -61,24 +60,14 @@ class Accepting : public platform::IPCListenerDelegate {
     return valueOf(answered.get_future());
   }
 
-  const std::shared_ptr<RecordingExportedObject> calls = std::make_shared<RecordingExportedObject>();
-
  private:
-  bool listenerShouldAcceptNewConnection(platform::IPCListener&,
-                                         const std::shared_ptr<IPCConnection>& connection) override {
-    connection->setExportedInterface(exported_, calls);
-    connection->setRemoteInterface(remote_);
-    connection->resume();
-    accepted_.set_value(connection);
-    return true;
-  }
-
-  const platform::IPCInterface& exported_;
-  const platform::IPCInterface& remote_;
   platform::SerialQueue queue_{"test host"};
-  std::promise<std::shared_ptr<IPCConnection>> accepted_;
+  fakes::AcceptingDelegate delegate_;
   std::shared_ptr<IPCConnection> connection_;
   const std::unique_ptr<platform::IPCListener> listener_;
+
+ public:
+  fakes::RecordingExportedObject* const calls = delegate_.object.get();
 };
 
 /// Writes down what it is told. It is read when a call has been answered.
@@ -86,13 +75,17 @@ struct Diary {
   std::vector<std::string> words;
   std::optional<quorvel::VideoFrame> frame;
   std::optional<quorvel::AudioSample> sound;
+  std::function<void(quorvel::Broadcast&)> beginning;  ///< of the author's object, in its constructor
   quorvel::Broadcast* broadcast = nullptr;
   std::promise<void> gone;
 };
 
 class Author final : public quorvel::SampleExtension {
  public:
-  Author(Diary& diary, quorvel::Broadcast& broadcast) : diary_(diary) { diary_.broadcast = &broadcast; }
+  Author(Diary& diary, quorvel::Broadcast& broadcast) : diary_(diary) {
+    diary_.broadcast = &broadcast;
+    if (diary_.beginning) diary_.beginning(broadcast);
+  }
   ~Author() override { diary_.gone.set_value(); }
   void started(quorvel::Dictionary userInfo) override {
     say("started " + std::get<std::string>(userInfo.at("url").content));
@@ -196,6 +189,8 @@ TEST_F(ExtensionLibrary, TakesSamplesAndTellsOfItsService) {
   EXPECT_EQ(diary.frame->presentationTime, 500ms);
   EXPECT_EQ(diary.sound->source, quorvel::AudioSample::Source::Microphone);
   EXPECT_EQ(diary.sound->presentationTime, 50ms) << "the pauses are taken out";
+  EXPECT_EQ(diary.sound->bytes, (platform::Data{1, 2, 3, 4}));
+  EXPECT_EQ(diary.sound->format.sampleRate, 44100);
   diary.frame.reset();
   valueOf(returned.get_future());  // the daemon may use the memory again
 
@@ -232,23 +227,10 @@ class Editor final : public quorvel::ClipExtension {
     quorvel::Clip clip;
     quorvel::ClipCompletion done;
   };
-  struct Desk {
-    std::mutex mutex;
-    std::condition_variable changed;
-    std::vector<Work> works;
-    Work take() {
-      std::unique_lock lock(mutex);
-      EXPECT_TRUE(changed.wait_for(lock, 30s, [&] { return !works.empty(); }));
-      Work work = std::move(works.front());
-      works.erase(works.begin());
-      return work;
-    }
-  };
+  using Desk = kit::Events<Work>;
   explicit Editor(Desk& desk) : desk_(desk) {}
   void processClip(quorvel::Clip clip, quorvel::ClipCompletion done) override {
-    std::lock_guard lock(desk_.mutex);
-    desk_.works.push_back({std::move(clip), std::move(done)});
-    desk_.changed.notify_all();
+    desk_.add({std::move(clip), std::move(done)});
   }
 
  private:
@@ -276,7 +258,7 @@ TEST_F(ExtensionLibrary, OverlappingClipsKeepTheirOrderAndTheirAnswers) {
   second.reply({fileWith("2")});  // the later file comes first
   first.reply({fileWith("1")});
 
-  Editor::Work one = desk.take(), two = desk.take();
+  Editor::Work one = desk.next(), two = desk.next();
   char text = 0;
   EXPECT_EQ(::read(one.clip.file, &text, 1), 1);
   EXPECT_EQ(text, '1');
@@ -321,27 +303,21 @@ TEST_F(ExtensionLibrary, AListenerTakesBroadcastsWithoutALaunch) {
   valueOf(diary.gone.get_future());
 }
 
-/// Speaks while it is made, and gives up there.
-class Hasty final : public quorvel::SampleExtension {
- public:
-  explicit Hasty(quorvel::Broadcast& broadcast) {
+TEST_F(ExtensionLibrary, WhatIsSaidInAConstructorArrivesFirstAndInOrder) {
+  Diary diary;
+  diary.beginning = [](quorvel::Broadcast& broadcast) {
     broadcast.updateServiceInfo({{"state", {std::string("no")}}});
     broadcast.updateBroadcastURL("https://x");
     broadcast.finishBroadcastWithError({-7, "", "no server", "d"});
-  }
-  void started(quorvel::Dictionary) override {}
-  void finished() override {}
-  void processVideo(quorvel::VideoFrame, quorvel::Orientation) override {}
-  void processAudio(quorvel::AudioSample) override {}
-};
-
-TEST_F(ExtensionLibrary, WhatIsSaidInAConstructorArrivesFirstAndInOrder) {
-  launch(quorvel::SampleExtensionFactory([](quorvel::Broadcast& to) { return std::make_unique<Hasty>(to); }));
+  };
+  launch(authorWith(diary));
   Accepting daemon(ipc_, broadcastDaemonProtocol(), broadcastExtensionProtocol());
   ASSERT_TRUE(auxiliary_.call("setEndpoint", {daemon.endpoint().rendezvous()}));
   for (const char* member : {"updateServiceInfo", "updateBroadcastURL", "finishBroadcastWithError", "ping"}) {
     EXPECT_EQ(daemon.calls->takeCall().member, member);
   }
+  daemon.connection().invalidate();
+  valueOf(diary.gone.get_future());
 }
 
 }  // namespace

@@ -17,17 +17,8 @@ using namespace std::chrono_literals;
 
 const SampleTimingInfo kTiming{MediaTime::make(1, 60), MediaTime::make(5'000'000'000, platform::kHostTimescale),
                                MediaTime::invalid()};
-const AudioStreamDescription kFormat{.sampleRate = 44100,
-                                     .formatID = platform::kAudioFormatLinearPCM,
-                                     .formatFlags = platform::kAudioFormatFlagIsSignedInteger |
-                                                    platform::kAudioFormatFlagIsBigEndian |
-                                                    platform::kAudioFormatFlagIsPacked,
-                                     .bytesPerPacket = 2,
-                                     .framesPerPacket = 1,
-                                     .bytesPerFrame = 2,
-                                     .channelsPerFrame = 1,
-                                     .bitsPerChannel = 16,
-                                     .reserved = 0};
+/// Big-endian, packed.
+const AudioStreamDescription kFormat{44100, platform::kAudioFormatLinearPCM, 14, 2, 1, 2, 1, 16, 0};
 
 class RecorderCapture : public RecorderFixture {
  protected:

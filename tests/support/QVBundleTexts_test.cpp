@@ -75,22 +75,5 @@ TEST_F(ExtensionsTest, ApplicationNamesByPrecedence) {
   EXPECT_EQ(nameWith(display), "Schach");
 }
 
-TEST_F(ExtensionsTest, ProcessesBelongToTheBundleAroundTheirExecutable) {
-  bundles_.addNamedApplication("Chess", "com.example.chess");
-  bundles_.setProcess(7, "/Applications/Chess/bin/chess");
-  bundles_.setProcess(8, "/usr/bin/tool");
-  ASSERT_TRUE(texts_.bundleWithPID(7));
-  EXPECT_EQ(texts_.bundleWithPID(7)->bundleIdentifier(), "com.example.chess");
-  for (const pid_t pid : {0, 1, 8}) EXPECT_EQ(texts_.bundleWithPID(pid), nullptr) << pid;
-}
-
-TEST_F(ExtensionsTest, BaseIdentifierDropsTheLastComponent) {
-  EXPECT_EQ(texts_.baseIdentifier("A.B.C.D"), "A.B.C");
-  EXPECT_EQ(texts_.baseIdentifier("A.B"), "A");
-  EXPECT_EQ(texts_.baseIdentifier("A"), "");
-  EXPECT_EQ(texts_.baseIdentifier("A."), "A");
-  EXPECT_EQ(texts_.baseIdentifier(std::nullopt), std::nullopt);
-}
-
 }  // namespace
 }  // namespace qv

@@ -184,17 +184,6 @@ TEST_F(TemporaryMoviesTest, DiscardTakesTheLastHandedMovieOfItsCallerAlone) {
   EXPECT_EQ(errors_, (std::vector<int64_t>{0, 0, 0}));
 }
 
-TEST_F(TemporaryMoviesTest, AMovieThatCannotBeRemovedIsNobodys) {
-  hand("Chess.mp4");
-  disk_.failOn(Operation::Remove, files_.pathInStore("Chess.mp4"), EBUSY);
-  movies_->discardLast(kChess, recordError());
-  background_.runUntilIdle();
-  EXPECT_EQ(errors_, std::vector<int64_t>{EBUSY});
-  EXPECT_FALSE(movies_->isHandedTo(kChess, url("Chess.mp4")));
-  disk_.failOn(Operation::Remove, files_.pathInStore("Chess.mp4"), 0);
-  EXPECT_EQ(movies_->deleteAllTempFiles(), 5);
-}
-
 TEST_F(TemporaryMoviesTest, PurgesLeaveAloneWhatIsMadeOrSaved) {
   const Claim paused = record("Paused.mp4");
   addFile("Paused.mp4", 2 * kDay);
