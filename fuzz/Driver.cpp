@@ -3,7 +3,6 @@
 //   fuzz_x --seconds N [--seed N] runs as many as there is time for
 //   fuzz_x --only SEED:RUN        runs that one again
 //   fuzz_x --write-seeds FOLDER   writes the seeds, as a first corpus for libFuzzer
-//   fuzz_x FILE...                runs these inputs
 #include <signal.h>
 #include <unistd.h>
 
@@ -102,8 +101,7 @@ int main(int argc, char** argv) {
   unsigned long seed = 1;
   const std::vector<std::string> arguments(argv + 1, argv + argc);
   for (size_t i = 0; i < arguments.size(); ++i) {
-    const bool isOption = arguments[i].starts_with("--");
-    if (isOption && i + 1 == arguments.size()) return 2;
+    if (i + 1 == arguments.size()) return 2;
     if (arguments[i] == "--runs") {
       runs = std::stoul(arguments[++i]);
     } else if (arguments[i] == "--seconds") {
@@ -117,13 +115,8 @@ int main(int argc, char** argv) {
       return 0;
     } else if (arguments[i] == "--write-seeds") {
       return writeSeeds(seeds, arguments[++i]);
-    } else if (isOption) {
-      return 2;
     } else {
-      std::ifstream file(arguments[i], std::ios::binary);
-      if (!file) return 1;
-      runOne({std::istreambuf_iterator<char>(file), {}});
-      if (i + 1 == arguments.size()) return 0;
+      return 2;
     }
   }
   for (const std::string& valid : seeds) runOne(valid);

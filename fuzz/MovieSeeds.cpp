@@ -1,12 +1,8 @@
 #include "fuzz/MovieSeeds.h"
 
-#include <cstdlib>
-#include <filesystem>
-#include <fstream>
-#include <iterator>
-
 #include "platform/mp4/AnnexB.h"
 #include "platform/mp4/MovieWriter.h"
+#include "tests/kit/ScratchFolder.h"
 
 namespace qv::fuzz {
 namespace {
@@ -57,40 +53,18 @@ std::vector<std::vector<EncodedSample>> fragment(int64_t number) {
 }
 
 std::string movie(int fragments, bool isFinished) {
-  const ScratchFile file;
-  std::filesystem::remove(file.path());
-  MovieWriter writer(std::move(DiskMovieFile::create(file.path()).value()), {pictureTrack(), soundTrack()},
+  const kit::ScratchFolder folder("/dev/shm");
+  MovieWriter writer(std::move(DiskMovieFile::create(folder / "movie.mp4").value()), {pictureTrack(), soundTrack()},
                      MovieWriter::Layout::Fragmented);
   (void)writer.writeHeader();
   for (int i = 0; i < fragments; ++i) (void)writer.writeFragment(fragment(i));
   if (isFinished) (void)writer.finish({});
-  return file.read();
+  return folder.read("/movie.mp4");
 }
 
 }  // namespace
 
 std::string growingMovie(int fragments) { return movie(fragments, false); }
 std::string finishedMovie(int fragments) { return movie(fragments, true); }
-
-ScratchFile::ScratchFile() {
-  // In memory: a movie is synced several times.
-  char name[] = "/dev/shm/quorveld-fuzz-XXXXXX";
-  directory_ = ::mkdtemp(name);
-  path_ = directory_ + "/movie.mp4";
-  write({});
-}
-
-ScratchFile::~ScratchFile() { std::filesystem::remove_all(directory_); }
-
-void ScratchFile::write(const std::string& bytes) const {
-  std::ofstream(path_, std::ios::binary | std::ios::trunc) << bytes;
-}
-
-std::string ScratchFile::read() const {
-  std::ifstream file(path_, std::ios::binary);
-  return {std::istreambuf_iterator<char>(file), {}};
-}
-
-bool ScratchFile::isAlone() const { return std::distance(std::filesystem::directory_iterator(directory_), {}) == 1; }
 
 }  // namespace qv::fuzz

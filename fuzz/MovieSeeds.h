@@ -10,20 +10,4 @@ std::string growingMovie(int fragments);
 /// The same after its finish.
 std::string finishedMovie(int fragments);
 
-/// A file in a directory of its own, for what only works on files. Both go with this object.
-class ScratchFile {
- public:
-  ScratchFile();
-  ~ScratchFile();
-  [[nodiscard]] const std::string& path() const { return path_; }
-  void write(const std::string& bytes) const;
-  [[nodiscard]] std::string read() const;
-  /// Whether the directory holds nothing else.
-  [[nodiscard]] bool isAlone() const;
-
- private:
-  std::string directory_;
-  std::string path_;
-};
-
 }  // namespace qv::fuzz

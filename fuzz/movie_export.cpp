@@ -6,6 +6,7 @@
 #include "fuzz/Target.h"
 #include "platform/ffmpeg/FFmpegLog.h"
 #include "platform/ffmpeg/MovieExport.h"
+#include "tests/kit/ScratchFolder.h"
 
 namespace {
 
@@ -24,11 +25,11 @@ std::optional<Error> exportMovie(const std::string& from, const std::string& to,
 std::vector<std::string> qv::fuzz::seeds() { return {growingMovie(1), growingMovie(3), finishedMovie(2)}; }
 
 extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
-  static const qv::fuzz::ScratchFile file;
-  static const std::string result = file.path() + ".out";
+  static const qv::kit::ScratchFolder folder("/dev/shm");
+  static const std::string result = folder / "result.mp4";
   ffmpeg::routeLibraryLog();
-  file.write({reinterpret_cast<const char*>(data), size});
-  const auto reader = ffmpeg::MovieReader::open(file.path(), nullptr);
+  const std::string path = folder.write("/movie.mp4", {reinterpret_cast<const char*>(data), size});
+  const auto reader = ffmpeg::MovieReader::open(path, nullptr);
   if (!reader) return 0;
   const int64_t duration = reader.value()->duration();
   const MediaTimeRange ranges[] = {
@@ -38,10 +39,11 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
   const bool isMixed = size % 16 == 0 && duration < kLongestMix;
   const auto& range = ranges[size % 2];
   const auto preset = isMixed ? ExportPreset::HighestQuality : ExportPreset::PassThrough;
-  const auto error = exportMovie(file.path(), result, preset, range);
+  const auto error = exportMovie(path, result, preset, range);
   qv::fuzz::require(std::filesystem::exists(result) == !error, "a result where there is no error, else none");
   qv::fuzz::require(error || ffmpeg::MovieReader::open(result, nullptr), "a result can be read");
   std::filesystem::remove(result);
-  qv::fuzz::require(file.isAlone(), "nothing is left beside the movie");
+  const auto files = std::distance(std::filesystem::directory_iterator(folder.path()), {});
+  qv::fuzz::require(files == 1, "nothing is left beside the movie");
   return 0;
 }

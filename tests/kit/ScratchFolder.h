@@ -15,8 +15,8 @@ namespace qv::kit {
 /// Threading: as the file system.
 class ScratchFolder {
  public:
-  ScratchFolder() {
-    std::string name = "/tmp/quorvel-test-XXXXXX";
+  explicit ScratchFolder(const std::string& parent = "/tmp") {
+    std::string name = parent + "/quorvel-test-XXXXXX";
     EXPECT_NE(::mkdtemp(name.data()), nullptr);
     path_ = name;
   }
