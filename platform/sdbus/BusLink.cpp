@@ -38,14 +38,15 @@ void BusLink::setRemoteInterface(const IPCInterface& interface) {
 void BusLink::call(std::string_view member, IPCArguments arguments, IPCConnection::Completion completion,
                    IPCConnection::ErrorHandler errorHandler) {
   const MessageCost cost = costOf(arguments);
+  PendingCall call{std::move(completion), std::move(errorHandler), {}};
   std::lock_guard lock(mutex_);
   const IPCOperation* operation = remote_ ? remote_->operation(member) : nullptr;
   if (ended_) {
-    failOnQueue(std::move(errorHandler), IPCErrorCode::ConnectionInvalid, "the connection has ended");
+    failOnQueue(std::move(call), IPCErrorCode::ConnectionInvalid, "the connection has ended");
   } else if (!operation) {
-    failOnQueue(std::move(errorHandler), IPCErrorCode::UnknownOperation, "no operation " + std::string(member));
+    failOnQueue(std::move(call), IPCErrorCode::UnknownOperation, "no operation " + std::string(member));
   } else {
-    addCall(*operation, std::move(arguments), cost, {std::move(completion), std::move(errorHandler), {}});
+    addCall(*operation, std::move(arguments), cost, std::move(call));
   }
 }
 
@@ -61,7 +62,7 @@ void BusLink::addCall(const IPCOperation& operation, IPCArguments arguments, con
       if (!std::exchange(hasDroppedMedia_, true)) {
         QV_LOG(logs::kIPC, "peer does not keep up: dropping %s", operation.member.c_str());
       }
-      return failOnQueue(std::move(call.errorHandler), IPCErrorCode::MessageDropped, "the peer does not keep up");
+      return failOnQueue(std::move(call), IPCErrorCode::MessageDropped, "the peer does not keep up");
     }
     call.slot = std::move(*slot);
   }
@@ -90,9 +91,12 @@ void BusLink::push(OutgoingMessage message, const MessageCost& cost) {
   driver_->closeSoon();
 }
 
-void BusLink::failOnQueue(IPCConnection::ErrorHandler handler, IPCErrorCode code, const std::string& text) {
-  if (!handler) return;
-  queue_->async([handler = std::move(handler), error = ipcError(code, text)] { handler(error); });
+void BusLink::failOnQueue(PendingCall call, IPCErrorCode code, const std::string& text) {
+  if (!call.errorHandler && !call.completion) return;
+  queue_->async(
+      [handler = std::move(call.errorHandler), completion = std::move(call.completion), error = ipcError(code, text)] {
+        if (handler) handler(error);
+      });
 }
 
 void BusLink::invalidate(bool tellOwner) {
@@ -108,7 +112,7 @@ void BusLink::endLocked(End end) {
   if (ended_) return;
   ended_ = true;
   for (auto& [id, call] : std::exchange(calls_, {})) {
-    failOnQueue(std::move(call.errorHandler), IPCErrorCode::ConnectionInvalid, "the connection has ended");
+    failOnQueue(std::move(call), IPCErrorCode::ConnectionInvalid, "the connection has ended");
   }
   if (end == End::Lost || end == End::Overflow) driver_->outbox().clear();
   if (end == End::Destroyed) return;

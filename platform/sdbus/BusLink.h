@@ -69,7 +69,8 @@ class BusLink final : public BusDriverClient, public std::enable_shared_from_thi
 
   // All with the lock held:
   void addCall(const IPCOperation& operation, IPCArguments arguments, const MessageCost& cost, PendingCall call);
-  void failOnQueue(IPCConnection::ErrorHandler handler, IPCErrorCode code, const std::string& text);
+  /// Also lets go of the call there: it may hold the last of its own connection, whose end takes the lock.
+  void failOnQueue(PendingCall call, IPCErrorCode code, const std::string& text);
   void push(OutgoingMessage message, const MessageCost& cost);
   void endLocked(End end);
   void deliver(std::function<void()> work, size_t bytes);

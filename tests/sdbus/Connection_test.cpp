@@ -64,6 +64,21 @@ TEST_F(ConnectionTest, SendsNoneAsTheEmptyValueOfItsTypeAndTextsAsUTF8) {
                                "b\xEF\xBF\xBD\xEF\xBF\xBD\xEF\xBF\xBD")});
 }
 
+TEST_F(ConnectionTest, ACallMayHoldTheLastOfItsConnectionWhenThePeerGoes) {
+  listen();
+  auto client = connectClient();
+  Events<int64_t> ended;
+  IPCConnection& connection = *client;
+  connection.call(
+      "echo", {Value(Dictionary{})}, [client](const IPCArguments&) {},
+      [&ended](const Error& error) { ended.add(error.code); });
+  const auto accepted = delegate_.connections.next();
+  const auto unanswered = delegate_.object->takeCall();
+  client.reset();
+  accepted->invalidate();
+  EXPECT_EQ(ended.next(), code(IPCErrorCode::ConnectionInvalid));
+}
+
 TEST_F(ConnectionTest, CarriesDescriptorsBothWays) {
   const auto client = connectEcho();
   const Value payload(Dictionary{{"frame", Value(Array{Value(descriptorFor("pixels")), Value(uint32_t{16})})}});
