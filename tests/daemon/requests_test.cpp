@@ -44,5 +44,28 @@ TEST_F(RequestsTest, StateHoldsWhatTheClientSet) {
   EXPECT_EQ(valueForKey(state, "broadcastURL").asString(), "https://example.com/live");
 }
 
+TEST_F(RequestsTest, AnErrorHasItsTextByWhicheverWayItReachesAClient) {
+  device_.disk.addFile("/System/Library/Frameworks/Quorvel.framework/Resources/en.lproj/Localizable.strings",
+                       R"("RECORDING_ERROR_FAILED_TO_START" = "It did not begin.";
+                          "RECORDING_ERROR_FAILED_TO_SAVE" = "It was not kept.";
+                          "RECORDING_ERROR_INVALID_BROADCAST_SESSION" = "Nobody broadcasts.";
+                          "RECORDING_ERROR_INTERRUPTED" = "Another took over.";)");
+  const auto textOf = [](const Value& error) {
+    return platform::decodeError(error.asDictionary())->localizedDescription();
+  };
+  auto client = game();
+  EXPECT_EQ(textOf(client.start({.width = 0})->values.at(0)), "It did not begin.");
+  EXPECT_EQ(textOf(client.request("saveVideoToCameraRoll", {Value("file:///none.mp4")})->values.at(0)),
+            "It was not kept.");
+  EXPECT_EQ(textOf(client.start({.broadcast = true})->values.at(0)), "Nobody broadcasts.");
+  client.start();
+  auto other = chat();
+  other.start();
+  EXPECT_EQ(textOf(client.object().takeCall().arguments.at(0)), "Another took over.");
+  client.start();
+  device_.disk.removeItem(device_.movies.last().url.path());
+  EXPECT_EQ(textOf(client.stop()->values.at(1)), "It was not kept.");
+}
+
 }  // namespace
 }  // namespace qv

@@ -40,5 +40,19 @@ TEST_F(ErrorsTest, TheTextReplacesTheCallersAndOtherEntriesStay) {
   EXPECT_EQ(platform::valueForKey(error.userInfo, "file").asString(), "a.mp4");
 }
 
+TEST_F(ErrorsTest, OnlyWhatIsOursAndHasNoTextGetsOneOnItsWayToAClient) {
+  addTable("en", R"("RECORDING_ERROR_FAILED" = "It failed.";)");
+  const QuorvelErrors errors(texts_);
+  const auto sent = [&](const std::optional<platform::Error>& error) {
+    const auto received = platform::decodeError(errors.encoded(error));
+    return received ? received->localizedDescription() : "none";
+  };
+  EXPECT_EQ(sent(recordingError(errorcode::kFailed)), "It failed.");
+  EXPECT_EQ(sent(platform::Error{kQVRecordingErrorDomain, errorcode::kFailed, {{kLocalizedDescriptionKey, "mine"}}}),
+            "mine");
+  EXPECT_EQ(sent(platform::Error{"other", errorcode::kFailed, {}}), "");
+  EXPECT_EQ(sent(std::nullopt), "none");
+}
+
 }  // namespace
 }  // namespace qv
