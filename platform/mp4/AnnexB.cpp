@@ -10,7 +10,8 @@ constexpr uint8_t kPictureParameterSet = 8;
 constexpr uint8_t kAccessUnitDelimiter = 9;
 constexpr uint8_t kHighProfile = 100;
 
-uint8_t unitType(std::span<const uint8_t> unit) { return unit.empty() ? 0 : unit[0] & 0x1F; }
+/// Of a unit that splitByteStream found, so not empty.
+uint8_t unitType(std::span<const uint8_t> unit) { return unit[0] & 0x1F; }
 
 /// Where the next start code (00 00 01) begins, or the end.
 size_t findStartCode(std::span<const uint8_t> stream, size_t from) {

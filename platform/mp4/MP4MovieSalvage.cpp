@@ -16,7 +16,7 @@ namespace {
 
 struct OpenMovie {
   std::unique_ptr<DiskMovieFile> file;
-  uint64_t size = 0;
+  uint64_t size;
 };
 
 /// EWOULDBLOCK where a writer has it. Not every file system has locks: without them nothing is in use.

@@ -16,9 +16,7 @@ Result<std::unique_ptr<MovieFile>> DiskMovieFile::create(const std::string& path
   return std::unique_ptr<MovieFile>(std::make_unique<DiskMovieFile>(std::move(fd)));
 }
 
-DiskMovieFile::~DiskMovieFile() {
-  if (fd_.isValid()) (void)::flock(fd_.get(), LOCK_UN);
-}
+DiskMovieFile::~DiskMovieFile() { (void)::flock(fd_.get(), LOCK_UN); }
 
 int64_t DiskMovieFile::writeAt(std::span<const uint8_t> bytes, uint64_t offset) {
   const ssize_t written = ::pwrite(fd_.get(), bytes.data(), bytes.size(), static_cast<off_t>(offset));

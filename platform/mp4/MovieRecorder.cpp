@@ -3,6 +3,7 @@
 #include <pthread.h>
 
 #include <algorithm>
+#include <utility>
 
 namespace qv::platform::mp4 {
 
@@ -48,30 +49,25 @@ void MovieRecorder::finish(const MovieEnd& end, std::function<void(std::optional
 void MovieRecorder::run() {
   if (auto error = writer_.writeHeader()) fail(*error);
   for (;;) {
-    std::vector<Item> items;
-    std::optional<Finish> finish;
-    bool stopping = false;
-    {
-      std::unique_lock lock(mutex_);
-      const auto isDue = [this] { return !queue_.empty() || finish_ || stopping_; };
-      hasPending() ? (void)changed_.wait_until(lock, pendingSince_ + kFragmentLength, isDue)
-                   : changed_.wait(lock, isDue);
-      gather(lock);
-      items.swap(queue_);
-      queuedBytes_ = 0;
-      finish = std::move(finish_);
-      finish_.reset();
-      stopping = stopping_;
-    }
+    Work work = waitForWork();
     room_.notify_all();
-    take(std::move(items));
-    if (finish || stopping) flush();
-    if (finish) {
-      if (!error_) error_ = writer_.finish(finish->end);
-      finish->completion(error_);
+    take(std::move(work.items));
+    if (work.finish || work.isLast) flush();
+    if (work.finish) {
+      if (!error_) error_ = writer_.finish(work.finish->end);
+      work.finish->completion(error_);
     }
-    if (stopping) return;
+    if (work.isLast) return;
   }
+}
+
+MovieRecorder::Work MovieRecorder::waitForWork() {
+  std::unique_lock lock(mutex_);
+  const auto isDue = [this] { return !queue_.empty() || finish_ || stopping_; };
+  hasPending() ? (void)changed_.wait_until(lock, pendingSince_ + kFragmentLength, isDue) : changed_.wait(lock, isDue);
+  gather(lock);
+  queuedBytes_ = 0;
+  return {std::exchange(queue_, {}), std::exchange(finish_, std::nullopt), stopping_};
 }
 
 /// Nothing is written until a fragment is full, so nothing is gained by waking up for each sample.

@@ -51,7 +51,14 @@ class MovieRecorder {
     MovieEnd end;
     std::function<void(std::optional<Error>)> completion;
   };
+  /// What came since the last time; all of it where `isLast`.
+  struct Work {
+    std::vector<Item> items;
+    std::optional<Finish> finish;
+    bool isLast;
+  };
   void run();
+  Work waitForWork();
   void gather(std::unique_lock<std::mutex>& lock);
   void take(std::vector<Item> items);
   void add(Item item);

@@ -76,8 +76,8 @@ std::vector<MovieTrack> readTracks(std::span<const uint8_t> moov) {
 struct SampleRun {
   size_t track;
   int64_t decodeTime;
-  uint64_t dataOffset = 0;  ///< from the fragment's beginning
-  uint64_t dataSize = 0;
+  uint64_t dataOffset;  ///< from the fragment's beginning
+  uint64_t dataSize;
   struct Entry {
     uint32_t duration, size, flags;
   };
@@ -92,7 +92,7 @@ constexpr uint32_t kDataOffset = 0x001, kFirstFlags = 0x004, kEachDuration = 0x1
 /// What a fragment says of all samples of a track.
 struct FragmentDefaults {
   std::optional<uint32_t> duration;
-  uint32_t flags = 0;
+  uint32_t flags;
 };
 
 /// Adds the samples of one "trun". False where it is not one of ours.
@@ -100,13 +100,13 @@ bool readRun(ByteReader trun, const FragmentDefaults& defaults, SampleRun& run) 
   const uint32_t flags = trun.u32();
   const uint32_t count = trun.u32();
   const uint32_t durationFlag = defaults.duration ? 0 : kEachDuration;
-  if ((flags & ~kFirstFlags) != (kDataOffset | kEachSize | durationFlag)) return false;
   const uint32_t dataOffset = trun.u32();
-  if (run.entries.empty()) run.dataOffset = dataOffset;
-  if (dataOffset != run.dataOffset + run.dataSize) return false;
   const uint32_t firstFlags = (flags & kFirstFlags) != 0 ? trun.u32() : defaults.flags;
   const size_t entrySize = defaults.duration ? 4 : 8;
-  if (trun.failed() || count == 0 || trun.left() != count * entrySize) return false;
+  const bool isGood = (flags & ~kFirstFlags) == (kDataOffset | kEachSize | durationFlag) &&
+                      dataOffset == run.dataOffset + run.dataSize && !trun.failed() && count > 0 &&
+                      trun.left() == count * entrySize;
+  if (!isGood) return false;
   for (uint32_t i = 0; i < count; ++i) {
     const uint32_t duration = defaults.duration ? *defaults.duration : trun.u32();
     const uint32_t size = trun.u32();
@@ -117,24 +117,23 @@ bool readRun(ByteReader trun, const FragmentDefaults& defaults, SampleRun& run) 
   return true;
 }
 
-/// One track's part of a fragment.
-std::optional<SampleRun> readRuns(std::span<const uint8_t> traf, const std::vector<MovieTrack>& tracks) {
+/// One track's part of a fragment; nothing where its data is not at `dataOffset`.
+std::optional<SampleRun> readRuns(std::span<const uint8_t> traf, uint64_t dataOffset,
+                                  const std::vector<MovieTrack>& tracks) {
   ByteReader tfhd(findBox(traf, boxType("tfhd")));
   const uint32_t flags = tfhd.u32();
   const uint32_t trackID = tfhd.u32();
-  FragmentDefaults defaults;
-  if ((flags & kDefaultDuration) != 0) defaults.duration = tfhd.u32();
-  defaults.flags = tfhd.u32();
+  const auto duration = (flags & kDefaultDuration) != 0 ? std::optional(tfhd.u32()) : std::nullopt;
+  const FragmentDefaults defaults{duration, tfhd.u32()};
   ByteReader tfdt(findBox(traf, boxType("tfdt")));
   tfdt.skip(4);
-  SampleRun run;
-  run.decodeTime = static_cast<int64_t>(tfdt.u64());
+  const auto decodeTime = static_cast<int64_t>(tfdt.u64());
   const auto track =
       std::find_if(tracks.begin(), tracks.end(), [&](const MovieTrack& t) { return t.trackID == trackID; });
   const bool isGood = track != tracks.end() && (flags & ~kDefaultDuration) == (kBaseIsMoof | kDefaultFlags) &&
-                      run.decodeTime >= 0 && run.decodeTime < kMaximumTime && !tfhd.failed() && !tfdt.failed();
+                      decodeTime >= 0 && decodeTime < kMaximumTime && !tfhd.failed() && !tfdt.failed();
   if (!isGood) return std::nullopt;
-  run.track = static_cast<size_t>(track - tracks.begin());
+  SampleRun run{static_cast<size_t>(track - tracks.begin()), decodeTime, dataOffset, 0, {}};
   while (auto box = takeBox(traf)) {
     if (box->type == boxType("trun") && !readRun(ByteReader(box->content), defaults, run)) return std::nullopt;
   }
@@ -148,8 +147,8 @@ std::optional<std::vector<SampleRun>> readFragment(std::span<const uint8_t> moof
   uint64_t expected = head.size + data.headSize;
   while (auto box = takeBox(moof)) {
     if (box->type != boxType("traf")) continue;
-    auto run = readRuns(box->content, tracks);
-    if (!run || run->dataOffset != expected) return std::nullopt;
+    auto run = readRuns(box->content, expected, tracks);
+    if (!run) return std::nullopt;
     expected += run->dataSize;
     runs.push_back(std::move(*run));
   }

@@ -7,10 +7,9 @@
 namespace qv::platform::mp4 {
 namespace {
 
-/// value * to / from, rounded to nearest.
+/// value * to / from, rounded to nearest; of a value that is not negative.
 int64_t rescale(int64_t value, uint32_t from, uint32_t to) {
-  const __int128 scaled = static_cast<__int128>(value) * to;
-  return static_cast<int64_t>((scaled + (scaled < 0 ? -int64_t{from} : int64_t{from}) / 2) / from);
+  return static_cast<int64_t>((static_cast<__int128>(value) * to + from / 2) / from);
 }
 
 }  // namespace

@@ -67,7 +67,7 @@ void TrackIndex::dropFrom(int64_t end) {
 }
 
 void TrackIndex::setEndTime(int64_t end) {
-  lastDuration_ = std::clamp<int64_t>(end - lastDecodeTime_, 1, std::numeric_limits<uint32_t>::max());
+  lastDuration_ = std::min<int64_t>(end - lastDecodeTime_, std::numeric_limits<uint32_t>::max());
 }
 
 void TrackIndex::writeTimes(ByteWriter& out) const {
