@@ -100,7 +100,6 @@ void QVMovieWriter::finishNotWriting(const FinishHandler& handler) {
     url = assetWriter_->outputURL();
   }
   if (handler) handler(url);
-  didProcessFirstSample_ = false;
 }
 
 void QVMovieWriter::finishFile(FinishHandler handler) {
@@ -114,7 +113,6 @@ void QVMovieWriter::finishFile(FinishHandler handler) {
       self->isSound_ = self->status() == AssetWriterStatus::Completed;
       if (!self->isSound_) self->noteFailure(self->assetWriter_->error());
       if (handler) handler(self->assetWriter_->outputURL());
-      self->didProcessFirstSample_ = false;
     });
   });
 }

@@ -19,11 +19,11 @@ bool QVMovieWriter::dispatchedAppendVideoSampleBuffer(const SampleBufferRef& sam
   if (status() != AssetWriterStatus::Writing || !didProcessFirstSample_) {
     return appendFirstVideoSample(sample, transform);
   }
-  if (!video_.queue.enqueue(sample)) {
+  if (video_.queue.enqueue(sample)) {
+    drainVideo();
+  } else {
     QV_LOG_ERROR(logs::kWriter, "ERROR Enqueing the Sample Video Buffer");
-    return true;
   }
-  drainVideo();
   return true;
 }
 
@@ -80,11 +80,11 @@ void QVMovieWriter::dispatchedAppendAudio2SampleBuffer(const SampleBufferRef& sa
 void QVMovieWriter::appendAudio(Track& track, int number, const SampleBufferRef& sample) {
   if (!assetWriter_ || !sample) return;
   if (status() != AssetWriterStatus::Writing || !didProcessFirstSample_ || isFinishingWriting_) return;
-  if (!track.queue.enqueue(sample)) {
+  if (track.queue.enqueue(sample)) {
+    drainAudio(track, number);
+  } else {
     QV_LOG_ERROR(logs::kWriter, "ERROR Enqueing the Sample Audio Buffer");
-    return;
   }
-  drainAudio(track, number);
 }
 
 void QVMovieWriter::drainAudio(Track& track, int number) {
@@ -93,21 +93,12 @@ void QVMovieWriter::drainAudio(Track& track, int number) {
     if (!sample) return;
     const MediaTime time = sample->presentationTime();
     if (isNotLater(time, track.lastPresentationTime.load())) {
-      if (number == 1) {
-        QV_LOG(logs::kWriter, "discarding audio 1 sample buffer due to timestamp earlier than previous");
-      } else {
-        QV_LOG(logs::kWriter, "discarding audio 2 sample buffer due to timestamp earlier than previous");
-      }
+      QV_LOG(logs::kWriter, "discarding audio %d sample buffer due to timestamp earlier than previous", number);
       return;
     }
     track.lastPresentationTime.store(time);
-    const auto value = static_cast<long long>(time.value);
-    const auto duration = static_cast<long long>(sample->duration().value);
-    if (number == 1) {
-      QV_LOG_DEBUG(logs::kWriter, "appending audio 1 sample with timestamp:%lld duration:%lld", value, duration);
-    } else {
-      QV_LOG_DEBUG(logs::kWriter, "appending audio 2 sample with timestamp:%lld duration:%lld", value, duration);
-    }
+    QV_LOG_DEBUG(logs::kWriter, "appending audio %d sample with timestamp:%lld duration:%lld", number,
+                 static_cast<long long>(time.value), static_cast<long long>(sample->duration().value));
     (void)track.input->append(sample);
   }
 }

@@ -6,7 +6,6 @@
 namespace qv {
 
 using platform::Dictionary;
-using platform::MediaTime;
 using platform::Value;
 namespace logs = platform::logs;
 namespace settings = platform::settings;
@@ -17,8 +16,7 @@ constexpr double kMaximumSide = 16384.0;
 
 /// Truncated to an integer and, when odd, one more: H.264 with 4:2:0 chroma wants even sides.
 double evenSide(double side) {
-  if (!(side >= 1.0)) return 2.0;
-  const auto whole = static_cast<int64_t>(std::min(side, kMaximumSide));
+  const auto whole = static_cast<int64_t>(std::min(std::max(1.0, side), kMaximumSide));  // what is no number is 1
   return static_cast<double>(whole + (whole & 1));
 }
 
@@ -59,10 +57,6 @@ void QVMovieWriter::dispatchedSetupAssetWriter() {
   QV_LOG(logs::kWriter, "QVMovieWriter: setupAssetWriter");
   // A recording that ended while its file was being prepared needs none any more.
   if (isFinishingWriting_) return;
-  for (Track* track : {&video_, &audio1_, &audio2_}) {
-    track->queue.reset();
-    track->lastPresentationTime.store(MediaTime::invalid());
-  }
   auto created = platform_.assetWriter->createAssetWriter(outputURL(), platform::kFileTypeMPEG4);
   if (!created) {
     noteFailure(created.error());

@@ -273,17 +273,18 @@ class FakeAssetWriterService final : public platform::AssetWriterService {
     platform::URL url;
     std::string content;
     platform::AssetWriterStatus status = platform::AssetWriterStatus::Unknown;
+    std::optional<platform::Error> error;
     std::vector<std::shared_ptr<Input>> inputs;  // video, app audio, microphone
     int starts = 0;
     std::vector<platform::MediaTime> sessionStarts;
     platform::MediaTime sessionEnd;
     std::function<void()> completion;
-    bool startFails = false;
+    bool startFails = false, finishFails = false;
   };
   struct Writer final : platform::AssetWriter {
     Writer(FakeAssetWriterService& fake, std::shared_ptr<Movie> to) : service(fake), movie(std::move(to)) {}
     platform::AssetWriterStatus status() const override { return movie->status; }
-    std::optional<platform::Error> error() const override { return std::nullopt; }
+    std::optional<platform::Error> error() const override { return movie->error; }
     const platform::URL& outputURL() const override { return movie->url; }
     void addInput(std::shared_ptr<platform::WriterInput> input) override {
       movie->inputs.push_back(std::static_pointer_cast<Input>(input));
@@ -304,7 +305,7 @@ class FakeAssetWriterService final : public platform::AssetWriterService {
     void finish() {
       // A file that was removed meanwhile does not come back.
       if (service.disk_.itemExists(movie->url.path())) service.write(*movie);
-      movie->status = platform::AssetWriterStatus::Completed;
+      movie->status = movie->finishFails ? platform::AssetWriterStatus::Failed : platform::AssetWriterStatus::Completed;
       const auto done = std::exchange(movie->completion, nullptr);
       done();
     }
@@ -358,7 +359,7 @@ class FakeExportService final : public platform::ExportService {
   };
   struct Session final : platform::ExportSession {
     void setOutputURL(const platform::URL& to) override { output = to; }
-    void setOutputFileType(const std::string&) override {}
+    void setOutputFileType(const std::string& to) override { fileType = to; }
     void setTimeRange(const platform::MediaTimeRange& to) override { range = to; }
     void setAudioMix(std::vector<platform::AudioMixInputParameters> to) override { mix = std::move(to); }
     void exportAsynchronously(std::function<void()> completion) override {
@@ -382,7 +383,7 @@ class FakeExportService final : public platform::ExportService {
     const platform::URL& outputURL() const override { return output; }
     FakeExportService* service = nullptr;
     platform::URL source, output;
-    std::string content;
+    std::string content, fileType;
     std::function<void()> whenEnded;  ///< while it is held back
     platform::MediaTimeRange range;
     std::vector<platform::AudioMixInputParameters> mix;

@@ -5,6 +5,8 @@
 
 #include "support/QuorvelErrors.h"
 #include "tests/fakes/FakeDevice.h"
+#include "tests/fakes/LogRecorder.h"
+#include "writer/QVAudioMixUtility.h"
 
 namespace qv {
 namespace {
@@ -74,12 +76,22 @@ TEST_F(MovieWriterTest, EncoderSettingsFollowSizeDeviceAndConfiguration) {
   EXPECT_EQ(bitRate(), 7000000);
   started({1280, 720}, QVBroadcastConfiguration{5, {{settings::kAverageBitRate, Value(int64_t{900000})}}});
   EXPECT_EQ(bitRate(), 900000);
-  EXPECT_EQ(valueForKey(compression(), settings::kMaxKeyFrameInterval).asInteger(), 60);
-  EXPECT_TRUE(device_.movies.appAudio().realTime);
+  platform::Data stereo(32, 0);
+  stereo[0] = 2;
+  stereo[2] = 101;
+  const Dictionary sound{{settings::kFormatID, Value(platform::kAudioFormatMPEG4AAC)},
+                         {settings::kNumberOfChannels, Value(int32_t{2})},
+                         {settings::kSampleRate, Value(44100.0)},
+                         {settings::kChannelLayout, Value(stereo)},
+                         {settings::kEncoderBitRate, Value(int32_t{128000})}};
+  EXPECT_EQ(device_.movies.appAudio().settings, sound);
+  EXPECT_EQ(device_.movies.microphone().settings, sound);
+  for (const auto& input : device_.movies.last().inputs) EXPECT_TRUE(input->realTime);
 }
 
 TEST_F(MovieWriterTest, TakesOnlyABitRateAsOverride) {
-  for (const std::string value : {"12000000", "12000000.0", "true", "1e30", "1.5", "-5", "0.0", "\"12\"", "1e19"}) {
+  for (const std::string value :
+       {"12000000", "12000000.0", "true", "1e30", "1.5", "-5", "0.0", "\"12\"", "1e19", "200000001"}) {
     device_.preferences.set(R"({"QVBitRateOverride": )" + value + "}");
     started();
     EXPECT_EQ(bitRate(), value.starts_with("12") ? 12000000 : 3000000) << value;
@@ -93,22 +105,36 @@ TEST_F(MovieWriterTest, HandsOnOnlyUsableCompressionProperties) {
   };
   started();
   const Dictionary defaults = compression();
+  EXPECT_EQ(defaults, (Dictionary{{settings::kExpectedSourceFrameRate, Value(int32_t{60})},
+                                  {settings::kProfileLevel, Value(settings::kProfileHighAutoLevel)},
+                                  {settings::kAverageBitRate, Value(int64_t{3000000})},
+                                  {settings::kMaxKeyFrameInterval, Value(int32_t{60})}}));
   const Dictionary unusable{{settings::kAverageBitRate, Value(int64_t{-1})},
                             {settings::kExpectedSourceFrameRate, Value(int32_t{0})},
                             {settings::kMaxKeyFrameInterval, Value(1e12)},
                             {settings::kProfileLevel, Value(int32_t{100})}};
   EXPECT_EQ(with(unusable), defaults);
   const Dictionary usable = with({{settings::kMaxKeyFrameInterval, Value(30.0)},
+                                  {settings::kAverageBitRate, Value(int64_t{1})},
+                                  {settings::kExpectedSourceFrameRate, Value(int64_t{240})},
                                   {settings::kProfileLevel, Value(settings::kProfileMainAutoLevel)},
                                   {"Quality", Value(0.5)}});
   EXPECT_EQ(valueForKey(usable, settings::kMaxKeyFrameInterval), Value(int64_t{30}));
+  EXPECT_EQ(valueForKey(usable, settings::kAverageBitRate), Value(int64_t{1}));
+  EXPECT_EQ(valueForKey(usable, settings::kExpectedSourceFrameRate), Value(int64_t{240}));
   EXPECT_EQ(valueForKey(usable, settings::kProfileLevel), Value(settings::kProfileMainAutoLevel));
   EXPECT_EQ(valueForKey(usable, "Quality"), Value(0.5));  // for the encoder to know
 }
 
 TEST_F(MovieWriterTest, TimelineStartsAtTheFirstFrameAndTimesRise) {
+  fakes::LogRecorder log;
   const auto writer = started();
   writer->appendAudio1SampleBuffer(audioAt(5));
+  EXPECT_TRUE(writer->appendVideoSampleBuffer(nullptr, {}));
+  const auto timeless = platform::SampleBuffer::makeVideo(fakes::makeFrame(0)->image(), {}, {});
+  EXPECT_TRUE(writer->appendVideoSampleBuffer(timeless, {0, 1, -1, 0, 0, 0}));
+  EXPECT_EQ(device_.movies.video().transform, (AffineTransform{0, 1, -1, 0, 0, 0}));
+  EXPECT_TRUE(device_.movies.last().sessionStarts.empty());
   EXPECT_TRUE(append(*writer, 100));
   EXPECT_TRUE(append(*writer, 90));  // the first frame sets no last time
   EXPECT_TRUE(append(*writer, 200));
@@ -118,10 +144,34 @@ TEST_F(MovieWriterTest, TimelineStartsAtTheFirstFrameAndTimesRise) {
   writer->appendAudio1SampleBuffer(audioAt(110));
   writer->appendAudio1SampleBuffer(audioAt(110));
   writer->appendAudio2SampleBuffer(audioAt(105));
+  writer->appendAudio2SampleBuffer(audioAt(104));
+  writer->appendAudio2SampleBuffer(nullptr);
+  platform::flushLog();
+  EXPECT_EQ(log.countContaining("discarding audio 1 sample buffer"), 1u);
+  EXPECT_EQ(log.countContaining("discarding audio 2 sample buffer"), 1u);
   EXPECT_EQ(device_.movies.video().times(), (std::vector<int64_t>{100, 90, 200, 300}));
   EXPECT_EQ(device_.movies.appAudio().times(), std::vector<int64_t>{110});
   EXPECT_EQ(device_.movies.microphone().times(), std::vector<int64_t>{105});
   EXPECT_EQ(finish(writer), std::string(fakes::kStore) + "/Game.mp4");
+  EXPECT_TRUE(append(*writer, 400));
+  writer->appendAudio1SampleBuffer(audioAt(400));
+  EXPECT_EQ(device_.movies.video().samples.size(), 4u);
+  EXPECT_EQ(device_.movies.appAudio().samples.size(), 1u);
+}
+
+TEST_F(MovieWriterTest, AFinishLetsGoOfWhatNoInputTook) {
+  const auto writer = started();
+  append(*writer, 100);
+  for (const auto& input : device_.movies.last().inputs) input->ready = false;
+  const auto picture = fakes::makeFrame(200);
+  const platform::SampleBufferRef sounds[] = {platform::SampleBuffer::silencedCopy(audioAt(200)),
+                                              platform::SampleBuffer::silencedCopy(audioAt(200))};
+  writer->appendVideoSampleBuffer(picture, {});
+  writer->appendAudio1SampleBuffer(sounds[0]);
+  writer->appendAudio2SampleBuffer(sounds[1]);
+  finish(writer);
+  for (const auto& sample : {picture, sounds[0], sounds[1]})
+    EXPECT_EQ(sample.use_count(), 2);  // the list's and its own
 }
 
 TEST_F(MovieWriterTest, WhatABusyInputCannotTakeWaitsInOrder) {
@@ -143,7 +193,8 @@ TEST_F(MovieWriterTest, ADroppedFirstSampleLeavesTheNextOneFirstAndNothingStarts
   device_.movies.video().ready = true;
   EXPECT_TRUE(append(*writer, 200));
   EXPECT_EQ(device_.movies.last().starts, 1);
-  EXPECT_EQ(device_.movies.last().sessionStarts.size(), 1u);
+  EXPECT_EQ(device_.movies.last().sessionStarts,
+            std::vector<MediaTime>{MediaTime::make(100, platform::kHostTimescale)});
   EXPECT_EQ(device_.movies.video().times(), std::vector<int64_t>{200});
   device_.movies.last().status = AssetWriterStatus::Failed;
   EXPECT_FALSE(append(*writer, 300));
@@ -153,8 +204,11 @@ TEST_F(MovieWriterTest, ADroppedFirstSampleLeavesTheNextOneFirstAndNothingStarts
 TEST_F(MovieWriterTest, FailuresAnswerWithoutAMovie) {
   device_.movies.startFails = true;
   auto writer = started();
+  device_.movies.last().error = platform::Error::posix(EIO);
   EXPECT_FALSE(append(*writer, 100));
+  device_.movies.last().error = platform::Error::posix(ENOSPC);
   EXPECT_FALSE(append(*writer, 200));
+  EXPECT_EQ(writer->failure(), platform::Error::posix(EIO)) << "the first that went wrong";
   EXPECT_EQ(device_.movies.last().starts, 1);
   EXPECT_EQ(finish(writer), "no movie");
 
@@ -200,8 +254,18 @@ TEST_F(MovieWriterTest, TellsWhetherTheMovieIsSoundAndWhatFailed) {
   writer = started();
   append(*writer, 100);
   device_.movies.last().status = AssetWriterStatus::Failed;
+  device_.movies.last().error = platform::Error::posix(EIO);
   EXPECT_EQ(finish(writer), std::string(fakes::kStore) + "/Game.mp4");
   EXPECT_FALSE(writer->isSound());
+  EXPECT_EQ(writer->failure(), platform::Error::posix(EIO));
+
+  writer = started();
+  append(*writer, 100);
+  device_.movies.last().error = platform::Error::posix(ENOSPC);
+  device_.movies.last().finishFails = true;
+  finish(writer);
+  EXPECT_FALSE(writer->isSound());
+  EXPECT_EQ(writer->failure(), platform::Error::posix(ENOSPC));
 }
 
 /// Each trim stands for itself: another one runs, and nobody holds the writer any more.
@@ -227,14 +291,17 @@ TEST_F(MovieWriterTest, TrimsAtOnceWithoutTheirWriter) {
 
 TEST_F(MovieWriterTest, TrimCutsWholeSecondsAndReportsFailure) {
   const auto writer = started();
+  fakes::LogRecorder log;
   const URL movie = URL::fileURL("/m.mp4");
   std::optional<URL> trimmed;
   const auto trim = [&](double start, double end) {
     writer->trimMovieWithURL(movie, start, end, URL::fileURL("/t.mp4"), [&](const auto& url) { trimmed = url; });
     device_.run();
   };
-  device_.disk.addFile("/m.mp4", "movie");
+  device_.disk.addFile("/m.mp4", "m");
   trim(2.4, 2.6);
+  EXPECT_EQ(device_.exports.sessions.back()->fileType, platform::kFileTypeMPEG4);
+  EXPECT_EQ(device_.exports.sessions.back()->preset, platform::ExportPreset::PassThrough);
   EXPECT_EQ(trimmed, URL::fileURL("/t.mp4"));
   EXPECT_EQ(device_.exports.sessions.back()->range.start, MediaTime::make(2, 1));
   EXPECT_EQ(device_.exports.sessions.back()->range.duration, MediaTime::make(90, 1));
@@ -243,15 +310,53 @@ TEST_F(MovieWriterTest, TrimCutsWholeSecondsAndReportsFailure) {
   trim(1, 1);
   EXPECT_EQ(trimmed, std::nullopt);
   EXPECT_FALSE(device_.disk.itemExists("/t.mp4"));
+  platform::flushLog();
+  EXPECT_EQ(log.countContaining("Export Trim Video Failed, due to error: " + std::to_string(ENODATA)), 1u);
   trimmed = movie;
   (void)device_.disk.removeItem("/m.mp4");
   trim(1, 1);
   EXPECT_EQ(trimmed, std::nullopt);
   device_.disk.addFile("/m.mp4", "movie");
-  trimmed = movie;
-  device_.exports.result = platform::ExportStatus::Failed;
-  trim(1, 1);
-  EXPECT_EQ(trimmed, std::nullopt);
+  for (const auto end : {platform::ExportStatus::Failed, platform::ExportStatus::Cancelled}) {
+    trimmed = movie;
+    device_.exports.result = end;
+    trim(1, 1);
+    EXPECT_EQ(trimmed, std::nullopt);
+  }
+}
+
+/// Whatever an export says that did not succeed: no mix, and no file of it.
+TEST_F(MovieWriterTest, MixesOrTellsWhyNot) {
+  using platform::ExportStatus;
+  const QVAudioMixUtility mixes(device_.platform, QVTemporaryMovies::create(QVTemporaryFiles(device_.platform)));
+  device_.disk.addFile("/m.mp4", "movie");
+  device_.exports.holds = true;
+  for (const auto end : {ExportStatus::Completed, ExportStatus::Failed, ExportStatus::Cancelled}) {
+    fakes::LogRecorder log;
+    std::shared_ptr<MovieClaim> mixed;
+    std::optional<platform::Error> failure;
+    mixes.mixAudioForMovie(URL::fileURL("/m.mp4"), [&](const auto& claim, const auto& error) {
+      mixed = claim;
+      failure = error;
+    });
+    device_.run();
+    auto& session = *device_.exports.sessions.back();
+    EXPECT_EQ(session.fileType, platform::kFileTypeMPEG4);
+    EXPECT_EQ(session.preset, platform::ExportPreset::HighestQuality);
+    session.result = end;
+    session.end();
+    device_.run();
+    const bool isMixed = end == ExportStatus::Completed;
+    EXPECT_EQ(mixed != nullptr, isMixed);
+    EXPECT_EQ(failure, isMixed ? std::nullopt : std::optional(recordingError(errorcode::kFailedToSave)));
+    EXPECT_EQ(device_.disk.itemExists(session.output.path()), isMixed);
+    platform::flushLog();
+    EXPECT_EQ(log.contains("QVAudioMixUtility: audio mix export failed"), end == ExportStatus::Failed);
+    EXPECT_EQ(log.contains("QVAudioMixUtility: audio mix export cancelled"), end == ExportStatus::Cancelled);
+  }
+  std::optional<platform::Error> failure;
+  mixes.mixAudioForMovie(std::nullopt, [&](const auto&, const auto& error) { failure = error; });
+  EXPECT_EQ(failure, recordingError(errorcode::kMixingFailure));
 }
 
 }  // namespace
