@@ -384,7 +384,7 @@ TEST_F(MovieWriterTest, RecordsByTheClockWhatNothingFollows) {
   MovieRecorder recorder(std::make_unique<MemoryFile>(disk), tracks(), [](const Error&) { ADD_FAILURE(); });
   for (int64_t i = 0; i < 2; ++i) {
     const auto begin = std::chrono::steady_clock::now();
-    recorder.append(0, sample(MovieRecorder::kMaximumQueuedBytes, i * 9000, 3000));
+    recorder.append(0, sample(i == 0 ? MovieRecorder::kMaximumQueuedBytes : 1, i * 9000, 3000));
     synced.acquire();
     EXPECT_GE(std::chrono::steady_clock::now() - begin, MovieRecorder::kFragmentLength);
   }
@@ -445,9 +445,9 @@ TEST_F(MovieWriterTest, TellsWhatTheDiskSays) {
 }
 
 TEST_F(MovieWriterTest, TakesByteStreamsApart) {
-  const std::vector<uint8_t> stream = {7, 0, 0, 0,    1, 0x67, 100, 0, 31, 9,    0, 0, 1, 0x67, 1, 2,    3,
-                                       0, 0, 1, 0x68, 5, 0,    0,   0, 1,  0x68, 6, 0, 0, 1,    9, 0x10, 0,
-                                       0, 0, 1, 0x65, 1, 0,    0,   3, 2,  0,    0, 1, 0, 0,    1, 0x41, 8};
+  const std::vector<uint8_t> stream = {7, 0,    0,    0, 1, 0x67, 100, 0, 31,   9, 0, 0, 1, 0x67, 1,    2, 3, 0,
+                                       0, 1,    0x68, 5, 0, 0,    0,   1, 0x68, 6, 0, 0, 1, 9,    0x10, 0, 0, 0,
+                                       1, 0x65, 1,    0, 0, 3,    2,   0, 0,    1, 0, 0, 1, 0x41, 8,    0, 0, 1};
   EXPECT_EQ(splitByteStream(stream).size(), 7u);
   EXPECT_EQ(lengthPrefixed(stream), (std::vector<uint8_t>{0, 0, 0, 6, 0x65, 1, 0, 0, 3, 2, 0, 0, 0, 2, 0x41, 8}));
   EXPECT_EQ(makeAVCConfiguration(stream), (std::vector<uint8_t>{1,  100, 0, 31, 0xFF, 0xE1, 0, 5,    0x67, 100,  0,
