@@ -4,7 +4,6 @@
 #include <cerrno>
 #include <functional>
 #include <map>
-#include <regex>
 #include <sstream>
 #include <string>
 #include <utility>
@@ -30,6 +29,14 @@ inline std::string numbers(std::span<const uint8_t> content) {
   return text.str();
 }
 
+/// A word a line, so that a difference is easily seen.
+inline std::string words(const std::string& text) {
+  std::string lines;
+  std::istringstream in(text);
+  for (std::string word; in >> word;) lines += word + '\n';
+  return lines;
+}
+
 /// The boxes in `bytes`, by ISO/IEC 14496-12: of each its name, its numbers, and the boxes in it between braces.
 inline std::string layoutOf(std::span<const uint8_t> bytes) {
   static const std::map<std::string, size_t> kBoxesAfter = {
@@ -43,11 +50,8 @@ inline std::string layoutOf(std::span<const uint8_t> bytes) {
     text += name + '\n' + numbers(box->content.first(own));
     if (parent != kBoxesAfter.end()) text += "{\n" + layoutOf(box->content.subspan(own)) + "}\n";
   }
-  return text + numbers(bytes);
+  return words(text + numbers(bytes));
 }
-
-/// A word a line, so that a difference is easily seen.
-inline std::string words(const std::string& text) { return std::regex_replace(text, std::regex("\\s+"), "\n"); }
 
 /// A disk in memory, which tells what it was asked for.
 ///
