@@ -22,7 +22,7 @@ void QVBroadcastBook::setupBroadcast(SetupRequest request, SetupHandler handler)
     handler(recordingError(errorcode::kInvalidBroadcastSession));
     return;
   }
-  const std::string base = QVBundleTexts::baseIdentifier(request.extensionBundleID).value_or("");
+  const std::string base = QVBundleTexts::baseIdentifier(request.extensionBundleID);
   if (base.empty()) {
     QV_LOG_ERROR(logs::kDaemon, "\"%s\" names no broadcast extension", request.extensionBundleID.c_str());
     handler(recordingError(errorcode::kInvalidBroadcastSession));

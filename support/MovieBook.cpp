@@ -96,7 +96,7 @@ MovieBook::Discard MovieBook::beginDiscard(const std::string& bundleID, Continua
   }
   if (movie->second.hands != Hands::Handed) return {};
   movie->second.hands = Hands::Removed;
-  return {movie->first, false};
+  return {movie->first};
 }
 
 void MovieBook::beginRemoval(const std::string& path) {

@@ -20,8 +20,6 @@ constexpr const char kTableType[] = "strings";
 constexpr const char kDevelopmentRegionKey[] = "CFBundleDevelopmentRegion";
 constexpr const char kDefaultLocalization[] = "en";
 constexpr const char kIconSuffix[] = ".png";
-/// A longer executable path is none.
-constexpr size_t kMaximumPathLength = 4096;
 
 std::optional<std::string> text(const platform::Dictionary& dictionary, std::string_view key) {
   const Value* value = platform::find(dictionary, key);
@@ -111,14 +109,12 @@ platform::Data QVBundleTexts::_qvAppIconFromBundleID(const std::string& bundleID
 BundleRef QVBundleTexts::bundleWithPID(pid_t pid) const {
   platform::BundleService& bundles = *platform_.bundles;
   const auto path = bundles.executablePathOfProcess(pid);
-  if (!path || path->empty() || path->size() > kMaximumPathLength) return nullptr;
-  return bundles.bundleEnclosingExecutable(*path);
+  return path ? bundles.bundleEnclosingExecutable(*path) : nullptr;
 }
 
-std::optional<std::string> QVBundleTexts::baseIdentifier(const std::optional<std::string>& identifier) {
-  if (!identifier) return std::nullopt;
-  const size_t dot = identifier->rfind('.');
-  return dot == std::string::npos ? std::string() : identifier->substr(0, dot);
+std::string QVBundleTexts::baseIdentifier(const std::string& identifier) {
+  const size_t dot = identifier.rfind('.');
+  return dot == std::string::npos ? std::string() : identifier.substr(0, dot);
 }
 
 }  // namespace qv

@@ -49,7 +49,7 @@ class QVBundleTexts {
   [[nodiscard]] platform::BundleRef bundleWithPID(pid_t pid) const;
 
   /// The identifier without its last dot-separated component: A.B for A.B.C, the empty string for A.
-  [[nodiscard]] static std::optional<std::string> baseIdentifier(const std::optional<std::string>& identifier);
+  [[nodiscard]] static std::string baseIdentifier(const std::string& identifier);
 
  private:
   [[nodiscard]] std::string stringInTable(const platform::Bundle& bundle, const std::string& localization,

@@ -64,28 +64,33 @@ class Parser {
   bool parseEntry() {
     std::string key;
     std::string text;
-    if (!skipBlanks() || rest_.empty()) return false;
-    if (!parseQuoted(key) || !expect('=') || !skipBlanks() || !parseQuoted(text) || !expect(';')) return false;
+    skipBlanks();
+    if (rest_.empty() || !parseQuoted(key) || !expect('=')) return false;
+    skipBlanks();
+    if (!parseQuoted(text) || !expect(';')) return false;
     table_.texts.insert_or_assign(std::move(key), std::move(text));
     return true;
   }
 
   bool expect(char c) {
-    if (!skipBlanks()) return false;
+    skipBlanks();
     if (!rest_.starts_with(c)) return fail(std::string("'") + c + "' expected");
     rest_.remove_prefix(1);
     return true;
   }
 
-  /// Skips white space and comments.
-  bool skipBlanks() {
+  /// Skips white space and comments. One without end is a fault, and stays in front, where nothing else can be.
+  void skipBlanks() {
     for (;;) {
       const size_t solid = rest_.find_first_not_of(" \t\r\n");
       rest_.remove_prefix(std::min(solid, rest_.size()));
       const bool line = rest_.starts_with("//");
-      if (!line && !rest_.starts_with("/*")) return true;
+      if (!line && !rest_.starts_with("/*")) return;
       const size_t end = line ? rest_.find('\n') : rest_.find("*/", 2);
-      if (end == std::string_view::npos && !line) return fail("comment without end");
+      if (end == std::string_view::npos && !line) {
+        fail("comment without end");
+        return;
+      }
       rest_.remove_prefix(end == std::string_view::npos ? rest_.size() : end + (line ? 1 : 2));
     }
   }

@@ -48,8 +48,10 @@ TEST_F(ExtensionsTest, TheFallbackDropsScriptAndRegion) {
   EXPECT_EQ(texts_.fallbackBundle()->path(), disk_.at(lproj("zh")));
   preferences_.setLanguages(R"(["pt-BR", "zh"])");
   EXPECT_EQ(texts_.fallbackBundle()->path(), disk_.at(lproj("pt")));
-  preferences_.setLanguages(R"(["fr", "zh"])");
-  EXPECT_EQ(texts_.fallbackBundle(), nullptr);
+  for (const char* others : {R"(["fr", "zh"])", "[]"}) {
+    preferences_.setLanguages(others);
+    EXPECT_EQ(texts_.fallbackBundle(), nullptr) << others;
+  }
 }
 
 TEST_F(ExtensionsTest, ABrokenTableIsLoggedAndUsedUpToItsFault) {

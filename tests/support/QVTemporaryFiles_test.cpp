@@ -1,6 +1,7 @@
 #include "support/QVTemporaryFiles.h"
 
 #include <cerrno>
+#include <cmath>
 #include <vector>
 
 #include "support/QVDiskSpace.h"
@@ -40,6 +41,7 @@ TEST_F(TemporaryFilesTest, SetupMakesTheDirectoryOnceAndSurvivesFailure) {
   platform_.deviceRoot = "/without/parents";
   files_._srSetupTempDirectory();
   EXPECT_TRUE(log_.contains("error creating temp directory"));
+  EXPECT_EQ(log_.countContaining("error: "), 1u) << "and why, on the console";
 }
 
 TEST_F(TemporaryFilesTest, OnlyWhatIsKnownToBeOlderAgesOut) {
@@ -51,6 +53,12 @@ TEST_F(TemporaryFilesTest, OnlyWhatIsKnownToBeOlderAgesOut) {
   EXPECT_EQ(files_._srDeleteFilesOlderThanTimeToLiveInSeconds(86400.0), 100);
   EXPECT_EQ(disk_.contentsOfDirectory(kStore).value(),
             (std::vector<std::string>{"limit.mp4", "new.mp4", "unknown.mp4"}));
+  EXPECT_EQ(log_.countContaining("_srDeleteFilesOlderThanTimeToLiveInSeconds, error code: 5"), 1u);
+  EXPECT_EQ(files_._srDeleteFilesOlderThanTimeToLiveInSeconds(std::nan("")), 0);
+  EXPECT_EQ(files_._srDeleteFilesOlderThanTimeToLiveInSeconds(1e300), 0);
+  for (const char* seconds : {"86400", "0", "2147483647"}) {
+    EXPECT_TRUE(log_.contains(std::string("_srDeleteFilesOlderThanTimeToLiveInSeconds: ") + seconds)) << seconds;
+  }
 }
 
 TEST_F(TemporaryFilesTest, DeletingAllCountsOnlyWhatWasRemoved) {
@@ -63,16 +71,50 @@ TEST_F(TemporaryFilesTest, DeletingAllCountsOnlyWhatWasRemoved) {
   disk_.failOn(Operation::Attributes, path("nameless.mp4"), EIO);
   EXPECT_EQ(files_._srDeleteAllTempFiles(), 7 + folder);
   EXPECT_EQ(disk_.contentsOfDirectory(kStore).value(), std::vector<std::string>{"stuck.mp4"});
+  EXPECT_EQ(log_.countContaining("_srDeleteFilesOlderThanTimeToLiveInSeconds, error code: "), 2u);
 }
 
 TEST_F(TemporaryFilesTest, AMissingDirectoryHoldsNothing) {
   EXPECT_EQ(files_._srDeleteAllTempFiles(), 0);
+  EXPECT_EQ(log_.countContaining("_srDeleteFilesOlderThanTimeToLiveInSeconds, error code: 2"), 1u);
+  files_._srDeleteFilesWithPrefix("clip");
+  global_.runUntilIdle();
+  EXPECT_TRUE(log_.contains("_qvDeleteFilesWithPrefix error: 2"));
+  EXPECT_EQ(files_._srGetCreationDateForFile(URL::fileURL(path("none.mp4"))), std::nullopt);
+  EXPECT_EQ(files_._srSizeOfTempDir(nullptr), 0);
   std::optional<Error> error;
   EXPECT_EQ(files_._srSizeOfTempDir(&error), 0);
   ASSERT_TRUE(error);
   EXPECT_EQ(error->code, ENOENT);
   EXPECT_EQ(QVDiskSpace(files_)._srDeviceFreeDiskSpace(), 0u);
   EXPECT_FALSE(QVDiskSpace(files_)._srDeviceHasSufficientFreeSpaceForRecording());
+  EXPECT_TRUE(QVDiskSpace(files_)._srDeviceHasSufficientFreeSpaceToContinueRecording()) << "nothing is known";
+
+  disk_.addDirectory(kStore);
+  error.reset();
+  EXPECT_EQ(files_._srSizeOfTempDir(&error), static_cast<int64_t>(disk_.attributesOfItem(kStore).value().size));
+  EXPECT_EQ(error, std::nullopt);
+}
+
+TEST_F(TemporaryFilesTest, ARecordingBeginsAboveItsBoundAndGoesOnDownToAnother) {
+  disk_.addDirectory(kStore);
+  const QVDiskSpace space(files_);
+  disk_.setFreeSize(100'000'001);
+  EXPECT_TRUE(space._srDeviceHasSufficientFreeSpaceForRecording());
+  disk_.setFreeSize(100'000'000);
+  EXPECT_FALSE(space._srDeviceHasSufficientFreeSpaceForRecording());
+  disk_.setFreeSize(50'000'000);
+  EXPECT_TRUE(space._srDeviceHasSufficientFreeSpaceToContinueRecording());
+  disk_.setFreeSize(49'999'999);
+  EXPECT_FALSE(space._srDeviceHasSufficientFreeSpaceToContinueRecording());
+}
+
+TEST_F(TemporaryFilesTest, AMovieIsAFileThatHoldsSomething) {
+  addFile("one.mp4", 1);
+  addFile("empty.mp4", 0);
+  disk_.addDirectory(path("folder.mp4"));
+  EXPECT_TRUE(files_.isMovieAt(path("one.mp4")));
+  for (const char* name : {"empty.mp4", "folder.mp4", "none.mp4"}) EXPECT_FALSE(files_.isMovieAt(path(name))) << name;
 }
 
 TEST_F(TemporaryFilesTest, RemovingAFileWorksInTheBackgroundAndToleratesAMissingOne) {

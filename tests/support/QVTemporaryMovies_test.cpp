@@ -93,6 +93,11 @@ TEST_F(TemporaryMoviesTest, CopiesLeaveAloneWhatIsNotTheirs) {
   save->succeeded(nullptr);
   background_.runUntilIdle();
   EXPECT_EQ(nameOf(movies_->claimTrimmed(files_.pathInStore("Chess_trimmed.mp4"), kChess)), "Chess_trimmed.mp4");
+
+  addFile("stuck.mp4");
+  disk_.failOn(Operation::Remove, files_.pathInStore("stuck.mp4"), EBUSY);
+  movies_->deleteAllTempFiles();
+  EXPECT_EQ(nameOf(movies_->claimTrimmed(files_.pathInStore("stuck.mp4"), kChess)), "stuck.mp4") << "it is nobody's";
 }
 
 TEST_F(TemporaryMoviesTest, OnlyItsApplicationSavesAMovieAndOnlyOnceAtATime) {
@@ -108,6 +113,7 @@ TEST_F(TemporaryMoviesTest, OnlyItsApplicationSavesAMovieAndOnlyOnceAtATime) {
   ASSERT_TRUE(save) << "a save that came to nothing can be tried again";
   save->succeeded(recordError());
   save->succeeded(recordError());
+  save->succeeded(nullptr);
   background_.runUntilIdle();
   EXPECT_EQ(errors_, (std::vector<int64_t>{0, ENOENT})) << "the right is used up";
   EXPECT_FALSE(exists("Chess.mp4"));
@@ -152,6 +158,31 @@ TEST_F(TemporaryMoviesTest, ARecordingWaitsForASaveThatFailsAndForARemoval) {
   background_.runUntilIdle();
   EXPECT_EQ(errors_, (std::vector<int64_t>{0, ENOENT, 0})) << "a claim ends once";
   EXPECT_EQ(waitedNames(), (Names{"Chess 2.mp4", "Chess.mp4"}));
+  record("Draft.mp4")->remove(nullptr);
+  wait("Draft.mp4");
+  EXPECT_EQ(waited_.size(), 2u) << "it is being removed by whoever made it";
+  background_.runUntilIdle();
+  EXPECT_EQ(nameOf(waited_.back()), "Draft.mp4");
+}
+
+TEST_F(TemporaryMoviesTest, AMovieThatIsStoredFirstIsHandedWhereThatFails) {
+  const Claim claim = record("Screen.mp4");
+  EXPECT_FALSE(claim->saveFor(kChess)) << "there is no file";
+  addFile("Screen.mp4");
+  auto save = claim->saveFor(kChess);
+  ASSERT_TRUE(save) << "the claim went on";
+  EXPECT_FALSE(claim->saveFor(kChess));
+  claim->handTo(kOther);
+  EXPECT_EQ(movies_->deleteAllTempFiles(), 0);
+  wait("Screen.mp4");
+  EXPECT_EQ(waitedNames(), Names{});
+  save = nullptr;
+  EXPECT_EQ(waitedNames(), Names{"Screen 2.mp4"});
+  EXPECT_TRUE(movies_->isHandedTo(kChess, url("Screen.mp4")));
+  movies_->discardLast(kChess, nullptr);
+  movies_->discardLast(kChess, nullptr);
+  background_.runUntilIdle();
+  EXPECT_FALSE(exists("Screen.mp4"));
 }
 
 TEST_F(TemporaryMoviesTest, WhoeverWaitsIsDroppedWithTheStore) {
@@ -182,6 +213,20 @@ TEST_F(TemporaryMoviesTest, DiscardTakesTheLastHandedMovieOfItsCallerAlone) {
   EXPECT_TRUE(exists("Chess.mp4")) << "an earlier movie is not the last one";
   EXPECT_TRUE(movies_->isHandedTo(kOther, url("Other.mp4")));
   EXPECT_EQ(errors_, (std::vector<int64_t>{0, 0, 0}));
+
+  // Nor is one that another application has at its path by now, or that is being made there anew.
+  movies_->deleteAllTempFiles();
+  hand("Chess_trimmed.mp4");
+  movies_->deleteAllTempFiles();
+  hand("Chess_trimmed.mp4", kOther);
+  movies_->discardLast(kChess, nullptr);
+  background_.runUntilIdle();
+  EXPECT_TRUE(movies_->isHandedTo(kOther, url("Chess_trimmed.mp4")));
+  hand("Chess.mp4");
+  const Claim made = record("Chess.mp4");
+  movies_->discardLast(kChess, nullptr);
+  background_.runUntilIdle();
+  EXPECT_TRUE(made->hasFile());
 }
 
 TEST_F(TemporaryMoviesTest, PurgesLeaveAloneWhatIsMadeOrSaved) {

@@ -1,6 +1,7 @@
 #include "support/QVUnfinishedMovies.h"
 
 #include <cerrno>
+#include <cstring>
 
 #include "tests/fakes/FakeMovieSalvage.h"
 #include "tests/support/SupportTest.h"
@@ -21,41 +22,65 @@ class UnfinishedMoviesTest : public SupportTest {
         {"Chess.mp4", MovieState::Unfinished}, {"Done.mp4", MovieState::Finished}, {"Live.mp4", MovieState::InUse}};
   }
   void add(const std::string& name) { disk_.addFile(kStore + name, name, {fakes::FakeClock::kStart}); }
+  void salvage() { QVUnfinishedMovies(files_, *platform_.movieSalvage, localization_)._srSalvageUnfinishedMovies(); }
+  /// Under which a movie of this name is kept, without the extension.
+  std::string stemOf(const std::string& name) {
+    return name + "_recovered_" + localization_.formatDate({fakes::FakeClock::kStart}, "MM-dd-yyyy HH-mm-ss");
+  }
   std::vector<std::string> names() { return disk_.contentsOfDirectory(kStore).value(); }
 
   fakes::FakeMovieSalvage salvage_;
 };
 
 TEST_F(UnfinishedMoviesTest, AreFinishedUnderANameThatNoRecordingTakes) {
-  QVUnfinishedMovies(files_, *platform_.movieSalvage, localization_)._srSalvageUnfinishedMovies();
-  ASSERT_EQ(salvage_.salvaged.size(), 1u);
-  const std::string kept = salvage_.salvaged.front();
-  EXPECT_TRUE(kept.starts_with("Chess_recovered_") && kept.ends_with(".mp4")) << kept;
-  EXPECT_EQ(kept.find(':'), std::string::npos);
+  salvage();
+  const std::string kept = stemOf("Chess") + ".mp4";
+  EXPECT_EQ(salvage_.salvaged, std::vector<std::string>{kept});
+  EXPECT_EQ(log_.countContaining("is no movie that can be finished"), 1u) << "text.mp4";
   EXPECT_EQ(names(), (std::vector<std::string>{"Chess.mp4.7-1.partial", kept, "Done.mp4", "Live.mp4", "text.mp4"}));
 
   // The same application crashed at the same moment of a clock that had begun anew.
   add("Chess.mp4");
-  QVUnfinishedMovies(files_, *platform_.movieSalvage, localization_)._srSalvageUnfinishedMovies();
-  ASSERT_EQ(salvage_.salvaged.size(), 2u);
-  EXPECT_NE(salvage_.salvaged.back(), kept);
+  salvage();
+  EXPECT_EQ(salvage_.salvaged, (std::vector<std::string>{kept, stemOf("Chess") + " 2.mp4"}));
 
   // One that a full disk kept from being finished is tried again, under the name that it has.
   salvage_.states[kept] = MovieState::Unfinished;
   salvage_.length = platform::Error::posix(ENOSPC, "disk");
   const auto before = names();
-  QVUnfinishedMovies(files_, *platform_.movieSalvage, localization_)._srSalvageUnfinishedMovies();
+  salvage();
   EXPECT_EQ(salvage_.salvaged.back(), kept);
   EXPECT_EQ(names(), before);
 
   salvage_.length = platform::MediaTime::zero();
-  QVUnfinishedMovies(files_, *platform_.movieSalvage, localization_)._srSalvageUnfinishedMovies();
+  salvage();
   EXPECT_FALSE(disk_.itemExists(kStore + kept));
+}
+
+TEST_F(UnfinishedMoviesTest, StayAsTheyAreWhereNoNameCanBeHad) {
+  const std::string longName(240, 'x');
+  add(longName + ".mp4");
+  salvage_.states[longName + ".mp4"] = MovieState::Unfinished;
+  disk_.failOn(fakes::ScratchDisk::Operation::Attributes, std::string(kStore) + "Chess.mp4", EIO);
+  auto before = names();
+  salvage();
+  EXPECT_EQ(names(), before);
+  EXPECT_EQ(log_.countContaining(std::strerror(ENAMETOOLONG)), 1u);
+  EXPECT_EQ(log_.countContaining(std::strerror(EIO)), 1u);
+
+  disk_.failOn(fakes::ScratchDisk::Operation::Attributes, std::string(kStore) + "Chess.mp4", 0);
+  add(stemOf("Chess") + ".mp4");
+  for (int number = 2; number < 100; ++number) add(stemOf("Chess") + " " + std::to_string(number) + ".mp4");
+  salvage();
+  add("Chess.mp4");
+  salvage();
+  EXPECT_EQ(salvage_.salvaged, std::vector<std::string>{stemOf("Chess") + " 100.mp4"});
+  EXPECT_TRUE(disk_.itemExists(std::string(kStore) + "Chess.mp4"));
 }
 
 TEST_F(UnfinishedMoviesTest, AStoreThatCannotBeReadCostsALogLine) {
   disk_.failOn(fakes::ScratchDisk::Operation::List, kStore, EIO);
-  QVUnfinishedMovies(files_, *platform_.movieSalvage, localization_)._srSalvageUnfinishedMovies();
+  salvage();
   EXPECT_EQ(log_.lines().size(), 1u);
   EXPECT_TRUE(salvage_.salvaged.empty());
 }
