@@ -9,14 +9,12 @@ constexpr int64_t kOverApplicationsLevel = 2;
 }
 
 DisplayLayoutRule::~DisplayLayoutRule() {
-  if (!layoutMonitor_) return;
-  layoutMonitor_->removeObserver(this);
-  layoutMonitor_->invalidate();
+  if (layoutMonitor_) layoutMonitor_->invalidate();
 }
 
 void DisplayLayoutRule::observe() {
   if (!layoutMonitor_) return;
-  previousElementCount_ = 0;
+  wasShared_ = false;
   layoutMonitor_->addObserver(weak_from_this());
 }
 
@@ -31,18 +29,11 @@ void DisplayLayoutRule::layoutMonitorDidUpdateDisplayLayout(platform::DisplayLay
 
 void DisplayLayoutRule::applyDisplayLayout(const platform::DisplayLayout& layout) {
   const auto& elements = layout.elements;
-  const auto isOrdinary = [](const platform::DisplayLayoutElement& element) {
-    return element.level < kOverApplicationsLevel;
-  };
-  int64_t count = 0;
-  bool mustStop = false;
-  if (elements.size() == 1) {
-    mustStop = previousElementCount_ > 1;
-  } else {
-    count = std::count_if(elements.begin(), elements.end(), isOrdinary);
-    mustStop = count == static_cast<int64_t>(elements.size());
-  }
-  previousElementCount_ = count;
+  const auto ordinary = std::ranges::count_if(
+      elements, [](const platform::DisplayLayoutElement& element) { return element.level < kOverApplicationsLevel; });
+  const bool isAlone = elements.size() == 1;
+  const bool mustStop = isAlone ? wasShared_ : ordinary == static_cast<int64_t>(elements.size());
+  wasShared_ = !isAlone && ordinary > 1;
   if (mustStop) stop_();
 }
 

@@ -58,12 +58,7 @@ void ForegroundFollower::follow(const std::shared_ptr<QVRecording>& recording) {
 
 void ForegroundFollower::clearSystemRecordingUI(const QVRecording& recording) {
   QV_LOG(logs::kDaemon, "stop monitoring foreground apps");
-  if (followed_.lock().get() == &recording) stopFollowing();
-}
-
-void ForegroundFollower::stopFollowing() {
-  followed_.reset();
-  applicationStateMonitor_->setHandler(nullptr);
+  if (followed_.lock().get() == &recording) applicationStateMonitor_->setHandler(nullptr);
 }
 
 /// The front may have changed between the question at the start and the follower's first look.

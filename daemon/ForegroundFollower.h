@@ -24,8 +24,6 @@ class ForegroundFollower : public std::enable_shared_from_this<ForegroundFollowe
   void follow(const std::shared_ptr<QVRecording>& recording);
   /// Nothing happens where another recording is followed: a late end must not take away the next one's follower.
   void clearSystemRecordingUI(const QVRecording& recording);
-  /// Whoever is followed.
-  void stopFollowing();
 
  private:
   void lookAtForeground();
@@ -34,7 +32,7 @@ class ForegroundFollower : public std::enable_shared_from_this<ForegroundFollowe
   platform::ApplicationService& applications_;
   platform::SerialQueue& sequence_;
   const std::unique_ptr<platform::ApplicationStateMonitor> applicationStateMonitor_;
-  /// The monitor has a handler while this was set.
+  /// Perhaps one that has ended, which takes no process any more.
   std::weak_ptr<QVRecording> followed_;
 };
 

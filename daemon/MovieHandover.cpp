@@ -81,7 +81,7 @@ void MovieHandover::saveInterrupted(const std::shared_ptr<MovieClaim>& movie, co
                                     KeptHandler handler) {
   const KeptHandler logged = [handler = std::move(handler)](const auto& kept, const auto& error) {
     if (error) QV_LOG_ERROR(logs::kDaemon, "error saving file with code: %i", static_cast<int>(error->code));
-    if (handler) handler(kept, error);
+    handler(kept, error);
   };
   if (auto save = movie ? movie->saveFor(bundleID) : nullptr) {
     mixAndStore(std::make_shared<Storing>(Storing{kSave, std::move(save), logged, nullptr}));

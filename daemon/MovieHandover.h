@@ -34,8 +34,7 @@ class MovieHandover : public std::enable_shared_from_this<MovieHandover> {
   void saveVideoToCameraRoll(const std::string& bundleID, const platform::URL& movie, Handler handler);
   /// Stores the movie, as it is, of a system recording that another start ended.
   void storeSystemRecording(const std::shared_ptr<MovieClaim>& movie, const std::string& bundleID, KeptHandler handler);
-  /// Stores the movie, with its sound mixed, of a system recording that the device's sleep ended. `handler` may be
-  /// empty.
+  /// Stores the movie, with its sound mixed, of a system recording that the device's sleep ended.
   void saveInterrupted(const std::shared_ptr<MovieClaim>& movie, const std::string& bundleID, KeptHandler handler);
   /// Removes the movie that was handed to this application last, if it still waits. The handler is called when it is
   /// gone.

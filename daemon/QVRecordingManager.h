@@ -79,8 +79,7 @@ class QVRecordingManager final : public platform::IPCListenerDelegate,
   void registerPurgeableSpace();
 
   // --- Admission.
-  void applicationDisconnectedWithBundleID(const std::optional<std::string>& bundleID,
-                                           const std::shared_ptr<platform::IPCConnection>& connection);
+  void applicationDisconnectedWithBundleID(const std::optional<std::string>& bundleID);
   void connectionEnded(const std::weak_ptr<platform::IPCConnection>& connection, const char* line);
   void adoptConnection(const Session& session, const std::string& bundleID,
                        const std::shared_ptr<platform::IPCConnection>& connection);

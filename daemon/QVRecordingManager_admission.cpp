@@ -41,10 +41,8 @@ void QVRecordingManager::adoptConnection(const Session& session, const std::stri
                                          const std::shared_ptr<IPCConnection>& connection) {
   if (const auto proxy = session->clientProxy()) {
     if (const auto former = proxy->connection()) {
-      former->setInvalidationHandler(nullptr);
-      former->setInterruptionHandler(nullptr);
-      former->invalidate();
       connections_.erase(former);
+      former->invalidate();
     }
     proxy->setConnection(nullptr);
     // Nobody is left to be told how the former connection's start ended.
@@ -60,20 +58,16 @@ void QVRecordingManager::connectionEnded(const std::weak_ptr<IPCConnection>& wea
   if (known == connections_.end()) return;
   const std::optional<std::string> bundleID = known->second;
   connections_.erase(known);
-  applicationDisconnectedWithBundleID(bundleID, connection);
+  applicationDisconnectedWithBundleID(bundleID);
 }
 
-void QVRecordingManager::applicationDisconnectedWithBundleID(const std::optional<std::string>& bundleID,
-                                                             const std::shared_ptr<IPCConnection>& connection) {
+void QVRecordingManager::applicationDisconnectedWithBundleID(const std::optional<std::string>& bundleID) {
   QV_LOG(logs::kDaemon, "QVRecordingManager: applicationDisconnected");
-  if (!bundleID) return;
   const Session session = sessions_->find(bundleID);
   if (!session) return;
-  const auto proxy = session->clientProxy();
-  if (proxy && proxy->connection() != connection) return;
   starts_.cancelPendingStart(*bundleID);
   if (session->isSystemRecording() && session->isRecording()) {
-    if (proxy) proxy->setConnection(nullptr);
+    session->clientProxy()->setConnection(nullptr);
     return;
   }
   stopRecordingSession(session, [](QVRecording& recording) {

@@ -65,7 +65,6 @@ void QVRecordingManager::recordingStarted(const Session& session) {
   if (session->isSystemRecording()) {
     foreground_->follow(session->recording());
   } else {
-    foreground_->stopFollowing();
     layoutRule_->observe();
   }
 }

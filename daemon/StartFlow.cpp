@@ -91,8 +91,7 @@ void StartFlow::showAcknowledgementAlertForSession() {
 }
 
 void StartFlow::continueAfterAcknowledgement(const AcknowledgementAnswer& answer) {
-  if (!answer_ || recording_) return;
-  alert_.reset();
+  if (!answer_) return;
   if (!answer.allowed) {
     QV_LOG(logs::kDaemon, "user declined");
     refuse(recordingError(errorcode::kUserDeclined));
@@ -177,7 +176,6 @@ void StartFlow::recordingStarted() {
 
 void StartFlow::refuse(const Error& error) {
   const auto self = shared_from_this();
-  alert_.reset();
   if (answer_) std::exchange(answer_, std::nullopt)->refused(error);
   over_();
 }

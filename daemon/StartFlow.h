@@ -73,6 +73,7 @@ class StartFlow : public std::enable_shared_from_this<StartFlow> {
   std::optional<StartAnswer> answer_;
   /// As the device can and the user allows.
   RecordedInputs inputs_;
+  /// Goes with this; what its answer says after that reaches nobody.
   std::unique_ptr<platform::UserAlert> alert_;
   std::shared_ptr<QVRecording> recording_;
 };

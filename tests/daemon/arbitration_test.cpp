@@ -60,9 +60,28 @@ TEST_F(ArbitrationTest, AClientThatDiesBeforeTheAnswerToItsStartEndsARecordingUn
   EXPECT_TRUE(systemUI().isRecording());
   auto killed = game();
   startUntilItRecords(killed, false);
-  auto relaunched = game();
-  EXPECT_FALSE(relaunched.isRecording());
-  EXPECT_EQ(openTransactions(), 0);
+  TestClient relaunched(device_, "com.example.game", 100, {}, false);
+  const auto started = relaunched.postStart({});
+  device_.run();
+  ASSERT_TRUE(*started);
+  EXPECT_EQ((*started)->code(), 0) << "the former start is over at once";
+  EXPECT_EQ(openTransactions(), 1);
+}
+
+TEST_F(ArbitrationTest, AStopWhoseClientIsReplacedMeanwhileTellsTheNextOne) {
+  int told = 0;
+  for (int pieces = 0; pieces < kPieces; ++pieces) {
+    auto system = systemUI();
+    system.postStart({.system = true});
+    system.post("stopRecordingWithHandler");
+    runWork(pieces);
+    auto next = systemUI();
+    for (const int64_t code : next.takeEnds()) told += code == errorcode::kInterrupted ? 1 : 0;
+    if (next.isRecording()) next.stop();
+    EXPECT_TRUE(areSourcesOff()) << pieces;
+    EXPECT_EQ(openTransactions(), 0) << pieces;
+  }
+  EXPECT_GT(told, 0);
 }
 
 TEST_F(ArbitrationTest, ASystemRecordingFollowsTheFront) {
@@ -74,6 +93,9 @@ TEST_F(ArbitrationTest, ASystemRecordingFollowsTheFront) {
   EXPECT_EQ(device_.tap.tap->process, 100);
   EXPECT_EQ(device_.movies.video().settings.at(platform::settings::kVideoWidth).asDouble(), 1080)
       << "never wider than tall";
+  system.request("pauseRecording");
+  system.request("resumeRecordingWithWindowLayerContextID", {Value(uint32_t{77})});
+  EXPECT_TRUE(device_.screen.last().running) << "neither is for a system recording";
   device_.applications.report(platform::kApplicationForeground, 200, true);
   device_.run();
   EXPECT_EQ(device_.tap.tap->process, 200);
@@ -84,9 +106,36 @@ TEST_F(ArbitrationTest, ASystemRecordingFollowsTheFront) {
   device_.run();
   EXPECT_FALSE(device_.tap.tap->running);
   sendFrame(kSecond);
+  const auto late = device_.applications.handler;
   system.stop();
   EXPECT_EQ(device_.sounds.played, (std::vector<uint32_t>{1117, 1118}));
   EXPECT_FALSE(device_.applications.handler);
+  // Reports that were on their way find nobody.
+  device_.applications.handler = late;
+  for (int gone = 0; gone < 3; ++gone) {
+    device_.applications.report(platform::kApplicationForeground, 100, true);
+    device_.run();
+    EXPECT_TRUE(areSourcesOff()) << gone;
+    if (gone == 0) system.disconnect();
+    if (gone == 1) manager_.reset();
+  }
+}
+
+TEST_F(ArbitrationTest, TheFollowerSeesAnApplicationComeOrGoDuringTheStart) {
+  install("First", "com.example.first", 1);
+  auto system = systemUI();
+  for (const bool comes : {true, false}) {
+    const size_t former = device_.movies.movies.size();
+    if (!comes) device_.applications.frontmost = "com.example.first";
+    system.postStart({.system = true});
+    while (device_.movies.movies.size() == former) ASSERT_TRUE(device_.executor.runOne());
+    device_.applications.frontmost = comes ? std::optional("com.example.first") : std::nullopt;
+    device_.run();
+    ASSERT_TRUE(device_.tap.tap);
+    EXPECT_EQ(device_.tap.tap->running, comes);
+    EXPECT_EQ(device_.tap.tap->process, 1);
+    system.stop();
+  }
 }
 
 TEST_F(ArbitrationTest, TheFollowerSeesASwitchDuringTheStartAndOutlivesTheFormerRecordingsEnd) {

@@ -26,6 +26,9 @@ TEST_F(BroadcastJointsTest, ASetUpServesOneBroadcastAlsoOverAReconnectionOfItsHo
   client.disconnect();
   auto again = game();
   EXPECT_EQ(again.start({.broadcast = true})->code(), 0);
+  EXPECT_EQ(setUp(again), 0) << "for the next one";
+  again.stop();
+  EXPECT_EQ(again.start({.broadcast = true})->code(), 0);
   again.stop();
   EXPECT_EQ(again.start({.broadcast = true})->code(), errorcode::kInvalidBroadcastSession);
   EXPECT_EQ(openTransactions(), 0);

@@ -87,6 +87,16 @@ TEST_F(BroadcastTest, SetUpFindsTheExtensionAndShowsItsImages) {
                                          {"extBundleID", Value("com.example.chat.upload")},
                                          {"extAppImgData", Value(icon)}}));
   EXPECT_EQ(list.at(1), Value(Dictionary{{"extBundleID", Value("com.example.plain")}}));
+
+  EXPECT_EQ(startBroadcast(), 0);
+  client_.stop();
+  EXPECT_EQ(client_.request("getCurrentBroadcastImages")->values,
+            (platform::IPCArguments{Value(Data{}), Value(Data{})}));
+  device_.extensions.queryError = platform::Error{"query", 3, {}};
+  const auto failed = client_.request("getSystemBroadcastExtensionInfo");
+  EXPECT_TRUE(failed->values[0].asArray().empty());
+  EXPECT_EQ(failed->code(1), 3);
+  EXPECT_EQ(setUp(client_), errorcode::kInvalidBroadcastSession);
 }
 
 TEST_F(BroadcastTest, SamplesReachTheExtensionBetweenStartedAndFinished) {
@@ -141,6 +151,29 @@ TEST_F(BroadcastTest, AnExtensionThatGoesEndsItsBroadcastOnly) {
   device_.run();
   ASSERT_TRUE(client_.answer());
   EXPECT_EQ(device_.extensions.killed.size(), 2u);
+  EXPECT_EQ(openTransactions(), 0);
+}
+
+TEST_F(BroadcastTest, APausedBroadcastStaysPaused) {
+  broadcastSamples();
+  client_.request("pauseRecording");
+  client_.request("resumeRecordingWithWindowLayerContextID", {Value(uint32_t{77})});
+  EXPECT_TRUE(client_.isRecording());
+  EXPECT_FALSE(device_.screen.last().running);
+}
+
+TEST_F(BroadcastTest, AnApplicationThatLeavesTheFrontWhileItsExtensionIsLaunchedIsRefused) {
+  install(client_, kSamples);
+  setUp(client_);
+  client_.start({.broadcast = true});
+  device_.applications.states["com.example.game"] = platform::kApplicationBackground;
+  extension_.connect();
+  device_.run();
+  extension_.call("ping");
+  device_.run();
+  ASSERT_TRUE(client_.answer());
+  EXPECT_EQ(client_.answer()->code(), errorcode::kFailedToStart);
+  EXPECT_TRUE(areSourcesOff());
   EXPECT_EQ(openTransactions(), 0);
 }
 

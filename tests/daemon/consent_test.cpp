@@ -38,6 +38,8 @@ TEST_F(ConsentTest, ThreeButtonsKeepOrDropTheMicrophone) {
   auto client = game();
   const TestClient::StartOptions withMicrophone{.microphone = true};
   EXPECT_EQ(startAnswering(client, withMicrophone, UserAlertAnswer::Default).code(), errorcode::kUserDeclined);
+  EXPECT_FALSE(startAnswering(client, {}, UserAlertAnswer::Default).values[1].asBool()) << "none was asked for";
+  client.stop();
   auto answer = startAnswering(client, withMicrophone, UserAlertAnswer::Other);
   EXPECT_EQ(answer.code(), 0);
   EXPECT_FALSE(answer.values[1].asBool());
@@ -64,6 +66,22 @@ TEST_F(ConsentTest, ExemptionLastsEightMinutesInTheBackground) {
   EXPECT_EQ(client.start(), std::nullopt);
   client.disconnect();
   EXPECT_FALSE(device_.alerts.shown.back()->visible);
+
+  auto next = game();
+  startAnswering(next, {}, UserAlertAnswer::Default);
+  next.stop();
+  next.request("clientDidResignActive");
+  device_.clock.advanceSeconds(481);
+  EXPECT_EQ(game().start(), std::nullopt) << "one that connects anew comes from the background";
+}
+
+TEST_F(ConsentTest, OnlyAnInternalBuildSuppressesTheAlert) {
+  auto client = game();
+  suppressAlert();
+  EXPECT_EQ(client.start()->code(), 0);
+  client.stop();
+  device_.deviceInfo.internalBuild = false;
+  EXPECT_EQ(client.start(), std::nullopt);
 }
 
 TEST_F(ConsentTest, AClientThatDiesTakesItsAlertAlongAndTheNextStartIsServed) {
@@ -78,9 +96,11 @@ TEST_F(ConsentTest, AClientThatDiesTakesItsAlertAlongAndTheNextStartIsServed) {
   // An answer that was on its way finds nobody.
   asked[0]->handler(UserAlertAnswer::Default);
   asked[1]->handler(UserAlertAnswer::Default);
+  asked[1]->handler(UserAlertAnswer::Default);
   device_.run();
   EXPECT_EQ(second.answer()->code(), 0);
   EXPECT_EQ(openTransactions(), 1);
+  EXPECT_EQ(device_.movies.movies.size(), 1u);
 }
 
 TEST_F(ConsentTest, AnAlertThatCannotBeShownDeclines) {
@@ -92,7 +112,10 @@ TEST_F(ConsentTest, AnAlertThatCannotBeShownDeclines) {
 TEST_F(ConsentTest, OthersAreServedWhileOneIsAskedAndItHasOneStartAtATime) {
   auto asked = game();
   auto other = chat();
+  EXPECT_EQ(other.start({.capture = true}), std::nullopt);
+  EXPECT_EQ(device_.movies.prepared, 0) << "a capture writes no movie";
   EXPECT_EQ(asked.start(), std::nullopt);
+  EXPECT_EQ(device_.movies.prepared, 1) << "while the user reads";
   EXPECT_EQ(asked.start()->code(), errorcode::kFailedToStart);  // one start at a time
   EXPECT_EQ(other.state().size(), 7u);
 }

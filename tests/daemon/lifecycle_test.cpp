@@ -44,6 +44,8 @@ TEST_F(LifecycleTest, PauseStopsTheSourcesAndResumeKeepsTheFile) {
   auto client = game();
   client.start();
   sendFrame(kSecond);
+  client.request("resumeRecordingWithWindowLayerContextID", {Value(uint32_t{77})});
+  EXPECT_TRUE(client.isRecording()) << "nothing is paused";
   client.request("pauseRecording");
   client.request("pauseRecording");
   EXPECT_FALSE(device_.screen.last().running);
@@ -112,6 +114,24 @@ TEST_F(LifecycleTest, ShuttingDownCompletesTheMovie) {
   device_.run();
   EXPECT_TRUE(down);
   EXPECT_EQ(device_.movies.last().status, platform::AssetWriterStatus::Completed);
+}
+
+TEST_F(LifecycleTest, ADaemonThatBeginsMakesItsStoreAndFinishesWhatACrashLeft) {
+  const auto begin = [this] { manager_ = QVRecordingManager::create(device_.platform, captureManager_); };
+  const auto end = [this] {
+    manager_.reset();
+    device_.run();
+  };
+  end();
+  EXPECT_EQ(device_.purgeableSpace.callbacks.purge(1, 3), 0) << "nobody is there to be asked";
+  device_.disk.removeItem(fakes::kStore);
+  begin();
+  EXPECT_TRUE(device_.disk.itemExists(fakes::kStore));
+  end();
+  device_.disk.addFile(std::string(fakes::kStore) + "/Game.mp4", "broken off");
+  device_.salvage.states["Game.mp4"] = platform::MovieState::Unfinished;
+  begin();
+  EXPECT_EQ(device_.salvage.salvaged.size(), 1u);
 }
 
 }  // namespace

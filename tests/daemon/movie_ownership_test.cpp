@@ -106,6 +106,14 @@ TEST_F(MovieOwnershipTest, ATrimmedStopLeavesOneMovieAndADiscardNone) {
   EXPECT_EQ(storeFiles(), std::vector<std::string>{"Game_trimmed.mp4"});
   client.request("discardRecordingWithHandler");
   EXPECT_EQ(storeFiles(), std::vector<std::string>{});
+  // A discard that comes while the recording ends waits for what there is then.
+  record(client);
+  client.post("stopRecordingWithHandler");
+  const auto discarded = client.post("discardRecordingWithHandler");
+  device_.run();
+  ASSERT_TRUE(*discarded);
+  EXPECT_EQ((*discarded)->failureName(), "");
+  EXPECT_EQ(storeFiles(), std::vector<std::string>{});
   // What cannot be trimmed is handed over whole.
   device_.exports.result = platform::ExportStatus::Failed;
   record(client);
@@ -165,6 +173,30 @@ TEST_F(MovieOwnershipTest, ALibraryThatRefusesLeavesTheMovieToBeSavedAgain) {
   EXPECT_EQ(save(system, system.lastMovie()), 0);
   EXPECT_EQ(save(client, stop(client)), 0);
   EXPECT_EQ(storeFiles(), std::vector<std::string>{});
+  const std::string saved = "Video saved to camera roll ";
+  EXPECT_EQ(device_.log.count("QVRecordingManager:saveVideoToCameraRoll: " + saved + "failed"), 1u);
+  EXPECT_EQ(device_.log.count("QVRecordingManager:stopCurrentRecordingSession: " + saved + "failed"), 1u);
+  EXPECT_EQ(device_.log.count("QVRecordingManager:saveVideoToCameraRoll: " + saved + "successful"), 2u);
+}
+
+TEST_F(MovieOwnershipTest, ASystemRecordingWhoseFileGoesAtItsEndKeepsNobodyWaiting) {
+  auto system = systemUI();
+  auto client = game();
+  for (const bool sleeps : {false, true}) {
+    for (int pieces = 0; pieces < kPieces; ++pieces) {
+      record(system, {.system = true});
+      const std::string file = device_.movies.last().url.path();
+      const auto started = sleeps ? nullptr : client.postStart({});
+      if (sleeps) manager_->stopSystemRecordingWithInterruption();
+      runWork(pieces);
+      device_.disk.removeItem(file);
+      device_.run();
+      EXPECT_EQ(system.takeEnds(), std::vector<int64_t>{errorcode::kInterrupted}) << pieces;
+      EXPECT_TRUE(sleeps || (*started && (*started)->code() == 0)) << pieces;
+      client.stop();
+      EXPECT_EQ(openTransactions(), 0);
+    }
+  }
 }
 
 TEST_F(MovieOwnershipTest, WhereMixingFailsTheMovieItselfIsStored) {
@@ -202,6 +234,7 @@ TEST_F(MovieOwnershipTest, AFileThatCannotBeRemovedIsToldAndKeepsNobodyWaiting) 
   device_.disk.failOn(Operation::Remove, platform::URL(discarded).path(), EBUSY);
   EXPECT_FALSE(client.request("discardRecordingWithHandler")->failure);
   EXPECT_EQ(save(client, discarded), errorcode::kFailedToSave) << "it is nobody's";
+  EXPECT_EQ(device_.log.count("error removing file with code: " + std::to_string(EBUSY)), 2u);
 }
 
 TEST_F(MovieOwnershipTest, ADailyPurgeLeavesWhatIsBeingRecorded) {
@@ -219,16 +252,25 @@ TEST_F(MovieOwnershipTest, ADailyPurgeLeavesWhatIsBeingRecorded) {
 
 TEST_F(MovieOwnershipTest, ANearlyFullDiskHandsOverTheMovieThatItEnds) {
   auto client = game();
-  record(client);
-  EXPECT_EQ(device_.purgeableSpace.callbacks.purge(1, 2), 0);
-  EXPECT_TRUE(client.isRecording());
+  const auto& callbacks = device_.purgeableSpace.callbacks;
   device_.disk.addFile(std::string(fakes::kStore) + "/old.mp4", "12345");
+  EXPECT_EQ(callbacks.purgeable(1), device_.files._srSizeOfTempDir(nullptr));
+  EXPECT_EQ(callbacks.purge(1, 2), 0) << "nothing is recorded";
+  record(client);
+  EXPECT_EQ(callbacks.purge(1, 2), 0);
   device_.disk.setFreeSize(49'999'999);
-  EXPECT_EQ(device_.purgeableSpace.callbacks.purge(1, 2), 5);
+  EXPECT_EQ(callbacks.purge(1, 1), 0);
+  EXPECT_TRUE(client.isRecording());
+  EXPECT_EQ(callbacks.purge(1, 2), 5);
   device_.run();
   EXPECT_EQ(client.takeEnds(), std::vector<int64_t>{errorcode::kInsufficientStorage});
   EXPECT_EQ(contentAt(client.lastMovie()), "movie 0");
   EXPECT_EQ(save(client, client.lastMovie()), 0);
+  device_.disk.setFreeSize(1'000'000'000);
+  record(client, {.capture = true});
+  device_.disk.setFreeSize(49'999'999);
+  callbacks.purge(1, 2);
+  EXPECT_TRUE(client.isRecording()) << "a capture fills no disk";
 }
 
 class InterruptionTest : public MovieOwnershipTest {
@@ -256,6 +298,8 @@ TEST_F(InterruptionTest, AnInterruptedMovieIsNeverToldByTheNameOfTheNextOne) {
   ASSERT_TRUE(again);
   EXPECT_EQ(again->code, errorcode::kInterrupted);
   EXPECT_NE(contentAt(again->movie), device_.movies.last().content);
+  client.request("clientDidBecomeActive");
+  EXPECT_TRUE(client.takeEnds().empty()) << "it has been told";
   EXPECT_TRUE(client.isRecording());
 }
 

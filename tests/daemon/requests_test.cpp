@@ -13,6 +13,10 @@ TEST_F(RequestsTest, ACallerWithoutBundleIsServedAsFarAsItGoes) {
   EXPECT_EQ(client.start()->code(), errorcode::kFailedToStart);
   EXPECT_TRUE(client.state().empty());
   EXPECT_EQ(client.stop()->failureName(), requesterror::kNotRecording);
+  EXPECT_EQ(client.request("discardRecordingWithHandler")->failureName(), requesterror::kNotRecording);
+  client.disconnect();
+  EXPECT_TRUE(TestClient(device_, "com.example.nobody", 0).isEnded()) << "a peer that has gone";
+  EXPECT_FALSE(TestClient(device_, "com.example.first", 1).isEnded());
 }
 
 TEST_F(RequestsTest, RequestsWithoutAnAnswerFailByName) {
@@ -34,14 +38,29 @@ TEST_F(RequestsTest, EveryRequestIsServed) {
 
 TEST_F(RequestsTest, StateHoldsWhatTheClientSet) {
   auto client = game();
-  EXPECT_EQ(client.state().size(), 7u);
-  client.request("setHasUserConsentForMicrophone", {Value(true)});
-  client.request("setMicrophoneEnabledPersistent", {Value(true)});
-  client.request("setBroadcastURL", {Value("https://example.com/live")});
-  const auto state = client.state();
-  EXPECT_TRUE(valueForKey(state, "hasUserConsentForMicrophone").asBool());
-  EXPECT_TRUE(valueForKey(state, "microphoneEnabledPersistent").asBool());
-  EXPECT_EQ(valueForKey(state, "broadcastURL").asString(), "https://example.com/live");
+  platform::Dictionary state;
+  for (const char* key : {"isRecording", "isBroadcasting", "microphoneEnabled", "isSystemRecording",
+                          "hasUserConsentForMicrophone", "hasUserConsentForCamera", "microphoneEnabledPersistent"}) {
+    state[key] = Value(false);
+  }
+  const platform::Dictionary fresh = state;
+  EXPECT_EQ(client.state(), fresh);
+  client.request("setMicrophoneEnabled", {Value(true)});
+  EXPECT_EQ(client.state(), fresh) << "of nothing that is recorded";
+  const auto set = [&](const char* member, const char* key, Value value) {
+    client.request(member, {value});
+    state[key] = std::move(value);
+    EXPECT_EQ(client.state(), state) << member;
+  };
+  set("setHasUserConsentForMicrophone", "hasUserConsentForMicrophone", Value(true));
+  set("setHasUserConsentForCamera", "hasUserConsentForCamera", Value(true));
+  set("setMicrophoneEnabledPersistent", "microphoneEnabledPersistent", Value(true));
+  set("setBroadcastURL", "broadcastURL", Value("https://example.com/live"));
+  client.request("setBroadcastURL", {Value("")});
+  state.erase("broadcastURL");
+  EXPECT_EQ(client.state(), state);
+  client.disconnect();
+  EXPECT_EQ(game().state(), fresh);
 }
 
 TEST_F(RequestsTest, AnErrorHasItsTextByWhicheverWayItReachesAClient) {

@@ -97,7 +97,8 @@ TEST_F(SourceEndsTest, AnApplicationTapsItsOwnProcessesTheSystemAny) {
   client.request("updateProcessIDForAudioCaptureWithPID", {Value(int32_t{101})});
   EXPECT_EQ(device_.tap.tap->process, 101);
   client.request("updateProcessIDForAudioCaptureWithPID", {Value(int32_t{200})});
-  EXPECT_NE(device_.tap.tap->process, 200) << "what another application plays is not its own";
+  client.request("updateProcessIDForAudioCaptureWithPID", {Value(int32_t{1})});
+  EXPECT_EQ(device_.tap.tap->process, 101) << "what another application plays is not its own";
   client.request("updateProcessIDForAudioCaptureWithPID", {Value(int32_t{0})});
   EXPECT_FALSE(device_.tap.tap->running);
   auto system = systemUI();

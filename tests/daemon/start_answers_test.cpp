@@ -1,3 +1,4 @@
+#include "daemon/RequestErrors.h"
 #include "tests/daemon/DaemonTest.h"
 
 namespace qv {
@@ -16,8 +17,10 @@ TEST_F(StartAnswersTest, AStopWaitsForItsStartHoweverEarlyItComes) {
     const auto started = client.postStart({});
     runWork(pieces);
     const auto stopped = client.post("stopRecordingWithHandler");
+    const auto again = client.post("stopRecordingWithHandler");
     device_.run();
-    ASSERT_TRUE(*started && *stopped) << pieces;
+    ASSERT_TRUE(*started && *stopped && *again) << pieces;
+    EXPECT_EQ((*again)->failureName(), requesterror::kNotRecording) << pieces;
     EXPECT_EQ((*started)->code(), 0) << pieces;
     ASSERT_FALSE((*stopped)->failure) << pieces << ": " << (*stopped)->failureName();
     EXPECT_EQ((*stopped)->code(1), errorcode::kFailedToSave) << "no picture came";
@@ -28,10 +31,12 @@ TEST_F(StartAnswersTest, AStopWaitsForItsStartHoweverEarlyItComes) {
 }
 
 TEST_F(StartAnswersTest, AStartWhoseEndHasAKnownCauseIsAnsweredThatCause) {
-  auto client = game();
-  for (int pieces = 0; pieces < kPieces; ++pieces) {
-    const auto started = client.postStart({});
-    runWork(pieces);
+  device_.applications.frontmost = "com.example.chat";
+  for (int pieces = 0; pieces < 2 * kPieces; ++pieces) {
+    const bool isSystem = pieces >= kPieces;
+    auto client = isSystem ? systemUI() : game();
+    const auto started = client.postStart({.system = isSystem});
+    runWork(pieces % kPieces);
     device_.purgeableSpace.callbacks.purge(1, 3);
     device_.run();
     ASSERT_TRUE(*started) << pieces;
@@ -110,6 +115,11 @@ TEST_F(StartAnswersTest, NoMovieIsSmallerThanAPictureCanBe) {
     EXPECT_GE(settings.at(platform::settings::kVideoWidth).asDouble(), 2) << width << " x " << height;
     EXPECT_GE(settings.at(platform::settings::kVideoHeight).asDouble(), 2) << width << " x " << height;
     client.stop();
+  }
+  EXPECT_EQ(client.start({.width = 1e6, .height = 1e6})->code(), 0);
+  client.stop();
+  for (const auto& [width, height] : {std::pair(1e6 + 1, 720.0), std::pair(1280.0, 0.5)}) {
+    EXPECT_EQ(client.start({.width = width, .height = height})->code(), errorcode::kFailedToStart);
   }
 }
 

@@ -1,4 +1,5 @@
 #include <cmath>
+#include <utility>
 
 #include "daemon/DeviceSleep.h"
 #include "tests/daemon/DaemonTest.h"
@@ -12,9 +13,10 @@ using platform::Value;
 struct FakeLayoutMonitor final : platform::DisplayLayoutMonitor {
   void addObserver(std::weak_ptr<platform::DisplayLayoutObserver> to) override { observer = std::move(to); }
   void removeObserver(const platform::DisplayLayoutObserver*) override { observer.reset(); }
-  void invalidate() override { observer.reset(); }
+  void invalidate() override { isInvalid = true; }
   [[nodiscard]] bool isObserved() const { return !observer.expired(); }
   std::weak_ptr<platform::DisplayLayoutObserver> observer;
+  bool isInvalid = false;
 };
 
 /// Whether a recording starts, and every way in which it ends.
@@ -26,10 +28,11 @@ class TransactionsTest : public QuietDaemonTest {
     std::string name;
     std::function<void(TransactionsTest&, TestClient&)> run;
   };
-  void showLayout(const std::vector<int64_t>& levels) {
+  void showLayout(const std::vector<int64_t>& levels) { showLayout(levels, monitor_->observer.lock()); }
+  void showLayout(const std::vector<int64_t>& levels, const std::shared_ptr<platform::DisplayLayoutObserver>& to) {
     platform::DisplayLayout layout;
     for (const int64_t level : levels) layout.elements.push_back({"e", level});
-    if (const auto to = monitor_->observer.lock()) to->layoutMonitorDidUpdateDisplayLayout(*monitor_, layout);
+    if (to) to->layoutMonitorDidUpdateDisplayLayout(*monitor_, layout);
     device_.run();
   }
   static const std::vector<Case>& ends();
@@ -150,11 +153,33 @@ TEST_F(TransactionsTest, ADividedDisplayEndsAnApplicationsRecordingWithItsMovie)
   client.start();
   sendFrame(kSecond);
   showLayout({0});
+  showLayout({0, 2});  // what is above applications does not divide the display
+  showLayout({0});
   showLayout({0, 0, 5});  // two ordinary ones and one above: counted, nothing ends
   EXPECT_TRUE(client.isRecording());
   showLayout({0});
   EXPECT_EQ(client.takeEnds(), std::vector<int64_t>{errorcode::kContentResize});
   EXPECT_EQ(client.request("saveVideoToCameraRoll", {Value(client.lastMovie())})->code(), 0);
+  client.start();
+  sendFrame(kSecond);
+  showLayout({0, 1});
+  EXPECT_EQ(client.takeEnds(), std::vector<int64_t>{errorcode::kContentResize});
+  client.start();
+  showLayout({0});
+  EXPECT_TRUE(client.isRecording()) << "a division before it began is not its own";
+  client.request("clientDidBecomeActive");
+  EXPECT_TRUE(client.takeEnds().empty()) << "only an interruption is told again";
+
+  auto late = monitor_->observer.lock();
+  auto system = systemUI();
+  system.start({.system = true});
+  showLayout({0, 0}, std::exchange(late, nullptr));
+  EXPECT_TRUE(system.isRecording());
+  client.disconnect();
+  system.disconnect();
+  manager_.reset();
+  device_.run();
+  EXPECT_TRUE(monitor_->isInvalid);
 }
 
 TEST_F(TransactionsTest, ALongSleepEndsASystemRecordingAShortOneDoesNot) {
@@ -167,19 +192,24 @@ TEST_F(TransactionsTest, ALongSleepEndsASystemRecordingAShortOneDoesNot) {
     auto hold = std::make_shared<int>();
     const std::weak_ptr<int> held = hold;
     handlers.willSleep(std::move(hold));
-    EXPECT_FALSE(held.expired()) << "the device waits for the manager";
+    EXPECT_EQ(held.expired(), !manager_) << "the device waits for the manager";
     device_.run();
     EXPECT_TRUE(held.expired());
     handlers.didWake(time);
     device_.run();
   };
-  sleep(std::chrono::seconds(30));
+  sleep(kLongestSleepOfRecording);
   EXPECT_TRUE(system.isRecording());
+  sendFrame(2 * kSecond);
   sleep(std::chrono::hours(8));
   EXPECT_FALSE(system.isRecording());
   EXPECT_EQ(system.takeEnds(), std::vector<int64_t>{errorcode::kInterrupted});
   EXPECT_EQ(device_.photoLibrary.stored.size(), 1u);
+  EXPECT_EQ(device_.movies.last().sessionEnd, platform::MediaTime::make(2, 1)) << "with what came after a short sleep";
   EXPECT_EQ(openTransactions(), 0);
+  system.disconnect();
+  manager_.reset();
+  sleep(std::chrono::hours(8));
 }
 
 }  // namespace

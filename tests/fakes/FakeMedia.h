@@ -249,7 +249,8 @@ class FakeAppAudioTap final : public platform::AppAudioTapService {
 class FakeAssetWriterService final : public platform::AssetWriterService {
  public:
   FakeAssetWriterService(ScratchDisk& disk, const FakeClock& clock) : disk_(disk), clock_(clock) {}
-  void prepareForWriting() override {}
+  void prepareForWriting() override { ++prepared; }
+  int prepared = 0;
   struct Input final : platform::WriterInput {
     void setTransform(const platform::AffineTransform& to) override { transform = to; }
     void setExpectsMediaDataInRealTime(bool to) override { realTime = to; }
