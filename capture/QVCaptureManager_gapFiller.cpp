@@ -20,9 +20,8 @@ SampleBufferRef QVCaptureManager::createEmptyAudioSampleBuffer(MediaTime present
   if (!(gap >= 0.0) || gap > kLongestFiller) return nullptr;
   auto format = createAudioFormatDescription();
   const platform::AudioStreamDescription& d = format->streamDescription;
-  const uint32_t sampleSize = d.bytesPerFrame != 0 ? d.bytesPerPacket : 1;
   const auto count = static_cast<uint64_t>(gap * kFillerRate / d.framesPerPacket);
-  auto silence = std::make_shared<const platform::DataBlock>(std::vector<uint8_t>(sampleSize * count, 0));
+  auto silence = std::make_shared<const platform::DataBlock>(std::vector<uint8_t>(d.bytesPerPacket * count, 0));
   return SampleBuffer::makeAudio(std::move(silence), std::move(format), static_cast<int64_t>(count), presentationTime,
                                  MediaTime::fromSeconds(gap, static_cast<int32_t>(kFillerRate)));
 }

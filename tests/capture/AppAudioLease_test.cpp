@@ -27,7 +27,39 @@ TEST_F(AppAudioLeaseTest, TapDeliversStampedAudioAndRecyclesItsBuffers) {
   a_.appAudioLease->stopAppAudioCapture();
   EXPECT_TRUE(a_.tap->disposed);
   EXPECT_EQ(a_.tap->freed, 10);
+  EXPECT_EQ(device_.log.count("QVRecordingManager: Audio Queue buffer released"), 10u);
+  EXPECT_TRUE(device_.log.contains("QVRecordingManager:stopAudioCapture: Audio Queue successfully stopped"));
   a_.appAudioLease->stopAppAudioCapture();
+}
+
+TEST_F(AppAudioLeaseTest, BuffersHoldASecondOfWhatTheTapReportsUpToTheirMaximum) {
+  using Description = platform::AudioStreamDescription;
+  const Description asked = manager_.audioBasicDescription();
+  EXPECT_EQ(asked, (Description{44100, platform::kAudioFormatLinearPCM, 2 | 4 | 8, 2, 1, 2, 1, 16, 0}));
+  const auto capacityOf = [&](double rate, uint32_t bytesPerPacket) {
+    device_.tap.reported = asked;
+    device_.tap.reported->sampleRate = rate;
+    device_.tap.reported->bytesPerPacket = bytesPerPacket;
+    startTap(a_);
+    return a_.tap->capacities.at(0);
+  };
+  EXPECT_EQ(capacityOf(8000, 2), 16000u);
+  EXPECT_EQ(capacityOf(8000, 1), 8000u);
+  EXPECT_EQ(capacityOf(8000, 0), 24000u) << "the greatest packet";
+  EXPECT_EQ(capacityOf(48000, 2), 57344u);
+}
+
+TEST_F(AppAudioLeaseTest, TapRunsOnTheBuffersThatItGot) {
+  device_.tap.mostBuffers = 2;
+  device_.tap.failures = {{"freeBuffer", -4}};
+  start(a_);
+  play(a_, 100, kSecond);
+  EXPECT_EQ(a_.appAudio.size(), 1u);
+  EXPECT_EQ(a_.tap->enqueued.size(), 2u);
+  a_.appAudioLease.reset();
+  EXPECT_EQ(a_.tap->freed, 2);
+  EXPECT_TRUE(a_.tap->disposed);
+  EXPECT_EQ(device_.log.count("QVRecordingManager: error: -4"), 2u);
 }
 
 TEST_F(AppAudioLeaseTest, WhatOneRecordingEndsIsNoOthers) {
@@ -79,7 +111,7 @@ TEST_F(AppAudioLeaseTest, BufferOfAStoppedTapIsIgnoredWhateverRunsSince) {
 }
 
 TEST_F(AppAudioLeaseTest, ProcessReplacedBeforeTheFirstTapRanStartsOnce) {
-  a_.appAudioLease = manager_.leaseAppAudio(nullptr);
+  a_.appAudioLease = manager_.leaseAppAudio([](const auto&) {});
   a_.appAudioLease->startAppAudioCaptureForProcessID(42, [&] { a_.tapStarts += 100; });
   a_.appAudioLease->resumeAppAudioCaptureForProcessID(43, [&] { ++a_.tapStarts; });
   device_.run();
@@ -108,6 +140,30 @@ TEST_F(AppAudioLeaseTest, ResumeFillsTheGapOnceAndInItsOwnLeaseOnly) {
   EXPECT_EQ(a_.appAudio[1]->duration(), MediaTime::make(2, 1));
 }
 
+TEST_F(AppAudioLeaseTest, ResumeFillsNoGapWhereThereIsNone) {
+  start(a_);
+  const auto resumeAndPlay = [&] {
+    a_.appAudioLease->resumeAppAudioCaptureForProcessID(43, nullptr);
+    device_.run();
+    a_.tap = device_.tap.tap;
+    play(a_, 22050, kSecond);
+  };
+  resumeAndPlay();
+  EXPECT_EQ(a_.appAudio.size(), 1u) << "nothing was heard before";
+  device_.clock.advanceSeconds(0.25);
+  resumeAndPlay();
+  EXPECT_EQ(a_.appAudio.size(), 2u) << "the former is heard still";
+  device_.clock.advanceSeconds(0.5);
+  resumeAndPlay();
+  EXPECT_EQ(a_.appAudio.size(), 3u) << "the former has just ended";
+  device_.clock.advanceSeconds(9);
+  a_.appAudioLease->startAppAudioCaptureForProcessID(44, nullptr);
+  device_.run();
+  a_.tap = device_.tap.tap;
+  play(a_, 100, kSecond);
+  EXPECT_EQ(a_.appAudio.size(), 4u) << "a start is no resume";
+}
+
 TEST_F(AppAudioLeaseTest, WhatAnUnstoppableTapStillBringsIsIgnored) {
   device_.tap.failures = {{"setTappedProcess", -50}, {"stop", -66}};
   start(a_);
@@ -115,12 +171,22 @@ TEST_F(AppAudioLeaseTest, WhatAnUnstoppableTapStillBringsIsIgnored) {
   a_.appAudioLease->stopAppAudioCapture();
   EXPECT_TRUE(a_.appAudio.empty());
   EXPECT_EQ(a_.tap->freed, 0) << "the queue may still use its buffers";
+  EXPECT_TRUE(device_.log.contains("QVRecordingManager:stopAudioCapture:error: -66"));
 }
 
 TEST_F(AppAudioLeaseTest, SoundThatCannotBeHadIsToldLikeAStart) {
+  device_.tap.startsLate = true;
+  startTap(a_);
+  EXPECT_EQ(a_.tapStarts, 0);
+  a_.tap->listener();
+  device_.run();
+  EXPECT_EQ(a_.tapStarts, 1);
+
   device_.tap.failures = {{"start", -5}};
+  a_.tapStarts = 0;
   startTap(a_);
   EXPECT_EQ(a_.tapStarts, 1);
+  EXPECT_TRUE(device_.log.contains("QVRecordingManager: startAudioCapture error: -5"));
 
   device_.tap.failures = {{"create", -3}};
   startTap(b_);

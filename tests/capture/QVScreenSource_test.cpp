@@ -95,6 +95,7 @@ TEST_F(ScreenSourceTest, ControllerIsTakenAgainForTheSameSizeAndRate) {
   EXPECT_EQ(device_.screen.controllers, std::vector{first}) << "one is kept";
 
   a = source_.lease(windows({1}), b_);
+  EXPECT_EQ(device_.screen.livingAtCreation.size(), 2u);
   a->startCapture();
   first->sendAt(1);
   EXPECT_EQ(b_->frames, 1);
@@ -105,6 +106,11 @@ TEST_F(ScreenSourceTest, ControllerIsTakenAgainForTheSameSizeAndRate) {
   a = source_.lease(request, a_);
   ASSERT_EQ(device_.screen.controllers.size(), 1u);
   EXPECT_EQ(device_.screen.last().interval, platform::MediaTime::make(1, 30));
+  EXPECT_EQ(device_.screen.livingAtCreation.back(), 0u) << "the former's memory goes first";
+  a.reset();
+  request.size.width = 640;
+  a = source_.lease(request, a_);
+  EXPECT_EQ(device_.screen.last().size, (platform::Size{640, 720}));
 }
 
 /// A recording whose callback is waited for may begin another one's capture meanwhile.

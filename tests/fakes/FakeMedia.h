@@ -30,8 +30,9 @@ inline platform::SampleBufferRef makeFrame(int64_t nanoseconds) {
 /// Frames come when a test sends them, in the test's thread.
 class FakeScreenCaptureController final : public platform::ScreenCaptureController {
  public:
-  FakeScreenCaptureController(platform::MediaTime minimumInterval, std::vector<FakeScreenCaptureController*>& all)
-      : interval(minimumInterval), living(all) {
+  FakeScreenCaptureController(platform::Size pictures, platform::MediaTime minimumInterval,
+                              std::vector<FakeScreenCaptureController*>& all)
+      : size(pictures), interval(minimumInterval), living(all) {
     living.push_back(this);
   }
   ~FakeScreenCaptureController() override { std::erase(living, this); }
@@ -49,6 +50,7 @@ class FakeScreenCaptureController final : public platform::ScreenCaptureControll
   }
   void sendAt(int64_t nanoseconds, uint64_t flags = 0) { send(makeFrame(nanoseconds), flags); }
 
+  const platform::Size size;
   const platform::MediaTime interval;
   std::vector<FakeScreenCaptureController*>& living;
   std::weak_ptr<platform::ScreenCaptureControllerDelegate> delegate;
@@ -58,9 +60,10 @@ class FakeScreenCaptureController final : public platform::ScreenCaptureControll
 
 class FakeScreenCapture final : public platform::ScreenCaptureService, public platform::DisplayCloneService {
  public:
-  std::unique_ptr<platform::ScreenCaptureController> createController(platform::Size,
+  std::unique_ptr<platform::ScreenCaptureController> createController(platform::Size size,
                                                                       platform::MediaTime interval) override {
-    return std::make_unique<FakeScreenCaptureController>(interval, controllers);
+    livingAtCreation.push_back(controllers.size());
+    return std::make_unique<FakeScreenCaptureController>(size, interval, controllers);
   }
   platform::DisplayCloneService& displayClone() override { return *this; }
   void setMirroringMode(platform::DisplayCloneMode to) override { mode = to; }
@@ -69,6 +72,7 @@ class FakeScreenCapture final : public platform::ScreenCaptureService, public pl
   FakeScreenCaptureController& last() { return *controllers.back(); }
 
   std::vector<FakeScreenCaptureController*> controllers;
+  std::vector<size_t> livingAtCreation;  ///< for each that was made, how many there were
   platform::DisplayCloneMode mode = platform::DisplayCloneMode::Off;
   std::set<uint32_t> contexts;
 };
@@ -85,8 +89,10 @@ class FakeDeviceCapture final : public platform::DeviceCaptureService, public pl
     platform::SerialQueue* queue = nullptr;
   };
   struct Session final : platform::DeviceCaptureSession {
-    void setUsesApplicationAudioSession(bool) override {}
-    void setAutomaticallyConfiguresApplicationAudioSession(bool) override {}
+    void setUsesApplicationAudioSession(bool uses) override { usesApplicationAudioSession = uses; }
+    void setAutomaticallyConfiguresApplicationAudioSession(bool configures) override {
+      configuresAutomatically = configures;
+    }
     bool canAddInput(const std::shared_ptr<platform::CaptureDeviceInput>& input) const override {
       return input != nullptr;
     }
@@ -97,8 +103,11 @@ class FakeDeviceCapture final : public platform::DeviceCaptureService, public pl
     }
     void addOutput(std::shared_ptr<platform::CaptureOutput>) override { ++outputs; }
     void removeOutput(const std::shared_ptr<platform::CaptureOutput>&) override { --outputs; }
-    void startRunning() override { setRunning(true); }
+    void startRunning() override {
+      if (!startsLate) setRunning(true);
+    }
     void stopRunning() override {
+      ++stops;
       if (atStop) atStop();
       setRunning(false);
     }
@@ -108,14 +117,16 @@ class FakeDeviceCapture final : public platform::DeviceCaptureService, public pl
       running = to;
       if (const auto call = observer) call();
     }
-    int inputs = 0, outputs = 0;
-    bool running = false;
+    int inputs = 0, outputs = 0, stops = 0;
+    bool running = false, startsLate = false, usesApplicationAudioSession = false, configuresAutomatically = true;
     std::function<void()> observer;
     std::function<void()> atStop;  ///< what it still has is delivered here
   };
 
   std::shared_ptr<platform::DeviceCaptureSession> createSession() override {
-    return session = std::make_shared<Session>();
+    session = std::make_shared<Session>();
+    session->startsLate = startsLate;
+    return session;
   }
   std::shared_ptr<platform::CaptureDeviceInput> createDefaultAudioInput() override { return std::make_shared<Input>(); }
   std::shared_ptr<platform::AudioDataOutput> createAudioDataOutput() override {
@@ -133,6 +144,7 @@ class FakeDeviceCapture final : public platform::DeviceCaptureService, public pl
   }
 
   uint32_t categoryOptions = 0;
+  bool startsLate = false;  ///< the test tells when a session runs
   std::shared_ptr<Session> session;
   std::shared_ptr<Output> output;
   std::function<void(uint32_t)> interruption;
@@ -159,11 +171,15 @@ class FakeAppAudioTap final : public platform::AppAudioTapService {
       return service.status("setTappedProcess");
     }
     int32_t streamDescription(platform::AudioStreamDescription& to) override {
-      to = description;
+      to = service.reported.value_or(description);
       return 0;
     }
-    int32_t maximumOutputPacketSize(uint32_t&) override { return 0; }
+    int32_t maximumOutputPacketSize(uint32_t& size) override {
+      size = 3;
+      return 0;
+    }
     int32_t allocateBuffer(uint32_t size, platform::QueueBuffer*& buffer) override {
+      if (buffers.size() == service.mostBuffers) return -108;
       memory.push_back(std::make_unique<std::vector<uint8_t>>(size));
       buffers.push_back(std::make_unique<platform::QueueBuffer>(platform::QueueBuffer{size, memory.back()->data(), 0}));
       state->capacities.push_back(size);
@@ -183,9 +199,10 @@ class FakeAppAudioTap final : public platform::AppAudioTapService {
       return 0;
     }
     int32_t start() override {
+      if (const int32_t failure = service.status("start")) return failure;
       state->running = true;
       if (const auto call = state->listener; call && !service.startsLate) call();
-      return service.status("start");
+      return 0;
     }
     int32_t stop() override {
       if (state->atStop) state->atStop();
@@ -194,7 +211,7 @@ class FakeAppAudioTap final : public platform::AppAudioTapService {
     }
     int32_t freeBuffer(platform::QueueBuffer*) override {
       ++state->freed;
-      return 0;
+      return service.status("freeBuffer");
     }
     int32_t dispose() override {
       state->disposed = true;
@@ -241,7 +258,9 @@ class FakeAppAudioTap final : public platform::AppAudioTapService {
   std::shared_ptr<State> tap;
   std::vector<std::shared_ptr<State>> taps;
   std::map<std::string, int32_t> failures;
-  bool startsLate = false;  ///< the test tells when a tap runs, by its listener
+  size_t mostBuffers = SIZE_MAX;                             ///< of one tap
+  std::optional<platform::AudioStreamDescription> reported;  ///< where it is not what was asked for
+  bool startsLate = false;                                   ///< the test tells when a tap runs, by its listener
 };
 
 /// Records what a movie would hold. With its first sample a movie gets a file, whose content is the movie's number
