@@ -58,7 +58,6 @@ bool ClipCutter::appendPicture(const SampleBufferRef& sample) {
   if (!current_) return true;
   if (!current_->writer->appendVideoSampleBuffer(sample, transform_)) return false;
   lastPicture_ = sample;
-  isEmpty_ = false;
   if (seam_ && !seam_->seam->isPlaced()) seam_->seam->place(*sample);
   return true;
 }
@@ -80,7 +79,7 @@ void ClipCutter::_processAudioSampleBufferForMP4ClipHandler(const SampleBufferRe
     broadcastFragmentStartTime_ = time;
   }
   const bool isOver = (time - broadcastFragmentStartTime_).seconds() > configuration_.effectiveClipDuration();
-  if (isOver && !isEmpty_ && !seam_) cutClip(time, endOf(*sample));
+  if (isOver && lastPicture_ && !seam_) cutClip(time, endOf(*sample));
 }
 
 void ClipCutter::appendMicrophone(const SampleBufferRef& sample) {
@@ -106,29 +105,27 @@ void ClipCutter::cutClip(MediaTime time, MediaTime soundEnd) {
   Clip beginning = makeClip_(current_->number + 1);
   beginning.writer->setupAssetWriter();
   broadcastFragmentStartTime_ = time;
-  auto seam = std::make_unique<ClipSeam>(current_->writer, beginning.writer, soundEnd, hasMicrophone_);
+  auto seam = std::make_shared<ClipSeam>(current_->writer, beginning.writer, soundEnd, hasMicrophone_);
   seam_ = Seam{*std::exchange(current_, std::move(beginning)), std::move(seam)};
-  isEmpty_ = true;
   armRepeat();
 }
 
+/// For this seam only: it may have closed, and another be open, when the timer's work comes to its turn.
 void ClipCutter::armRepeat() {
-  const std::weak_ptr<QVMovieWriter> beginning = current_->writer;
-  repeatTimer_ = platform_.timers->after(kPicturePatience,
-                                         [weakSelf = weak_from_this(), beginning, queue = platform_.globalQueue] {
-                                           queue->post([weakSelf, beginning] {
-                                             const auto self = weakSelf.lock();
-                                             const auto writer = beginning.lock();
-                                             if (!self || !writer) return;
-                                             std::lock_guard lock(self->mutex_);
-                                             if (self->current_ && self->current_->writer == writer)
-                                               self->repeatLastPicture();
-                                           });
-                                         });
+  repeatTimer_ = platform_.timers->after(
+      kPicturePatience,
+      [weakSelf = weak_from_this(), seam = std::weak_ptr(seam_->seam), queue = platform_.globalQueue] {
+        queue->post([weakSelf, seam] {
+          const auto self = weakSelf.lock();
+          if (!self) return;
+          std::lock_guard lock(self->mutex_);
+          if (!seam.expired()) self->repeatLastPicture();
+        });
+      });
 }
 
 void ClipCutter::repeatLastPicture() {
-  if (!seam_ || seam_->seam->isPlaced() || !lastPicture_) return;
+  if (!seam_ || seam_->seam->isPlaced()) return;
   const SampleBuffer& last = *lastPicture_;
   (void)appendPicture(pictureAt(last, seam_->seam->timeForRepeatedPicture(last)));
 }
@@ -137,16 +134,12 @@ void ClipCutter::closeSeamIfComplete(MediaTime now) {
   if (!seam_ || !seam_->seam->isComplete(now)) return;
   clipEnded_(std::move(seam_->ending));
   seam_.reset();
-  repeatTimer_.reset();
 }
 
 std::optional<Clip> ClipCutter::end() {
   std::lock_guard lock(mutex_);
   repeatLastPicture();
-  if (seam_) clipEnded_(std::move(seam_->ending));
-  seam_.reset();
-  repeatTimer_.reset();
-  lastPicture_ = nullptr;
+  if (auto open = std::exchange(seam_, std::nullopt)) clipEnded_(std::move(open->ending));
   return std::exchange(current_, std::nullopt);
 }
 

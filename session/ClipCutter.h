@@ -56,7 +56,7 @@ class ClipCutter : public std::enable_shared_from_this<ClipCutter> {
   /// The clip before an open seam.
   struct Seam {
     Clip ending;
-    std::unique_ptr<ClipSeam> seam;
+    std::shared_ptr<ClipSeam> seam;  ///< the timer knows it weakly
   };
 
   const platform::Platform& platform_;
@@ -67,10 +67,9 @@ class ClipCutter : public std::enable_shared_from_this<ClipCutter> {
   std::optional<Seam> seam_;
   QVBroadcastConfiguration configuration_;
   platform::MediaTime broadcastFragmentStartTime_ = platform::MediaTime::invalid();
-  platform::SampleBufferRef lastPicture_;
+  platform::SampleBufferRef lastPicture_;  ///< none before the first
   platform::AffineTransform transform_;
   std::unique_ptr<platform::TimerHandle> repeatTimer_;
-  bool isEmpty_ = true;  ///< the current clip has no picture yet
   bool hasMicrophone_ = false;
 };
 

@@ -35,19 +35,24 @@ ClipHandover::ClipHandover(const platform::Platform& platform, const platform::E
 
 /// Files are finished by several writers at once, so a later clip may be complete before an earlier one.
 void ClipHandover::clipCompleted(int64_t number, ClipFile clip, bool finished, std::function<void()> handed) {
-  std::unique_lock lock(mutex_);
-  completed_[number] = {std::move(clip), finished, std::move(handed)};
-  if (std::exchange(isHanding_, true)) return;
-  for (auto next = completed_.find(next_); next != completed_.end(); next = completed_.find(++next_)) {
-    const Completed ready = std::move(next->second);
-    completed_.erase(next);
-    lock.unlock();
-    if (ready.clip) _notifyBroadcastExtensionOfCompletedMovieWithURL(ready.clip, ready.finished);
-    if (ready.finished) awaitLastRequests();
-    if (ready.handed) ready.handed();
-    lock.lock();
+  {
+    std::lock_guard lock(mutex_);
+    completed_[number] = {std::move(clip), finished, std::move(handed)};
   }
-  isHanding_ = false;
+  while (const auto ready = takeNext()) {
+    if (ready->clip) _notifyBroadcastExtensionOfCompletedMovieWithURL(ready->clip, ready->finished);
+    if (ready->finished) awaitLastRequests();
+    if (ready->handed) ready->handed();
+    std::lock_guard lock(mutex_);
+    ++next_;
+  }
+}
+
+/// While the clip of this number is handed over nobody finds the one after it: its turn comes only then.
+std::optional<ClipHandover::Completed> ClipHandover::takeNext() {
+  std::lock_guard lock(mutex_);
+  auto next = completed_.extract(next_);
+  return next ? std::optional(std::move(next.mapped())) : std::nullopt;
 }
 
 void ClipHandover::_notifyBroadcastExtensionOfCompletedMovieWithURL(const ClipFile& clip, bool finished) {
@@ -110,11 +115,9 @@ void ClipHandover::requestCompleted(const ClipFile& clip, const Result<std::vect
 
 void ClipHandover::requestEnded(const ClipFile& clip) {
   removeClip(*clip);
-  std::unique_lock lock(mutex_);
-  if (--outstanding_ > 0 || !isFinished_) return;
-  const auto last = std::exchange(lastRequests_, nullptr);
-  lock.unlock();
-  if (last) last->answer();
+  std::shared_ptr<AnswerDeadline> last;  // answers when it goes, without the lock
+  std::lock_guard lock(mutex_);
+  if (--outstanding_ == 0 && isFinished_) last.swap(lastRequests_);
 }
 
 void ClipHandover::loadReturnedItem(const ExtensionItem& item) {
@@ -136,21 +139,17 @@ void ClipHandover::loadReturnedItem(const ExtensionItem& item) {
 }
 
 void ClipHandover::awaitLastRequests() {
-  std::unique_lock lock(mutex_);
-  isFinished_ = true;
-  // It holds this until the extension is let go, whatever becomes of the session.
+  // It holds this until the extension is let go, whatever becomes of the session. Where nobody keeps it, it answers
+  // when it goes, without the lock.
   auto deadline = AnswerDeadline::start(platform_, kLastClipsPatience, [self = shared_from_this()](bool isLate) {
     if (isLate) QV_LOG_ERROR(logs::kSession, "the broadcast extension did not finish its last clips in time");
     std::shared_ptr<platform::ExtensionUse> ended;
-    std::lock_guard releaseLock(self->mutex_);
+    std::lock_guard lock(self->mutex_);
     ended.swap(self->use_);
   });
-  if (outstanding_ > 0) {
-    lastRequests_ = std::move(deadline);
-    return;
-  }
-  lock.unlock();
-  deadline->answer();
+  std::lock_guard lock(mutex_);
+  isFinished_ = true;
+  if (outstanding_ > 0) lastRequests_ = std::move(deadline);
 }
 
 }  // namespace qv

@@ -49,6 +49,7 @@ class ClipHandover : public std::enable_shared_from_this<ClipHandover> {
     std::function<void()> handed;
   };
   using ClipFile = std::shared_ptr<MovieClaim>;
+  [[nodiscard]] std::optional<Completed> takeNext();
   void _notifyBroadcastExtensionOfCompletedMovieWithURL(const ClipFile& clip, bool finished);
   [[nodiscard]] std::vector<platform::ExtensionItem> itemsForClip(const platform::URL& clip, const std::string& token,
                                                                   bool finished) const;
@@ -65,7 +66,6 @@ class ClipHandover : public std::enable_shared_from_this<ClipHandover> {
   std::mutex mutex_;
   std::map<int64_t, Completed> completed_;
   int64_t next_ = 1;
-  bool isHanding_ = false;
   size_t outstanding_ = 0;
   bool isFinished_ = false;
   std::shared_ptr<AnswerDeadline> lastRequests_;

@@ -11,11 +11,6 @@ using platform::Error;
 using platform::URL;
 namespace logs = platform::logs;
 
-namespace {
-constexpr const char kSystemRecording[] = "SystemRecording";
-constexpr const char kInAppRecording[] = "InAppRecording";
-}  // namespace
-
 bool QVRecording::end(RecordingEnd end) {
   {
     std::lock_guard lock(shouldStopLock_);
@@ -96,20 +91,19 @@ void QVRecording::trimMovie(const std::shared_ptr<MovieClaim>& movie) {
   const auto trimmed =
       context_->movies->claimTrimmed(context_->names.trimmedOutputPath(settings_.bundleID), settings_.bundleID);
   auto writer = std::make_shared<QVMovieWriter>(context_->platform, settings_.windowSize, movie->path());
-  writer->trimMovieWithURL(
-      movie->url(), end_.startClipDuration, end_.endClipDuration, trimmed->url(),
-      [self = shared_from_this(), movie, trimmed](const std::optional<URL>& url) {
-        self->context_->sequence.async([self, movie, trimmed, isTrimmed = url && trimmed->hasFile()] {
-          if (isTrimmed) {
-            QV_LOG(logs::kSession, "finished trimming");
-            movie->remove(nullptr);
-          } else {
-            QV_LOG_ERROR(logs::kSession, "trimming failed, handing on the untrimmed movie");
-            trimmed->remove(nullptr);
-          }
-          self->disposeOfMovie(isTrimmed ? trimmed : movie);
-        });
-      });
+  writer->trimMovieWithURL(movie->url(), end_.startClipDuration, end_.endClipDuration, trimmed->url(),
+                           [self = shared_from_this(), movie, trimmed](const std::optional<URL>& url) {
+                             self->context_->sequence.async([self, movie, trimmed, isTrimmed = url.has_value()] {
+                               if (isTrimmed) {
+                                 QV_LOG(logs::kSession, "finished trimming");
+                                 movie->remove(nullptr);
+                               } else {
+                                 QV_LOG_ERROR(logs::kSession, "trimming failed, handing on the untrimmed movie");
+                                 trimmed->remove(nullptr);
+                               }
+                               self->disposeOfMovie(isTrimmed ? trimmed : movie);
+                             });
+                           });
 }
 
 void QVRecording::disposeOfMovie(std::shared_ptr<MovieClaim> movie) {
@@ -153,13 +147,13 @@ void QVRecording::whenEnded(std::function<void()> work) {
 }
 
 std::string QVRecording::_serviceNameForReporting() const {
-  if (settings_.systemRecording) return settings_.broadcast ? "SystemBroadcast" : kSystemRecording;
+  if (settings_.systemRecording) return settings_.broadcast ? "SystemBroadcast" : "SystemRecording";
   if (settings_.broadcast) return "InAppBroadcast";
-  return settings_.captureEnabled ? "InAppCapture" : kInAppRecording;
+  return settings_.captureEnabled ? "InAppCapture" : "InAppRecording";
 }
 
 uint64_t QVRecording::getRecordedFileSize() const {
-  if (reportingAgent_->serviceName() != kSystemRecording && reportingAgent_->serviceName() != kInAppRecording) return 0;
+  if (!output_->makesMovie()) return 0;
   const auto attributes = context_->platform.fileSystem->attributesOfItem(output_->moviePath());
   if (!attributes) {
     QV_LOG_ERROR(logs::kSession, "error getting recordedFileSize :%ld", static_cast<long>(attributes.error().code));

@@ -71,15 +71,13 @@ void QVRecording::_processSampleBuffer(const SampleBufferRef& sample, uint64_t t
 /// Sound comes later than it was captured: a pause and the end leave out only what was captured after they began. What
 /// is heard between a resume and its first picture belongs to the pause.
 std::optional<PlacedSound> QVRecording::placeSound(const SampleBufferRef& sample) const {
-  std::unique_lock lock(shouldStopLock_);
-  const State state = state_;
-  const MediaTime stoppedAt = stoppedAt_;
+  std::lock_guard lock(shouldStopLock_);
+  // There are no sources then.
+  if (state_ == State::Preparing || state_ == State::Ended) return std::nullopt;
+  if (state_ == State::Running && timing_.isInPause()) return std::nullopt;
   PlacedSound placed{sample, timing_.pauses()};
-  const bool isInPause = state == State::Running && timing_.isInPause();
-  lock.unlock();
-  if (state == State::Preparing || state == State::Ended || isInPause) return std::nullopt;
   const bool hasTime = sample->presentationTime() > MediaTime::zero();
-  if (state != State::Running && hasTime) placed.sample = splitSound(sample, stoppedAt).before;
+  if (state_ != State::Running && hasTime) placed.sample = splitSound(sample, stoppedAt_).before;
   return placed.sample ? std::optional(placed) : std::nullopt;
 }
 

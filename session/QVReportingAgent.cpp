@@ -77,13 +77,11 @@ void QVReportingAgent::reportEventWithType(uint16_t eventType, const Dictionary&
   platform::MetricsMessage message;
   message.clientType = kClientType;
   message.clientVersion = kClientVersion;
-  message.sessionID = 0;
   message.batchEvent = true;
   message.userInfoRequired = true;
   message.clientName = "Quorvel";
   message.serviceName = serviceName_;
   message.category = eventType;
-  message.type = 0;
   message.payload = dictionary;
   if (const auto error = metrics_.sendMessage(message)) {
     QV_LOG_ERROR(logs::kSession, "eventType:%d error code %d.", eventType, static_cast<int>(error->code));
