@@ -46,6 +46,14 @@ class BroadcastFixture : public DaemonTest {
     ASSERT_TRUE(device_.tap.fill(4410, tenths * kSecond / 10));
     device_.run();
   }
+  /// The same to the microphone.
+  void speak(double tenths) {
+    device_.deviceCapture.send(
+        platform::SampleBuffer::makeAudio(std::make_shared<platform::DataBlock>(std::vector<uint8_t>(8820)),
+                                          captureManager_.createAudioFormatDescription(), 4410,
+                                          platform::MediaTime::fromSeconds(tenths / 10, platform::kHostTimescale)));
+    device_.run();
+  }
   void frame(int64_t tenths) { sendFrame(tenths * kSecond / 10); }
   /// Pictures, and their sound `lag` tenths of a second later.
   void play(int64_t from, int64_t to, int64_t lag = 0) {

@@ -100,6 +100,9 @@ class DaemonTest : public testing::Test {
   void suppressAlert();
   /// By the newest screen capture that runs, if any does.
   void sendFrame(int64_t nanoseconds, uint64_t flags = 0);
+  std::shared_ptr<QVRecording> recordingOf(const TestClient& client) {
+    return manager_->sessions().recordingSessionForBundleID(client.bundleID())->recording();
+  }
   /// Some of the daemon's work.
   void runWork(int count) {
     for (int done = 0; done < count && device_.executor.runOne(); ++done) {

@@ -84,7 +84,27 @@ TEST_F(BroadcastJointsTest, TheExtensionIsToldWhoIsInFrontWhenItBegins) {
   EXPECT_EQ(std::count(extension_.received.begin(), extension_.received.end(),
                        Dictionary{{broadcastpayload::kFrontmostApp, Value("com.example.chat")}}),
             1);
+  device_.applications.report(platform::kApplicationForeground, 100, true);
+  device_.run();
+  EXPECT_EQ(std::count_if(extension_.received.begin(), extension_.received.end(),
+                          [](const auto& each) { return each.contains(broadcastpayload::kFrontmostApp); }),
+            1)
+      << "the first only";
   system.stop();
+}
+
+TEST_F(BroadcastJointsTest, AnExtensionThatHangsAtTheStartCostsItsPatienceOnce) {
+  auto client = game();
+  install(client, kSamples);
+  EXPECT_EQ(setUp(client), 0);
+  extension_.answers = false;
+  const auto started = startSamples(client);
+  EXPECT_FALSE(*started);
+  device_.timers.advance(kExtensionPatience);
+  device_.run();
+  ASSERT_TRUE(*started);
+  EXPECT_EQ((*started)->code(), errorcode::kInvalidBroadcastSession);
+  EXPECT_EQ(openTransactions(), 0);
 }
 
 TEST_F(BroadcastJointsTest, AnExtensionThatFailsAtOnceLeavesNoSourceOn) {

@@ -1,4 +1,6 @@
+#include <algorithm>
 #include <cmath>
+#include <cstring>
 
 #include "platform/base/KeyedArchive.h"
 #include "tests/daemon/BroadcastFixture.h"
@@ -23,6 +25,7 @@ class BroadcastTest : public BroadcastFixture {
   }
   /// A broadcast in samples mode that runs.
   void broadcastSamples() {
+    device_.deviceInfo.audioCaptureDevice = true;
     install(client_, kSamples);
     setUp(client_);
     (void)startSamples(client_);
@@ -105,17 +108,27 @@ TEST_F(BroadcastTest, SamplesReachTheExtensionBetweenStartedAndFinished) {
   EXPECT_EQ(client_.answer()->code(), 0);
   EXPECT_TRUE(device_.alerts.shown.empty());
   EXPECT_TRUE(valueForKey(client_.state(), "isBroadcasting").asBool());
+  extension_.call("ping");
+  EXPECT_EQ(device_.purgeableSpace.callbacks.purge(1, 2), 0) << "it needs no disk";
   frame(10);
   sound(11);
+  speak(11);
+  client_.request("pauseRecording");
+  recordingOf(client_)->resumeSessionWithContextID(5);
+  recordingOf(client_)->resumeSessionWithContextID(5);  // it is not paused any more
+  device_.run();
+  frame(20);
+  sound(21);
   client_.request("updateProcessIDForAudioCaptureWithPID", {Value(int32_t{200})});
+  extension_.call("updateServiceInfo", {Value(Dictionary{{"viewers", Value(int64_t{5})}})});
   extension_.call("updateBroadcastURL", {Value("https://live")});
   client_.stop();
   EXPECT_EQ(client_.answer()->values[0].asString(), "");
   EXPECT_EQ(client_.answer()->code(1), 0);
-  EXPECT_EQ(client_.object().takeCall().member, "updateBroadcastURL");
+  EXPECT_EQ(client_.object().callCount(), 2u) << "service information and the place";
 
   const auto& payloads = extension_.received;
-  ASSERT_EQ(payloads.size(), 5u) << "the sound of another application is not the caller's to record";
+  ASSERT_EQ(payloads.size(), 10u) << "the sound of another application is not the caller's to record";
   EXPECT_EQ(payloads[0].at(broadcastpayload::kUserInfo), Value(Dictionary{{"key", Value("stream")}}));
   EXPECT_EQ(payloads[1], (Dictionary{{broadcastpayload::kFrontmostApp, Value("com.example.game")}}));
   EXPECT_EQ(payloads[2].size(), 5u);
@@ -124,7 +137,17 @@ TEST_F(BroadcastTest, SamplesReachTheExtensionBetweenStartedAndFinished) {
   EXPECT_EQ(payloads[3].size(), 6u);
   EXPECT_EQ(payloads[3].at(broadcastpayload::kNumSamples).asInteger(), 4410);
   EXPECT_EQ(payloads[3].at(broadcastpayload::kAudioFormatDescription).asData().size(), 40u);
-  EXPECT_EQ(actions(), (std::vector<int64_t>{1, 4}));
+  EXPECT_EQ(payloads[4].at(broadcastpayload::kSampleType).asInteger(), 3) << "the microphone";
+  for (const size_t resumed : {7, 8}) {
+    platform::MediaTime pauses;
+    ASSERT_EQ(payloads[resumed].at(broadcastpayload::kPauses).asData().size(), sizeof pauses);
+    std::memcpy(&pauses, payloads[resumed].at(broadcastpayload::kPauses).asData().data(), sizeof pauses);
+    EXPECT_EQ(pauses, platform::MediaTime::make(1, 1)) << resumed;
+  }
+  EXPECT_EQ(device_.log.count("quorveld sending video payload to broadcast extension..."), 2u);
+  EXPECT_EQ(device_.log.count("quorveld sending audio payload to broadcast extension..."), 3u);
+  EXPECT_EQ(device_.log.count("quorveld sending frontmost app bundleID to broadcast extension..."), 1u);
+  EXPECT_EQ(actions(), (std::vector<int64_t>{1, 2, 3, 4}));
   EXPECT_EQ(device_.extensions.killed.size(), 1u);
   EXPECT_TRUE(device_.movies.movies.empty());
   EXPECT_EQ(openTransactions(), 0);
@@ -133,17 +156,35 @@ TEST_F(BroadcastTest, SamplesReachTheExtensionBetweenStartedAndFinished) {
 
 TEST_F(BroadcastTest, AnExtensionThatGoesEndsItsBroadcastOnly) {
   broadcastSamples();
+  extension_.answers = false;
   frame(10);
+  device_.tap.tap->atStop = [this] { (void)device_.tap.fill(441, kSecond); };
   extension_.connection->invalidate();
   device_.run();
   EXPECT_EQ(client_.takeEnds(), std::vector<int64_t>{errorcode::kInvalidBroadcastSession});
   EXPECT_FALSE(client_.isRecording());
   EXPECT_FALSE(device_.screen.last().running);
   EXPECT_EQ(openTransactions(), 0);
+  EXPECT_EQ(device_.log.countContaining("payload to broadcast extension..."), 0u) << "nothing was taken";
 
-  // One that hangs instead costs the stop ten seconds.
+  // One that hangs instead costs the stop ten seconds, and gets the newest two seconds of sound if it goes on.
   device_.extensions.installed.clear();
+  extension_.answers = true;
   broadcastSamples();
+  extension_.answers = false;
+  extension_.received.clear();
+  extension_.unanswered.clear();
+  for (int64_t tenth = 100; tenth < 160; ++tenth) {
+    if (tenth % 10 == 0) frame(tenth);
+    sound(tenth);
+  }
+  extension_.answers = true;
+  for (const auto& reply : std::exchange(extension_.unanswered, {})) reply({});
+  device_.run();
+  EXPECT_NEAR(std::count_if(extension_.received.begin(), extension_.received.end(),
+                            [](const auto& each) { return each.contains(broadcastpayload::kNumSamples); }),
+              3 + 20, 1)
+      << "with a picture the first three are on their way";
   extension_.answers = false;
   client_.send("stopRecordingWithHandler");
   EXPECT_FALSE(client_.answer());
@@ -225,13 +266,18 @@ TEST_F(BroadcastTest, AStillScreensClipBeginsWithTheLastPictureAndCutsTheSoundTh
   for (int64_t tenth = 100; tenth <= 106; ++tenth) sound(tenth);
   ASSERT_EQ(device_.movies.movies.size(), 2u);
   EXPECT_TRUE(movie(1).inputs[0]->samples.empty());
-  device_.timers.advance(std::chrono::milliseconds(34));
+  device_.timers.advance(std::chrono::milliseconds(33));
+  device_.run();
+  EXPECT_TRUE(movie(1).inputs[0]->samples.empty());
+  device_.timers.advance(std::chrono::milliseconds(1));
   device_.run();
   EXPECT_EQ(movie(1).inputs[0]->times(), std::vector<int64_t>{107 * kSecond / 10}) << "where the sound had got to";
   EXPECT_EQ(movie(1).inputs[0]->samples[0]->image(), movie(0).inputs[0]->samples[0]->image());
   // A picture that was taken before that is not lost, and sound across a seam is cut at it.
+  frame(107);
   frame(106);
-  EXPECT_EQ(movie(1).inputs[0]->samples.size(), 2u);
+  EXPECT_EQ(movie(1).inputs[0]->times(), (std::vector<int64_t>{10'700'000'000, 10'701'000'000, 10'702'000'000}));
+  EXPECT_EQ(device_.extensions.requests.size(), 1u);
   for (int64_t tenth = 107; tenth <= 112; ++tenth) sound(tenth);
   ASSERT_EQ(device_.movies.movies.size(), 3u);
   sendFrame(113 * kSecond / 10 + kSecond / 20);
@@ -239,6 +285,15 @@ TEST_F(BroadcastTest, AStillScreensClipBeginsWithTheLastPictureAndCutsTheSoundTh
   EXPECT_EQ(movie(1).inputs[1]->samples.back()->numSamples(), 2205);
   EXPECT_EQ(movie(2).inputs[1]->samples.front()->numSamples(), 2205);
   EXPECT_EQ(movie(2).inputs[1]->times().front(), movie(2).inputs[0]->times().front());
+  EXPECT_EQ(device_.extensions.requests.size(), 2u) << "with its sound";
+  // One that is newer than the sound is shown for the time of a frame.
+  for (int64_t tenth = 114; tenth <= 117; ++tenth) sound(tenth);
+  sendFrame(119 * kSecond / 10 - kSecond / 100);
+  sound(118);
+  ASSERT_EQ(device_.movies.movies.size(), 4u);
+  device_.timers.advance(std::chrono::milliseconds(34));
+  device_.run();
+  EXPECT_EQ(movie(3).inputs[0]->times(), std::vector<int64_t>{11'923'333'333});
 }
 
 TEST_F(BroadcastTest, EachRequestRemovesItsOwnClipAndMayChangeTheNext) {
@@ -253,17 +308,23 @@ TEST_F(BroadcastTest, EachRequestRemovesItsOwnClipAndMayChangeTheNext) {
       1,
       std::vector<ExtensionItem>{item(broadcastitem::kBroadcastConfiguration, Value(Data{9})),
                                  item(broadcastitem::kBroadcastConfiguration, Value(clipsOf(3))),
+                                 {broadcastitem::kBroadcastConfiguration, {}},
+                                 {broadcastitem::kBroadcastConfiguration, {{"public.text", Value(clipsOf(1))}}},
+                                 item("another", Value(Dictionary{{"viewers", Value(int64_t{6})}})),
                                  item(broadcastitem::kServiceInfo, Value(Dictionary{{"viewers", Value(int64_t{5})}}))});
   device_.run();
   EXPECT_TRUE(device_.disk.itemExists(clipPath(0)));
   EXPECT_FALSE(device_.disk.itemExists(clipPath(1)));
   EXPECT_EQ(client_.object().takeCall().member, "updateBroadcastServiceInfo");
+  EXPECT_EQ(client_.object().callCount(), 0u);
   play(125, 145);
   EXPECT_EQ(device_.extensions.requests.size(), 2u) << "clips are longer now";
   client_.stop();
   ASSERT_EQ(device_.extensions.requests.size(), 3u);
   EXPECT_TRUE(device_.extensions.killed.empty()) << "it still sends";
   device_.extensions.complete(2, std::vector<ExtensionItem>{});
+  device_.run();
+  EXPECT_TRUE(device_.extensions.killed.empty()) << "it sends the first one still";
   device_.extensions.complete(0, std::vector<ExtensionItem>{});
   device_.run();
   EXPECT_FALSE(device_.disk.itemExists(clipPath(0)));

@@ -1,3 +1,5 @@
+#include <tuple>
+
 #include "session/MovieNames.h"
 #include "session/VideoSize.h"
 #include "tests/daemon/DaemonTest.h"
@@ -18,6 +20,7 @@ TEST_F(LifecycleTest, SizesAreClampedByDeviceAndPreference) {
   EXPECT_EQ(clamped({1080, 2400}), (Size{864, 1920}));
   EXPECT_EQ(clamped({1000, 800}), (Size{1000, 800}));
   device_.deviceInfo.idiom = platform::UserInterfaceIdiom::Tablet;
+  EXPECT_EQ(clamped({2048, 1536}), (Size{1920, 1440}));
   device_.deviceInfo.integers["ChipID"] = 0x8960;
   EXPECT_EQ(clamped({2048, 1536}), (Size{1600, 1200}));
   device_.preferences.set(R"({"QVFullResCapture": true})");
@@ -34,7 +37,9 @@ TEST_F(LifecycleTest, FileNamesHoldWhateverAnAppIsCalled) {
   EXPECT_EQ(name("Comet Run"), "Comet Run.mp4");
   EXPECT_EQ(name("../../etc/cron"), "_.:..:etc:cron.mp4");
   EXPECT_EQ(name(""), "com.example.game.mp4");
-  EXPECT_LE(name(std::string(400, 'x')).size(), 255u);
+  EXPECT_EQ(name("a\\u0001b\\u007fc"), "abc.mp4");
+  EXPECT_EQ(name(std::string(400, 'x')), std::string(200, 'x') + ".mp4");
+  EXPECT_EQ(name(std::string(199, 'x') + "\u00e9"), std::string(199, 'x') + ".mp4") << "no half a character";
   const std::string path = names.screenMoviePath();
   EXPECT_NE(path.find("/ScreenRecording_"), std::string::npos);
   EXPECT_EQ(path.find(':'), std::string::npos);
@@ -85,10 +90,17 @@ TEST_F(LifecycleTest, ARefusedFrameEndsTheRecording) {
 }
 
 TEST_F(LifecycleTest, MetricsCountBothStretchesOfAPausedRecording) {
+  device_.deviceInfo.audioCaptureDevice = true;
   auto client = game();
-  client.start();
+  client.start({.microphone = true});
   device_.clock.advanceSeconds(7.25);
   sendFrame(kSecond);
+  ASSERT_TRUE(device_.tap.fill(10, kSecond));
+  const auto heard = platform::SampleBuffer::makeAudio(std::make_shared<platform::DataBlock>(std::vector<uint8_t>(20)),
+                                                       captureManager_.createAudioFormatDescription(), 10,
+                                                       platform::MediaTime::make(1, platform::kHostTimescale));
+  for (int i = 0; i < 2; ++i) device_.deviceCapture.send(heard);
+  device_.run();
   client.request("pauseRecording");
   device_.clock.advanceSeconds(100);
   device_.applications.owners[5] = 100;
@@ -97,12 +109,36 @@ TEST_F(LifecycleTest, MetricsCountBothStretchesOfAPausedRecording) {
   client.request("reportCameraUsage", {Value(int32_t{2})});
   client.stop();
   const auto& message = device_.metrics.messages.back();
+  EXPECT_EQ(std::tuple(message.clientType, message.clientVersion, message.sessionID, message.batchEvent,
+                       message.userInfoRequired, message.category, message.type),
+            std::tuple(23, 1, 0, true, true, 1, 0));
+  EXPECT_EQ(message.clientName, "Quorvel");
   EXPECT_EQ(message.serviceName, "InAppRecording");
-  EXPECT_EQ(message.payload.size(), 15u);
-  EXPECT_EQ(valueForKey(message.payload, "ActiveDuration").asInteger(), 13);
-  EXPECT_EQ(valueForKey(message.payload, "VideoFrameCount").asInteger(), 1);
-  EXPECT_TRUE(valueForKey(message.payload, "FrontCameraUsed").asBool());
-  EXPECT_FALSE(valueForKey(message.payload, "BackCameraUsed").asBool());
+  EXPECT_EQ(message.payload, (platform::Dictionary{{"ActiveDuration", Value(int64_t{13})},
+                                                   {"VideoCaptureWidth", Value(int64_t{1280})},
+                                                   {"VideoCaptureHeight", Value(int64_t{720})},
+                                                   {"VideoCaptureRate", Value(int64_t{60})},
+                                                   {"VideoFrameCount", Value(int64_t{1})},
+                                                   {"AppAudioCaptureRate", Value(int32_t{2})},
+                                                   {"AppAudioFrameCount", Value(int64_t{1})},
+                                                   {"MicCaptureRate", Value(int32_t{43})},
+                                                   {"MicFrameCount", Value(int64_t{2})},
+                                                   {"FrontCameraUsed", Value(true)},
+                                                   {"BackCameraUsed", Value(false)},
+                                                   {"RecordedFileSize", Value(uint64_t{7})},
+                                                   {"BroadcastExtensionBundleID", Value("")},
+                                                   {"ClientAppBundleID", Value("")},
+                                                   {"EndReason", Value(int64_t{0})}}));
+  EXPECT_EQ(device_.log.countContaining("payload:{ActiveDuration=13, AppAudioCaptureRate=2, "), 1u);
+  auto system = systemUI();
+  system.start({.system = true});
+  system.request("reportCameraUsage", {Value(int32_t{1})});
+  sendFrame(kSecond);
+  system.stop();
+  const auto& back = device_.metrics.messages.back();
+  EXPECT_EQ(back.serviceName, "SystemRecording");
+  EXPECT_TRUE(valueForKey(back.payload, "BackCameraUsed").asBool());
+  EXPECT_FALSE(valueForKey(back.payload, "FrontCameraUsed").asBool());
 }
 
 TEST_F(LifecycleTest, ShuttingDownCompletesTheMovie) {

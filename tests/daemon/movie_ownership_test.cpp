@@ -53,6 +53,19 @@ TEST_F(MovieOwnershipTest, AStartDuringASaveLosesNothingToIt) {
   EXPECT_EQ(contentAt(stop(client)), "movie 1");
 }
 
+TEST_F(MovieOwnershipTest, AClientMayLeaveWhileItsStartWaitsForASave) {
+  auto client = game();
+  const std::string movie = recordMovie(client);
+  device_.exports.holds = true;
+  client.post("saveVideoToCameraRoll", {Value(movie)});
+  client.postStart({});
+  device_.run();
+  client.disconnect();
+  endExports();
+  EXPECT_EQ(openTransactions(), 0);
+  EXPECT_EQ(device_.photoLibrary.contents, std::vector<std::string>{"movie 0"});
+}
+
 TEST_F(MovieOwnershipTest, AStartReplacesTheOwnFormerMovieAndTheRightToIt) {
   auto client = game();
   const std::string former = recordMovie(client);
@@ -100,7 +113,7 @@ TEST_F(MovieOwnershipTest, ADiscardTakesOnlyWhatItsCallerWasHandedLast) {
 TEST_F(MovieOwnershipTest, ATrimmedStopLeavesOneMovieAndADiscardNone) {
   auto client = game();
   record(client);
-  const std::vector<Value> clips{Value(2.0), Value(3.0)};
+  const std::vector<Value> clips{Value(1.0), Value(1.0)};
   const auto answer = client.request("stopRecordingWithStartClipDuration", clips);
   EXPECT_TRUE(answer->values[0].asString().ends_with("/Game_trimmed.mp4"));
   EXPECT_EQ(storeFiles(), std::vector<std::string>{"Game_trimmed.mp4"});
@@ -114,6 +127,11 @@ TEST_F(MovieOwnershipTest, ATrimmedStopLeavesOneMovieAndADiscardNone) {
   ASSERT_TRUE(*discarded);
   EXPECT_EQ((*discarded)->failureName(), "");
   EXPECT_EQ(storeFiles(), std::vector<std::string>{});
+  for (const auto& [start, end] : {std::pair(0.0, 3.0), std::pair(3.0, 0.0)}) {
+    record(client);
+    const auto whole = client.request("stopRecordingWithStartClipDuration", {Value(start), Value(end)});
+    EXPECT_TRUE(whole->values[0].asString().ends_with("/Game.mp4")) << start;
+  }
   // What cannot be trimmed is handed over whole.
   device_.exports.result = platform::ExportStatus::Failed;
   record(client);

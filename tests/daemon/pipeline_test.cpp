@@ -1,3 +1,4 @@
+#include <cerrno>
 #include <cstring>
 
 #include "session/PictureTransform.h"
@@ -75,13 +76,19 @@ TEST_F(PipelineTest, AnEndedRecordingLeavesItsTimesBehind) {
 TEST_F(PipelineTest, TransformOfAllFlagsOfWhichTheMovieHasNone) {
   const AffineTransform transforms[] = {{1, 0, 0, 1},  {1, 0, 0, -1}, {-1, 0, 0, 1},  {-1, 0, 0, -1},
                                         {0, 1, -1, 0}, {0, 1, 1, 0},  {0, -1, -1, 0}, {0, -1, 1, 0}};
+  // Upright, mirrored at the horizontal, at the vertical, at both; turned to the left, and the same of that.
+  const uint32_t orientations[] = {1, 4, 2, 3, 8, 5, 7, 6};
   for (uint64_t flags = 0; flags < 8; ++flags) {
+    EXPECT_EQ(orientationFromVellTransform(flags), orientations[flags]) << flags;
     EXPECT_EQ(_affineTransformFromVellTransformFlags(flags), transforms[flags]) << flags;
   }
-  EXPECT_EQ(orientationFromVellTransform(9), 1u);
+  for (const uint64_t unknown : {8, 9}) EXPECT_EQ(orientationFromVellTransform(unknown), 1u);
   client_.start();
   sendFrame(kSecond, 5);
   EXPECT_EQ(device_.movies.video().transform, AffineTransform::identity());
+  EXPECT_EQ(device_.movies.video().settings.at(platform::settings::kVideoWidth).asDouble(), 1280);
+  EXPECT_EQ(device_.screen.last().interval, platform::MediaTime::make(1, 60));
+  EXPECT_EQ(device_.screen.last().size, (platform::Size{1280, 720}));
 }
 
 TEST_F(PipelineTest, AudioOfTheApplicationAndAMutedMicrophoneReachTheirTracks) {
@@ -98,6 +105,111 @@ TEST_F(PipelineTest, AudioOfTheApplicationAndAMutedMicrophoneReachTheirTracks) {
   ASSERT_EQ(microphone.size(), 2u);
   EXPECT_EQ(microphone[0]->data()->bytes()[0], 9);
   EXPECT_EQ(microphone[1]->data()->bytes()[0], 0);
+  pause();
+  resume();
+  speak(4 * kSecond, 10);
+  device_.run();
+  EXPECT_EQ(microphone.size(), 2u) << "the pause lasts until the next picture";
+}
+
+/// Picture and pause at 0 s, of 1 s and more: what is written ends where the recording did, pauses left out.
+TEST_F(PipelineTest, AMovieEndsWhereItsRecordingWasStoppedOrPaused) {
+  const auto begin = [this] {
+    client_.start();
+    sendFrame(device_.clock.hostTime().value);
+    const int64_t time = device_.clock.hostTime().value;
+    device_.clock.advanceSeconds(1);
+    pause();
+    device_.clock.advanceSeconds(2);
+    return time;
+  };
+  const auto secondsTo = [this](int64_t time) {
+    client_.stop();
+    return static_cast<double>(device_.movies.last().sessionEnd.value - time) / kSecond;
+  };
+  int64_t start = begin();
+  EXPECT_EQ(secondsTo(start), 1);
+  start = begin();
+  pause();
+  EXPECT_EQ(secondsTo(start), 1) << "paused already";
+  start = begin();
+  resume();
+  device_.clock.advanceSeconds(1);
+  EXPECT_EQ(secondsTo(start), 1) << "no picture closed the pause";
+  start = begin();
+  resume();
+  device_.clock.advanceSeconds(1);
+  pause();
+  EXPECT_EQ(secondsTo(start), 1) << "the pause went on";
+  start = begin();
+  resume();
+  sendFrame(device_.clock.hostTime().value);  // 3 s after the last, whose time it takes
+  device_.clock.advanceSeconds(2);
+  EXPECT_EQ(secondsTo(start), 2);
+}
+
+TEST_F(PipelineTest, AFileThatFailsEndsTheRecordingByItsCauseAndStaysInTheStore) {
+  const auto failWith = [this](const platform::Error& failure) {
+    client_.start();
+    frame(10);
+    device_.movies.last().status = platform::AssetWriterStatus::Failed;
+    device_.movies.last().error = failure;
+  };
+  const auto isInStore = [this] { return !contentAt(device_.movies.last().url.absoluteString()).empty(); };
+  struct {
+    platform::Error failure;
+    uint64_t freeSize;
+    int64_t code;
+  } const cases[] = {{platform::Error::posix(ENOSPC), 1ull << 40, errorcode::kInsufficientStorage},
+                     {platform::Error::posix(EDQUOT), 1ull << 40, errorcode::kInsufficientStorage},
+                     {platform::Error::posix(EIO), 1ull << 40, errorcode::kFailedToSave},
+                     {{"another", ENOSPC, {}}, 1ull << 40, errorcode::kFailedToSave},
+                     {platform::Error::posix(EIO), 0, errorcode::kInsufficientStorage}};
+  for (const auto& [failure, freeSize, code] : cases) {
+    device_.disk.setFreeSize(1ull << 40);
+    failWith(failure);
+    device_.disk.setFreeSize(freeSize);
+    frame(11);
+    EXPECT_EQ(client_.takeEnds(), std::vector<int64_t>{code}) << failure.description();
+    EXPECT_EQ(client_.lastMovie().empty(), code == errorcode::kFailedToSave) << "handed over where it is only full";
+    EXPECT_TRUE(isInStore());
+  }
+  device_.disk.setFreeSize(1ull << 40);
+  failWith(platform::Error::posix(EIO));
+  EXPECT_EQ(client_.stop()->code(1), errorcode::kFailedToSave);
+  EXPECT_TRUE(isInStore());
+}
+
+TEST_F(PipelineTest, DurationsCountFromTheFirstPicture) {
+  struct Delegate final : QVRecordingSessionDelegate {
+    void recordingSessionWillStop(const std::shared_ptr<QVRecordingSession>&,
+                                  const std::shared_ptr<QVRecording>&) override {}
+    void recordingSessionStoppedWithError(const std::shared_ptr<QVRecordingSession>&,
+                                          const std::optional<platform::Error>&,
+                                          const std::optional<platform::URL>&) override {}
+    void recordingSessionDidStop(const std::shared_ptr<QVRecordingSession>&,
+                                 const std::shared_ptr<QVRecording>&) override {}
+    void broadcastSessionDidUpdateServiceInfo(const std::shared_ptr<QVRecordingSession>&,
+                                              const platform::Dictionary&) override {}
+    void broadcastSessionDidUpdateDuration(QVRecordingSession&, double seconds) override {
+      durations.push_back(seconds);
+    }
+    std::vector<double> durations;
+  };
+  device_.deviceInfo.audioCaptureDevice = true;
+  client_.start({.microphone = true});
+  const auto delegate = std::make_shared<Delegate>();
+  const auto session = manager_->sessions().recordingSessionForBundleID(client_.bundleID());
+  session->setDelegate(delegate);
+  frame(10);
+  device_.screen.last().send(nullptr);  // a picture that got lost
+  frame(20);
+  ASSERT_TRUE(device_.tap.fill(100, 3 * kSecond));
+  device_.run();
+  speak(4 * kSecond, 10);
+  device_.run();
+  EXPECT_EQ(delegate->durations, (std::vector<double>{0, 1, 2, 3}));
+  session->setDelegate(manager_);
 }
 
 /// A tap and a microphone hand over at their stop what was captured since their last buffer, here 100 ms that begin
@@ -138,11 +250,15 @@ TEST_F(PipelineTest, SoundOfBeforeAPauseOrAStopIsWrittenThoughItComesAfterwards)
 }
 
 TEST_F(PipelineTest, CaptureHandsFramesAndAudioToTheClient) {
-  client_.start({.capture = true});
+  device_.deviceInfo.audioCaptureDevice = true;
+  client_.start({.microphone = true, .capture = true});
+  speak(kSecond / 2, 10);
+  device_.run();
   frame(10);
   ASSERT_TRUE(device_.tap.fill(100, 2 * kSecond));
   device_.run();
   EXPECT_EQ(client_.object().takeCall().member, "captureTimelineDidChange");
+  EXPECT_EQ(client_.object().takeCall().arguments.at(3).asInteger(), 3) << "the microphone is heard first";
   const auto video = client_.object().takeCall();
   ASSERT_EQ(video.member, "captureHandlerWithSample");
   const auto frame = QVSharedFrameObject::decodeFromIPC(video.arguments[0]);
@@ -159,6 +275,12 @@ TEST_F(PipelineTest, CaptureHandsFramesAndAudioToTheClient) {
   EXPECT_EQ(audio.arguments[2].asInteger(), 100);
   EXPECT_EQ(audio.arguments[3].asInteger(), 2);
   EXPECT_TRUE(device_.movies.movies.empty()) << "a capture makes no file";
+  // What a tap hands over when its client has gone is nobody's.
+  device_.tap.tap->atStop = [this] { (void)device_.tap.fill(100, 3 * kSecond); };
+  client_.disconnect();
+  EXPECT_EQ(device_.metrics.messages.back().serviceName, "InAppCapture");
+  EXPECT_EQ(valueForKey(device_.metrics.messages.back().payload, "RecordedFileSize").asInteger(), 0);
+  EXPECT_EQ(device_.log.countContaining("error getting recordedFileSize"), 0u);
 }
 
 }  // namespace

@@ -71,6 +71,7 @@ TEST_F(SourceEndsTest, AChangeOfSoundThatMeetsTheEndStartsNothing) {
       ASSERT_TRUE(*stopped);
       EXPECT_EQ((*stopped)->code(1), 0);
       EXPECT_TRUE(areSourcesOff()) << member << " after " << pieces;
+      for (const auto& tap : device_.tap.taps) EXPECT_NE(tap->process, 200) << pieces;
       EXPECT_EQ(openTransactions(), 0);
     }
   }
@@ -105,6 +106,64 @@ TEST_F(SourceEndsTest, AnApplicationTapsItsOwnProcessesTheSystemAny) {
   system.start({.system = true});
   system.request("updateProcessIDForAudioCaptureWithPID", {Value(int32_t{200})});
   EXPECT_EQ(device_.tap.tap->process, 200);
+}
+
+TEST_F(SourceEndsTest, AChangeOfProcessInAPauseIsTakenUpByTheResume) {
+  install("First", "com.example.first", 1);  // of a container
+  TestClient client(device_, "com.example.first", 1);
+  client.start();
+  EXPECT_EQ(device_.tap.tap->process, 1);
+  const auto recording = recordingOf(client);
+  recording->updateProcessIDForAudioCaptureWithPID(1);
+  device_.run();
+  EXPECT_EQ(device_.tap.taps.size(), 2u);
+  recording->pauseSession();
+  recording->updateProcessIDForAudioCaptureWithPID(200);
+  recording->checkAndStopAppAudioForPID(200);
+  EXPECT_FALSE(device_.tap.tap->running);
+  recording->resumeSessionWithContextID(5);
+  device_.run();
+  EXPECT_EQ(device_.tap.tap->process, 200);
+  recording->checkAndStopAppAudioForPID(1);
+  EXPECT_TRUE(device_.tap.tap->running) << "of another";
+  recording->checkAndStopAppAudioForPID(200);
+  EXPECT_FALSE(device_.tap.tap->running);
+  client.stop();
+}
+
+TEST_F(SourceEndsTest, ASystemRecordingTakesTheMicrophoneWhenItIsOnAnApplicationWhatItsUserAllowed) {
+  const auto& session = device_.deviceCapture.session;
+  const auto switchOn = [](TestClient& client) { client.request("setMicrophoneEnabled", {Value(true)}); };
+  auto system = systemUI();
+  system.start({.system = true});
+  EXPECT_EQ(session, nullptr);
+  switchOn(system);
+  const auto first = session;
+  ASSERT_TRUE(first && first->running);
+  EXPECT_TRUE(valueForKey(system.state(), "microphoneEnabled").asBool());
+  switchOn(system);
+  EXPECT_EQ(session, first);
+  recordingOf(system)->pauseSession();
+  switchOn(system);
+  EXPECT_FALSE(first->running);
+  recordingOf(system)->resumeSessionWithContextID(0);
+  device_.run();
+  EXPECT_TRUE(session != first && session->running);
+  system.stop();
+
+  device_.deviceCapture.session.reset();
+  auto client = game();
+  client.start();
+  switchOn(client);
+  EXPECT_EQ(session, nullptr) << "nobody was asked";
+  client.start({.microphone = true});
+  EXPECT_TRUE(session && valueForKey(client.state(), "microphoneEnabled").asBool());
+  client.stop();
+  device_.deviceCapture.session.reset();
+  device_.deviceInfo.audioCaptureDevice = false;
+  client.start({.microphone = true});
+  EXPECT_EQ(session, nullptr) << "there is none";
+  client.stop();
 }
 
 TEST_F(SourceEndsTest, SoundBeforeALateFirstFrameGoesBackToItsTap) {
@@ -149,6 +208,11 @@ TEST_F(SourceEndsTest, SilenceThatFillsAGapNeverReachesACaptureClient) {
     ++sounds;
   }
   EXPECT_EQ(sounds, 2);
+  // After a jump of the wall clock there is none: nobody is given the lack of it.
+  device_.clock.setNow({2e9});
+  client.request("updateProcessIDForAudioCaptureWithPID", {Value(int32_t{100})});
+  ASSERT_TRUE(play(now()));
+  EXPECT_EQ(client.object().callCount(), 1u);
 }
 
 }  // namespace

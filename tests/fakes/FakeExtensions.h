@@ -76,7 +76,8 @@ class FakeExtensionService final : public platform::ExtensionService {
 
   std::vector<platform::ExtensionRecordRef> installed;
   std::vector<Request> requests;
-  std::vector<std::string> killed;
+  std::vector<std::string> killed, revoked;
+  bool refusesTokens = false;
   std::shared_ptr<platform::IPCConnection> vendor;
   std::optional<platform::Error> queryError, launchError;
 
@@ -102,9 +103,9 @@ class FakeExtensionService final : public platform::ExtensionService {
           [began = service_.requests.back().handlers.began, id, error = service_.launchError] { began(id, error); });
     }
     std::optional<std::string> issueSandboxToken(const std::string& tokenClass, const std::string& path) override {
-      return tokenClass + " for " + path;
+      return service_.refusesTokens ? std::nullopt : std::optional(tokenClass + " for " + path);
     }
-    void revokeSandboxToken(const std::string&) override {}
+    void revokeSandboxToken(const std::string& token) override { service_.revoked.push_back(token); }
 
    private:
     FakeExtensionService& service_;

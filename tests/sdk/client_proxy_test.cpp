@@ -23,7 +23,9 @@ TEST_F(ClientProxy, FailuresOfSamplesAreToldAsTheirNumberDoubles) {
   EXPECT_EQ(log.count(sound + "1"), 1u);
   EXPECT_EQ(log.countContaining(sound), 10u) << "1, 2, 4 ... 512";
   EXPECT_EQ(log.count(sound + "1 (512 times)"), 1u);
-  EXPECT_EQ(log.countContaining("updateBroadcastURL: error getting remote proxy"), 3u);
+  EXPECT_EQ(log.count("QVClientProxy:updateBroadcastURL: error getting remote proxy: 1"), 3u);
+  QVClientProxy(errors, "com.example.game", nullptr).updateBroadcastURL(platform::URL("https://x"));
+  EXPECT_EQ(log.countContaining("updateBroadcastURL: error getting remote proxy"), 3u) << "its application has gone";
 }
 
 }  // namespace
