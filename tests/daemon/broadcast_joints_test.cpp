@@ -93,20 +93,6 @@ TEST_F(BroadcastJointsTest, TheExtensionIsToldWhoIsInFrontWhenItBegins) {
   system.stop();
 }
 
-TEST_F(BroadcastJointsTest, AnExtensionThatHangsAtTheStartCostsItsPatienceOnce) {
-  auto client = game();
-  install(client, kSamples);
-  EXPECT_EQ(setUp(client), 0);
-  extension_.answers = false;
-  const auto started = startSamples(client);
-  EXPECT_FALSE(*started);
-  device_.timers.advance(kExtensionPatience);
-  device_.run();
-  ASSERT_TRUE(*started);
-  EXPECT_EQ((*started)->code(), errorcode::kInvalidBroadcastSession);
-  EXPECT_EQ(openTransactions(), 0);
-}
-
 TEST_F(BroadcastJointsTest, AnExtensionThatFailsAtOnceLeavesNoSourceOn) {
   device_.deviceInfo.audioCaptureDevice = true;
   auto client = game();

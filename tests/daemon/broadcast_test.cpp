@@ -167,24 +167,10 @@ TEST_F(BroadcastTest, AnExtensionThatGoesEndsItsBroadcastOnly) {
   EXPECT_EQ(openTransactions(), 0);
   EXPECT_EQ(device_.log.countContaining("payload to broadcast extension..."), 0u) << "nothing was taken";
 
-  // One that hangs instead costs the stop ten seconds, and gets the newest two seconds of sound if it goes on.
+  // One that hangs instead costs the stop ten seconds.
   device_.extensions.installed.clear();
   extension_.answers = true;
   broadcastSamples();
-  extension_.answers = false;
-  extension_.received.clear();
-  extension_.unanswered.clear();
-  for (int64_t tenth = 100; tenth < 160; ++tenth) {
-    if (tenth % 10 == 0) frame(tenth);
-    sound(tenth);
-  }
-  extension_.answers = true;
-  for (const auto& reply : std::exchange(extension_.unanswered, {})) reply({});
-  device_.run();
-  EXPECT_NEAR(std::count_if(extension_.received.begin(), extension_.received.end(),
-                            [](const auto& each) { return each.contains(broadcastpayload::kNumSamples); }),
-              3 + 20, 1)
-      << "with a picture the first three are on their way";
   extension_.answers = false;
   client_.send("stopRecordingWithHandler");
   EXPECT_FALSE(client_.answer());

@@ -53,19 +53,6 @@ TEST_F(MovieOwnershipTest, AStartDuringASaveLosesNothingToIt) {
   EXPECT_EQ(contentAt(stop(client)), "movie 1");
 }
 
-TEST_F(MovieOwnershipTest, AClientMayLeaveWhileItsStartWaitsForASave) {
-  auto client = game();
-  const std::string movie = recordMovie(client);
-  device_.exports.holds = true;
-  client.post("saveVideoToCameraRoll", {Value(movie)});
-  client.postStart({});
-  device_.run();
-  client.disconnect();
-  endExports();
-  EXPECT_EQ(openTransactions(), 0);
-  EXPECT_EQ(device_.photoLibrary.contents, std::vector<std::string>{"movie 0"});
-}
-
 TEST_F(MovieOwnershipTest, AStartReplacesTheOwnFormerMovieAndTheRightToIt) {
   auto client = game();
   const std::string former = recordMovie(client);

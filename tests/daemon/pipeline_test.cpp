@@ -1,5 +1,6 @@
 #include <cerrno>
 #include <cstring>
+#include <tuple>
 
 #include "session/PictureTransform.h"
 #include "tests/daemon/DaemonTest.h"
@@ -112,40 +113,24 @@ TEST_F(PipelineTest, AudioOfTheApplicationAndAMutedMicrophoneReachTheirTracks) {
   EXPECT_EQ(microphone.size(), 2u) << "the pause lasts until the next picture";
 }
 
-/// Picture and pause at 0 s, of 1 s and more: what is written ends where the recording did, pauses left out.
+/// A picture, a second, a pause of two; then what the case says, and a stop.
 TEST_F(PipelineTest, AMovieEndsWhereItsRecordingWasStoppedOrPaused) {
-  const auto begin = [this] {
+  const auto picture = [this] { sendFrame(device_.clock.hostTime().value); };
+  const auto wait = [this](double seconds) { device_.clock.advanceSeconds(seconds); };
+  const std::pair<std::function<void()>, int> cases[] = {
+      {[&] {}, 1},
+      {[&] { pause(); }, 1},
+      {[&] { resume(), wait(1); }, 1},  // no picture closed the pause
+      {[&] { resume(), wait(1), pause(); }, 1},
+      {[&] { resume(), picture(), wait(2); }, 2}};  // the picture takes the first one's time
+  for (const auto& [goOn, seconds] : cases) {
     client_.start();
-    sendFrame(device_.clock.hostTime().value);
-    const int64_t time = device_.clock.hostTime().value;
-    device_.clock.advanceSeconds(1);
-    pause();
-    device_.clock.advanceSeconds(2);
-    return time;
-  };
-  const auto secondsTo = [this](int64_t time) {
+    const auto begin = device_.clock.hostTime();
+    picture(), wait(1), pause(), wait(2);
+    goOn();
     client_.stop();
-    return static_cast<double>(device_.movies.last().sessionEnd.value - time) / kSecond;
-  };
-  int64_t start = begin();
-  EXPECT_EQ(secondsTo(start), 1);
-  start = begin();
-  pause();
-  EXPECT_EQ(secondsTo(start), 1) << "paused already";
-  start = begin();
-  resume();
-  device_.clock.advanceSeconds(1);
-  EXPECT_EQ(secondsTo(start), 1) << "no picture closed the pause";
-  start = begin();
-  resume();
-  device_.clock.advanceSeconds(1);
-  pause();
-  EXPECT_EQ(secondsTo(start), 1) << "the pause went on";
-  start = begin();
-  resume();
-  sendFrame(device_.clock.hostTime().value);  // 3 s after the last, whose time it takes
-  device_.clock.advanceSeconds(2);
-  EXPECT_EQ(secondsTo(start), 2);
+    EXPECT_EQ(device_.movies.last().sessionEnd - begin, platform::MediaTime::make(seconds, 1));
+  }
 }
 
 TEST_F(PipelineTest, AFileThatFailsEndsTheRecordingByItsCauseAndStaysInTheStore) {
@@ -156,17 +141,15 @@ TEST_F(PipelineTest, AFileThatFailsEndsTheRecordingByItsCauseAndStaysInTheStore)
     device_.movies.last().error = failure;
   };
   const auto isInStore = [this] { return !contentAt(device_.movies.last().url.absoluteString()).empty(); };
-  struct {
-    platform::Error failure;
-    uint64_t freeSize;
-    int64_t code;
-  } const cases[] = {{platform::Error::posix(ENOSPC), 1ull << 40, errorcode::kInsufficientStorage},
-                     {platform::Error::posix(EDQUOT), 1ull << 40, errorcode::kInsufficientStorage},
-                     {platform::Error::posix(EIO), 1ull << 40, errorcode::kFailedToSave},
-                     {{"another", ENOSPC, {}}, 1ull << 40, errorcode::kFailedToSave},
-                     {platform::Error::posix(EIO), 0, errorcode::kInsufficientStorage}};
+  constexpr uint64_t kRoom = 1ull << 40;
+  const std::tuple<platform::Error, uint64_t, int64_t> cases[] = {
+      {platform::Error::posix(ENOSPC), kRoom, errorcode::kInsufficientStorage},
+      {platform::Error::posix(EDQUOT), kRoom, errorcode::kInsufficientStorage},
+      {platform::Error::posix(EIO), kRoom, errorcode::kFailedToSave},
+      {{"another", ENOSPC, {}}, kRoom, errorcode::kFailedToSave},
+      {platform::Error::posix(EIO), 0, errorcode::kInsufficientStorage}};
   for (const auto& [failure, freeSize, code] : cases) {
-    device_.disk.setFreeSize(1ull << 40);
+    device_.disk.setFreeSize(kRoom);
     failWith(failure);
     device_.disk.setFreeSize(freeSize);
     frame(11);
@@ -174,42 +157,10 @@ TEST_F(PipelineTest, AFileThatFailsEndsTheRecordingByItsCauseAndStaysInTheStore)
     EXPECT_EQ(client_.lastMovie().empty(), code == errorcode::kFailedToSave) << "handed over where it is only full";
     EXPECT_TRUE(isInStore());
   }
-  device_.disk.setFreeSize(1ull << 40);
+  device_.disk.setFreeSize(kRoom);
   failWith(platform::Error::posix(EIO));
   EXPECT_EQ(client_.stop()->code(1), errorcode::kFailedToSave);
   EXPECT_TRUE(isInStore());
-}
-
-TEST_F(PipelineTest, DurationsCountFromTheFirstPicture) {
-  struct Delegate final : QVRecordingSessionDelegate {
-    void recordingSessionWillStop(const std::shared_ptr<QVRecordingSession>&,
-                                  const std::shared_ptr<QVRecording>&) override {}
-    void recordingSessionStoppedWithError(const std::shared_ptr<QVRecordingSession>&,
-                                          const std::optional<platform::Error>&,
-                                          const std::optional<platform::URL>&) override {}
-    void recordingSessionDidStop(const std::shared_ptr<QVRecordingSession>&,
-                                 const std::shared_ptr<QVRecording>&) override {}
-    void broadcastSessionDidUpdateServiceInfo(const std::shared_ptr<QVRecordingSession>&,
-                                              const platform::Dictionary&) override {}
-    void broadcastSessionDidUpdateDuration(QVRecordingSession&, double seconds) override {
-      durations.push_back(seconds);
-    }
-    std::vector<double> durations;
-  };
-  device_.deviceInfo.audioCaptureDevice = true;
-  client_.start({.microphone = true});
-  const auto delegate = std::make_shared<Delegate>();
-  const auto session = manager_->sessions().recordingSessionForBundleID(client_.bundleID());
-  session->setDelegate(delegate);
-  frame(10);
-  device_.screen.last().send(nullptr);  // a picture that got lost
-  frame(20);
-  ASSERT_TRUE(device_.tap.fill(100, 3 * kSecond));
-  device_.run();
-  speak(4 * kSecond, 10);
-  device_.run();
-  EXPECT_EQ(delegate->durations, (std::vector<double>{0, 1, 2, 3}));
-  session->setDelegate(manager_);
 }
 
 /// A tap and a microphone hand over at their stop what was captured since their last buffer, here 100 ms that begin
