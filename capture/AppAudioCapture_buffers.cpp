@@ -33,7 +33,10 @@ void AppAudioCapture::processInputBuffer(AudioRecorderRecord& record, QueueBuffe
     QV_LOG(logs::kCapture, "recorder is not running, ignoring audio data");
     return;
   }
+  const uint32_t bytesPerPacket = record.dataFormat.bytesPerPacket;
+  const uint32_t packets = packetCount != 0 ? packetCount : bytesPerPacket != 0 ? buffer->byteSize / bytesPerPacket : 0;
   deliverAppAudio(record, *buffer, platform::mediaTimeFromHostTime(startTime.hostTime), packetCount);
+  record.currentPacket += packets;
   if (record.queue->enqueueBuffer(buffer) == 0) {
     QV_LOG_DEBUG(logs::kCapture, "QVRecordingManager: HandleInputBuffer: Successfully enqueued the audio buffer");
   }
@@ -47,8 +50,9 @@ void AppAudioCapture::deliverAppAudio(const AudioRecorderRecord& record, const Q
       std::make_shared<const platform::DataBlock>(std::vector<uint8_t>(buffer.data, buffer.data + buffer.byteSize));
   const auto sample =
       platform::SampleBuffer::makeAudio(std::move(data), std::move(format), packetCount, presentationTime);
+  if (!sample) return;
   lastAudioDate_ = Date{platform_.clock->now().secondsSince1970 + sample->duration().seconds()};
-  outputHandler_(sample);
+  if (outputHandler_) outputHandler_(sample);
 }
 
 void AppAudioCapture::fillGapAfterResume() {
@@ -57,7 +61,7 @@ void AppAudioCapture::fillGapAfterResume() {
   if (!(gap > 0.0)) return;
   QV_LOG(logs::kCapture, "gap since last audio tap, filling with empty sample buffer");
   const auto filler = manager_.createEmptyAudioSampleBuffer(MediaTime::zero(), gap);
-  outputHandler_(filler);
+  if (outputHandler_) outputHandler_(filler);
 }
 
 }  // namespace qv

@@ -14,8 +14,8 @@ class QVCaptureManager;
 /// the tap that it has started, and its end stops that tap and no other.
 ///
 /// Sound before `captureStartTime` (the first screen frame of the stretch) is left out; until that is set, the tap's
-/// buffers go back to it unread, so that it goes on at its own pace. The output handler is not empty, and must accept
-/// an absent sample: a filler that could not be made.
+/// buffers go back to it unread, so that it goes on at its own pace. The output handler must accept an absent sample: a
+/// filler that could not be made.
 ///
 /// Threading: thread-safe. Starts work asynchronously on the audio dispatch queue, where the handlers are called too;
 /// stops (and the destructor) wait for it and must not be called from it, nor with a lock held that a handler takes.

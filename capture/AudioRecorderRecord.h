@@ -33,6 +33,7 @@ struct AudioRecorderRecord {
   platform::AudioStreamDescription dataFormat;
   std::array<platform::QueueBuffer*, kTapBufferCount> buffers{};
   uint32_t bufferByteSize = 0;
+  int64_t currentPacket = 0;  ///< packets received since the start
   /// False once the queue has refused to stop: nobody asked for what it goes on to bring.
   bool isRunning = true;
   bool resumed = false;  ///< the gap before its first buffer is still to be filled

@@ -38,9 +38,14 @@ void MicrophoneCapture::attachMicrophone() {
   QV_LOG(logs::kCapture, "QVCaptureManager: setAudioCaptureEnabled: YES");
   startCaptureSession();
   const auto session = captureSession_.load();
+  if (!session) return;
   session->setUsesApplicationAudioSession(true);
   session->setAutomaticallyConfiguresApplicationAudioSession(false);
   attachInputAndOutput(*session);
+  if (session->isRunning()) {
+    runMicDidStartHandler(*micDidStartHandler_);
+    return;
+  }
   session->setRunningObserver([weakPending = std::weak_ptr(micDidStartHandler_)] {
     if (const auto pending = weakPending.lock()) runMicDidStartHandler(*pending);
   });
@@ -51,6 +56,7 @@ void MicrophoneCapture::attachInputAndOutput(platform::DeviceCaptureSession& ses
   captureDeviceAudioInput_ = platform_.deviceCapture->createDefaultAudioInput();
   if (session.canAddInput(captureDeviceAudioInput_)) session.addInput(captureDeviceAudioInput_);
   captureSessionAudioDataOutput_ = platform_.deviceCapture->createAudioDataOutput();
+  if (!captureSessionAudioDataOutput_) return;
   captureSessionAudioDataOutput_->setSampleDelegate(this, &manager_.sessionSampleBufferQueue());
   if (session.canAddOutput(captureSessionAudioDataOutput_)) session.addOutput(captureSessionAudioDataOutput_);
 }
@@ -84,6 +90,7 @@ void MicrophoneCapture::stopMicrophoneCapture() {
 
 void MicrophoneCapture::captureOutputDidOutputSampleBuffer(const platform::CaptureOutput&,
                                                            const SampleBufferRef& sample) {
+  if (!microphoneOutputHandler_) return;
   checkAndHandleMicInterruption();
   lastMicAudioDate_ = Date{platform_.clock->now().secondsSince1970 + sample->duration().seconds()};
   micInterruptionPresentationTimeStamp_ = sample->presentationTime() + sample->duration();

@@ -79,11 +79,9 @@ class AudioSession {
 class DeviceCaptureService {
  public:
   virtual ~DeviceCaptureService() = default;
-  /// One that does not run yet; never null.
   virtual std::shared_ptr<DeviceCaptureSession> createSession() = 0;
   /// The default microphone; nothing where there is none or it cannot be opened.
   virtual std::shared_ptr<CaptureDeviceInput> createDefaultAudioInput() = 0;
-  /// Never null.
   virtual std::shared_ptr<AudioDataOutput> createAudioDataOutput() = 0;
   virtual AudioSession& audioSession() = 0;
 };

@@ -1,23 +1,41 @@
 #include "session/TimingGate.h"
 
 #include <utility>
+#include <vector>
+
+#include "platform/threads/Log.h"
 
 namespace qv {
 
 using platform::MediaTime;
 using platform::SampleBuffer;
 using platform::SampleBufferRef;
+namespace logs = platform::logs;
 
 namespace {
 
 /// All pictures of a recording share one timescale.
 MediaTime difference(const MediaTime& a, const MediaTime& b) { return MediaTime::make(a.value - b.value, a.timescale); }
 
-/// The sample itself where nothing is to be taken off.
+SampleBufferRef _copySampleBufferFromSourceBuffer(const SampleBufferRef& sample, MediaTime updatedTimeStamp) {
+  size_t bytes = 0;
+  if (__builtin_mul_overflow(sample->timing().size(), sizeof(platform::SampleTimingInfo), &bytes)) {
+    QV_LOG_ERROR(logs::kSession, "QVRecordingSession: _copySampleBufferFromSourceBuffer: Overflow detected");
+    return nullptr;
+  }
+  std::vector<platform::SampleTimingInfo> timing(sample->timing().begin(), sample->timing().end());
+  for (platform::SampleTimingInfo& entry : timing) {
+    entry.presentationTimeStamp = updatedTimeStamp;
+    entry.decodeTimeStamp = MediaTime::invalid();
+  }
+  return SampleBuffer::copyWithNewTiming(sample, std::move(timing));
+}
+
+/// The sample itself where nothing is to be taken off, and where it cannot be copied.
 SampleBufferRef _updateSampleBufferWithOffset(const SampleBufferRef& sample, MediaTime offset) {
   if (offset == MediaTime::zero()) return sample;
-  const MediaTime time = difference(sample->presentationTime(), offset);
-  return SampleBuffer::copyWithNewTiming(sample, {{sample->duration(), time, MediaTime::invalid()}});
+  const auto copy = _copySampleBufferFromSourceBuffer(sample, difference(sample->presentationTime(), offset));
+  return copy ? copy : sample;
 }
 
 }  // namespace
@@ -32,7 +50,9 @@ void TimingGate::accountForPause(MediaTime time) {
   const MediaTime last = std::exchange(lastSampleTimestamp_, time);
   if (!std::exchange(sessionWasResumed_, false)) return;
   const MediaTime gap = difference(time, last);
-  sampleTimeOffset_ = MediaTime::make(sampleTimeOffset_.value + gap.value, gap.timescale);
+  sampleTimeOffset_ = sampleTimeOffset_ == MediaTime::zero()
+                          ? gap
+                          : MediaTime::make(sampleTimeOffset_.value + gap.value, gap.timescale);
 }
 
 MediaTime TimingGate::endTime(MediaTime stoppedAt) const {
