@@ -2,6 +2,7 @@
 
 #include <fcntl.h>
 
+#include <algorithm>
 #include <cerrno>
 #include <type_traits>
 
@@ -74,85 +75,83 @@ class MessageReader {
  public:
   MessageReader(sd_bus_message* message, FormSink& sink) : message_(message), sink_(sink) {}
 
-  /// More than 0 for a value, 0 where there is none any more in this container.
-  int read(int depth) {
+  /// Whether there was a value: none is at the end of a container, and after an error.
+  bool read(int depth) {
     char type = 0;
     const char* peeked = nullptr;
     const int r = sd_bus_message_peek_type(message_, &type, &peeked);
-    if (r <= 0) return r;
-    if (depth > kMaximumFormDepth) return -ELOOP;
+    if (r == 0 || !succeeds(r)) return false;
+    if (depth > kMaximumFormDepth) return succeeds(-ELOOP);
     const std::string contents(peeked ? peeked : "");
     if (type == 'e') return readContainer(type, contents, depth);
-    if (!spend(kCostPerValue)) return -E2BIG;
+    if (!spend(kCostPerValue)) return false;
     if (type == 'a' && contents == "y") return readBytes();
-    if (type == 'a' && contents[0] == '{' && contents[1] != 's') return -EINVAL;
+    if (type == 'a' && contents[0] == '{' && contents[1] != 's') return succeeds(-EINVAL);
     if (type == 'a' || type == 'r' || type == 'v') return readContainer(type, contents, depth + 1);
     if (type == 's' || type == 'o' || type == 'g') return readText(type);
     return type == 'h' ? readDescriptor() : readNumber(type);
   }
+  /// 0 or a negative errno.
+  [[nodiscard]] int error() const { return error_; }
 
  private:
+  bool succeeds(int r) {
+    error_ = std::min(r, 0);
+    return r >= 0;
+  }
+
   bool spend(size_t bytes) {
-    if (bytes > budget_) return false;
+    if (bytes > budget_) return succeeds(-E2BIG);
     budget_ -= bytes;
     return true;
   }
 
-  int readContainer(char kind, const std::string& contents, int depth) {
-    int r = sd_bus_message_enter_container(message_, kind, contents.c_str());
-    if (r <= 0) return r < 0 ? r : -EBADMSG;
-    if ((r = sink_.open(kind, contents)) < 0) return r;
-    while ((r = read(depth)) > 0) {
+  bool readContainer(char kind, const std::string& contents, int depth) {
+    if (!succeeds(sd_bus_message_enter_container(message_, kind, contents.c_str()))) return false;
+    if (!succeeds(sink_.open(kind, contents))) return false;
+    while (read(depth)) {
     }
-    if (r >= 0) r = sd_bus_message_exit_container(message_);
-    if (r >= 0) r = sink_.close();
-    return r < 0 ? r : 1;
+    return error_ == 0 && succeeds(sd_bus_message_exit_container(message_)) && succeeds(sink_.close());
   }
 
-  int readBytes() {
+  bool readBytes() {
     const void* bytes = nullptr;
     size_t size = 0;
-    const int r = sd_bus_message_read_array(message_, 'y', &bytes, &size);
-    if (r < 0) return r;
-    return spend(size) ? took(sink_.bytes({static_cast<const uint8_t*>(bytes), size})) : -E2BIG;
+    if (!succeeds(sd_bus_message_read_array(message_, 'y', &bytes, &size)) || !spend(size)) return false;
+    return succeeds(sink_.bytes({static_cast<const uint8_t*>(bytes), size}));
   }
 
-  int readText(char type) {
+  bool readText(char type) {
     const char* text = nullptr;
-    if (const int r = readBasic(type, &text); r < 0) return r;
+    if (!readBasic(type, &text)) return false;
     const std::string_view view(text);
-    return spend(view.size()) ? took(sink_.text(view)) : -E2BIG;
+    return spend(view.size()) && succeeds(sink_.text(view));
   }
 
-  int readDescriptor() {
+  bool readDescriptor() {
     int borrowed = -1;
-    if (const int r = readBasic('h', &borrowed); r < 0) return r;
+    if (!readBasic('h', &borrowed)) return false;
     FileDescriptor copy(::fcntl(borrowed, F_DUPFD_CLOEXEC, 3));
-    return copy.isValid() ? took(sink_.descriptor(shareFileDescriptor(std::move(copy)))) : -errno;
+    return succeeds(copy.isValid() ? sink_.descriptor(shareFileDescriptor(std::move(copy))) : -errno);
   }
 
   /// Values have no numbers of less than 32 bits.
-  int readNumber(char type) {
-    return visitNumberType(type, [&]<typename Number>() {
+  bool readNumber(char type) {
+    return succeeds(visitNumberType(type, [&]<typename Number>() {
       constexpr bool isBool = std::is_same_v<Number, bool>;
       using Wide = std::conditional_t<std::is_signed_v<Number>, int32_t, uint32_t>;
       using Exact = std::conditional_t<isBool || sizeof(Number) >= sizeof(Wide), Number, Wide>;
       std::conditional_t<isBool, int, Number> wire{};
-      const int r = readBasic(type, &wire);
-      return r < 0 ? r : took(sink_.number(type, Value(static_cast<Exact>(wire))));
-    });
+      return readBasic(type, &wire) ? sink_.number(type, Value(static_cast<Exact>(wire))) : error_;
+    }));
   }
 
-  int readBasic(char type, void* wire) {
-    const int r = sd_bus_message_read_basic(message_, type, wire);
-    return r == 0 ? -EBADMSG : r;
-  }
-
-  static int took(int r) { return r < 0 ? r : 1; }
+  bool readBasic(char type, void* wire) { return succeeds(sd_bus_message_read_basic(message_, type, wire)); }
 
   sd_bus_message* const message_;
   FormSink& sink_;
   size_t budget_ = kMaximumDecodedBytes;
+  int error_ = 0;
 };
 
 }  // namespace
@@ -172,7 +171,7 @@ int decodeArguments(sd_bus_message* message, const std::vector<std::string>& sig
   ValueAssembly assembly;
   MessageReader reader(message, assembly);
   for (size_t i = 0; i < signatures.size(); ++i) {
-    if (const int r = reader.read(0); r <= 0) return r < 0 ? r : -EBADMSG;
+    if (!reader.read(0)) return reader.error() != 0 ? reader.error() : -EBADMSG;
   }
   values = assembly.take();
   return 0;

@@ -78,10 +78,10 @@ int BusDriver::prepareBus() {
   bus_.reset(bus);
   if ((r = sd_bus_set_fd(bus, socket_.get(), socket_.get())) < 0) return r;
   const int fd = socket_.release();
-  if ((r = sd_bus_negotiate_fds(bus, 1)) < 0) return r;
+  if ((r = sd_bus_negotiate_fds(bus, true)) < 0) return r;
   if (side_ == Side::Server) {
     sd_id128_t id{};
-    if ((r = sd_id128_randomize(&id)) < 0 || (r = sd_bus_set_server(bus, 1, id)) < 0) return r;
+    if ((r = sd_id128_randomize(&id)) < 0 || (r = sd_bus_set_server(bus, true, id)) < 0) return r;
     if ((r = addBusObject(bus)) < 0) return r;
   }
   if ((r = sd_bus_add_filter(bus, nullptr, &BusDriver::onMessage, this)) < 0) return r;
@@ -106,7 +106,7 @@ void BusDriver::process(bool hangUp, bool writable) {
     // sd-bus writes before it reads, one step a call: with room to write, nothing is read.
     writable = false;
     r = sd_bus_process(bus_.get(), nullptr);
-    if (r >= 0) r = receiveFailure_ < 0 ? receiveFailure_ : r;
+    r = receiveFailure_.value_or(r);
   }
   if (!bus_) return;
   if (r < 0) return lost(r);

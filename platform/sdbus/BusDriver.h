@@ -142,7 +142,7 @@ class BusDriver final : public std::enable_shared_from_this<BusDriver> {
   std::unordered_map<uint64_t, ReceivedCall> received_;
   Peer peer_ = Peer::Unheard;
   bool everSent_ = false;
-  int receiveFailure_ = 0;
+  std::optional<int> receiveFailure_;  ///< ends the connection after this step
   std::optional<Drain> drain_;
 };
 

@@ -53,7 +53,7 @@ int BusDriver::receiveCall(sd_bus_message* message, sd_bus_error* error) {
   }
   IPCArguments arguments;
   const int r = decodeArguments(message, operation->arguments, arguments);
-  if (r < 0 && isGarbage(r)) receiveFailure_ = r;
+  if (isGarbage(r)) receiveFailure_ = r;
   if (r == -EINVAL) return sd_bus_error_set(error, SD_BUS_ERROR_INVALID_ARGS, "a type that is not understood");
   if (r < 0) return sd_bus_error_set(error, SD_BUS_ERROR_LIMITS_EXCEEDED, std::strerror(-r));
   uint64_t token = 0;
@@ -71,7 +71,7 @@ void BusDriver::receiveReply(sd_bus_message* message) {
   if (sd_bus_message_get_reply_cookie(message, &cookie) < 0) return;
   noteProgress();
   if (drain_ && drain_->marker != 0 && cookie == drain_->marker) {
-    receiveFailure_ = -ECONNRESET;  // all is read; ends the connection after this step
+    receiveFailure_ = -ECONNRESET;  // all is read
     return;
   }
   const auto it = sentCalls_.find(cookie);
@@ -85,7 +85,7 @@ void BusDriver::receiveReply(sd_bus_message* message) {
   int r = 0;
   if (!sd_bus_message_has_signature(message, InterfaceTable::replySignature(operation).c_str())) r = -EINVAL;
   if (r == 0 && operation.reply) r = decodeArguments(message, *operation.reply, values);
-  if (r < 0 && isGarbage(r)) receiveFailure_ = r;
+  if (isGarbage(r)) receiveFailure_ = r;
   if (r < 0) return endCall(call.id, ipcError(IPCErrorCode::RemoteError, "a malformed reply"));
   endCall(call.id, std::move(values));
 }

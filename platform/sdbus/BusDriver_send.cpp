@@ -80,7 +80,7 @@ int BusDriver::sendMessage(OutgoingCall& call) {
   if (r < 0) return r;
   const MessageHandle message(created);
   if ((r = encodeArguments(created, call.operation->arguments, call.arguments)) < 0) return r;
-  if (!call.expectsReply && (r = sd_bus_message_set_expect_reply(created, 0)) < 0) return r;
+  if (!call.expectsReply && (r = sd_bus_message_set_expect_reply(created, false)) < 0) return r;
   uint64_t cookie = 0;
   if ((r = sd_bus_send(bus_.get(), created, call.expectsReply ? &cookie : nullptr)) < 0) return r;
   if (call.expectsReply) {

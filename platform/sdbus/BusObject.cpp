@@ -17,7 +17,7 @@ int onGetNameOwner(sd_bus_message* call, void*, sd_bus_error*) {
   return r < 0 ? r : sd_bus_reply_method_return(call, "s", name);
 }
 
-int onNameHasOwner(sd_bus_message* call, void*, sd_bus_error*) { return sd_bus_reply_method_return(call, "b", 1); }
+int onNameHasOwner(sd_bus_message* call, void*, sd_bus_error*) { return sd_bus_reply_method_return(call, "b", true); }
 
 int onStartServiceByName(sd_bus_message* call, void*, sd_bus_error*) {
   constexpr uint32_t kAlreadyRunning = 2;

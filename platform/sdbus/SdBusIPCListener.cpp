@@ -47,21 +47,20 @@ FileDescriptor ListenerState::acceptNext(bool& isEmpty) {
   }
   FileDescriptor accepted(::accept4(socket_.get(), nullptr, nullptr, SOCK_CLOEXEC | SOCK_NONBLOCK));
   if (accepted.isValid()) return accepted;
-  if (errno == EMFILE || errno == ENFILE) {
-    refuseOne();
-  } else {
-    isEmpty = errno != EINTR && errno != ECONNABORTED;
-  }
+  const bool isOutOfDescriptors = errno == EMFILE || errno == ENFILE;
+  isEmpty = !isOutOfDescriptors || !refuseOne();
   return {};
 }
 
 /// Without this a full descriptor table would wake the thread without end.
-void ListenerState::refuseOne() {
-  QV_LOG_ERROR(logs::kIPC, "out of descriptors: refusing a connection");
+bool ListenerState::refuseOne() {
   spare_.reset();
   FileDescriptor refused(::accept4(socket_.get(), nullptr, nullptr, SOCK_CLOEXEC));
+  const bool isRefused = refused.isValid();
   refused.reset();
   spare_ = openSpare();
+  if (isRefused) QV_LOG_ERROR(logs::kIPC, "out of descriptors: refusing a connection");
+  return isRefused;
 }
 
 void ListenerState::acceptAll() {

@@ -34,7 +34,7 @@ struct ListenerState : std::enable_shared_from_this<ListenerState> {
   void acceptAll();
   void acceptOne(FileDescriptor connected);
   [[nodiscard]] FileDescriptor acceptNext(bool& isEmpty);
-  void refuseOne();
+  bool refuseOne();  ///< false where nobody waits
   void offer(const std::shared_ptr<IPCConnection>& connection);
 
   // I/O thread:

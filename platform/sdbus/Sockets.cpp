@@ -22,7 +22,6 @@
 namespace qv::platform::sdbus {
 namespace {
 
-constexpr int kConnectTimeoutSeconds = 5;
 constexpr mode_t kAnyLocalUser = 0666;
 
 std::optional<sockaddr_un> addressOf(const std::string& path) {
@@ -47,7 +46,9 @@ Result<FileDescriptor> lockService(const std::string& path) {
 bool removeStaleSocket(const std::string& path) {
   struct stat status {};
   if (::lstat(path.c_str(), &status) != 0) return errno == ENOENT;
-  return S_ISSOCK(status.st_mode) && ::unlink(path.c_str()) == 0;
+  if (S_ISSOCK(status.st_mode)) return ::unlink(path.c_str()) == 0;
+  errno = EEXIST;
+  return false;
 }
 
 int integerOption(int socket, int option) {
@@ -59,27 +60,13 @@ int integerOption(int socket, int option) {
 /// Whether this is an end of a stream pair, as `connectThrough` sends it: connected, and to no
 /// named socket, so that nobody makes us talk to some other service.
 bool isStreamPairEnd(int fd) {
-  if (integerOption(fd, SO_DOMAIN) != AF_UNIX || integerOption(fd, SO_TYPE) != SOCK_STREAM) return false;
-  if (integerOption(fd, SO_ACCEPTCONN) != 0) return false;
-  sockaddr_un address{};
-  socklen_t size = sizeof address;
-  if (::getpeername(fd, reinterpret_cast<sockaddr*>(&address), &size) != 0 || size > sizeof address.sun_family) {
-    return false;
-  }
-  size = sizeof address;
-  return ::getsockname(fd, reinterpret_cast<sockaddr*>(&address), &size) == 0 && size <= sizeof address.sun_family;
-}
-
-SharedFileDescriptor processHandleOf(int socket, pid_t pid) {
-  if (pid <= 0) return nullptr;
-  const int pinned = integerOption(socket, SO_PEERPIDFD);
-  if (pinned >= 0) return shareFileDescriptor(FileDescriptor(pinned));
-  // Before Linux 6.5: the pid may have been reused already, but not while its socket is still open.
-  FileDescriptor opened(static_cast<int>(::syscall(SYS_pidfd_open, pid, 0)));
-  if (!opened.isValid()) return nullptr;
-  pollfd hangUp{socket, 0, 0};
-  if (::poll(&hangUp, 1, 0) != 0) return nullptr;
-  return shareFileDescriptor(std::move(opened));
+  const auto isUnnamed = [fd](auto nameOf) {
+    sockaddr_un address{};
+    socklen_t size = sizeof address;
+    return nameOf(fd, reinterpret_cast<sockaddr*>(&address), &size) == 0 && size == sizeof address.sun_family &&
+           address.sun_family == AF_UNIX;
+  };
+  return integerOption(fd, SO_TYPE) == SOCK_STREAM && isUnnamed(::getpeername) && isUnnamed(::getsockname);
 }
 
 /// A message of one byte with room for the descriptors that it carries.
@@ -122,7 +109,7 @@ Result<NamedSocket> listenAt(const std::string& path) {
   if (!socket.isValid()) return Error::posix(errno, path);
   if (!removeStaleSocket(path) || ::bind(socket.get(), asAddress(*address), sizeof *address) != 0 ||
       ::chmod(path.c_str(), kAnyLocalUser) != 0 || ::listen(socket.get(), SOMAXCONN) != 0) {
-    return Error::posix(errno != 0 ? errno : EEXIST, path);
+    return Error::posix(errno, path);
   }
   return NamedSocket{std::move(socket), std::move(*lock)};
 }
@@ -130,7 +117,7 @@ Result<NamedSocket> listenAt(const std::string& path) {
 std::optional<FileDescriptor> adoptActivatedSocket(const std::string& path) {
   const int count = sd_listen_fds(0);
   for (int fd = SD_LISTEN_FDS_START; fd < SD_LISTEN_FDS_START + count; ++fd) {
-    if (sd_is_socket_unix(fd, SOCK_STREAM, 1, path.c_str(), 0) <= 0) continue;
+    if (sd_is_socket_unix(fd, SOCK_STREAM, true, path.c_str(), 0) <= 0) continue;
     // A copy: the listener may be ended and opened again.
     FileDescriptor copy(::fcntl(fd, F_DUPFD_CLOEXEC, 3));
     if (!copy.isValid() || ::fcntl(copy.get(), F_SETFL, O_NONBLOCK) != 0) return std::nullopt;
@@ -144,7 +131,7 @@ Result<FileDescriptor> connectTo(const std::string& path) {
   if (!address) return Error::posix(ENAMETOOLONG, path);
   FileDescriptor socket(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
   if (!socket.isValid()) return Error::posix(errno, path);
-  const timeval timeout{kConnectTimeoutSeconds, 0};
+  const timeval timeout{kConnectPatience.count(), 0};
   ::setsockopt(socket.get(), SOL_SOCKET, SO_SNDTIMEO, &timeout, sizeof timeout);
   int r = 0;
   do {
@@ -160,7 +147,7 @@ Result<std::pair<FileDescriptor, FileDescriptor>> createRendezvous() {
   return std::pair{FileDescriptor(ends[0]), FileDescriptor(ends[1])};
 }
 
-Result<FileDescriptor> connectThrough(int rendezvous) {
+Result<FileDescriptor> connectThrough(int rendezvous, std::chrono::milliseconds patience) {
   if (integerOption(rendezvous, SO_DOMAIN) != AF_UNIX || integerOption(rendezvous, SO_TYPE) != SOCK_SEQPACKET) {
     return Error::posix(ENOTSOCK, "endpoint");
   }
@@ -169,10 +156,9 @@ Result<FileDescriptor> connectThrough(int rendezvous) {
   FileDescriptor ours(ends[0]);
   const FileDescriptor theirs(ends[1]);
   while (sendDescriptor(rendezvous, theirs.get()) < 0) {
-    if (errno == EINTR) continue;
     if (errno != EAGAIN) return Error::posix(errno, "endpoint");
     pollfd room{rendezvous, POLLOUT, 0};
-    if (::poll(&room, 1, kConnectTimeoutSeconds * 1000) == 0) return Error::posix(ETIMEDOUT, "endpoint");
+    if (::poll(&room, 1, static_cast<int>(patience.count())) == 0) return Error::posix(ETIMEDOUT, "endpoint");
   }
   return ours;
 }
@@ -180,7 +166,7 @@ Result<FileDescriptor> connectThrough(int rendezvous) {
 std::optional<FileDescriptor> acceptFrom(int rendezvous) {
   DescriptorMessage message;
   const ssize_t size = ::recvmsg(rendezvous, &message.header, MSG_DONTWAIT | MSG_CMSG_CLOEXEC);
-  if (size < 0) return errno == EINTR ? std::optional<FileDescriptor>(FileDescriptor()) : std::nullopt;
+  if (size < 0) return std::nullopt;
   FileDescriptor first;
   size_t count = 0;
   for (cmsghdr* item = CMSG_FIRSTHDR(&message.header); item; item = CMSG_NXTHDR(&message.header, item)) {
@@ -196,6 +182,13 @@ std::optional<FileDescriptor> acceptFrom(int rendezvous) {
   return first;
 }
 
+SharedFileDescriptor openPeerProcess(int socket, pid_t pid) {
+  FileDescriptor opened(static_cast<int>(::syscall(SYS_pidfd_open, pid, 0)));
+  pollfd hangUp{socket, 0, 0};
+  const bool isOpen = ::poll(&hangUp, 1, 0) == 0;
+  return opened.isValid() && isOpen ? shareFileDescriptor(std::move(opened)) : nullptr;
+}
+
 IPCPeer peerOf(int socket) {
   IPCPeer peer;
   ucred credentials{};
@@ -206,7 +199,9 @@ IPCPeer peerOf(int socket) {
   }
   peer.processIdentifier = credentials.pid;
   peer.userIdentifier = credentials.uid;
-  peer.processHandle = processHandleOf(socket, credentials.pid);
+  FileDescriptor pinned(integerOption(socket, SO_PEERPIDFD));
+  peer.processHandle =
+      pinned.isValid() ? shareFileDescriptor(std::move(pinned)) : openPeerProcess(socket, credentials.pid);
   return peer;
 }
 

@@ -1,5 +1,6 @@
 #pragma once
 
+#include <chrono>
 #include <optional>
 #include <string>
 #include <utility>
@@ -25,19 +26,25 @@ Result<NamedSocket> listenAt(const std::string& path);
 /// The listening socket for `path` that the service manager opened for this process, if it did.
 std::optional<FileDescriptor> adoptActivatedSocket(const std::string& path);
 
-/// Connects to a listening socket; gives up after five seconds with its backlog full.
+/// How long a listener's backlog may stay full for one who wants to connect.
+inline constexpr std::chrono::seconds kConnectPatience{5};
+
+/// Connects to a listening socket; EAGAIN after `kConnectPatience`.
 Result<FileDescriptor> connectTo(const std::string& path);
 
 /// A rendezvous: what holders of the second end send over it are ends of fresh stream pairs.
 Result<std::pair<FileDescriptor, FileDescriptor>> createRendezvous();
-/// Sends one end of a fresh pair to the listener and answers the other.
-Result<FileDescriptor> connectThrough(int rendezvous);
+/// Sends one end of a fresh pair to the listener and answers the other; ETIMEDOUT after `patience`.
+Result<FileDescriptor> connectThrough(int rendezvous, std::chrono::milliseconds patience = kConnectPatience);
 /// Takes the next connection; an invalid descriptor where what arrived was none, nothing when
 /// nothing more is there.
 std::optional<FileDescriptor> acceptFrom(int rendezvous);
 
 /// The process on the other side of a socket, pinned.
 IPCPeer peerOf(int socket);
+/// Pins a peer's process where the kernel does not do it (before Linux 6.5): its pid may have been reused already, but
+/// not while its socket is still open. Nothing where it is closed.
+SharedFileDescriptor openPeerProcess(int socket, pid_t pid);
 
 /// Lets this process have as many descriptors as it may ask for by itself, at most 65536: each
 /// client takes two. To be called before there are clients: it may hold the process up for some milliseconds.

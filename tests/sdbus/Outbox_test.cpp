@@ -27,25 +27,33 @@ class OutboxTest : public ::testing::Test {
   Outbox outbox_{smallBounds()};
 };
 
+/// Each message costs 256 bytes besides.
 TEST_F(OutboxTest, MediaIsDroppedUntilTheKernelHasWhatWaits) {
+  EXPECT_FALSE(outbox_.nextHasDescriptors());
   EXPECT_TRUE(pushMedia(2000)) << "nothing else waits";
   EXPECT_FALSE(pushMedia(1));
-  EXPECT_TRUE(pushControl(1000));
-  EXPECT_FALSE(pushControl(1000)) << "with what each message costs besides, this is the bound of all";
+  EXPECT_TRUE(pushControl(4000 - 256 - 2256)) << "the bound of all";
+  EXPECT_FALSE(pushControl(0));
   EXPECT_TRUE(outbox_.next());
   EXPECT_FALSE(pushMedia(1)) << "sd-bus may still have it";
   EXPECT_TRUE(outbox_.settle());
+  EXPECT_FALSE(outbox_.settle());
   EXPECT_TRUE(pushMedia(600));
-  EXPECT_FALSE(pushMedia(600));
-  EXPECT_TRUE(pushControl(1000));
+  EXPECT_FALSE(pushMedia(1000 - 856 + 1));
+  EXPECT_TRUE(pushMedia(1000 - 856));
+  EXPECT_TRUE(pushControl(744));
   outbox_.clear();
   EXPECT_FALSE(outbox_.next());
   EXPECT_FALSE(outbox_.settle());
   EXPECT_TRUE(pushMedia(600));
+  EXPECT_FALSE(outbox_.nextHasDescriptors());
+  EXPECT_TRUE(outbox_.next());
+  EXPECT_TRUE(outbox_.push(OutgoingAnswer{}, {1, 1}));
+  EXPECT_TRUE(outbox_.nextHasDescriptors());
 }
 
 TEST_F(OutboxTest, MediaThatThePeerAnswersIsBoundedUntilItHas) {
-  auto first = outbox_.admitMedia({1, 2}, true), second = outbox_.admitMedia({1, 2}, true);
+  auto first = outbox_.admitMedia({1, 1}, true), second = outbox_.admitMedia({1, 2}, true);
   EXPECT_TRUE(first && second);
   EXPECT_FALSE(outbox_.admitMedia({1, 2}, true));
   auto call = outbox_.admitMedia({1, 0}, true);

@@ -15,6 +15,7 @@ SdBusIPCOptions smallBounds() {
   options.maximumFramesInFlight = 4;
   options.maximumUnhandledMessages = 32;
   options.maximumUnansweredCalls = 8;
+  options.drainMilliseconds = 200;
   return options;
 }
 
@@ -117,6 +118,18 @@ TEST_F(PeersTest, APeerThatAsksWithoutEndIsNotReadFurtherThanItIsServed) {
   EXPECT_TRUE(delegate_.ended.isEmpty());
 }
 
+TEST_F(PeersTest, APeerThatTakesNothingIsNotWaitedFor) {
+  listen();
+  RawPeer first(socketPath()), second(socketPath());
+  Events<int64_t> failures;
+  for (RawPeer* deaf : {&first, &second}) sendNumbered(*admit(*deaf), "notify", 1, failures);
+  EXPECT_EQ(failures.next(), code(IPCErrorCode::ConnectionInvalid)) << "its last reference has gone";
+  EXPECT_FALSE(first.readUntil("an end")) << "it is closed";
+  listener_.reset();
+  server_.reset();
+  EXPECT_FALSE(second.readUntil("an end"));
+}
+
 TEST_F(PeersTest, CallsBeyondTheBoundOfUnansweredOnesAreRefused) {
   listen();
   const auto client = connectClient();
@@ -154,6 +167,14 @@ TEST_F(PeersTest, GarbageEndsItsConnectionOnly) {
     peer.send(body);
     EXPECT_EQ(delegate_.ended.next(), "invalidated");
   }
+  RawPeer peer(socketPath());
+  const auto server = admit(peer);
+  Events<int64_t> failures;
+  server->call("echo", {Value(1.0)}, {}, [&failures](const Error& error) { failures.add(error.code); });
+  EXPECT_TRUE(peer.readUntil("echo"));
+  peer.send(rawReply("\1s\0\0\xFF\xFF\xFF\x7F"s));
+  EXPECT_EQ(failures.next(), code(IPCErrorCode::RemoteError));
+  EXPECT_EQ(delegate_.ended.next(), "invalidated");
   EXPECT_EQ(valuesOf(call(*client, "nothing", {})), IPCArguments{});
 }
 

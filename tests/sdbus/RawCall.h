@@ -33,4 +33,10 @@ inline std::string rawCall(const std::string& interface, const std::string& memb
   return message + body;
 }
 
+/// The reply with one variant to the first call of a peer.
+inline std::string rawReply(const std::string& body) {
+  using namespace std::string_literals;
+  return "l\2\1\1"s + static_cast<char>(body.size()) + "\0\0\0\1\0\0\0\17\0\0\0\5\1u\0\1\0\0\0\10\1g\0\1v\0\0"s + body;
+}
+
 }  // namespace qv::platform::test
