@@ -152,6 +152,9 @@ TEST_F(ConnectionTest, AnInterfaceThatCannotBeServedEndsTheConnection) {
   client->resume();
   EXPECT_EQ(clientEnded_.next(), "interrupted");
   EXPECT_EQ(delegate_.ended.next(), "invalidated");
+  const auto neverResumed = makeClient();
+  neverResumed->invalidate();
+  EXPECT_EQ(delegate_.ended.next(), "invalidated") << "its socket is closed";
 }
 
 TEST_F(ConnectionTest, AnAnswerThatDoesNotFitFailsTheCallOnly) {
