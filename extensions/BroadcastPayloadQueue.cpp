@@ -12,9 +12,9 @@ BroadcastPayloadQueue::Items BroadcastPayloadQueue::push(Item item) {
   const Kind kind = item.payload.kind;
   items_.push_back(std::move(item));
   if (kind == Kind::Video) {
-    while (count(kind) > kMaximumFrames && dropOldest(kind, dropped)) ++droppedFrames_;
+    for (; count(kind) > kMaximumFrames; ++droppedFrames_) dropOldest(kind, dropped);
   } else if (kind != Kind::Control) {
-    while (seconds(kind) > kMaximumAudioSeconds && dropOldest(kind, dropped)) ++droppedAudio_;
+    for (; seconds(kind) > kMaximumAudioSeconds; ++droppedAudio_) dropOldest(kind, dropped);
   }
   return dropped;
 }
@@ -26,13 +26,11 @@ std::optional<BroadcastPayloadQueue::Item> BroadcastPayloadQueue::pop() {
   return item;
 }
 
-bool BroadcastPayloadQueue::dropOldest(Kind kind, Items& dropped) {
+void BroadcastPayloadQueue::dropOldest(Kind kind, Items& dropped) {
   const auto oldest =
       std::find_if(items_.begin(), items_.end(), [kind](const Item& item) { return item.payload.kind == kind; });
-  if (oldest == items_.end()) return false;
   dropped.push_back(std::move(*oldest));
   items_.erase(oldest);
-  return true;
 }
 
 size_t BroadcastPayloadQueue::count(Kind kind) const {

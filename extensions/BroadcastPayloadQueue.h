@@ -45,7 +45,8 @@ class BroadcastPayloadQueue {
   [[nodiscard]] uint64_t droppedAudio() const { return droppedAudio_; }
 
  private:
-  bool dropOldest(BroadcastPayload::Kind kind, Items& dropped);
+  /// There is one.
+  void dropOldest(BroadcastPayload::Kind kind, Items& dropped);
   [[nodiscard]] size_t count(BroadcastPayload::Kind kind) const;
   [[nodiscard]] double seconds(BroadcastPayload::Kind kind) const;
 

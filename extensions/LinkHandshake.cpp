@@ -9,8 +9,11 @@ std::shared_ptr<LinkHandshake> LinkHandshake::start(const platform::Platform& pl
   handshake->deadline_ =
       AnswerDeadline::start(platform, kExtensionPatience, [weak = std::weak_ptr(handshake)](bool isLate) {
         const auto self = weak.lock();
-        if (!isLate || !self || !self->fail(recordingError(errorcode::kInvalidBroadcastSession))) return;
-        QV_LOG_ERROR(platform::logs::kExtensions, "the extension did not connect and ping in time");
+        if (!isLate || !self) return;
+        if (self->stage_ == Stage::Waiting) {
+          QV_LOG_ERROR(platform::logs::kExtensions, "the extension did not connect and ping in time");
+        }
+        self->fail(recordingError(errorcode::kInvalidBroadcastSession));
       });
   return handshake;
 }
@@ -23,11 +26,9 @@ void LinkHandshake::succeed() {
   if (handler_) handler_(std::nullopt);
 }
 
-bool LinkHandshake::fail(const platform::Error& error) {
+void LinkHandshake::fail(const platform::Error& error) {
   Stage stage = Stage::Waiting;
-  if (!stage_.compare_exchange_strong(stage, Stage::Failed)) return false;
-  if (handler_) handler_(error);
-  return true;
+  if (stage_.compare_exchange_strong(stage, Stage::Failed) && handler_) handler_(error);
 }
 
 }  // namespace qv

@@ -25,8 +25,8 @@ class LinkHandshake : public std::enable_shared_from_this<LinkHandshake> {
   LinkHandshake& operator=(const LinkHandshake&) = delete;
 
   void succeed();
-  /// Whether the waiter was told: false where he knows already that the link is, or will not be, ready.
-  bool fail(const platform::Error& error);
+  /// Tells the waiter, unless he knows already that the link is, or will not be, ready.
+  void fail(const platform::Error& error);
   [[nodiscard]] bool isReady() const { return stage_ == Stage::Ready; }
 
  private:

@@ -88,7 +88,8 @@ void QVBroadcastExtensionProxy::tellError(const Error& error) {
     std::lock_guard lock(mutex_);
     if (std::exchange(isErrorTold_, true)) return;
   }
-  if (waiting && (waiting->fail(error) || !waiting->isReady())) return;
+  if (waiting) waiting->fail(error);
+  if (waiting && !waiting->isReady()) return;
   errorHandler_.tell(error);
 }
 
@@ -178,19 +179,14 @@ void QVBroadcastExtensionProxy::invalidateConnection() {
     handshake.swap(handshake_);
     std::swap(givenUp, payloads_);
     listenerEndpoint_ = {};
-    isErrorTold_ = true;
   }
   if (givenUp.waiting.droppedFrames() + givenUp.waiting.droppedAudio() > 0) {
     QV_LOG(logs::kExtensions, "broadcast ended with %llu frames and %llu runs of sound dropped",
            static_cast<unsigned long long>(givenUp.waiting.droppedFrames()),
            static_cast<unsigned long long>(givenUp.waiting.droppedAudio()));
   }
-  if (connection) {
-    connection->setInvalidationHandler(nullptr);
-    connection->setInterruptionHandler(nullptr);
-    connection->invalidate();
-  }
-  if (listener) listener->invalidate();
+  if (connection) connection->invalidate();
+  listener.reset();
   use.reset();
   if (handshake) handshake->fail(recordingError(errorcode::kInvalidBroadcastSession));
 }

@@ -99,7 +99,6 @@ void QVBroadcastExtensionProxy::handshakeFailed(const Error& error) {
 /// Every connection is taken: only the launched extension knows the endpoint. A new one replaces the former.
 bool QVBroadcastExtensionProxy::listenerShouldAcceptNewConnection(
     platform::IPCListener&, const std::shared_ptr<platform::IPCConnection>& connection) {
-  if (weak_from_this().expired()) return false;
   takeConnection(connection);
   return true;
 }

@@ -47,6 +47,23 @@ TEST_F(QVExtensionsTest, EachOptionalParameterRestrictsAsItSays) {
   device_.extensions.installed.clear();
   device_.extensions.queryError = platform::Error{"d", 3, {}};
   EXPECT_EQ(found({.pointName = "point"}), "error");
+  extensionsWithMatchingPointName(&device_.extensions, {}, nullptr);
+  device_.run();
+}
+
+TEST_F(QVExtensionsTest, WithoutAServiceThereIsAnError) {
+  int64_t code = 0;
+  extensionsWithMatchingPointName(nullptr, {}, [&](const auto&, const auto& error) { code = error->code; });
+  EXPECT_EQ(code, ENOTSUP);
+  extensionsWithMatchingPointName(nullptr, {}, nullptr);
+}
+
+TEST(ExtensionItemTest, HasOneAttachmentOfTheGenericType) {
+  const auto item = itemWithTitle("title", Value(true));
+  EXPECT_EQ(item.attributedTitle, "title");
+  ASSERT_EQ(item.attachments.size(), 1u);
+  EXPECT_EQ(item.attachments[0].typeIdentifier, platform::kGenericDataType);
+  EXPECT_EQ(item.attachments[0].value, Value(true));
 }
 
 TEST_F(QVExtensionsTest, OnlyTheDeclaredSampleModeIsOne) {
