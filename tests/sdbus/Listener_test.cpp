@@ -41,6 +41,7 @@ TEST_F(ListenerTest, PeersAreIdentifiedWhenTheyAreAccepted) {
 
 TEST_F(ListenerTest, ASecondDaemonIsRefusedUntilTheFirstEnds) {
   listen();
+  EXPECT_FALSE(listener_->endpoint().isValid()) << "it has a name";
   struct stat status {};
   ASSERT_EQ(::stat((directory_ + "/test.service").c_str(), &status), 0);
   EXPECT_EQ(status.st_mode & 0777, 0666u);
