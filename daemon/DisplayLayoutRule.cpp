@@ -9,12 +9,14 @@ constexpr int64_t kOverApplicationsLevel = 2;
 }
 
 DisplayLayoutRule::~DisplayLayoutRule() {
-  if (layoutMonitor_) layoutMonitor_->invalidate();
+  if (!layoutMonitor_) return;
+  layoutMonitor_->removeObserver(this);
+  layoutMonitor_->invalidate();
 }
 
 void DisplayLayoutRule::observe() {
   if (!layoutMonitor_) return;
-  wasShared_ = false;
+  previousElementCount_ = 0;
   layoutMonitor_->addObserver(weak_from_this());
 }
 
@@ -29,11 +31,18 @@ void DisplayLayoutRule::layoutMonitorDidUpdateDisplayLayout(platform::DisplayLay
 
 void DisplayLayoutRule::applyDisplayLayout(const platform::DisplayLayout& layout) {
   const auto& elements = layout.elements;
-  const auto ordinary = std::ranges::count_if(
-      elements, [](const platform::DisplayLayoutElement& element) { return element.level < kOverApplicationsLevel; });
-  const bool isAlone = elements.size() == 1;
-  const bool mustStop = isAlone ? wasShared_ : ordinary == static_cast<int64_t>(elements.size());
-  wasShared_ = !isAlone && ordinary > 1;
+  const auto isOrdinary = [](const platform::DisplayLayoutElement& element) {
+    return element.level < kOverApplicationsLevel;
+  };
+  int64_t count = 0;
+  bool mustStop = false;
+  if (elements.size() == 1) {
+    mustStop = previousElementCount_ > 1;
+  } else {
+    count = std::count_if(elements.begin(), elements.end(), isOrdinary);
+    mustStop = count == static_cast<int64_t>(elements.size());
+  }
+  previousElementCount_ = count;
   if (mustStop) stop_();
 }
 

@@ -24,7 +24,7 @@ class DisplayLayoutRule final : public platform::DisplayLayoutObserver,
   void setLayoutMonitor(std::shared_ptr<platform::DisplayLayoutMonitor> monitor) {
     layoutMonitor_ = std::move(monitor);
   }
-  /// From now on; what was shown before says nothing.
+  /// From now on; what was counted before says nothing.
   void observe();
   void ignore();
 
@@ -37,7 +37,7 @@ class DisplayLayoutRule final : public platform::DisplayLayoutObserver,
   platform::SerialQueue& sequence_;
   const std::function<void()> stop_;
   std::shared_ptr<platform::DisplayLayoutMonitor> layoutMonitor_;
-  bool wasShared_ = false;  ///< by two ordinary elements or more, in the layout before
+  int64_t previousElementCount_ = 0;
 };
 
 }  // namespace qv

@@ -41,6 +41,8 @@ void QVRecordingManager::adoptConnection(const Session& session, const std::stri
                                          const std::shared_ptr<IPCConnection>& connection) {
   if (const auto proxy = session->clientProxy()) {
     if (const auto former = proxy->connection()) {
+      former->setInvalidationHandler(nullptr);
+      former->setInterruptionHandler(nullptr);
       connections_.erase(former);
       former->invalidate();
     }

@@ -120,7 +120,7 @@ class ExtensionService {
   /// Never nothing. An extension has at most 8 processes, those counted that still die: requests of a use beyond them
   /// end in an error (EBUSY).
   [[nodiscard]] virtual std::shared_ptr<ExtensionUse> useExtension(const ExtensionRecordRef& extension) = 0;
-  /// Of the process that took the request; nothing once it is gone.
+  /// Of the process that took the request; nothing once it is gone. Offered: the daemon needs its connection only.
   [[nodiscard]] virtual std::shared_ptr<ExtensionHostContext> contextForRequest(ExtensionRequestID request) = 0;
   /// Its remote interface is the vendor's; nothing once it is gone.
   [[nodiscard]] virtual std::shared_ptr<IPCConnection> auxiliaryConnectionForRequest(ExtensionRequestID request) = 0;

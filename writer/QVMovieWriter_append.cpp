@@ -93,12 +93,21 @@ void QVMovieWriter::drainAudio(Track& track, int number) {
     if (!sample) return;
     const MediaTime time = sample->presentationTime();
     if (isNotLater(time, track.lastPresentationTime.load())) {
-      QV_LOG(logs::kWriter, "discarding audio %d sample buffer due to timestamp earlier than previous", number);
+      if (number == 1) {
+        QV_LOG(logs::kWriter, "discarding audio 1 sample buffer due to timestamp earlier than previous");
+      } else {
+        QV_LOG(logs::kWriter, "discarding audio 2 sample buffer due to timestamp earlier than previous");
+      }
       return;
     }
     track.lastPresentationTime.store(time);
-    QV_LOG_DEBUG(logs::kWriter, "appending audio %d sample with timestamp:%lld duration:%lld", number,
-                 static_cast<long long>(time.value), static_cast<long long>(sample->duration().value));
+    const auto value = static_cast<long long>(time.value);
+    const auto duration = static_cast<long long>(sample->duration().value);
+    if (number == 1) {
+      QV_LOG_DEBUG(logs::kWriter, "appending audio 1 sample with timestamp:%lld duration:%lld", value, duration);
+    } else {
+      QV_LOG_DEBUG(logs::kWriter, "appending audio 2 sample with timestamp:%lld duration:%lld", value, duration);
+    }
     (void)track.input->append(sample);
   }
 }

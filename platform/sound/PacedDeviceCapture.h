@@ -32,7 +32,8 @@ class PacedDeviceCapture final : public DeviceCaptureService {
   std::shared_ptr<CaptureDeviceInput> createDefaultAudioInput() override;
   std::shared_ptr<AudioDataOutput> createAudioDataOutput() override;
   AudioSession& audioSession() override;
-  /// Tells the audio session's observer, in the calling thread.
+  /// Tells the audio session's observer, in the calling thread. Offered to a device whose audio policy interrupts; no
+  /// sound server here does.
   void postInterruption(AudioSessionInterruption type);
 
  private:
