@@ -134,8 +134,20 @@ void Game::stop() {
 void Game::stopped(const quorvel::StopResult& result) {
   if (capturing_ && recording_) printCaptured();
   recording_ = false;
+  movieURL_ = result.movieURL;
   std::printf("stopped url=%s error=%" PRId64 "\n", result.movieURL.c_str(), result.error ? result.error->code : 0);
   if (result.error) report(*result.error);
+}
+
+void Game::save() {
+  recorder_->saveVideoToCameraRoll(movieURL_, [this](const std::optional<quorvel::Error>& error) {
+    if (error) {
+      report(*error);
+      return failScript();
+    }
+    std::printf("saved\n");
+    answered();
+  });
 }
 
 void Game::discard() {
@@ -265,6 +277,9 @@ void Game::nextStep() {
       return wait(step.duration, stopThenGoOn);
     case Step::Kind::Stop:
       return stopThenGoOn();
+    case Step::Kind::Save:
+      scriptWaits_ = true;
+      return save();
     case Step::Kind::Discard:
       scriptWaits_ = true;
       return discard();

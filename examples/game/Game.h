@@ -5,6 +5,7 @@
 #include <cstdint>
 #include <functional>
 #include <memory>
+#include <string>
 #include <vector>
 
 #include "MainLoop.h"
@@ -31,6 +32,7 @@ class Game {
   void pauseOrResume();
   void stop();
   void stopped(const quorvel::StopResult& result);
+  void save();
   void discard();
   void toggleMicrophone();
   void captured(const quorvel::VideoFrame& frame);
@@ -64,6 +66,7 @@ class Game {
 
   bool recording_ = false, paused_ = false, capturing_ = false, microphone_ = false, ok_ = true;
   uint64_t videoFrames_ = 0, audioSamples_ = 0, microphoneSamples_ = 0;
+  std::string movieURL_;           // of the movie that the last stop gave
   std::vector<double> latencies_;  // milliseconds from capture to arrival, of each frame
 
   bool begun_ = false;

@@ -15,7 +15,7 @@ constexpr char kUsage[] =
     "                            [--title TEXT] [--sky RRGGBB] [--tone HZ] [--numbered]\n"
     "                            [--trim START,END]\n"
     "                            [--broadcast EXTENSION_ID [--broadcast-info KEY=VALUE]... [--clip-duration S]]\n"
-    "steps, separated by \";\": record S, pause S, wait S, capture S, stop, discard, quit\n"
+    "steps, separated by \";\": record S, pause S, wait S, capture S, stop, save, discard, quit\n"
     "keys: r start, p pause and resume, s stop, d discard, c capture, m microphone, q quit\n";
 
 [[noreturn]] void refuse(const char* what) {

@@ -14,11 +14,12 @@ struct Verb {
   Step::Kind kind;
   bool hasDuration;
 };
-constexpr std::array<Verb, 7> kVerbs = {{{"record", Step::Kind::Record, true},
+constexpr std::array<Verb, 8> kVerbs = {{{"record", Step::Kind::Record, true},
                                          {"pause", Step::Kind::Pause, true},
                                          {"wait", Step::Kind::Wait, true},
                                          {"capture", Step::Kind::Capture, true},
                                          {"stop", Step::Kind::Stop, false},
+                                         {"save", Step::Kind::Save, false},
                                          {"discard", Step::Kind::Discard, false},
                                          {"quit", Step::Kind::Quit, false}}};
 constexpr double kLongestStep = 86'400;  // seconds

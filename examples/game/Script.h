@@ -9,7 +9,7 @@ namespace comet {
 
 /// One step of a scripted session, e.g. of "record 4; pause 2; record 4; stop; quit".
 struct Step {
-  enum class Kind { Record, Pause, Wait, Capture, Stop, Discard, Quit };
+  enum class Kind { Record, Pause, Wait, Capture, Stop, Save, Discard, Quit };
   Kind kind = Kind::Wait;
   std::chrono::nanoseconds duration{0};
 };

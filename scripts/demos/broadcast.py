@@ -17,7 +17,7 @@ import time
 sys.path.insert(0, os.path.join(os.path.dirname(os.path.abspath(__file__)), ".."))
 from stage.device import Stage  # noqa: E402
 from stage.movie import frame_times, free_port, worst_distance  # noqa: E402
-from stage.processes import children, wait_until  # noqa: E402
+from stage.processes import children, extension_processes, wait_until  # noqa: E402
 
 LIVE, CLIPS = "com.example.quorvel.game.live.upload", "com.example.quorvel.game.clips.upload"
 INVALID_BROADCAST = -5808
@@ -194,19 +194,6 @@ def run_clips(stage, server, output):
     left = os.listdir(stage.movies)
     print(f"clips: {len(left)} files left in the temporary store")
     return len(lengths) >= 3 and abs(sum(lengths) - SECONDS) < 1 and distance < WORST_SYNC and not left
-
-
-def extension_processes(stage):
-    """Of the daemon's descendants, those that run an extension."""
-    found = []
-    for entry in filter(str.isdigit, os.listdir("/proc")):
-        try:
-            with open(f"/proc/{entry}/environ") as file:
-                if "QUORVEL_EXTENSION_REQUESTS=" in file.read() and os.readlink(f"/proc/{entry}/exe").startswith(stage.build):
-                    found.append(int(entry))
-        except OSError:
-            continue
-    return found
 
 
 def run_crash(stage, server):

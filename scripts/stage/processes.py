@@ -172,3 +172,16 @@ def shared_memory_files(pid):
                 fields = line.split(None, 5)
                 found[int(fields[4])] = fields[1]
     return found
+
+
+def extension_processes(stage):
+    """Those that run an extension of this device's build."""
+    found = []
+    for entry in filter(str.isdigit, os.listdir("/proc")):
+        try:
+            with open(f"/proc/{entry}/environ") as file:
+                if "QUORVEL_EXTENSION_REQUESTS=" in file.read() and os.readlink(f"/proc/{entry}/exe").startswith(stage.build):
+                    found.append(int(entry))
+        except OSError:
+            continue
+    return found
