@@ -21,6 +21,9 @@ void blockTerminationSignals() {
   pthread_sigmask(SIG_BLOCK, &set, nullptr);
   // A peer that closes its socket is an error of the write, not the end of the process.
   std::signal(SIGPIPE, SIG_IGN);
+  // As is one beyond a limit of a file's size; and a limit of processor time is no reason to lose a recording.
+  std::signal(SIGXFSZ, SIG_IGN);
+  std::signal(SIGXCPU, SIG_IGN);
 }
 
 int runMainRunLoop() {

@@ -5,7 +5,8 @@
 namespace qv::platform {
 
 /// Blocks the main thread until the process is asked to end (SIGTERM, SIGINT, SIGHUP) and returns
-/// that signal's number. Call `blockTerminationSignals` first thing in main, before any thread.
+/// that signal's number. Call `blockTerminationSignals` first thing in main, before any thread; it also makes errors of
+/// calls of what would end the process by other signals: a peer that is gone, a limit.
 int runMainRunLoop();
 void blockTerminationSignals();
 
