@@ -2,6 +2,7 @@
 
 #include <fcntl.h>
 #include <sys/stat.h>
+#include <unistd.h>
 
 #include <algorithm>
 #include <cerrno>
@@ -9,6 +10,18 @@
 #include <system_error>
 
 namespace qv::platform {
+namespace {
+
+std::optional<Error> writeAndSync(const FileDescriptor& file, std::string_view content) {
+  while (!content.empty()) {
+    const ssize_t count = ::write(file.get(), content.data(), content.size());
+    if (count < 0 && errno != EINTR) return Error::posix(errno, "write");
+    content.remove_prefix(static_cast<size_t>(std::max<ssize_t>(count, 0)));
+  }
+  return ::fsync(file.get()) == 0 ? std::nullopt : std::optional(Error::posix(errno, "fsync"));
+}
+
+}  // namespace
 
 Result<std::string> readSmallFile(const std::string& path) {
   // O_NONBLOCK: opening a pipe for reading would wait for its writer.
@@ -31,6 +44,22 @@ Result<std::string> readSmallFile(const FileDescriptor& file) {
     content.append(chunk, static_cast<size_t>(count));
     if (content.size() > kMaximumSmallFileSize) return Error::posix(EFBIG, "read");
   }
+}
+
+std::optional<Error> replaceSmallFile(const std::string& path, std::string_view content) {
+  const std::string made = path + ".new";
+  (void)::unlink(made.c_str());
+  const FileDescriptor file(::open(made.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC, 0600));
+  if (!file.isValid()) return Error::posix(errno, made);
+  auto failure = writeAndSync(file, content);
+  if (!failure && ::rename(made.c_str(), path.c_str()) != 0) failure = Error::posix(errno, path);
+  if (failure) {
+    (void)::unlink(made.c_str());
+    return failure;
+  }
+  const std::string directory = std::filesystem::path(path).parent_path();
+  const FileDescriptor parent(::open(directory.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+  return parent.isValid() && ::fsync(parent.get()) == 0 ? std::nullopt : std::optional(Error::posix(errno, directory));
 }
 
 std::optional<Error> makeDirectories(const std::string& path) {

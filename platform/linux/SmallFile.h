@@ -19,6 +19,10 @@ Result<std::string> readSmallFile(const std::string& path);
 /// The same of an open file, from where it stands.
 Result<std::string> readSmallFile(const FileDescriptor& file);
 
+/// Writes a whole small file, for the daemon's user alone (0600): it is there as it was, or as it is to be, and on the
+/// disk when this returns.
+std::optional<Error> replaceSmallFile(const std::string& path, std::string_view content);
+
 /// Makes a directory and its parents; no failure where it is there already.
 std::optional<Error> makeDirectories(const std::string& path);
 
