@@ -8,7 +8,9 @@
 #include <string>
 
 #include "platform/Extensions.h"
+#include "platform/linux/ExtensionCgroups.h"
 #include "platform/linux/ExtensionLaunch.h"
+#include "platform/linux/ExtensionUsers.h"
 #include "platform/threads/Guarded.h"
 #include "platform/threads/Timer.h"
 
@@ -31,6 +33,8 @@ struct ExtensionHost {
   TimerService& timers;
   Executor& executor;
   const ExtensionLaunchOptions options;
+  ExtensionUsers users{containersOf(options)};  ///< where the daemon is root
+  ExtensionCgroups cgroups{};
   Guarded<std::map<std::string, MakeContext>> contextClasses{};  ///< by extension point
   Guarded<std::map<ExtensionRequestID, Place>> places{};         ///< of the requests that were begun
   Guarded<std::set<std::shared_ptr<ExtensionProcesses>>> uses{};

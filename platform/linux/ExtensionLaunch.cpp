@@ -1,6 +1,7 @@
 #include "platform/linux/ExtensionLaunch.h"
 
 #include <fcntl.h>
+#include <sys/socket.h>
 #include <sys/stat.h>
 #include <sys/wait.h>
 #include <unistd.h>
@@ -11,6 +12,7 @@
 #include <system_error>
 #include <utility>
 
+#include "platform/linux/ExtensionHost.h"
 #include "platform/linux/SmallFile.h"
 #include "protocol/ExtensionRequests.h"
 
@@ -18,7 +20,6 @@ namespace qv::platform {
 namespace {
 
 constexpr const char kLauncher[] = "quorvel-extension-launcher";
-constexpr const char kContainers[] = "/Containers";
 constexpr int kStatusNotConfined = 126;  // of the launcher
 constexpr int kStatusNotRun = 127;
 
@@ -28,16 +29,30 @@ std::optional<Error> makeContainer(const std::string& container) {
   struct stat info {};
   if (::mkdir(container.c_str(), 0700) != 0 && errno != EEXIST) return Error::posix(errno, container);
   if (::lstat(container.c_str(), &info) != 0) return Error::posix(errno, container);
-  if (!S_ISDIR(info.st_mode)) return Error::posix(ENOTDIR, container);
-  (void)::mkdir((container + "/tmp").c_str(), 0700);
-  return std::nullopt;
+  return S_ISDIR(info.st_mode) ? std::nullopt : std::optional(Error::posix(ENOTDIR, container));
 }
 
-/// Made anew, since whatever lies there is the extension's: it may have left a link or a pipe.
-FileDescriptor openOutput(const std::string& container) {
-  const std::string path = container + "/stderr.log";
-  (void)::unlink(path.c_str());
-  return FileDescriptor(::open(path.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_NOFOLLOW | O_APPEND | O_CLOEXEC, 0600));
+/// 0, the daemon's own, where it is not root and can give none.
+Result<uid_t> userOf(const ExtensionRecord& extension, ExtensionHost& host) {
+  return ::geteuid() == 0 ? host.users.userOf(extension.identifier) : Result<uid_t>(uid_t{0});
+}
+
+/// Of what the program writes; it waits where nobody reads.
+std::optional<Error> connectOutput(ExtensionLaunch& launch) {
+  int ends[2];
+  if (::pipe2(ends, O_CLOEXEC) != 0) return Error::posix(errno, "pipe");
+  launch.output.reset(ends[0]);
+  launch.request.output.reset(ends[1]);
+  launch.request.joinsErrors = true;
+  return ::fcntl(ends[0], F_SETFL, O_NONBLOCK) == 0 ? std::nullopt : std::optional(Error::posix(errno, "pipe"));
+}
+
+std::optional<Error> connectLife(ExtensionLaunch& launch) {
+  int ends[2];
+  if (::socketpair(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0, ends) != 0) return Error::posix(errno, "socketpair");
+  launch.life.reset(ends[0]);
+  launch.launcherLife = shareFileDescriptor(FileDescriptor(ends[1]));
+  return std::nullopt;
 }
 
 std::vector<std::string> makeEnvironment(const std::string& container) {
@@ -60,20 +75,30 @@ std::string installedExtensionLauncher() {
   return fs::exists(directory / kLauncher, error) ? directory / kLauncher : directory / "../lib/quorveld" / kLauncher;
 }
 
-Result<SpawnRequest> makeExtensionLaunch(const ExtensionRecord& extension, const ExtensionLaunchOptions& options,
-                                         const ListenerEndpoint& requests, const ListenerEndpoint& auxiliary) {
+std::string containersOf(const ExtensionLaunchOptions& options) { return options.dataDirectory + "/Containers"; }
+
+Result<ExtensionLaunch> makeExtensionLaunch(const ExtensionRecord& extension, ExtensionHost& host,
+                                            const ListenerEndpoint& requests, const ListenerEndpoint& auxiliary) {
   if (!isSafeFileStem(extension.identifier)) return Error::posix(EINVAL, extension.identifier);
-  const std::string container = options.dataDirectory + kContainers + "/" + extension.identifier;
+  const std::string container = containersOf(host.options) + "/" + extension.identifier;
   if (auto error = makeContainer(container)) return *error;
-  SpawnRequest launch;
-  launch.program = options.launcherPath;
-  launch.arguments = {std::to_string(::getpid()), options.dataDirectory, extension.bundlePath, container,
-                      extension.executablePath};
-  if (options.alwaysAnotherUser) launch.arguments.emplace_back("another-user");
-  launch.environment = makeEnvironment(container);
-  launch.output = openOutput(container);
-  launch.joinsErrors = true;
-  launch.descriptors = {requests.rendezvous(), auxiliary.rendezvous()};
+  auto user = userOf(extension, host);
+  if (!user) return user.error();
+  ExtensionLaunch launch{.request = {},
+                         .launcherLife = nullptr,
+                         .life = {},
+                         .output = {},
+                         .log = ExtensionLog(container, *user),
+                         .container = container,
+                         .cgroup = host.cgroups.make()};
+  if (auto error = connectOutput(launch)) return *error;
+  if (auto error = connectLife(launch)) return *error;
+  SpawnRequest& request = launch.request;
+  request.program = host.options.launcherPath;
+  request.arguments = {std::to_string(::getpid()), host.options.dataDirectory, extension.bundlePath, container,
+                       extension.executablePath,   std::to_string(*user)};
+  request.environment = makeEnvironment(container);
+  request.descriptors = {requests.rendezvous(), auxiliary.rendezvous(), launch.launcherLife};
   return launch;
 }
 

@@ -82,11 +82,16 @@ std::optional<Error> LinuxExtensionProcess::launch() {
   if (!requests) return requests.error();
   auto auxiliary = listen(auxiliaryListener_);
   if (!auxiliary) return auxiliary.error();
-  auto launch = makeExtensionLaunch(*extension_, host_->options, *requests, *auxiliary);
+  auto launch = makeExtensionLaunch(*extension_, *host_, *requests, *auxiliary);
   if (!launch) return launch.error();
-  auto process = LaunchedProcess::start(std::move(*launch), [queue = queue_, self = weak_from_this()](int status) {
-    queue->async(self, [status](LinuxExtensionProcess& ended) { ended.processEnded(status); });
-  });
+  auto process = LaunchedProcess::start(
+      std::move(*launch),
+      {.didEnd = [queue = queue_, self = weak_from_this()](
+                     int status) { queue->async(self, [status](auto& ended) { ended.processEnded(status); }); },
+       .willKill =
+           [queue = queue_, self = weak_from_this()](const Error& why) {
+             queue->async(self, [why](auto& killed) { killed.processWillBeKilled(why); });
+           }});
   if (!process) return process.error();
   process_ = std::move(*process);
   QV_LOG(logs::kExtensions, "extension %s launched as process %d", extension_->identifier.c_str(),
@@ -241,6 +246,11 @@ void LinuxExtensionProcess::connectionEnded(const char* which) {
   });
 }
 
+void LinuxExtensionProcess::processWillBeKilled(const Error& why) {
+  reason_ = Error::posix(static_cast<int>(why.code), "extension " + extension_->identifier + ": " + why.description());
+  kill(why.description());
+}
+
 void LinuxExtensionProcess::processEnded(int status) {
   status_ = status;
   isEnding_ = true;
@@ -253,7 +263,7 @@ void LinuxExtensionProcess::finish() {
   if (process_ && !status_) return;
   if (requestsConnection_ && !requestsConnectionEnded_) return;
   isEnding_ = true;
-  const Error error = errorOfExtensionEnd(extension_->identifier, status_.value_or(0));
+  const Error error = reason_.value_or(errorOfExtensionEnd(extension_->identifier, status_.value_or(0)));
   while (!requests_.empty()) end(requests_.begin()->first, error);
   if (auxiliaryConnection_) auxiliaryConnection_->invalidate();
   if (const auto didEnd = std::exchange(didEnd_, nullptr)) didEnd(this);

@@ -71,6 +71,7 @@ class LinuxExtensionProcess final : public IPCListenerDelegate,
   /// Tells the request's owner, by `began` or `completed` as it stands, and forgets it.
   void end(ExtensionRequestID request, Outcome outcome);
   void connectionEnded(const char* which);
+  void processWillBeKilled(const Error& why);
   void processEnded(int status);
   void kill(const std::string& why);
   void finish();
@@ -91,6 +92,7 @@ class LinuxExtensionProcess final : public IPCListenerDelegate,
   std::map<ExtensionRequestID, Request> requests_;
   bool isEnding_ = false;
   bool wasKilled_ = false;
+  std::optional<Error> reason_;  ///< why it was, where its requests are told
   std::unique_ptr<TimerHandle> leaveDeadline_;
   bool requestsConnectionEnded_ = false;
   std::optional<int> status_;  ///< once the process is dead

@@ -1,5 +1,7 @@
 #include "platform/linux/LinuxExtensionService.h"
 
+#include <unistd.h>
+
 #include <set>
 #include <utility>
 
@@ -34,7 +36,13 @@ std::vector<ExtensionRecordRef> findExtensions(LinuxBundleService& bundles, cons
 LinuxExtensionService::LinuxExtensionService(IPCService& ipc, LinuxBundleService& bundles, TimerService& timers,
                                              Executor& executor, ExtensionLaunchOptions options)
     : bundles_(bundles),
-      host_(new ExtensionHost{.ipc = ipc, .timers = timers, .executor = executor, .options = std::move(options)}) {}
+      host_(new ExtensionHost{.ipc = ipc, .timers = timers, .executor = executor, .options = std::move(options)}) {
+  if (::geteuid() == 0) return;
+  QV_LOG(
+      logs::kExtensions,
+      "the daemon is not root: extensions run as its own user, without a bound of threads, a view of their own of the "
+      "files, or protection of containers from each other but Landlock; the other bounds hold");
+}
 
 LinuxExtensionService::~LinuxExtensionService() {
   for (const auto& processes : host_->uses.exchange({})) {

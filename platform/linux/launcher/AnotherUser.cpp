@@ -21,19 +21,8 @@
 namespace qv::platform::launcher {
 namespace {
 
-/// Up to 2^31: no login, service or container has its users here.
-constexpr uint32_t kFirstUser = 0x7F000000;
-constexpr uint32_t kUserMask = 0x00FFFFFF;
-
 void check(long result, const std::string& what) {
   if (result < 0) throw std::system_error(errno, std::generic_category(), what);
-}
-
-/// FNV-1a, 32 bit.
-uint32_t hashOf(const std::string& text) {
-  uint32_t hash = 2166136261u;
-  for (const char c : text) hash = (hash ^ static_cast<uint8_t>(c)) * 16777619u;
-  return hash;
 }
 
 struct CloseDirectory {
@@ -62,15 +51,21 @@ void giveEntriesTo(int directory, uid_t user) {
   }
 }
 
+/// The container itself last: where it is the user's already, all that is in it is.
 void giveTo(const std::string& directory, uid_t user) {
-  check(::lchown(directory.c_str(), user, user), directory);
   const int opened = ::open(directory.c_str(), O_RDONLY | O_DIRECTORY | O_NOFOLLOW | O_CLOEXEC);
   check(opened, directory);
-  giveEntriesTo(opened, user);
+  struct stat info {};
+  check(::fstat(opened, &info), directory);
+  if (info.st_uid != user) {
+    giveEntriesTo(::fcntl(opened, F_DUPFD_CLOEXEC, 0), user);
+    check(::fchown(opened, user, user), directory);
+  }
+  check(::fchmod(opened, 0700), directory);
+  ::close(opened);
 }
 
 void hideAllBut(const std::string& container, const std::string& dataDirectory) {
-  check(::unshare(CLONE_NEWNS), "mount namespace");
   check(::mount(nullptr, "/", nullptr, MS_REC | MS_PRIVATE, nullptr), "private mounts");
   // Within the new namespace: what belongs to another one cannot be mounted.
   const int kept = ::open(container.c_str(), O_PATH | O_DIRECTORY | O_CLOEXEC);
@@ -84,18 +79,35 @@ void hideAllBut(const std::string& container, const std::string& dataDirectory) 
   ::close(kept);
 }
 
+/// What the device leaves open to every user, /tmp and /dev/shm first of all, is closed to this one.
+void forbidWriting(const std::string& container) {
+  mount_attr readOnly{};
+  readOnly.attr_set = MOUNT_ATTR_RDONLY | MOUNT_ATTR_NOSUID;
+  const int r = ::mount_setattr(AT_FDCWD, "/", AT_RECURSIVE, &readOnly, sizeof readOnly);
+  if (r != 0 && errno == ENOSYS) return;  // Linux before 5.12
+  check(r, "read-only mounts");
+  mount_attr writable{};
+  writable.attr_set = MOUNT_ATTR_NOSUID | MOUNT_ATTR_NODEV | MOUNT_ATTR_NOEXEC;
+  writable.attr_clr = MOUNT_ATTR_RDONLY;
+  check(::mount_setattr(AT_FDCWD, container.c_str(), 0, &writable, sizeof writable), container);
+}
+
 }  // namespace
 
-AnotherUser::AnotherUser(const std::string& dataDirectory, const std::string& container)
-    : userIdentifier_(kFirstUser | (hashOf(std::filesystem::path(container).filename()) & kUserMask)) {
-  giveTo(container, userIdentifier_);
-  hideAllBut(container, dataDirectory);
+AnotherUser::AnotherUser(uid_t user, const View& view) : user_(user) {
+  giveTo(view.container, user);
+  if (::unshare(CLONE_NEWNS) != 0) {
+    if (errno == EPERM && view.isOptional) return;
+    check(-1, "mount namespace");
+  }
+  hideAllBut(view.container, view.dataDirectory);
+  forbidWriting(view.container);
 }
 
 void AnotherUser::become() const {
   check(::setgroups(0, nullptr), "groups");
-  check(::setresgid(userIdentifier_, userIdentifier_, userIdentifier_), "group");
-  check(::setresuid(userIdentifier_, userIdentifier_, userIdentifier_), "user");
+  check(::setresgid(user_, user_, user_), "group");
+  check(::setresuid(user_, user_, user_), "user");
 }
 
 void dropCapabilities() {

@@ -7,10 +7,6 @@ namespace qv::platform::launcher {
 /// The version of the kernel's Landlock interface; 0 where it has none, or where it is switched off.
 [[nodiscard]] int landlockVersion();
 
-/// From this version on Landlock alone confines a process of the daemon's own user: it then also covers the changing
-/// of a file's length (3), device controls (5), and signals and abstract sockets (6, Linux 6.12).
-inline constexpr int kCompleteLandlockVersion = 6;
-
 /// The directories and files that an extension may use, as a Landlock domain. Everything else of the file system is
 /// closed to the process, and to all that it executes, once it has entered.
 ///
