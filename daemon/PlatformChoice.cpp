@@ -8,6 +8,7 @@
 #include "platform/headless/HeadlessPlatform.h"
 #include "platform/linux/LinuxExtensionService.h"
 #include "platform/linux/LinuxPlatform.h"
+#include "platform/linux/SessionUser.h"
 #include "platform/logind/LogindKeepAlive.h"
 #include "platform/mp4/MP4MovieSalvage.h"
 #include "platform/sdbus/SdBusIPC.h"
@@ -35,9 +36,10 @@ platform::LinuxDevice thisDevice() {
           .metrics = kMetricsDirectory,
           .screenReaders = kScreenReaders,
           .watchedPath = kTempPath,
-          .watchedSpace = {
-              .thresholds = {kMinimumFreeSpaceForRecording, kMinimumFreeSpaceWhileRecording, kCriticalFreeSpace},
-              .criticalFor = kCriticalFor}};
+          .watchedSpace = {.thresholds = {kMinimumFreeSpaceForRecording, kMinimumFreeSpaceWhileRecording,
+                                          kCriticalFreeSpace},
+                           .criticalFor = kCriticalFor},
+          .sessionUser = platform::sessionUserFromEnvironment()};
 }
 
 }  // namespace

@@ -60,6 +60,8 @@ class BundleService {
   [[nodiscard]] virtual BundleRef bundleEnclosingExecutable(const std::string& executablePath) = 0;
   /// The path of a process's executable; nothing where it cannot be read.
   [[nodiscard]] virtual std::optional<std::string> executablePathOfProcess(pid_t pid) = 0;
+  /// The effective user of a process; nothing where there is no such process.
+  [[nodiscard]] virtual std::optional<uid_t> userOfProcess(pid_t pid) = 0;
 };
 
 }  // namespace qv::platform

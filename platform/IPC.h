@@ -97,19 +97,45 @@ class IPCExportedObject {
                           IPCArguments arguments, IPCReply reply) = 0;
 };
 
+/// What a peer is now, compared with what it was when its connection was made.
+enum class PeerStanding {
+  Same,
+  Uninstalled,     ///< it runs what it ran, but that is its bundle's no longer: updated, renamed or removed meanwhile
+  AnotherProgram,  ///< the process has executed another program, or has ended
+};
+
+/// What a peer was when its connection was made: a process may become another program, and keeps its pid and its
+/// connections.
+///
+/// Threading: thread-safe.
+class PeerIdentity {
+ public:
+  virtual ~PeerIdentity() = default;
+  /// Looks at the system anew each time: at some small files of it, and nothing slower.
+  [[nodiscard]] virtual PeerStanding standing() const = 0;
+};
+
 /// Who is on the other side, found out once when the connection is made.
 ///
 /// The process is pinned by `processHandle` (a pidfd), so that a reused pid is never mistaken for
 /// it. `entitlements` come from root-owned files, never from the client.
 struct IPCPeer {
   pid_t processIdentifier = 0;  ///< 0 when the peer is outside our pid namespace
-  uid_t userIdentifier = 0;
+  uid_t userIdentifier = 0;     ///< effective, of whoever connected
   SharedFileDescriptor processHandle;
   std::optional<std::string> bundleIdentifier;
   Dictionary entitlements;
+  /// What `bundleIdentifier` and `entitlements` rest on; null where they are empty.
+  std::shared_ptr<const PeerIdentity> identity;
+
+  /// Of a peer without a bundle nothing is claimed, and nothing can have changed.
+  [[nodiscard]] PeerStanding standing() const {
+    if (!bundleIdentifier) return PeerStanding::Same;
+    return identity ? identity->standing() : PeerStanding::AnotherProgram;
+  }
 };
 
-/// Fills in `bundleIdentifier` and `entitlements` of a peer whose process fields are set. Called once
+/// Fills in `bundleIdentifier`, `entitlements` and `identity` of a peer whose process fields are set. Called once
 /// for each connection, on the IPC thread: it reads small local files and nothing slower.
 using IPCPeerResolver = std::function<void(IPCPeer&)>;
 

@@ -1,5 +1,7 @@
 #pragma once
 
+#include <sys/types.h>
+
 #include <string>
 
 #include "platform/base/Value.h"
@@ -13,15 +15,23 @@ namespace qv::platform {
 /// directory that does too, and neither can be written by group or others; any other is logged and
 /// grants nothing.
 ///
+/// A file holds for some users only. Its entry "users", an array, lists all of them: numbers, names as in /etc/passwd,
+/// and "session" for the session's user. Without it these are the session's user and root. An entry that is nobody is
+/// logged; "users" of another type is too, and then the file grants nothing.
+///
 /// Threading: thread-safe, blocking.
 class EntitlementStore {
  public:
-  explicit EntitlementStore(const std::string& deviceRoot);
-  /// Empty where there are none.
-  [[nodiscard]] Dictionary entitlementsForBundle(const std::string& bundleIdentifier) const;
+  EntitlementStore(const std::string& deviceRoot, uid_t sessionUser);
+  /// Of a bundle that this user runs, without "users". Empty where there are none.
+  [[nodiscard]] Dictionary entitlementsForBundle(const std::string& bundleIdentifier, uid_t user) const;
 
  private:
+  [[nodiscard]] Dictionary read(const std::string& bundleIdentifier) const;
+  [[nodiscard]] bool isFor(uid_t user, const Dictionary& file, const std::string& bundleIdentifier) const;
+
   const std::string directory_;
+  const uid_t sessionUser_;
 };
 
 }  // namespace qv::platform

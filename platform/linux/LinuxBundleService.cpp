@@ -5,10 +5,12 @@
 
 #include <algorithm>
 #include <climits>
+#include <cstdio>
 #include <filesystem>
 #include <system_error>
 
 #include "platform/linux/DirectoryBundle.h"
+#include "platform/linux/SmallFile.h"
 #include "platform/threads/Log.h"
 
 namespace qv::platform {
@@ -79,6 +81,22 @@ std::optional<std::string> LinuxBundleService::executablePathOfProcess(pid_t pid
     return std::nullopt;
   }
   return executable;
+}
+
+std::optional<uid_t> LinuxBundleService::userOfProcess(pid_t pid) {
+  if (pid <= 0) return std::nullopt;
+  const auto status = readSmallFile("/proc/" + std::to_string(pid) + "/status");
+  if (!status) return std::nullopt;
+  // "Uid:", then the real, effective, saved and file system's one. The owner of the directory says less: it is root
+  // for whoever may not be debugged.
+  const std::string& text = status.value();
+  const size_t line = text.find("\nUid:");
+  unsigned real = 0;
+  unsigned effective = 0;
+  if (line == std::string::npos || std::sscanf(text.c_str() + line, " Uid: %u %u", &real, &effective) != 2) {
+    return std::nullopt;
+  }
+  return effective;
 }
 
 }  // namespace qv::platform

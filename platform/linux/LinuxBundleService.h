@@ -34,6 +34,7 @@ class LinuxBundleService final : public BundleService {
   [[nodiscard]] std::vector<BundleRef> installedBundles();
   [[nodiscard]] BundleRef bundleEnclosingExecutable(const std::string& executablePath) override;
   [[nodiscard]] std::optional<std::string> executablePathOfProcess(pid_t pid) override;
+  [[nodiscard]] std::optional<uid_t> userOfProcess(pid_t pid) override;
 
  private:
   const std::vector<std::string> roots_;

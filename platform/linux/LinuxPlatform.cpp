@@ -1,9 +1,11 @@
 #include "platform/linux/LinuxPlatform.h"
 
-#include <poll.h>
-
 #include <cstdlib>
 #include <utility>
+
+#include "platform/linux/OwnedFiles.h"
+#include "platform/linux/ProcessIdentity.h"
+#include "platform/threads/Log.h"
 
 namespace qv::platform {
 namespace {
@@ -11,13 +13,6 @@ namespace {
 std::string environment(const char* name) {
   const char* value = std::getenv(name);
   return value ? value : "";
-}
-
-/// Whether the pinned process still runs: a pidfd becomes readable when it ends.
-bool isRunning(const SharedFileDescriptor& process) {
-  if (!process) return false;
-  pollfd state{process->get(), POLLIN, 0};
-  return ::poll(&state, 1, 0) == 0;
 }
 
 }  // namespace
@@ -29,7 +24,7 @@ LinuxPlatform::LinuxPlatform(const LinuxDevice& device)
       localization_(preferences_, device.preferenceDomain),
       bundles_(deviceRoot_, device.bundlePath, localization_),
       deviceInfo_(deviceRoot_),
-      entitlements_(deviceRoot_),
+      entitlements_(deviceRoot_, device.sessionUser),
       purgeableSpace_(systemTimers(), globalBackgroundQueue(), device.watchedSpace,
                       [this] { return watchedFreeSpace(); }),
       photoLibrary_(deviceRoot_ + device.photoLibrary, globalQueue()),
@@ -61,13 +56,17 @@ IPCPeerResolver LinuxPlatform::peerResolver() {
 }
 
 void LinuxPlatform::resolve(IPCPeer& peer) {
-  const auto executable = bundles_.executablePathOfProcess(peer.processIdentifier);
-  // Looked at afterwards: while the pinned process still runs, the pid was its own all along.
-  if (!executable || !isRunning(peer.processHandle)) return;
-  const BundleRef bundle = bundles_.bundleEnclosingExecutable(*executable);
-  if (!bundle || bundle->bundleIdentifier().empty()) return;
-  peer.bundleIdentifier = bundle->bundleIdentifier();
-  peer.entitlements = entitlements_.entitlementsForBundle(*peer.bundleIdentifier);
+  const auto identity = ProcessIdentity::of(peer.processIdentifier, peer.processHandle, bundles_);
+  if (!identity) return;
+  peer.bundleIdentifier = identity->bundleIdentifier();
+  peer.entitlements = entitlements_.entitlementsForBundle(*peer.bundleIdentifier, peer.userIdentifier);
+  peer.identity = identity;
+  if (peer.entitlements.empty()) return;
+  const std::string foreign = whatOthersCanWrite(identity->executable());
+  if (foreign.empty()) return;
+  QV_LOG_ERROR(logs::kPlatform, "entitlements of %s are ignored: others than root could have written %s",
+               peer.bundleIdentifier->c_str(), foreign.c_str());
+  peer.entitlements.clear();
 }
 
 std::string deviceRootFromEnvironment() {

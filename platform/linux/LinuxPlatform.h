@@ -1,5 +1,7 @@
 #pragma once
 
+#include <sys/types.h>
+
 #include <cstdint>
 #include <optional>
 #include <set>
@@ -32,6 +34,7 @@ struct LinuxDevice {
   std::set<std::string> screenReaders{};  ///< names of their processes
   std::string watchedPath;                ///< on the disk whose free space is watched
   FreeSpaceLimits watchedSpace{};
+  uid_t sessionUser = 0;  ///< for whom entitlements hold that name nobody (EntitlementStore)
 };
 
 /// The services that need nothing but Linux and files, for one device root. Making it reads nothing.
@@ -52,8 +55,9 @@ class LinuxPlatform {
   /// Sets the device root, fileSystem, bundles, localization, preferences, deviceInfo,
   /// purgeableSpace, photoLibrary, metrics, reachability and screenReader.
   void addTo(Platform& platform);
-  /// Fills in a peer's bundle identifier and entitlements. It borrows this object. A process that has
-  /// ended, or whose executable lies in no bundle, keeps neither.
+  /// Fills in a peer's bundle identifier, entitlements and identity. It borrows this object, as the identities do. A
+  /// process that has ended, or whose executable lies in no bundle or was deleted, keeps none of them; one whose
+  /// executable others than root and this process's user could have written keeps no entitlements.
   [[nodiscard]] IPCPeerResolver peerResolver();
   /// What the extension service searches.
   [[nodiscard]] LinuxBundleService& bundles() { return bundles_; }

@@ -28,10 +28,10 @@ class ScratchBundles final : public platform::BundleService {
                    R"({"CFBundleIdentifier": ")" + identifier + R"(", "CFBundleDisplayName": ")" + name + R"("})");
   }
   /// A process that runs a file, which is made.
-  void setProcess(pid_t pid, const std::string& executablePath) {
+  void setProcess(pid_t pid, const std::string& executablePath, uid_t user = 0) {
     disk_.addFile(root_ + executablePath, {});
     std::lock_guard lock(mutex_);
-    processes_[pid] = disk_.at(root_ + executablePath);
+    processes_[pid] = {disk_.at(root_ + executablePath), user};
   }
 
   platform::BundleRef bundleAtPath(const std::string& path) override { return bundles_.bundleAtPath(disk_.at(path)); }
@@ -44,7 +44,12 @@ class ScratchBundles final : public platform::BundleService {
   std::optional<std::string> executablePathOfProcess(pid_t pid) override {
     std::lock_guard lock(mutex_);
     const auto it = processes_.find(pid);
-    return it == processes_.end() ? std::nullopt : std::optional(it->second);
+    return it == processes_.end() ? std::nullopt : std::optional(it->second.executable);
+  }
+  std::optional<uid_t> userOfProcess(pid_t pid) override {
+    std::lock_guard lock(mutex_);
+    const auto it = processes_.find(pid);
+    return it == processes_.end() ? std::nullopt : std::optional(it->second.user);
   }
 
  private:
@@ -52,7 +57,11 @@ class ScratchBundles final : public platform::BundleService {
   const std::string root_;
   platform::LinuxBundleService bundles_;
   std::mutex mutex_;
-  std::map<pid_t, std::string> processes_;
+  struct Process {
+    std::string executable;
+    uid_t user;
+  };
+  std::map<pid_t, Process> processes_;
 };
 
 }  // namespace qv::fakes

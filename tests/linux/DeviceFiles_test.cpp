@@ -3,6 +3,7 @@
 #include <unistd.h>
 
 #include <filesystem>
+#include <vector>
 
 #include "platform/linux/DeviceDescription.h"
 #include "platform/linux/EntitlementStore.h"
@@ -78,11 +79,38 @@ class EntitlementsTest : public DeviceFilesTest {
   }
   void setMode(mode_t mode) { ASSERT_EQ(::chmod(file_.c_str(), mode), 0); }
   Dictionary entitlements(const std::string& identifier = "com.example.remote") {
-    return EntitlementStore(root_.path()).entitlementsForBundle(identifier);
+    return EntitlementStore(root_.path(), kSessionUser).entitlementsForBundle(identifier, user_);
   }
   static inline const std::string kDirectory = "/etc/quorvel/entitlements";
+  static constexpr uid_t kSessionUser = 1000;
+  uid_t user_ = kSessionUser;
   std::string file_;
 };
+
+TEST_F(EntitlementsTest, HoldForTheUsersThatTheyName) {
+  constexpr uid_t kDaemonAccount = 1;  // "daemon", on every Debian
+  const auto holders = [&](const std::string& users) {
+    root_.write(kDirectory + "/com.example.remote.json", R"({"com.tarnwick.private.quorvel": true)" + users + "}");
+    std::vector<uid_t> found;
+    for (const uid_t user : {uid_t{0}, kDaemonAccount, kSessionUser, uid_t{1001}}) {
+      user_ = user;
+      const Dictionary granted = entitlements();
+      if (!granted.empty()) found.push_back(user);
+      EXPECT_FALSE(granted.contains("users"));
+    }
+    return found;
+  };
+  using Users = std::vector<uid_t>;
+  EXPECT_EQ(holders(""), (Users{0, kSessionUser}));
+  EXPECT_EQ(holders(R"(, "users": ["session", 1001])"), (Users{kSessionUser, 1001}));
+  EXPECT_EQ(holders(R"(, "users": ["daemon", "1001"])"), (Users{kDaemonAccount, 1001}));
+  EXPECT_EQ(holders(R"(, "users": [])"), Users{});
+  EXPECT_EQ(log_.countContaining("nobody"), 0u);
+  EXPECT_EQ(holders(R"(, "users": [-1, 4294967295, true, "no such user", 0.5, 0])"), Users{0});
+  EXPECT_EQ(log_.countContaining("name a user who is nobody: \"no such user\""), 4u);
+  EXPECT_EQ(holders(R"(, "users": "session")"), Users{});
+  EXPECT_EQ(log_.countContaining("\"users\" is no array"), 4u);
+}
 
 TEST_F(EntitlementsTest, AreReadFromTheBundlesFile) {
   EXPECT_EQ(entitlements(), (Dictionary{{"com.tarnwick.private.quorvel", Value(true)}}));

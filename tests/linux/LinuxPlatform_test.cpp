@@ -20,12 +20,14 @@ LinuxDevice device(const kit::ScratchFolder& root, const std::string& bundlePath
           .preferenceDomain = "com.tarnwick.quorveld",
           .photoLibrary = "/Movies",
           .metrics = "/Logs",
-          .watchedPath = "/"};
+          .watchedPath = "/",
+          .sessionUser = ::geteuid()};
 }
 
 IPCPeer thisProcess() {
   IPCPeer peer;
   peer.processIdentifier = ::getpid();
+  peer.userIdentifier = ::getuid();
   peer.processHandle = shareFileDescriptor(FileDescriptor(static_cast<int>(::syscall(SYS_pidfd_open, ::getpid(), 0))));
   return peer;
 }
