@@ -54,8 +54,8 @@ MovieHandover::MovieHandover(platform::Platform& platform, platform::SerialQueue
       movies_(std::move(movies)),
       mixes_(platform, movies_) {}
 
-void MovieHandover::saveVideoToCameraRoll(const std::string& bundleID, const URL& movie, Handler handler) {
-  auto save = movies_->beginSave(bundleID, movie);
+void MovieHandover::saveVideoToCameraRoll(const std::string& owner, const URL& movie, Handler handler) {
+  auto save = movies_->beginSave(owner, movie);
   if (!save) {
     QV_LOG_ERROR(logs::kDaemon, "a movie that was not handed to the caller is not saved");
     handler(recordingError(errorcode::kFailedToSave));
@@ -66,9 +66,9 @@ void MovieHandover::saveVideoToCameraRoll(const std::string& bundleID, const URL
               [handler = std::move(handler)](const auto&, const auto& error) { handler(error); }, nullptr}));
 }
 
-void MovieHandover::storeSystemRecording(const std::shared_ptr<MovieClaim>& movie, const std::string& bundleID,
+void MovieHandover::storeSystemRecording(const std::shared_ptr<MovieClaim>& movie, const std::string& owner,
                                          KeptHandler handler) {
-  if (auto save = movie ? movie->saveFor(bundleID) : nullptr) {
+  if (auto save = movie ? movie->saveFor(owner) : nullptr) {
     store(std::make_shared<Storing>(Storing{kStopByOtherStart, std::move(save), std::move(handler), nullptr}));
     return;
   }
@@ -77,21 +77,21 @@ void MovieHandover::storeSystemRecording(const std::shared_ptr<MovieClaim>& movi
   handler(std::nullopt, error);
 }
 
-void MovieHandover::saveInterrupted(const std::shared_ptr<MovieClaim>& movie, const std::string& bundleID,
+void MovieHandover::saveInterrupted(const std::shared_ptr<MovieClaim>& movie, const std::string& owner,
                                     KeptHandler handler) {
   const KeptHandler logged = [handler = std::move(handler)](const auto& kept, const auto& error) {
     if (error) QV_LOG_ERROR(logs::kDaemon, "error saving file with code: %i", static_cast<int>(error->code));
     handler(kept, error);
   };
-  if (auto save = movie ? movie->saveFor(bundleID) : nullptr) {
+  if (auto save = movie ? movie->saveFor(owner) : nullptr) {
     mixAndStore(std::make_shared<Storing>(Storing{kSave, std::move(save), logged, nullptr}));
   } else {
     logged(std::nullopt, recordingError(errorcode::kFailedToSave));
   }
 }
 
-void MovieHandover::discard(const std::string& bundleID, std::function<void()> handler) {
-  movies_->discardLast(bundleID, [weak = weak_from_this(), handler = std::move(handler)](const auto& error) {
+void MovieHandover::discard(const std::string& owner, std::function<void()> handler) {
+  movies_->discardLast(owner, [weak = weak_from_this(), handler = std::move(handler)](const auto& error) {
     logRemoval(error);
     onSequence(weak, [handler](MovieHandover&) { handler(); });
   });

@@ -14,7 +14,7 @@ namespace qv {
 
 /// What becomes of finished movies: each is kept in the photo library, or stays in the temporary store with its
 /// application, or is discarded. A movie leaves the store only when the library has it; one that the library refuses
-/// stays, and its application can save it again.
+/// stays, and its application can save it again. Applications are told apart by their owners (applicationOwner).
 ///
 /// Threading: the manager's sequence, on which all handlers are called, perhaps before the call returns. It is held by
 /// shared_ptr; what is under way when it is destroyed is not answered, and its movies stay.
@@ -31,14 +31,14 @@ class MovieHandover : public std::enable_shared_from_this<MovieHandover> {
 
   /// Stores a movie that was handed to this application and not saved yet: with its sound mixed, or as it is where that
   /// fails.
-  void saveVideoToCameraRoll(const std::string& bundleID, const platform::URL& movie, Handler handler);
+  void saveVideoToCameraRoll(const std::string& owner, const platform::URL& movie, Handler handler);
   /// Stores the movie, as it is, of a system recording that another start ended.
-  void storeSystemRecording(const std::shared_ptr<MovieClaim>& movie, const std::string& bundleID, KeptHandler handler);
+  void storeSystemRecording(const std::shared_ptr<MovieClaim>& movie, const std::string& owner, KeptHandler handler);
   /// Stores the movie, with its sound mixed, of a system recording that the device's sleep ended.
-  void saveInterrupted(const std::shared_ptr<MovieClaim>& movie, const std::string& bundleID, KeptHandler handler);
+  void saveInterrupted(const std::shared_ptr<MovieClaim>& movie, const std::string& owner, KeptHandler handler);
   /// Removes the movie that was handed to this application last, if it still waits. The handler is called when it is
   /// gone.
-  void discard(const std::string& bundleID, std::function<void()> handler);
+  void discard(const std::string& owner, std::function<void()> handler);
 
  private:
   struct Storing;

@@ -66,20 +66,20 @@ void QVBroadcastBook::loadBroadcastUploadExtensionWithBaseIdentifier(const std::
 
 void QVBroadcastBook::store(const SetupRequest& request, const ExtensionRecordRef& extension,
                             const QVBroadcastConfiguration& configuration) {
-  hostBundleIDtoExtensionInfoLookup_[request.hostBundleID] = {
+  hostBundleIDtoExtensionInfoLookup_[request.hostOwner] = {
       {extension, processMode(*extension), request.userInfo, configuration}, request.before};
   currentExtensionAppImage_ = extension->icons.empty() ? Data() : extension->icons.front();
   currentExtensionDisplayName_ = extension->displayName;
   currentHostAppImage_ = context_->texts._qvAppIconFromBundleID(request.hostBundleID);
 }
 
-const QVBroadcastInfo* QVBroadcastBook::infoForHostBundleID(const std::string& hostBundleID) const {
-  const auto info = hostBundleIDtoExtensionInfoLookup_.find(hostBundleID);
+const QVBroadcastInfo* QVBroadcastBook::infoForHostBundleID(const std::string& hostOwner) const {
+  const auto info = hostBundleIDtoExtensionInfoLookup_.find(hostOwner);
   return info == hostBundleIDtoExtensionInfoLookup_.end() ? nullptr : &info->second.info;
 }
 
 void QVBroadcastBook::recordingEnded(const std::shared_ptr<const QVRecording>& recording) {
-  const auto entry = hostBundleIDtoExtensionInfoLookup_.find(recording->settings().bundleID);
+  const auto entry = hostBundleIDtoExtensionInfoLookup_.find(recording->settings().owner);
   if (entry == hostBundleIDtoExtensionInfoLookup_.end() || entry->second.before.lock() == recording) return;
   hostBundleIDtoExtensionInfoLookup_.erase(entry);
 }

@@ -20,6 +20,7 @@ class QVBroadcastBook : public std::enable_shared_from_this<QVBroadcastBook> {
  public:
   struct SetupRequest {
     std::string hostBundleID;
+    std::string hostOwner;  ///< as in applicationOwner
     std::string extensionBundleID;
     platform::Data configuration;
     platform::Dictionary userInfo;
@@ -35,7 +36,7 @@ class QVBroadcastBook : public std::enable_shared_from_this<QVBroadcastBook> {
   /// Finds the upload extension with the same base identifier and notes it, in place of any earlier one of that host.
   /// RECORDING_ERROR_INVALID_BROADCAST_SESSION, and nothing noted, where there is none or the configuration is none.
   void setupBroadcast(SetupRequest request, SetupHandler handler);
-  [[nodiscard]] const QVBroadcastInfo* infoForHostBundleID(const std::string& hostBundleID) const;
+  [[nodiscard]] const QVBroadcastInfo* infoForHostBundleID(const std::string& hostOwner) const;
   /// A recording of this host that had begun has ended: a set-up is for one recording.
   void recordingEnded(const std::shared_ptr<const QVRecording>& recording);
   /// One dictionary for each installed upload extension: "displayName", "extBundleID", "extAppImgData" (PNG). An
@@ -61,7 +62,7 @@ class QVBroadcastBook : public std::enable_shared_from_this<QVBroadcastBook> {
     QVBroadcastInfo info;
     std::weak_ptr<const QVRecording> before;
   };
-  std::map<std::string, Entry> hostBundleIDtoExtensionInfoLookup_;
+  std::map<std::string, Entry> hostBundleIDtoExtensionInfoLookup_;  ///< by the host's owner
   platform::Data currentHostAppImage_;
   platform::Data currentExtensionAppImage_;
   std::string currentExtensionDisplayName_;

@@ -53,7 +53,8 @@ QVRecordingManager::QVRecordingManager(platform::Platform& platform, QVCaptureMa
                                         });
                                       }
                                     }}),
-      alerts_(*platform_.globalQueue) {
+      alerts_(*platform_.globalQueue),
+      requests_([this](const Caller& caller, platform::PeerStanding standing) { callerWasRefused(caller, standing); }) {
   context_->files._srSetupTempDirectory();
   QVUnfinishedMovies(context_->files, *platform_.movieSalvage, *platform_.localization)._srSalvageUnfinishedMovies();
   addRecordingRequests();

@@ -83,6 +83,7 @@ class QVRecordingManager final : public platform::IPCListenerDelegate,
   void connectionEnded(const std::weak_ptr<platform::IPCConnection>& connection, const char* line);
   void adoptConnection(const Session& session, const std::string& bundleID,
                        const std::shared_ptr<platform::IPCConnection>& connection);
+  void callerWasRefused(const Caller& caller, platform::PeerStanding standing);
 
   // --- Requests.
   void addRecordingRequests();
@@ -102,7 +103,7 @@ class QVRecordingManager final : public platform::IPCListenerDelegate,
   // --- Ends.
   void stopRecordingSession(const Session& session, const std::function<void(QVRecording&)>& end);
   void stopCurrentRecordingSessionWithHandler();
-  [[nodiscard]] MovieFate storeInPhotoLibrary(const std::string& bundleID) const;
+  [[nodiscard]] MovieFate storeInPhotoLibrary(const std::string& owner) const;
   void interruptOtherRecordingSessionAgainstSession(const Session& session);
   void endRecordingsOfApplications(const platform::Error& cause);
   void recordingStarted(const Session& session);

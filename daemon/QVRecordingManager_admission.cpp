@@ -14,6 +14,12 @@ bool QVRecordingManager::listenerShouldAcceptNewConnection(platform::IPCListener
   const pid_t processID = connection->processIdentifier();
   if (processID == 0) return false;
   const std::optional<std::string> bundleID = connection->peer().bundleIdentifier;
+  const uid_t user = connection->peer().userIdentifier;
+  if (const Session other = sessions_->livingOfAnotherUser(bundleID, user)) {
+    QV_LOG_ERROR(logs::kDaemon, "process %d of user %u is refused: %s is in use by user %u",
+                 static_cast<int>(processID), user, bundleID->c_str(), other->userIdentifier());
+    return false;
+  }
   QV_LOG(logs::kDaemon, "accepted client connection PID: %d", static_cast<int>(processID));
   connection->setExportedInterface(daemonProtocol(), shared_from_this());
   connection->setRemoteInterface(clientProtocol());
@@ -26,17 +32,19 @@ bool QVRecordingManager::listenerShouldAcceptNewConnection(platform::IPCListener
     if (const auto self = weakSelf.lock()) self->connectionEnded(weakConnection, "connection INVALID");
   });
   connections_.emplace(connection, bundleID);
-  if (const Session session = sessions_->recordingSessionForBundleID(bundleID)) {
+  if (const Session session = sessions_->recordingSessionForBundleID(bundleID, user)) {
     session->setDelegate(weak_from_this());
     adoptConnection(session, *bundleID, connection);
   }
   connection->resume();
-  if (bundleID) exemptions_.expireAcknowledgementExemptionsForBundleID(*bundleID, platform_.clock->now());
+  if (bundleID) {
+    exemptions_.expireAcknowledgementExemptionsForBundleID(applicationOwner(*bundleID, user), platform_.clock->now());
+  }
   return true;
 }
 
 /// An application that connects anew replaces its former connection; the end of that one must not
-/// tear down the session.
+/// tear down the session. Both are the same user's.
 void QVRecordingManager::adoptConnection(const Session& session, const std::string& bundleID,
                                          const std::shared_ptr<IPCConnection>& connection) {
   if (const auto proxy = session->clientProxy()) {
@@ -51,6 +59,22 @@ void QVRecordingManager::adoptConnection(const Session& session, const std::stri
     starts_.cancelPendingStart(bundleID);
   }
   session->setClientProxy(std::make_shared<QVClientProxy>(context_->errors, bundleID, connection));
+}
+
+/// Another program is nobody's application, and goes. One that was updated while it runs is still the application: what
+/// it records by now goes on, and is its own.
+void QVRecordingManager::callerWasRefused(const Caller& caller, platform::PeerStanding standing) {
+  const int processID = caller.connection->processIdentifier();
+  const std::string bundleID = caller.bundleID().value_or("");
+  if (standing == platform::PeerStanding::AnotherProgram) {
+    QV_LOG_ERROR(logs::kDaemon, "process %d is no longer the program that connected as %s: its connection ends",
+                 processID, bundleID.c_str());
+    caller.connection->invalidate();
+  } else {
+    QV_LOG_ERROR(logs::kDaemon,
+                 "the executable of process %d is no longer %s's: it is refused until it is started anew", processID,
+                 bundleID.c_str());
+  }
 }
 
 void QVRecordingManager::connectionEnded(const std::weak_ptr<IPCConnection>& weakConnection, const char* line) {

@@ -42,7 +42,7 @@ void QVRecordingManager::addApplicationRequests() {
   });
   requests_.add<request::DidResignActive>([this](const Caller& caller, const auto&, const IPCReply&) {
     QV_LOG(logs::kDaemon, "QVRecordingManager:clientDidResignActiveWithBundleID:");
-    if (caller.bundleID()) exemptions_.noteBackground(*caller.bundleID(), platform_.clock->now());
+    if (caller.bundleID()) exemptions_.noteBackground(caller.owner(), platform_.clock->now());
   });
   requests_.add<request::GetState>([this](const Caller& caller, const auto&, const IPCReply& reply) {
     const Session session = sessions_->find(caller.bundleID());
@@ -63,11 +63,11 @@ void QVRecordingManager::addApplicationRequests() {
 /// Of a former recording, and told a second time: now the application can be expected to listen. What it records now
 /// goes on. A movie that is gone, saved, or replaced by now is not named.
 void QVRecordingManager::clientDidBecomeActive(const Session& session) {
-  exemptions_.expireAcknowledgementExemptionsForBundleID(session->bundleID(), platform_.clock->now());
+  exemptions_.expireAcknowledgementExemptionsForBundleID(session->owner(), platform_.clock->now());
   if (!session->isRecording() || !session->interruptedMovieURL()) return;
   auto movie = session->interruptedMovieURL();
   session->setInterruptedMovieURL(std::nullopt);
-  if (!context_->movies->isHandedTo(session->bundleID(), *movie)) movie.reset();
+  if (!context_->movies->isHandedTo(session->owner(), *movie)) movie.reset();
   QV_LOG(logs::kDaemon, "current session was interrupted - notify client app of error");
   QV_LOG(logs::kDaemon, "QVRecordingManager:recordingSessionStoppedWithError:movieURL:");
   if (const auto proxy = session->clientProxy()) {
@@ -76,9 +76,13 @@ void QVRecordingManager::clientDidBecomeActive(const Session& session) {
 }
 
 void QVRecordingManager::addBroadcastRequests() {
-  requests_.add<request::SetupBroadcast>([this](const Caller& caller, const auto& request, const IPCReply& reply) {
-    setupBroadcast(caller, request, reply);
-  });
+  requests_.addIdentified<request::SetupBroadcast>(
+      [this](const Caller& caller, const auto& request, const IPCReply& reply) {
+        setupBroadcast(caller, request, reply);
+      },
+      [this](const auto&, const IPCReply& reply) {
+        reply({Value(context_->errors.encoded(recordingError(errorcode::kEntitlements)))});
+      });
   requests_.add<request::GetBroadcastImages>([this](const Caller&, const auto&, const IPCReply& reply) {
     reply({Value(broadcasts_->currentHostAppImage()), Value(broadcasts_->currentExtensionAppImage())});
   });
@@ -90,7 +94,8 @@ void QVRecordingManager::addBroadcastRequests() {
   });
 }
 
-/// An application sets up its own broadcasts; those of others only the system does.
+/// An application sets up its own broadcasts; those of others only the system does. One that is not there now is
+/// expected under the caller's user.
 void QVRecordingManager::setupBroadcast(const Caller& caller, const request::SetupBroadcast& request,
                                         const IPCReply& reply) {
   if (!caller.is(request.hostBundleID) && !caller.isPrivileged()) {
@@ -98,12 +103,15 @@ void QVRecordingManager::setupBroadcast(const Caller& caller, const request::Set
     reply({Value(context_->errors.encoded(recordingError(errorcode::kEntitlements)))});
     return;
   }
-  QVBroadcastBook::SetupRequest setup{request.hostBundleID,
-                                      request.broadcastExtensionBundleID,
-                                      request.broadcastConfigurationData,
-                                      request.userInfo,
-                                      {}};
-  if (const Session session = sessions_->find(request.hostBundleID)) setup.before = session->recording();
+  const Session session = sessions_->find(request.hostBundleID);
+  QVBroadcastBook::SetupRequest setup{
+      request.hostBundleID,
+      applicationOwner(request.hostBundleID, session ? session->userIdentifier() : caller.user()),
+      request.broadcastExtensionBundleID,
+      request.broadcastConfigurationData,
+      request.userInfo,
+      {}};
+  if (session) setup.before = session->recording();
   broadcasts_->setupBroadcast(std::move(setup), [reply, context = context_](const std::optional<Error>& error) {
     reply({Value(context->errors.encoded(error))});
   });

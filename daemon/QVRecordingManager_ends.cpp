@@ -28,7 +28,7 @@ void QVRecordingManager::stopCurrentRecordingSessionWithHandler() {
     stopRecordingSession(session, [this](QVRecording& recording) {
       const Error interrupted = recordingError(errorcode::kInterrupted);
       if (recording.settings().systemRecording) {
-        recording.end({.cause = interrupted, .movie = storeInPhotoLibrary(recording.settings().bundleID)});
+        recording.end({.cause = interrupted, .movie = storeInPhotoLibrary(recording.settings().owner)});
       } else {
         recording.finishAndCleanupSessionFiles(interrupted);
       }
@@ -36,10 +36,9 @@ void QVRecordingManager::stopCurrentRecordingSessionWithHandler() {
   }
 }
 
-MovieFate QVRecordingManager::storeInPhotoLibrary(const std::string& bundleID) const {
-  return [handover = handover_, bundleID](const std::shared_ptr<MovieClaim>& movie, auto done) {
-    handover->storeSystemRecording(movie, bundleID,
-                                   [done](const std::optional<URL>& kept, const auto&) { done(kept); });
+MovieFate QVRecordingManager::storeInPhotoLibrary(const std::string& owner) const {
+  return [handover = handover_, owner](const std::shared_ptr<MovieClaim>& movie, auto done) {
+    handover->storeSystemRecording(movie, owner, [done](const std::optional<URL>& kept, const auto&) { done(kept); });
   };
 }
 
@@ -49,14 +48,14 @@ void QVRecordingManager::interruptOtherRecordingSessionAgainstSession(const Sess
     if (other == session) continue;
     QV_LOG(logs::kDaemon, "interrupted session");
     other->recording()->end(
-        {.cause = recordingError(errorcode::kInterrupted), .movie = moviefate::handTo(other->bundleID())});
+        {.cause = recordingError(errorcode::kInterrupted), .movie = moviefate::handTo(other->owner())});
   }
 }
 
 void QVRecordingManager::endRecordingsOfApplications(const Error& cause) {
   for (const Session& session : sessions_->recordingSessions()) {
     if (session->isSystemRecording()) continue;
-    session->recording()->end({.cause = cause, .movie = moviefate::handTo(session->bundleID())});
+    session->recording()->end({.cause = cause, .movie = moviefate::handTo(session->owner())});
   }
 }
 

@@ -27,9 +27,14 @@ void QVRecordingManager::handleCall(const std::shared_ptr<platform::IPCConnectio
 }
 
 void QVRecordingManager::addRecordingRequests() {
-  requests_.add<request::StartRecording>([this](const Caller& caller, const auto& request, const IPCReply& reply) {
-    starts_.startRecordingWindowLayerContextIDs(caller, request, reply);
-  });
+  requests_.addIdentified<request::StartRecording>(
+      [this](const Caller& caller, const auto& request, const IPCReply& reply) {
+        starts_.startRecordingWindowLayerContextIDs(caller, request, reply);
+      },
+      [this](const auto& request, const IPCReply& reply) {
+        const auto code = request.systemRecording ? errorcode::kEntitlements : errorcode::kFailedToStart;
+        StartAnswer(context_->errors, reply).refused(recordingError(code));
+      });
   requests_.add<request::Stop>([this](const Caller& caller, const auto&, const IPCReply& reply) {
     QV_LOG(logs::kDaemon, "QVRecordingManager: stopRecordingWithHandler:");
     requestStop(caller, 0, 0, reply);
@@ -38,7 +43,7 @@ void QVRecordingManager::addRecordingRequests() {
     requestStop(caller, request.startClipDuration, request.endClipDuration, reply);
   });
   requests_.add<request::SaveVideo>([this](const Caller& caller, const auto& request, const IPCReply& reply) {
-    handover_->saveVideoToCameraRoll(caller.bundleID().value_or(std::string()), request.movieURL,
+    handover_->saveVideoToCameraRoll(caller.owner(), request.movieURL,
                                      [reply, context = context_](const std::optional<Error>& error) {
                                        reply({Value(context->errors.encoded(error))});
                                      });
@@ -64,9 +69,11 @@ void QVRecordingManager::addRecordingRequests() {
     const Session session = sessions_->find(caller.bundleID());
     if (session && session->isRecording()) session->setMicrophoneEnabled(request.enabled);
   });
-  requests_.add<request::UpdateProcessID>([this](const Caller& caller, const auto& request, const IPCReply&) {
-    updateProcessID(caller, request.processID);
-  });
+  requests_.addIdentified<request::UpdateProcessID>(
+      [this](const Caller& caller, const auto& request, const IPCReply&) {
+        updateProcessID(caller, request.processID);
+      },
+      [](const auto&, const IPCReply&) {});
   requests_.add<request::ReportCameraUsage>([this](const Caller& caller, const auto& request, const IPCReply&) {
     const Session session = sessions_->find(caller.bundleID());
     if (session && session->isRecording()) session->recording()->sessionReportCameraUsage(request.cameraPosition);
@@ -99,8 +106,8 @@ void QVRecordingManager::stopForClient(const Caller& caller, const Session& sess
   if (proxy && proxy->connection() != caller.connection) {
     // Whoever asked has gone meanwhile. The client that came after it is told, and has the movie.
     stopRecordingSession(session, [](QVRecording& recording) {
-      recording.end({.cause = recordingError(errorcode::kInterrupted),
-                     .movie = moviefate::handTo(recording.settings().bundleID)});
+      recording.end(
+          {.cause = recordingError(errorcode::kInterrupted), .movie = moviefate::handTo(recording.settings().owner)});
     });
     return;
   }
@@ -122,8 +129,8 @@ void QVRecordingManager::discardRecording(const Caller& caller, const IPCReply& 
     QV_LOG_ERROR(logs::kDaemon, "can't discard recording while recording is in progress");
     reply.fail(requesterror::kRecording, "a recording is in progress");
   } else {
-    const auto discard = [handover = handover_, bundleID = session->bundleID(), reply] {
-      handover->discard(bundleID, [reply] { reply({}); });
+    const auto discard = [handover = handover_, owner = session->owner(), reply] {
+      handover->discard(owner, [reply] { reply({}); });
     };
     if (session->recording()) {
       session->recording()->whenEnded(discard);
@@ -153,7 +160,7 @@ void QVRecordingManager::resumeRecording(const Caller& caller, const Session& se
   } else {
     stopRecordingSession(session, [](QVRecording& recording) {
       recording.end({.cause = recordingError(errorcode::kNoContextIDMatch),
-                     .movie = moviefate::handTo(recording.settings().bundleID)});
+                     .movie = moviefate::handTo(recording.settings().owner)});
     });
   }
 }
@@ -163,12 +170,9 @@ void QVRecordingManager::updateProcessID(const Caller& caller, int32_t processID
   QV_LOG(logs::kDaemon, "QVRecordingManager: updateProcessIDForAudioCaptureWithPID:%i", processID);
   const Session session = sessions_->find(caller.bundleID());
   if (!session || !session->isRecording()) return;
-  if (processID >= 1 && !caller.isPrivileged()) {
-    const auto bundle = context_->texts.bundleWithPID(processID);
-    if (!bundle || !caller.is(bundle->bundleIdentifier())) {
-      QV_LOG_ERROR(logs::kDaemon, "the sound of process %i is not the caller's to record", processID);
-      return;
-    }
+  if (processID >= 1 && !caller.isPrivileged() && !starts_.isOfCallersApplication(caller, processID)) {
+    QV_LOG_ERROR(logs::kDaemon, "the sound of process %i is not the caller's to record", processID);
+    return;
   }
   session->recording()->updateProcessIDForAudioCaptureWithPID(processID);
 }

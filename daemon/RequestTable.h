@@ -14,12 +14,29 @@ namespace qv {
 
 /// Which function serves which operation. A call is read into its typed request once, and handed on with its caller.
 ///
-/// Threading: filled before the first call; served on the sequence.
+/// Threading: filled before the first call; served on the sequence. It stays where it is.
 class RequestTable {
  public:
   template <DescribedCall Request>
   using Serve = std::function<void(const Caller&, const Request&, const platform::IPCReply&)>;
+  template <DescribedCall Request>
+  using Refuse = std::function<void(const Request&, const platform::IPCReply&)>;
 
+  /// `refused` is told of each caller who was refused because it is not what it was when it connected.
+  explicit RequestTable(std::function<void(const Caller&, platform::PeerStanding)> refused)
+      : refused_(std::move(refused)) {}
+
+  /// Of an operation that hangs upon what the caller is: that is looked at again with each request.
+  template <DescribedCall Request>
+  void addIdentified(Serve<Request> serve, Refuse<Request> refuse) {
+    add<Request>([this, serve = std::move(serve), refuse = std::move(refuse)](
+                     const Caller& caller, const Request& request, const platform::IPCReply& reply) {
+      const auto standing = caller.standing();
+      if (standing == platform::PeerStanding::Same) return serve(caller, request, reply);
+      refuse(request, reply);
+      refused_(caller, standing);
+    });
+  }
   template <DescribedCall Request>
   void add(Serve<Request> serve) {
     static_assert(request::All::contains<Request>, "or no client can call it");
@@ -41,6 +58,7 @@ class RequestTable {
   }
 
  private:
+  const std::function<void(const Caller&, platform::PeerStanding)> refused_;
   std::map<std::string, std::function<void(const Caller&, const platform::IPCArguments&, const platform::IPCReply&)>>
       entries_;
 };

@@ -10,20 +10,32 @@ namespace qv {
 namespace logs = platform::logs;
 
 namespace {
+bool isLiving(const QVRecordingSession& session) {
+  const auto proxy = session.clientProxy();
+  return (proxy && proxy->connection()) || session.recording();
+}
+
 bool isOver(const std::weak_ptr<QVRecording>& recording) {
   const auto living = recording.lock();
   return !living || living->state() == QVRecording::State::Ended;
 }
 }  // namespace
 
-SessionRegistry::Session SessionRegistry::recordingSessionForBundleID(const std::optional<std::string>& bundleID) {
+SessionRegistry::Session SessionRegistry::recordingSessionForBundleID(const std::optional<std::string>& bundleID,
+                                                                      uid_t user) {
   QV_LOG(logs::kDaemon, "QVRecordingManager:recordingSessionForBundleID");
   if (!bundleID) return nullptr;
-  if (Session known = find(bundleID)) return known;
+  if (Session known = find(bundleID); known && known->userIdentifier() == user) return known;
   QV_LOG(logs::kDaemon, "no session, creating a new one");
-  auto session = std::make_shared<QVRecordingSession>(*bundleID, context_);
-  bundleIDToRecordingSessionLookup_.emplace(*bundleID, session);
+  auto session = std::make_shared<QVRecordingSession>(*bundleID, user, context_);
+  bundleIDToRecordingSessionLookup_.insert_or_assign(*bundleID, session);
   return session;
+}
+
+SessionRegistry::Session SessionRegistry::livingOfAnotherUser(const std::optional<std::string>& bundleID,
+                                                              uid_t user) const {
+  Session session = find(bundleID);
+  return session && session->userIdentifier() != user && isLiving(*session) ? session : nullptr;
 }
 
 SessionRegistry::Session SessionRegistry::find(const std::optional<std::string>& bundleID) const {

@@ -60,6 +60,12 @@ std::optional<Error> StartDesk::checkStartIsAllowed(const Caller& caller,
   return std::nullopt;
 }
 
+bool StartDesk::isOfCallersApplication(const Caller& caller, pid_t processID) const {
+  const auto bundle = services_.context.texts.bundleWithPID(processID);
+  return bundle && caller.is(bundle->bundleIdentifier()) &&
+         services_.context.platform.bundles->userOfProcess(processID) == caller.user();
+}
+
 bool StartDesk::checkContextIDsMatch(const Caller& caller, const std::vector<uint32_t>& contextIDs) const {
   const std::set<uint32_t> distinct(contextIDs.begin(), contextIDs.end());
   if (distinct.size() > kMostContextIDs) {
@@ -68,8 +74,7 @@ bool StartDesk::checkContextIDsMatch(const Caller& caller, const std::vector<uin
   }
   for (const uint32_t contextID : distinct) {
     const auto owner = services_.context.platform.renderServer->ownerOfContext(contextID);
-    const auto bundle = owner ? services_.context.texts.bundleWithPID(*owner) : nullptr;
-    if (!bundle || !caller.is(bundle->bundleIdentifier())) return false;
+    if (!owner || !isOfCallersApplication(caller, *owner)) return false;
   }
   return true;
 }

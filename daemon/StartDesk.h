@@ -22,6 +22,8 @@ class StartDesk {
 
   void startRecordingWindowLayerContextIDs(const Caller& caller, const request::StartRecording& request,
                                            const platform::IPCReply& reply);
+  /// Whether a process belongs to the caller's application: the same bundle, under the same user.
+  [[nodiscard]] bool isOfCallersApplication(const Caller& caller, pid_t processID) const;
   /// Whether all these windows are the caller's own. Each is asked for once.
   [[nodiscard]] bool checkContextIDsMatch(const Caller& caller, const std::vector<uint32_t>& contextIDs) const;
   /// The client of this application has gone.

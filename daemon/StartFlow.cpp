@@ -78,7 +78,7 @@ void StartFlow::showAcknowledgementAlertForSession() {
     return;
   }
   QV_LOG(logs::kDaemon, "QVRecordingManager:showAcknowledgementAlert");
-  if (services_.exemptions.isExemptFromAcknowledgementAlertSession(session_->bundleID(), inputs_.microphone)) {
+  if (services_.exemptions.isExemptFromAcknowledgementAlertSession(session_->owner(), inputs_.microphone)) {
     begin();
     return;
   }
@@ -98,7 +98,7 @@ void StartFlow::continueAfterAcknowledgement(const AcknowledgementAnswer& answer
     return;
   }
   inputs_ = {answer.microphone, answer.camera};
-  services_.exemptions.updateExemptionListWithSession(session_->bundleID(), answer.microphone);
+  services_.exemptions.updateExemptionListWithSession(session_->owner(), answer.microphone);
   begin();
 }
 
@@ -106,6 +106,7 @@ RecordingSettings StartFlow::settings(const QVBroadcastInfo* broadcast) const {
   const platform::Platform& platform = services_.context.platform;
   RecordingSettings settings;
   settings.bundleID = session_->bundleID();
+  settings.owner = session_->owner();
   settings.systemRecording = request_.systemRecording;
   settings.captureEnabled = request_.captureEnabled;
   settings.microphoneEnabled = request_.systemRecording ? request_.microphoneEnabled : inputs_.microphone;
@@ -120,7 +121,7 @@ void StartFlow::begin() {
   const QVBroadcastInfo* broadcast = nullptr;
   if (request_.broadcast) {
     QV_LOG(logs::kDaemon, "broadcast requested");
-    broadcast = services_.broadcasts.infoForHostBundleID(session_->bundleID());
+    broadcast = services_.broadcasts.infoForHostBundleID(session_->owner());
     if (!broadcast) {
       QV_LOG(logs::kDaemon, "attempted to start broadcast without a session, bailing out");
       refuse(recordingError(errorcode::kInvalidBroadcastSession));

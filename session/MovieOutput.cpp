@@ -30,7 +30,7 @@ std::string MovieOutput::moviePath() const {
 
 void MovieOutput::prepare(ReadyHandler handler) {
   context_->movies->claimForRecording(
-      movie_.path, movie_.bundleID,
+      movie_.path, movie_.owner,
       [weak = weak_from_this(), handler = std::move(handler)](std::shared_ptr<MovieClaim> claim) {
         const auto self = weak.lock();
         if (!self) return;

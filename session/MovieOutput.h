@@ -16,9 +16,9 @@ namespace qv {
 class MovieOutput final : public RecordingOutput, public std::enable_shared_from_this<MovieOutput> {
  public:
   struct Movie {
-    std::string path;      ///< where it is to be; another path where that one is somebody else's
-    std::string bundleID;  ///< whose it is
-    platform::Size size;   ///< of the pictures as they are coded
+    std::string path;     ///< where it is to be; another path where that one is somebody else's
+    std::string owner;    ///< whose it is
+    platform::Size size;  ///< of the pictures as they are coded
     bool systemRecording = false;
   };
   MovieOutput(std::shared_ptr<RecordingContext> context, Movie movie);

@@ -10,8 +10,9 @@ using platform::Dictionary;
 using platform::Error;
 using platform::URL;
 
-QVRecordingSession::QVRecordingSession(std::string bundleID, std::shared_ptr<RecordingContext> context)
-    : bundleID_(std::move(bundleID)), context_(std::move(context)) {}
+QVRecordingSession::QVRecordingSession(std::string bundleID, uid_t userIdentifier,
+                                       std::shared_ptr<RecordingContext> context)
+    : bundleID_(std::move(bundleID)), userIdentifier_(userIdentifier), context_(std::move(context)) {}
 
 QVRecordingSession::~QVRecordingSession() = default;
 

@@ -1,5 +1,7 @@
 #pragma once
 
+#include <sys/types.h>
+
 #include <memory>
 #include <optional>
 #include <string>
@@ -7,6 +9,7 @@
 #include "platform/threads/Guarded.h"
 #include "session/QVClientProxy.h"
 #include "session/QVRecording.h"
+#include "support/ApplicationOwner.h"
 
 namespace qv {
 
@@ -38,11 +41,14 @@ class QVRecordingSessionDelegate {
 /// Threading: sequence only, but for the client proxy.
 class QVRecordingSession final : public QVRecordingObserver, public std::enable_shared_from_this<QVRecordingSession> {
  public:
-  QVRecordingSession(std::string bundleID, std::shared_ptr<RecordingContext> context);
+  QVRecordingSession(std::string bundleID, uid_t userIdentifier, std::shared_ptr<RecordingContext> context);
   ~QVRecordingSession() override;
 
   // --- The application.
   [[nodiscard]] const std::string& bundleID() const { return bundleID_; }
+  /// Who runs it.
+  [[nodiscard]] uid_t userIdentifier() const { return userIdentifier_; }
+  [[nodiscard]] std::string owner() const { return applicationOwner(bundleID_, userIdentifier_); }
   void setDelegate(std::weak_ptr<QVRecordingSessionDelegate> delegate) { delegate_.store(std::move(delegate)); }
   /// Thread-safe.
   [[nodiscard]] std::shared_ptr<QVClientProxy> clientProxy() const { return clientProxy_.load(); }
@@ -82,6 +88,7 @@ class QVRecordingSession final : public QVRecordingObserver, public std::enable_
   [[nodiscard]] OutputEvents outputEvents(const std::shared_ptr<QVRecording>& recording);
 
   const std::string bundleID_;
+  const uid_t userIdentifier_;
   const std::shared_ptr<RecordingContext> context_;
   platform::Guarded<std::weak_ptr<QVRecordingSessionDelegate>> delegate_;
   platform::Guarded<std::shared_ptr<QVClientProxy>> clientProxy_;

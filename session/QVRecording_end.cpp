@@ -27,7 +27,7 @@ bool QVRecording::end(RecordingEnd end) {
 
 void QVRecording::finishSessionWithStartClipDuration(double startClipDuration, double endClipDuration,
                                                      RecordingEnd::Handler handler) {
-  end({.movie = moviefate::handTo(settings_.bundleID),
+  end({.movie = moviefate::handTo(settings_.owner),
        .handler = std::move(handler),
        .startClipDuration = startClipDuration,
        .endClipDuration = endClipDuration});
@@ -41,7 +41,7 @@ void QVRecording::fail(const Error& error) {
   const bool isDiskFull = error.domain == kQVRecordingErrorDomain && error.code == errorcode::kInsufficientStorage;
   end({.cause = error,
        .endReason = error.code,
-       .movie = isDiskFull ? moviefate::handTo(settings_.bundleID) : moviefate::keep()});
+       .movie = isDiskFull ? moviefate::handTo(settings_.owner) : moviefate::keep()});
 }
 
 void QVRecording::beginEnd() {
@@ -89,7 +89,7 @@ void QVRecording::outputFinished(const OutputResult& result) {
 void QVRecording::trimMovie(const std::shared_ptr<MovieClaim>& movie) {
   QV_LOG(logs::kSession, "trimming");
   const auto trimmed =
-      context_->movies->claimTrimmed(context_->names.trimmedOutputPath(settings_.bundleID), settings_.bundleID);
+      context_->movies->claimTrimmed(context_->names.trimmedOutputPath(settings_.bundleID), settings_.owner);
   auto writer = std::make_shared<QVMovieWriter>(context_->platform, settings_.windowSize, movie->path());
   writer->trimMovieWithURL(movie->url(), end_.startClipDuration, end_.endClipDuration, trimmed->url(),
                            [self = shared_from_this(), movie, trimmed](const std::optional<URL>& url) {

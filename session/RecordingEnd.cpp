@@ -10,10 +10,10 @@ using platform::Error;
 using platform::URL;
 namespace logs = platform::logs;
 
-MovieFate handTo(const std::string& bundleID) {
-  return [bundleID](const std::shared_ptr<MovieClaim>& movie, const auto& done) {
+MovieFate handTo(const std::string& owner) {
+  return [owner](const std::shared_ptr<MovieClaim>& movie, const auto& done) {
     const URL url = movie->url();
-    movie->handTo(bundleID);
+    movie->handTo(owner);
     done(url);
   };
 }

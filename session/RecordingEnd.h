@@ -15,8 +15,8 @@ using MovieFate = std::function<void(std::shared_ptr<MovieClaim> movie,
                                      std::function<void(const std::optional<platform::URL>&)> done)>;
 
 namespace moviefate {
-/// The client may save or discard it.
-[[nodiscard]] MovieFate handTo(const std::string& bundleID);
+/// The client may save or discard it. `owner` as in applicationOwner.
+[[nodiscard]] MovieFate handTo(const std::string& owner);
 [[nodiscard]] MovieFate remove();
 /// It stays in the store, and ages out there.
 [[nodiscard]] MovieFate keep();

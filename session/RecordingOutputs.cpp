@@ -45,7 +45,7 @@ std::shared_ptr<RecordingOutput> makeRecordingOutput(const std::shared_ptr<Recor
   const std::string path = settings.systemRecording ? context->names.screenMoviePath()
                                                     : context->names.applicationMoviePath(settings.bundleID);
   return std::make_shared<MovieOutput>(context,
-                                       MovieOutput::Movie{path, settings.bundleID, size, settings.systemRecording});
+                                       MovieOutput::Movie{path, settings.owner, size, settings.systemRecording});
 }
 
 }  // namespace qv

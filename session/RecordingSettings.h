@@ -42,6 +42,7 @@ struct RecordingContext {
 /// What one recording is: settled before it is made.
 struct RecordingSettings {
   std::string bundleID;
+  std::string owner;  ///< whose its movies are (applicationOwner)
   bool systemRecording = false;
   bool captureEnabled = false;
   bool microphoneEnabled = false;

@@ -8,27 +8,27 @@ namespace {
 constexpr double kExemptionSeconds = 480.0;
 }
 
-bool QVExemptionBook::isExemptFromAcknowledgementAlertSession(const std::string& bundleID, bool withMicrophone) const {
-  return withMicrophone ? exemptWithMicRecordingEnabledBundleIdentifiers_.contains(bundleID)
-                        : exemptBundleIdentifiers_.contains(bundleID);
+bool QVExemptionBook::isExemptFromAcknowledgementAlertSession(const std::string& owner, bool withMicrophone) const {
+  return withMicrophone ? exemptWithMicRecordingEnabledBundleIdentifiers_.contains(owner)
+                        : exemptBundleIdentifiers_.contains(owner);
 }
 
-void QVExemptionBook::updateExemptionListWithSession(const std::string& bundleID, bool withMicrophone) {
-  if (withMicrophone) exemptWithMicRecordingEnabledBundleIdentifiers_.insert(bundleID);
-  exemptBundleIdentifiers_.insert(bundleID);
+void QVExemptionBook::updateExemptionListWithSession(const std::string& owner, bool withMicrophone) {
+  if (withMicrophone) exemptWithMicRecordingEnabledBundleIdentifiers_.insert(owner);
+  exemptBundleIdentifiers_.insert(owner);
 }
 
-void QVExemptionBook::noteBackground(const std::string& bundleID, platform::Date now) {
-  lastBackgroundDateByBundleIdentifier_.emplace(bundleID, now);
+void QVExemptionBook::noteBackground(const std::string& owner, platform::Date now) {
+  lastBackgroundDateByBundleIdentifier_.emplace(owner, now);
 }
 
-void QVExemptionBook::expireAcknowledgementExemptionsForBundleID(const std::string& bundleID, platform::Date now) {
+void QVExemptionBook::expireAcknowledgementExemptionsForBundleID(const std::string& owner, platform::Date now) {
   QV_LOG(platform::logs::kUI, "QVRecordingManager:removeAcknowledgementExemptionIfOverThreshholdForBundleID:");
-  const auto background = lastBackgroundDateByBundleIdentifier_.find(bundleID);
+  const auto background = lastBackgroundDateByBundleIdentifier_.find(owner);
   if (background == lastBackgroundDateByBundleIdentifier_.end()) return;
   if (!(now.secondsSince1970 - background->second.secondsSince1970 > kExemptionSeconds)) return;
-  exemptBundleIdentifiers_.erase(bundleID);
-  exemptWithMicRecordingEnabledBundleIdentifiers_.erase(bundleID);
+  exemptBundleIdentifiers_.erase(owner);
+  exemptWithMicRecordingEnabledBundleIdentifiers_.erase(owner);
   lastBackgroundDateByBundleIdentifier_.erase(background);
   QV_LOG(platform::logs::kUI, "removedExemption");
 }

@@ -5,12 +5,14 @@
 namespace qv {
 
 TestClient::TestClient(fakes::FakeDevice& device, std::string bundleID, pid_t pid, platform::Dictionary entitlements,
-                       bool waits)
+                       bool waits, uid_t user)
     : device_(device), bundleID_(std::move(bundleID)) {
   platform::IPCPeer peer;
   peer.processIdentifier = pid;
+  peer.userIdentifier = user;
   if (!bundleID_.empty()) peer.bundleIdentifier = bundleID_;
   peer.entitlements = std::move(entitlements);
+  peer.identity = identity_;
   device.ipc.setClientPeer(peer);
   connection_ = *device.ipc.connect(kServiceName);
   connection_->setRemoteInterface(daemonProtocol());
@@ -110,6 +112,11 @@ void DaemonTest::install(const std::string& name, const std::string& bundleID, p
 }
 
 TestClient DaemonTest::game() { return {device_, "com.example.game", 100}; }
+TestClient DaemonTest::gameOf(uid_t user) {
+  const pid_t pid = 100 + static_cast<pid_t>(user);
+  device_.bundles.setProcess(pid, "/Applications/Game/bin/run", user);
+  return {device_, "com.example.game", pid, {}, true, user};
+}
 TestClient DaemonTest::chat() { return {device_, "com.example.chat", 200}; }
 
 TestClient DaemonTest::namesake() {

@@ -19,7 +19,7 @@ class TestClient {
  public:
   /// Unless it `waits` the daemon has not seen it yet.
   TestClient(fakes::FakeDevice& device, std::string bundleID, pid_t pid, platform::Dictionary entitlements = {},
-             bool waits = true);
+             bool waits = true, uid_t user = 0);
 
   struct Answer {
     platform::IPCArguments values;
@@ -60,6 +60,10 @@ class TestClient {
   bool isRecording() { return valueForKey(state(), "isRecording").asBool(); }
   void disconnect();
   void leave() { connection_->invalidate(); }
+  /// Its process executes another program, and keeps the connection.
+  void becomeAnotherProgram() { identity_->now = platform::PeerStanding::AnotherProgram; }
+  /// Its executable is replaced while it runs.
+  void isUpdated() { identity_->now = platform::PeerStanding::Uninstalled; }
   /// Takes the oldest end-of-recording message.
   std::optional<End> takeEnd();
   /// The codes of the end-of-recording messages so far; 0 for none. Takes them.
@@ -71,6 +75,11 @@ class TestClient {
   fakes::RecordingExportedObject& object() { return *object_; }
 
  private:
+  struct Identity final : platform::PeerIdentity {
+    platform::PeerStanding standing() const override { return now; }
+    platform::PeerStanding now = platform::PeerStanding::Same;
+  };
+  const std::shared_ptr<Identity> identity_ = std::make_shared<Identity>();
   fakes::FakeDevice& device_;
   const std::string bundleID_;
   const std::shared_ptr<fakes::RecordingExportedObject> object_ = std::make_shared<fakes::RecordingExportedObject>();
@@ -92,6 +101,8 @@ class DaemonTest : public testing::Test {
 
   void install(const std::string& name, const std::string& bundleID, pid_t pid);
   TestClient game();
+  /// The same program, which another user runs.
+  TestClient gameOf(uid_t user);
   TestClient chat();
   /// Another application that is called "Game".
   TestClient namesake();

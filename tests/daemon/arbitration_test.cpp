@@ -50,7 +50,7 @@ TEST_F(ArbitrationTest, ADisconnectedApplicationLosesItsRecordingASystemRecordin
 TEST_F(ArbitrationTest, AClientThatDiesBeforeTheAnswerToItsStartEndsARecordingUnlessItIsTheSystems) {
   const auto startUntilItRecords = [this](TestClient& client, bool system) {
     client.postStart({.system = system});
-    while (!manager_->sessions().recordingSessionForBundleID(client.bundleID())->isRecording()) {
+    while (!manager_->sessions().find(client.bundleID())->isRecording()) {
       ASSERT_TRUE(device_.executor.runOne());
     }
   };
