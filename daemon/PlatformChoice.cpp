@@ -42,11 +42,17 @@ platform::LinuxDevice thisDevice() {
           .sessionUser = platform::sessionUserFromEnvironment()};
 }
 
+platform::SdBusIPCOptions messaging() {
+  platform::SdBusIPCOptions options;
+  if (const char* group = ::secure_getenv("QUORVEL_SOCKET_GROUP")) options.socketGroup = group;
+  return options;
+}
+
 }  // namespace
 
 struct PlatformChoice::Backends {
   platform::LinuxPlatform linux{thisDevice()};
-  platform::SdBusIPCService ipc{linux.peerResolver()};
+  platform::SdBusIPCService ipc{linux.peerResolver(), messaging()};
   platform::LinuxExtensionService extensions{ipc,
                                              linux.bundles(),
                                              platform::systemTimers(),

@@ -16,6 +16,9 @@ struct SdBusIPCOptions {
   /// Where the sockets of named services stand. Empty: $XDG_RUNTIME_DIR, or /run without it; then
   /// `connect` looks in /run too.
   std::string runtimeDirectory;
+  /// The group whose members may connect to named services, besides root and the user of this process: a name, or a
+  /// number. Empty: the group of this process. A socket of the service manager's keeps what that gave it.
+  std::string socketGroup;
   /// Bytes of queued messages beyond which media messages are dropped.
   size_t maximumQueuedMediaBytes = size_t{4} << 20;
   /// Bytes of queued messages of any kind beyond which the peer is cut off.

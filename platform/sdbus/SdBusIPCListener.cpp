@@ -140,7 +140,7 @@ std::optional<Error> SdBusIPCListener::resumeNamed() {
   if (auto activated = adoptActivatedSocket(path_)) {
     socket = std::move(*activated);
   } else {
-    auto named = listenAt(path_);
+    auto named = listenAt(path_, state_->context->options.socketGroup);
     if (!named) return named.error();
     socket = std::move(named->socket);
     lock_ = std::move(named->lock);

@@ -1,6 +1,7 @@
 #include "platform/sdbus/Sockets.h"
 
 #include <fcntl.h>
+#include <grp.h>
 #include <poll.h>
 #include <sys/eventfd.h>
 #include <sys/file.h>
@@ -13,7 +14,9 @@
 
 #include <algorithm>
 #include <cerrno>
+#include <charconv>
 #include <cstring>
+#include <vector>
 
 #ifndef SO_PEERPIDFD
 #define SO_PEERPIDFD 77  // Linux 6.5
@@ -22,7 +25,7 @@
 namespace qv::platform::sdbus {
 namespace {
 
-constexpr mode_t kAnyLocalUser = 0666;
+constexpr mode_t kOwnerAndGroup = 0660;
 
 std::optional<sockaddr_un> addressOf(const std::string& path) {
   sockaddr_un address{};
@@ -41,6 +44,22 @@ Result<FileDescriptor> lockService(const std::string& path) {
   if (!lock.isValid()) return Error::posix(errno, lockPath);
   if (::flock(lock.get(), LOCK_EX | LOCK_NB) == 0) return lock;
   return Error::posix(errno == EWOULDBLOCK ? EADDRINUSE : errno, path);
+}
+
+/// -1, which changes nothing, for the empty name.
+Result<gid_t> groupNamed(const std::string& name) {
+  if (name.empty()) return static_cast<gid_t>(-1);
+  gid_t number = 0;
+  const char* const end = name.data() + name.size();
+  if (const auto read = std::from_chars(name.data(), end, number); read.ec == std::errc() && read.ptr == end) {
+    return number;
+  }
+  group entry{};
+  group* found = nullptr;
+  std::vector<char> texts(size_t{64} << 10);
+  const int r = ::getgrnam_r(name.c_str(), &entry, texts.data(), texts.size(), &found);
+  if (found == nullptr) return Error::posix(r != 0 ? r : ENOENT, "group " + name);
+  return entry.gr_gid;
 }
 
 bool removeStaleSocket(const std::string& path) {
@@ -100,15 +119,18 @@ std::string socketPath(const std::string& directory, const std::string& serviceN
   return directory + "/" + serviceName;
 }
 
-Result<NamedSocket> listenAt(const std::string& path) {
+Result<NamedSocket> listenAt(const std::string& path, const std::string& group) {
   const auto address = addressOf(path);
   if (!address) return Error::posix(ENAMETOOLONG, path);
+  auto members = groupNamed(group);
+  if (!members) return members.error();
   auto lock = lockService(path);
   if (!lock) return lock.error();
   FileDescriptor socket(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0));
   if (!socket.isValid()) return Error::posix(errno, path);
   if (!removeStaleSocket(path) || ::bind(socket.get(), asAddress(*address), sizeof *address) != 0 ||
-      ::chmod(path.c_str(), kAnyLocalUser) != 0 || ::listen(socket.get(), SOMAXCONN) != 0) {
+      ::lchown(path.c_str(), static_cast<uid_t>(-1), *members) != 0 || ::chmod(path.c_str(), kOwnerAndGroup) != 0 ||
+      ::listen(socket.get(), SOMAXCONN) != 0) {
     return Error::posix(errno, path);
   }
   return NamedSocket{std::move(socket), std::move(*lock)};
@@ -203,6 +225,18 @@ IPCPeer peerOf(int socket) {
   peer.processHandle =
       pinned.isValid() ? shareFileDescriptor(std::move(pinned)) : openPeerProcess(socket, credentials.pid);
   return peer;
+}
+
+uid_t userOf(int socket) {
+  ucred credentials{};
+  socklen_t size = sizeof credentials;
+  const bool isTold = ::getsockopt(socket, SOL_SOCKET, SO_PEERCRED, &credentials, &size) == 0;
+  return isTold ? credentials.uid : static_cast<uid_t>(-1);
+}
+
+void askForSenders(int socket) {
+  const int on = 1;
+  ::setsockopt(socket, SOL_SOCKET, SO_PASSCRED, &on, sizeof on);
 }
 
 void raiseDescriptorLimit() {

@@ -19,9 +19,9 @@ struct NamedSocket {
   FileDescriptor socket;
   FileDescriptor lock;
 };
-/// Opens `path` for connections of every local user. A socket file that a dead process left is
-/// replaced; EADDRINUSE when a living one serves it.
-Result<NamedSocket> listenAt(const std::string& path);
+/// Opens `path` for connections of root, this process's user, and the members of `group` (a name or a number; empty:
+/// this process's own). A socket file that a dead process left is replaced; EADDRINUSE when a living one serves it.
+Result<NamedSocket> listenAt(const std::string& path, const std::string& group);
 
 /// The listening socket for `path` that the service manager opened for this process, if it did.
 std::optional<FileDescriptor> adoptActivatedSocket(const std::string& path);
@@ -45,9 +45,13 @@ IPCPeer peerOf(int socket);
 /// Pins a peer's process where the kernel does not do it (before Linux 6.5): its pid may have been reused already, but
 /// not while its socket is still open. Nothing where it is closed.
 SharedFileDescriptor openPeerProcess(int socket, pid_t pid);
+/// The user of it; -1 where the kernel does not tell.
+uid_t userOf(int socket);
+/// From now on the kernel tells of what is received which process sent it; so do the sockets that are accepted.
+void askForSenders(int socket);
 
 /// Lets this process have as many descriptors as it may ask for by itself, at most 65536: each
-/// client takes two. To be called before there are clients: it may hold the process up for some milliseconds.
+/// client takes five. To be called before there are clients: it may hold the process up for some milliseconds.
 void raiseDescriptorLimit();
 
 }  // namespace qv::platform::sdbus

@@ -44,7 +44,7 @@ TEST_F(ListenerTest, ASecondDaemonIsRefusedUntilTheFirstEnds) {
   EXPECT_FALSE(listener_->endpoint().isValid()) << "it has a name";
   struct stat status {};
   ASSERT_EQ(::stat((directory_ + "/test.service").c_str(), &status), 0);
-  EXPECT_EQ(status.st_mode & 0777, 0666u);
+  EXPECT_EQ(status.st_mode & 0777, 0660u);
   const auto second = client_->createListener("test.service");
   const auto error = second->resume();
   ASSERT_TRUE(error);
