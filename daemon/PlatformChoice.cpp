@@ -42,8 +42,10 @@ platform::LinuxDevice thisDevice() {
           .sessionUser = platform::sessionUserFromEnvironment()};
 }
 
+/// Anybody who may connect is a peer that is not trusted, and so is every extension.
 platform::SdBusIPCOptions messaging() {
   platform::SdBusIPCOptions options;
+  options.trustsPeers = false;
   if (const char* group = ::secure_getenv("QUORVEL_SOCKET_GROUP")) options.socketGroup = group;
   return options;
 }

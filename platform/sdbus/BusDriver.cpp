@@ -2,7 +2,6 @@
 
 #include <poll.h>
 #include <sys/epoll.h>
-#include <sys/socket.h>
 
 #include <algorithm>
 #include <cerrno>
@@ -20,10 +19,6 @@ constexpr int kMessagesPerTurn = 64;  // then others have theirs
 /// Answers that sd-bus gives by itself (errors, introspection) wait in its own queue: a peer that
 /// asks without reading is not read either beyond this many.
 constexpr uint64_t kMaximumBusQueue = 64;
-
-/// How much the kernel may hold for a peer that does not read; it counts twice this, with its own
-/// overhead. sd-bus asks for 8 MiB and gets them as root: seconds of sound on top of our own bound.
-constexpr int kSocketBufferBytes = 256 << 10;
 
 }  // namespace
 
@@ -76,8 +71,7 @@ int BusDriver::prepareBus() {
   int r = sd_bus_new(&bus);
   if (r < 0) return r;
   bus_.reset(bus);
-  if ((r = sd_bus_set_fd(bus, socket_.get(), socket_.get())) < 0) return r;
-  const int fd = socket_.release();
+  if ((r = connectBus(bus)) < 0) return r;
   if ((r = sd_bus_negotiate_fds(bus, true)) < 0) return r;
   if (side_ == Side::Server) {
     sd_id128_t id{};
@@ -90,28 +84,29 @@ int BusDriver::prepareBus() {
     if (r < 0) return r;
   }
   if ((r = sd_bus_start(bus)) < 0) return r;
-  ::setsockopt(fd, SOL_SOCKET, SO_SNDBUF, &kSocketBufferBytes, sizeof kSocketBufferBytes);
-  watchedEvents_ = EPOLLIN;
-  watch_ = context_->io.watch(fd, watchedEvents_,
-                              [this](uint32_t events) { process(events & (EPOLLHUP | EPOLLERR), events & EPOLLOUT); });
+  watchSocket();
   return watch_ ? 0 : -ENOMEM;
 }
 
 void BusDriver::process(bool hangUp, bool writable) {
   const auto self = shared_from_this();
   int budget = kMessagesPerTurn;
-  int r = 1;
-  while (bus_ && r > 0 && budget-- > 0) {
+  bool goesOn = true;
+  while (goesOn && budget-- > 0) {
     if (pausesReading(hangUp) && !writable) break;
+    const bool isFed = feed();
+    if (!bus_) return;
     // sd-bus writes before it reads, one step a call: with room to write, nothing is read.
     writable = false;
-    r = sd_bus_process(bus_.get(), nullptr);
+    int r = sd_bus_process(bus_.get(), nullptr);
+    if (!bus_) return;
     r = receiveFailure_.value_or(r);
+    if (r < 0) return lost(r);
+    goesOn = isFed || r > 0;
   }
-  if (!bus_) return;
-  if (r < 0) return lost(r);
+  updateDeadline();
   flush();
-  if (bus_ && r > 0 && !backlog_.isPaused()) readSoon();
+  if (bus_ && goesOn && !backlog_.isPaused()) readSoon();
 }
 
 void BusDriver::processNext() {
@@ -130,6 +125,7 @@ bool BusDriver::pausesReading(bool hangUp) {
 }
 
 void BusDriver::updateWatch() {
+  if (pause_) return;
   const int wanted = sd_bus_get_events(bus_.get());
   if (wanted < 0) {
     // Closed by the peer: sd-bus has a last step to do.
@@ -179,7 +175,10 @@ void BusDriver::checkProgress() {
 }
 
 void BusDriver::lost(int error) {
-  if (error != -ECONNRESET && error != -EPIPE && error != -ENOTCONN) {
+  const bool isLeaving = error == -ECONNRESET || error == -EPIPE || error == -ENOTCONN;
+  if (!isLeaving && input_) {
+    context_->refusals.note(input_->user(), std::string("dropped: ") + std::strerror(-error));
+  } else if (!isLeaving) {
     QV_LOG_ERROR(logs::kIPC, "connection dropped: %s", std::strerror(-error));
   }
   if (const auto client = client_.lock()) client->driverLostPeer();
@@ -188,14 +187,17 @@ void BusDriver::lost(int error) {
 
 void BusDriver::close() {
   const auto self = shared_from_this();
-  // sd-bus closes a broken connection's descriptor by itself.
-  if (bus_ && sd_bus_get_fd(bus_.get()) < 0) watch_.forget();
   watch_.end();
   timer_.end();
+  pause_.end();
+  deadline_.timer.end();
   drain_.reset();
   received_.clear();
   sentCalls_.clear();
   bus_.reset();
+  if (input_) context_->memory.noteGone();
+  input_.reset();
+  guard_.reset();
   socket_.reset();
   admission_.reset();
   outbox_.clear();

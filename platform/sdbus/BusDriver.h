@@ -10,6 +10,7 @@
 #include <vector>
 
 #include "platform/sdbus/Backlog.h"
+#include "platform/sdbus/GatedInput.h"
 #include "platform/sdbus/Handles.h"
 #include "platform/sdbus/InterfaceTable.h"
 #include "platform/sdbus/Outbox.h"
@@ -53,6 +54,8 @@ class BusDriver final : public std::enable_shared_from_this<BusDriver> {
   void setExportedInterface(const IPCInterface& interface);
   /// Held until the socket is closed.
   void setAdmission(std::shared_ptr<void> admission) { admission_ = std::move(admission); }
+  /// The peer is not trusted: what it sends passes a gate. Without this, sd-bus reads the socket itself.
+  void setGuard(PeerGuard guard) { guard_ = std::move(guard); }
   void resume(std::weak_ptr<BusDriverClient> client);
 
   [[nodiscard]] Outbox& outbox() { return outbox_; }
@@ -85,6 +88,11 @@ class BusDriver final : public std::enable_shared_from_this<BusDriver> {
     uint64_t marker = 0;  ///< the cookie of the last message
   };
   enum class Peer { Unheard, Probed, Heard };
+  /// Until when the peer has to end what it has begun.
+  struct Deadline {
+    uint64_t unit = 0;  ///< of the input's finished ones, that it is for
+    EventLoop::Timer timer;
+  };
 
   // BusDriver.cpp
   void post(void (BusDriver::*work)());
@@ -100,6 +108,16 @@ class BusDriver final : public std::enable_shared_from_this<BusDriver> {
   void checkProgress();
   void noteProgress();
   void lost(int error);
+
+  // BusDriver_gate.cpp
+  int connectBus(sd_bus* bus);
+  Result<FileDescriptor> openInput();
+  bool feed();
+  void pauseReading();
+  void watchSocket();
+  void updateDeadline();
+  void awaitEndOfMessage();
+  void refuse(const std::string& why);
 
   // BusDriver_send.cpp
   void flush();
@@ -129,8 +147,12 @@ class BusDriver final : public std::enable_shared_from_this<BusDriver> {
 
   // I/O thread:
   std::weak_ptr<BusDriverClient> client_;
-  FileDescriptor socket_;  ///< until the bus has it
+  FileDescriptor socket_;  ///< sd-bus has copies, and closes them when it likes
   std::shared_ptr<void> admission_;
+  std::optional<PeerGuard> guard_;  ///< until the bus is opened
+  std::unique_ptr<GatedInput> input_;
+  Deadline deadline_;
+  EventLoop::Timer pause_;  ///< while the peer is not read because of its user's quota
   std::shared_ptr<const InterfaceTable> exported_;
   std::vector<sd_bus_vtable> exportedMethods_;
   BusHandle bus_;

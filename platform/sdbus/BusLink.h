@@ -41,6 +41,8 @@ class BusLink final : public BusDriverClient, public std::enable_shared_from_thi
   void setOwner(std::weak_ptr<BusLinkOwner> owner);
   /// Held until the link has closed its socket; set before `resume`.
   void setAdmission(std::shared_ptr<void> admission) { driver_->setAdmission(std::move(admission)); }
+  /// For a peer that is not trusted; set before `resume`.
+  void setGuard(PeerGuard guard) { driver_->setGuard(std::move(guard)); }
   void resume() { driver_->resume(weak_from_this()); }
 
   void call(std::string_view member, IPCArguments arguments, IPCConnection::Completion completion,

@@ -15,8 +15,10 @@ namespace qv::platform {
 
 using sdbus::BusLink;
 using sdbus::IPCContext;
+using sdbus::QuotaShare;
 using sdbus::SdBusIPCConnection;
 using sdbus::SdBusIPCListener;
+using sdbus::UserQuota;
 
 namespace {
 
@@ -37,7 +39,12 @@ std::vector<std::string> runtimeDirectories(const SdBusIPCOptions& options) {
 
 std::shared_ptr<IPCConnection> makeConnection(const std::shared_ptr<IPCContext>& context, FileDescriptor socket,
                                               BusLink::Role role, IPCPeer peer) {
-  return SdBusIPCConnection::create(std::make_shared<BusLink>(context, std::move(socket), role), std::move(peer));
+  auto link = std::make_shared<BusLink>(context, std::move(socket), role);
+  if (!context->options.trustsPeers) {
+    const auto now = UserQuota::Time::clock::now();
+    link->setGuard({QuotaShare::take(context->quotas.of(peer.userIdentifier, now), QuotaShare::Kind::Bytes, now), {}});
+  }
+  return SdBusIPCConnection::create(std::move(link), std::move(peer));
 }
 
 }  // namespace

@@ -11,8 +11,23 @@ namespace sdbus {
 struct IPCContext;
 }
 
-/// Where and within which bounds a service object works. The bounds are per peer.
+/// What all peers of one user may take together.
+struct IPCQuotas {
+  size_t connections = 256;                  ///< of listeners; root's are not counted
+  double connectionsPerSecond = 20;          ///< for long; `connections` at once. More are refused; not of root
+  size_t unfinishedBytes = size_t{8} << 20;  ///< of messages that have begun; who goes beyond is dropped
+  double callsPerSecond = 1000;              ///< for long, of messages of any kind; beyond, peers are read later
+  double callsAtOnce = 2000;
+};
+
+/// Where and within which bounds a service object works. The bounds are per peer, but for the quotas.
 struct SdBusIPCOptions {
+  /// Peers are believed to send sound messages, as a daemon is. Otherwise everything that comes passes a gate before
+  /// sd-bus reads it, the quotas count, and over a named service only the process that connected is listened to.
+  bool trustsPeers = false;
+  IPCQuotas quotas;
+  /// How long a peer that is not trusted may take for a message that it has begun, and for the authentication.
+  int unfinishedMilliseconds = 10000;
   /// Where the sockets of named services stand. Empty: $XDG_RUNTIME_DIR, or /run without it; then
   /// `connect` looks in /run too.
   std::string runtimeDirectory;
@@ -39,6 +54,13 @@ struct SdBusIPCOptions {
   /// taken nothing for so long. With the service it ends after that time in any case.
   int drainMilliseconds = 1000;
 };
+
+/// Of a process whose peers are the daemon's.
+inline SdBusIPCOptions optionsForTrustedPeers() {
+  SdBusIPCOptions options;
+  options.trustsPeers = true;
+  return options;
+}
 
 /// Inter-process messaging in the D-Bus wire format, peer to peer over Unix sockets, without a
 /// broker (docs/protocol.md).

@@ -46,7 +46,10 @@ FileDescriptor ListenerState::acceptNext(bool& isEmpty) {
     return received ? std::move(*received) : FileDescriptor();
   }
   FileDescriptor accepted(::accept4(socket_.get(), nullptr, nullptr, SOCK_CLOEXEC | SOCK_NONBLOCK));
-  if (accepted.isValid()) return accepted;
+  if (accepted.isValid()) {
+    if (!context->options.trustsPeers) askForSenders(accepted.get());
+    return accepted;
+  }
   const bool isOutOfDescriptors = errno == EMFILE || errno == ENFILE;
   isEmpty = !isOutOfDescriptors || !refuseOne();
   return {};
@@ -57,9 +60,9 @@ bool ListenerState::refuseOne() {
   spare_.reset();
   FileDescriptor refused(::accept4(socket_.get(), nullptr, nullptr, SOCK_CLOEXEC));
   const bool isRefused = refused.isValid();
+  if (isRefused) context->refusals.note(userOf(refused.get()), "refused: out of descriptors");
   refused.reset();
   spare_ = openSpare();
-  if (isRefused) QV_LOG_ERROR(logs::kIPC, "out of descriptors: refusing a connection");
   return isRefused;
 }
 
@@ -72,15 +75,29 @@ void ListenerState::acceptAll() {
   }
 }
 
+std::optional<PeerGuard> ListenerState::admit(uid_t user) {
+  const auto now = UserQuota::Time::clock::now();
+  auto share = QuotaShare::take(context->quotas.of(user, now), QuotaShare::Kind::Connection, now);
+  if (!share) return std::nullopt;
+  return PeerGuard{std::move(share), std::nullopt};
+}
+
 void ListenerState::acceptOne(FileDescriptor connected) {
+  const uid_t user = userOf(connected.get());
   if (*connections_ >= context->options.maximumConnections) {
-    QV_LOG_ERROR(logs::kIPC, "too many connections: refusing one");
-    return;
+    return context->refusals.note(user, "refused: too many connections");
+  }
+  std::optional<PeerGuard> guard;
+  if (!context->options.trustsPeers) {
+    guard = admit(user);
+    if (!guard) return context->refusals.note(user, "refused: too many connections of this user");
   }
   ++*connections_;
   IPCPeer peer = peerOf(connected.get());
+  if (guard && !isRendezvous_) guard->sender = WireSender{peer.processIdentifier, peer.userIdentifier};
   if (context->resolver) context->resolver(peer);
   auto link = std::make_shared<BusLink>(context, std::move(connected), BusLink::Role::Accepted);
+  if (guard) link->setGuard(std::move(*guard));
   link->setAdmission(std::shared_ptr<void>(nullptr, [connections = connections_](void*) { --*connections; }));
   auto connection = SdBusIPCConnection::create(std::move(link), std::move(peer));
   std::lock_guard lock(mutex);
@@ -145,6 +162,7 @@ std::optional<Error> SdBusIPCListener::resumeNamed() {
     socket = std::move(named->socket);
     lock_ = std::move(named->lock);
   }
+  if (!state_->context->options.trustsPeers) askForSenders(socket.get());
   state_->start(std::move(socket), false);
   isOpen_ = true;
   return std::nullopt;

@@ -3,9 +3,11 @@
 #include <atomic>
 #include <memory>
 #include <mutex>
+#include <optional>
 #include <string>
 
 #include "platform/IPC.h"
+#include "platform/sdbus/GatedInput.h"
 #include "platform/sdbus/IPCContext.h"
 #include "platform/threads/CallbackGate.h"
 
@@ -33,6 +35,7 @@ struct ListenerState : std::enable_shared_from_this<ListenerState> {
  private:
   void acceptAll();
   void acceptOne(FileDescriptor connected);
+  [[nodiscard]] std::optional<PeerGuard> admit(uid_t user);
   [[nodiscard]] FileDescriptor acceptNext(bool& isEmpty);
   bool refuseOne();  ///< false where nobody waits
   void offer(const std::shared_ptr<IPCConnection>& connection);

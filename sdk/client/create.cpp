@@ -17,8 +17,9 @@ std::shared_ptr<qv::platform::IPCService> sharedMessaging() {
   std::lock_guard lock(mutex);
   auto service = shared.lock();
   if (!service) {
-    // An application's only peer is the daemon, which it does not have to identify.
-    service = std::make_shared<qv::platform::SdBusIPCService>([](qv::platform::IPCPeer&) {});
+    // An application's only peer is the daemon, which it trusts and does not have to identify.
+    service = std::make_shared<qv::platform::SdBusIPCService>([](qv::platform::IPCPeer&) {},
+                                                              qv::platform::optionsForTrustedPeers());
     shared = service;
   }
   return service;

@@ -15,6 +15,9 @@ using namespace std::chrono_literals;
 
 constexpr auto kLongestFarewell = 5s;
 
+/// Nobody but the daemon reaches an extension: by its endpoints only.
+qv::platform::SdBusIPCOptions messaging() { return qv::platform::optionsForTrustedPeers(); }
+
 int run(qv::extension::ExtensionRuntime::Factory make) {
   const auto endpoints = qv::extension::ExtensionRuntime::inheritedEndpoints();
   if (!endpoints.requests.isValid() || !endpoints.auxiliary.isValid()) {
@@ -23,7 +26,7 @@ int run(qv::extension::ExtensionRuntime::Factory make) {
   }
   // A server that closes its socket is an error of the write, not the end of the process.
   std::signal(SIGPIPE, SIG_IGN);
-  qv::platform::SdBusIPCService ipc;
+  qv::platform::SdBusIPCService ipc({}, messaging());
   const auto process = qv::extension::ExtensionRuntime::create(ipc, std::move(make));
   if (const auto error = process->start(endpoints)) {
     std::fprintf(stderr, "no connection to the recording daemon: %s\n", error->description().c_str());
@@ -44,7 +47,8 @@ int runSampleExtension(SampleExtensionFactory make) { return run(std::move(make)
 int runClipExtension(ClipExtensionFactory make) { return run(std::move(make)); }
 
 std::unique_ptr<BroadcastListener> BroadcastListener::create(SampleExtensionFactory make) {
-  return qv::extension::ListenerBroadcasts::create(std::make_unique<qv::platform::SdBusIPCService>(), std::move(make));
+  auto ipc = std::make_unique<qv::platform::SdBusIPCService>(qv::platform::IPCPeerResolver(), messaging());
+  return qv::extension::ListenerBroadcasts::create(std::move(ipc), std::move(make));
 }
 
 }  // namespace quorvel

@@ -19,6 +19,7 @@ class ListenerTest : public SdBusTest {
   static SdBusIPCOptions options() {
     SdBusIPCOptions bounded;
     bounded.maximumConnections = kMostConnections;
+    bounded.quotas.connections = 2 * kMostConnections;  // of one user
     return bounded;
   }
 };

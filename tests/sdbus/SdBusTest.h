@@ -28,6 +28,7 @@ class SdBusTest : public ::testing::Test {
   explicit SdBusTest(SdBusIPCOptions options = {}) {
     options.runtimeDirectory = directory_;
     server_ = std::make_unique<SdBusIPCService>(resolver(), options);
+    options.trustsPeers = true;
     client_ = std::make_unique<SdBusIPCService>(IPCPeerResolver(), options);
   }
   ~SdBusTest() override {
