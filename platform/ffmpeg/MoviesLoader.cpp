@@ -18,6 +18,16 @@ auto openModule(const std::filesystem::path& path, const char* entry) -> Result<
   return open.error();
 }
 
+/// A failure is not kept.
+template <typename Open, typename Late>
+auto loaded(Late& late, const std::filesystem::path& path, const char* entry) {
+  std::lock_guard lock(late.mutex);
+  if (late.service != nullptr) return Result(late.service);
+  auto opened = openModule<Open>(path, entry);
+  if (opened) late.service = *opened;
+  return opened;
+}
+
 /// What there is of a movie, and of an export, when nothing can be read.
 ///
 /// Threading: immutable.
@@ -50,48 +60,42 @@ class FailedExportSession final : public ExportSession {
 
 MoviesLoader::MoviesLoader(std::string directory) : directory_(std::move(directory)) {}
 
-const Result<AssetWriterService*>& MoviesLoader::assetWriters() {
-  std::call_once(assetWritersOnce_, [this] {
-    assetWriters_.emplace(openModule<OpenMovies>(pathOfModule(directory_, kMoviesModule), kMoviesModuleEntry));
-  });
-  return *assetWriters_;
+Result<AssetWriterService*> MoviesLoader::assetWriters() {
+  return loaded<OpenMovies>(assetWriters_, pathOfModule(directory_, kMoviesModule), kMoviesModuleEntry);
 }
 
-const Result<ExportService*>& MoviesLoader::exports() {
-  std::call_once(exportsOnce_, [this] {
-    exports_.emplace(openModule<OpenExports>(pathOfModule(directory_, kExportsModule), kExportsModuleEntry));
-  });
-  return *exports_;
+Result<ExportService*> MoviesLoader::exports() {
+  return loaded<OpenExports>(exports_, pathOfModule(directory_, kExportsModule), kExportsModuleEntry);
 }
 
 void MoviesLoader::prepareForWriting() {
   // The loader lives as long as the process; a load that is under way makes later ones wait for it.
   globalQueue().post([this] {
-    if (const auto& service = assetWriters()) service.value()->prepareForWriting();
+    if (const auto service = assetWriters()) service.value()->prepareForWriting();
   });
 }
 
 Result<std::unique_ptr<AssetWriter>> MoviesLoader::createAssetWriter(const URL& outputURL,
                                                                      const std::string& fileType) {
-  const auto& service = assetWriters();
+  const auto service = assetWriters();
   if (!service) return service.error();
   return service.value()->createAssetWriter(outputURL, fileType);
 }
 
 std::shared_ptr<WriterInput> MoviesLoader::createWriterInput(MediaType type, const Dictionary& outputSettings) {
-  const auto& service = assetWriters();
+  const auto service = assetWriters();
   return service ? service.value()->createWriterInput(type, outputSettings) : nullptr;
 }
 
 std::shared_ptr<MovieAsset> MoviesLoader::openMovie(const URL& url) {
-  const auto& service = exports();
+  const auto service = exports();
   if (!service) return std::make_shared<UnreadableMovie>();
   return service.value()->openMovie(url);
 }
 
 std::shared_ptr<ExportSession> MoviesLoader::createExportSession(std::shared_ptr<MovieAsset> asset,
                                                                  ExportPreset preset) {
-  const auto& service = exports();
+  const auto service = exports();
   if (!service) return std::make_shared<FailedExportSession>(service.error());
   return service.value()->createExportSession(std::move(asset), preset);
 }

@@ -3,7 +3,6 @@
 #include <filesystem>
 #include <memory>
 #include <mutex>
-#include <optional>
 #include <string>
 
 #include "platform/AssetWriter.h"
@@ -15,8 +14,8 @@ namespace qv::platform::ffmpeg {
 /// megabytes, which a daemon that records nothing should not carry.
 ///
 /// The modules, `quorveld-movies.so` and `quorveld-exports.so`, stand beside the executable, or in
-/// ../lib/quorveld from there. Where one cannot be loaded every operation of it fails with the
-/// loader's words.
+/// ../lib/quorveld from there. Where one cannot be loaded the operation fails with the loader's words, and the next one
+/// tries again: the process may have been short of descriptors or memory.
 ///
 /// Threading: thread-safe.
 class MoviesLoader final : public AssetWriterService, public ExportService {
@@ -33,13 +32,20 @@ class MoviesLoader final : public AssetWriterService, public ExportService {
   std::shared_ptr<ExportSession> createExportSession(std::shared_ptr<MovieAsset> asset, ExportPreset preset) override;
 
  private:
-  const Result<AssetWriterService*>& assetWriters();
-  const Result<ExportService*>& exports();
+  /// A service of a module, from when it is loaded. Who asks meanwhile waits.
+  ///
+  /// Threading: thread-safe.
+  template <typename Service>
+  struct Late {
+    std::mutex mutex;
+    Service* service = nullptr;
+  };
+  Result<AssetWriterService*> assetWriters();
+  Result<ExportService*> exports();
 
   const std::string directory_;
-  std::once_flag assetWritersOnce_, exportsOnce_;
-  std::optional<Result<AssetWriterService*>> assetWriters_;
-  std::optional<Result<ExportService*>> exports_;
+  Late<AssetWriterService> assetWriters_;
+  Late<ExportService> exports_;
 };
 
 }  // namespace qv::platform::ffmpeg

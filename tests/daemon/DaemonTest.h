@@ -112,7 +112,7 @@ class DaemonTest : public testing::Test {
   /// By the newest screen capture that runs, if any does.
   void sendFrame(int64_t nanoseconds, uint64_t flags = 0);
   std::shared_ptr<QVRecording> recordingOf(const TestClient& client) {
-    return manager_->sessions().recordingSessionForBundleID(client.bundleID())->recording();
+    return manager_->sessions().find(client.bundleID())->recording();
   }
   /// Some of the daemon's work.
   void runWork(int count) {
