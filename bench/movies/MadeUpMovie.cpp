@@ -31,6 +31,7 @@ class ImpatientFile final : public MovieFile {
   int64_t writeAt(std::span<const uint8_t> bytes, uint64_t offset) override { return file_->writeAt(bytes, offset); }
   int truncate(uint64_t size) override { return file_->truncate(size); }
   int sync() override { return syncs_ ? file_->sync() : 0; }
+  int close() override { return file_->close(); }
 
  private:
   std::unique_ptr<MovieFile> file_;
@@ -43,6 +44,7 @@ class CountingFile final : public MovieFile {
   int64_t writeAt(std::span<const uint8_t> bytes, uint64_t) override { return static_cast<int64_t>(bytes.size()); }
   int truncate(uint64_t) override { return 0; }
   int sync() override { return 0; }
+  int close() override { return 0; }
 };
 
 MovieTrack soundTrack(uint32_t trackID) {

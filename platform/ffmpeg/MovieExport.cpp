@@ -48,7 +48,8 @@ std::optional<Error> MovieExport::exportTo(const std::string& path) {
   if (auto error = openDestination(path)) return error;
   if (auto error = copyMedia()) return error;
   if (auto error = finishMedia()) return error;
-  return writer_->finish({std::nullopt, static_cast<uint64_t>(range_.end - range_.start)});
+  if (auto error = writer_->finish({std::nullopt, static_cast<uint64_t>(range_.end - range_.start)})) return error;
+  return writer_->close();
 }
 
 std::optional<Error> MovieExport::chooseRange() {

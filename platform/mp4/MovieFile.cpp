@@ -2,6 +2,7 @@
 
 #include <fcntl.h>
 #include <sys/file.h>
+#include <sys/stat.h>
 #include <unistd.h>
 
 #include <cerrno>
@@ -13,7 +14,7 @@ Result<std::unique_ptr<MovieFile>> DiskMovieFile::create(const std::string& path
   if (!fd.isValid()) return Error::posix(errno, path);
   // For whoever looks for unfinished movies. Where the file system has no locks, nobody is kept away.
   (void)::flock(fd.get(), LOCK_EX | LOCK_NB);
-  return std::unique_ptr<MovieFile>(std::make_unique<DiskMovieFile>(std::move(fd)));
+  return std::unique_ptr<MovieFile>(std::make_unique<DiskMovieFile>(std::move(fd), path));
 }
 
 DiskMovieFile::~DiskMovieFile() { (void)::flock(fd_.get(), LOCK_UN); }
@@ -25,7 +26,30 @@ int64_t DiskMovieFile::writeAt(std::span<const uint8_t> bytes, uint64_t offset) 
 
 int DiskMovieFile::truncate(uint64_t size) { return ::ftruncate(fd_.get(), static_cast<off_t>(size)) == 0 ? 0 : errno; }
 
-int DiskMovieFile::sync() { return ::fdatasync(fd_.get()) == 0 ? 0 : errno; }
+int DiskMovieFile::sync() {
+  struct stat info {};
+  if (::fdatasync(fd_.get()) != 0 || ::fstat(fd_.get(), &info) != 0) return errno;
+  return info.st_nlink > 0 ? 0 : ENOENT;
+}
+
+int DiskMovieFile::checkPlace() const {
+  struct stat mine {
+  }, found{};
+  if (::fstat(fd_.get(), &mine) != 0) return errno;
+  if (mine.st_nlink == 0) return ENOENT;
+  if (path_.empty()) return 0;
+  if (::lstat(path_.c_str(), &found) != 0) return errno;
+  return found.st_dev == mine.st_dev && found.st_ino == mine.st_ino ? 0 : ENOENT;
+}
+
+int DiskMovieFile::close() {
+  if (!fd_.isValid()) return EBADF;
+  const int place = checkPlace();
+  (void)::flock(fd_.get(), LOCK_UN);
+  // Some file systems tell of a lost write only here. Interrupted, the descriptor is closed all the same.
+  if (::close(fd_.release()) != 0 && errno != EINTR) return errno;
+  return place;
+}
 
 std::optional<Error> writeFully(MovieFile& file, std::span<const uint8_t> bytes, uint64_t offset) {
   while (!bytes.empty()) {

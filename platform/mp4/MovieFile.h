@@ -26,6 +26,8 @@ class MovieFile {
   virtual int truncate(uint64_t size) = 0;
   /// Waits until all that was written has reached the disk; 0 or an errno.
   virtual int sync() = 0;
+  /// Ends the use of the file, and tells what only shows then; 0 or an errno.
+  virtual int close() = 0;
 };
 
 /// A file on disk.
@@ -35,7 +37,8 @@ class DiskMovieFile final : public MovieFile {
  public:
   /// A new file; EEXIST where there is one already. It is locked (flock) until it is closed.
   static Result<std::unique_ptr<MovieFile>> create(const std::string& path);
-  explicit DiskMovieFile(FileDescriptor fd) : fd_(std::move(fd)) {}
+  /// `path`: where the file was made, and must be until it is closed; empty where that does not matter.
+  explicit DiskMovieFile(FileDescriptor fd, std::string path = {}) : fd_(std::move(fd)), path_(std::move(path)) {}
   /// Gives the lock back, rather than to leave that to the last close: whoever lists the descriptors of this process
   /// holds each of them for a moment.
   ~DiskMovieFile() override;
@@ -43,10 +46,16 @@ class DiskMovieFile final : public MovieFile {
   [[nodiscard]] int fd() const { return fd_.get(); }
   int64_t writeAt(std::span<const uint8_t> bytes, uint64_t offset) override;
   int truncate(uint64_t size) override;
+  /// ENOENT where the file was removed meanwhile: nobody will find what goes there.
   int sync() override;
+  /// ENOENT where the file was removed, moved, or another one is in its place.
+  int close() override;
 
  private:
+  [[nodiscard]] int checkPlace() const;
+
   FileDescriptor fd_;
+  const std::string path_;
 };
 
 /// Writes all of `bytes` at `offset`, going on after short writes and interruptions.

@@ -55,6 +55,8 @@ void MovieRecorder::run() {
     if (work.finish || work.isLast) flush();
     if (work.finish) {
       if (!error_) error_ = writer_.finish(work.finish->end);
+      const auto lost = writer_.close();
+      if (!error_) error_ = lost;
       work.finish->completion(error_);
     }
     if (work.isLast) return;

@@ -39,7 +39,7 @@ class MovieRecorder {
 
   /// Blocks while the queue is full.
   void append(size_t track, EncodedSample sample);
-  /// Once. `completion` gets the first error that there was.
+  /// Once. `completion` gets the first error that there was; the file is closed by then.
   void finish(const MovieEnd& end, std::function<void(std::optional<Error>)> completion);
 
  private:

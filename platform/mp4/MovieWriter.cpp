@@ -142,4 +142,10 @@ std::optional<Error> MovieWriter::finish(const MovieEnd& end) {
   return syncFile();
 }
 
+std::optional<Error> MovieWriter::close() {
+  const int failure = file_->close();
+  if (failure != 0) return Error::posix(failure, "movie file");
+  return std::nullopt;
+}
+
 }  // namespace qv::platform::mp4

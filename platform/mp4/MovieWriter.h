@@ -58,6 +58,8 @@ class MovieWriter {
   void setTrackStart(size_t index, int64_t mediaStart, uint64_t startDelay);
   /// Also after an error, to make the most of what is there.
   std::optional<Error> finish(const MovieEnd& end);
+  /// Lets go of the file, which cannot be written any more; an error where it is not sure to hold all of that.
+  std::optional<Error> close();
 
   /// Takes over a file that was read back: `size` is the end of its last whole fragment.
   void adopt(uint64_t placeholderOffset, uint64_t size, std::vector<TrackIndex> index);

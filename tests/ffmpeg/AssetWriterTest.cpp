@@ -171,6 +171,7 @@ class FailingDisk final : public mp4::MovieFile {
   }
   int truncate(uint64_t size) override { return file_->truncate(size); }
   int sync() override { return fault_.isOnSync && end_ >= kRoom && fails() ? fault_.errnum : file_->sync(); }
+  int close() override { return file_->close(); }
 
  private:
   bool fails() { return !std::exchange(hasFailed_, true) || !fault_.isOnce; }
