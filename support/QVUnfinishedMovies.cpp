@@ -46,8 +46,8 @@ Result<std::string> QVUnfinishedMovies::keepAside(const std::string& name) {
   return Error::posix(EEXIST, stem.value());
 }
 
-void QVUnfinishedMovies::removeWithoutPicture(const std::string& name) {
-  QV_LOG(logs::kSupport, "removing the unfinished movie \"%s\", which holds no whole picture", name.c_str());
+void QVUnfinishedMovies::removeWithoutMedia(const std::string& name) {
+  QV_LOG(logs::kSupport, "removing the unfinished movie \"%s\", into which no picture was written", name.c_str());
   if (const auto error = files_.disk().removeItem(files_.pathInStore(name))) {
     QV_LOG_ERROR(logs::kSupport, "unfinished movie: %s", error->description().c_str());
   }
@@ -64,11 +64,19 @@ void QVUnfinishedMovies::finishMovie(const std::string& name) {
     QV_LOG_ERROR(logs::kSupport, "the unfinished movie \"%s\" stays as it is: %s", kept.value().c_str(),
                  length.error().description().c_str());
   } else if (length.value() == platform::MediaTime::zero()) {
-    removeWithoutPicture(kept.value());
+    removeWithoutMedia(kept.value());
   } else {
     QV_LOG(logs::kSupport, "finished an unfinished movie of %.1f s: \"%s\"", length.value().seconds(),
            kept.value().c_str());
   }
+}
+
+/// A movie that is damaged so that nobody here can read it. Somebody else may.
+void QVUnfinishedMovies::keepDamaged(const std::string& name, const Error& damage) {
+  const auto kept = keepAside(name);
+  const Error& reason = kept ? damage : kept.error();
+  QV_LOG_ERROR(logs::kSupport, "\"%s\" is no movie that can be finished, and stays as it is, as \"%s\": %s",
+               name.c_str(), kept ? kept.value().c_str() : name.c_str(), reason.description().c_str());
 }
 
 void QVUnfinishedMovies::_srSalvageUnfinishedMovies() {
@@ -80,9 +88,10 @@ void QVUnfinishedMovies::_srSalvageUnfinishedMovies() {
   for (const std::string& name : names.value()) {
     if (!name.ends_with(kExtension)) continue;
     const auto state = salvage_.stateOfMovie(files_.pathInStore(name));
-    if (!state) {
-      QV_LOG_ERROR(logs::kSupport, "\"%s\" is no movie that can be finished: %s", name.c_str(),
-                   state.error().description().c_str());
+    if (!state && state.error().domain != platform::kPosixErrorDomain) {
+      keepDamaged(name, state.error());
+    } else if (!state) {
+      QV_LOG_ERROR(logs::kSupport, "\"%s\" cannot be looked at: %s", name.c_str(), state.error().description().c_str());
     } else if (state.value() == MovieState::Unfinished) {
       finishMovie(name);
     }

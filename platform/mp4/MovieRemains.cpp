@@ -1,193 +1,86 @@
 #include "platform/mp4/MovieRemains.h"
 
 #include <algorithm>
-#include <string>
+#include <limits>
 
+#include "platform/mp4/FragmentReader.h"
+#include "platform/mp4/HeaderReader.h"
 #include "platform/mp4/MovieHeader.h"
 #include "platform/mp4/MovieWriter.h"
+#include "platform/mp4/RunTimes.h"
 
 namespace qv::platform::mp4 {
 namespace {
 
-constexpr uint32_t kMaximumTrackID = 16;
-constexpr int64_t kMaximumTime = int64_t{1} << 52;
+/// The header of an unfinished movie takes less.
+constexpr uint64_t kMaximumWithoutMedia = 64u << 10;
 
 Error notOurs(const char* what) { return movieError(kMovieNotReadable, what); }
 
-std::span<const uint8_t> descend(std::span<const uint8_t> bytes, std::initializer_list<uint32_t> path) {
-  for (const uint32_t type : path) bytes = findBox(bytes, type);
-  return bytes;
-}
-
-void readTrackHead(std::span<const uint8_t> content, MovieTrack& track) {
-  ByteReader in(content);
-  in.skip(4 + 16);
-  track.trackID = in.u32();
-  in.skip(4 + 8 + 8 + 8);
-  for (int32_t& value : track.matrix) value = static_cast<int32_t>(in.u32());
-  track.width = in.u32() >> 16;
-  track.height = in.u32() >> 16;
-  if (in.failed()) track.trackID = 0;
-}
-
-int64_t readMediaStart(std::span<const uint8_t> content) {
-  ByteReader in(content);
-  in.skip(8 + 8);
-  return static_cast<int64_t>(in.u64());
-}
-
-/// The first sample entry, where it lies whole in its box.
-std::vector<uint8_t> readSampleEntry(std::span<const uint8_t> content) {
-  if (content.size() < 8) return {};
-  auto entries = content.subspan(8);
-  const auto entry = takeBox(entries);
-  return entry ? std::vector<uint8_t>(entry->whole.begin(), entry->whole.end()) : std::vector<uint8_t>();
-}
-
-std::optional<MovieTrack> readTrack(std::span<const uint8_t> trak) {
-  MovieTrack track;
-  readTrackHead(findBox(trak, boxType("tkhd")), track);
-  ByteReader mdhd(descend(trak, {boxType("mdia"), boxType("mdhd")}));
-  mdhd.skip(4 + 16);
-  track.timescale = mdhd.u32();
-  ByteReader hdlr(descend(trak, {boxType("mdia"), boxType("hdlr")}));
-  hdlr.skip(8);
-  track.kind = hdlr.u32() == boxType("vide") ? MovieTrack::Kind::Video : MovieTrack::Kind::Audio;
-  track.mediaStart = readMediaStart(descend(trak, {boxType("edts"), boxType("elst")}));
-  track.sampleEntry =
-      readSampleEntry(descend(trak, {boxType("mdia"), boxType("minf"), boxType("stbl"), boxType("stsd")}));
-  const bool isGood = track.trackID >= 1 && track.trackID <= kMaximumTrackID && track.timescale > 0 &&
-                      track.mediaStart >= 0 && track.mediaStart < kMaximumTime && !track.sampleEntry.empty();
-  return isGood ? std::optional(track) : std::nullopt;
-}
-
-std::vector<MovieTrack> readTracks(std::span<const uint8_t> moov) {
-  std::vector<MovieTrack> tracks;
-  while (auto box = takeBox(moov)) {
-    if (box->type != boxType("trak")) continue;
-    auto track = readTrack(box->content);
-    if (!track || tracks.size() >= kMaximumTrackID) return {};
-    tracks.push_back(std::move(*track));
-  }
-  return tracks;
-}
-
-/// The samples of one track as a fragment's head describes them.
-struct SampleRun {
-  size_t track;
-  int64_t decodeTime;
-  uint64_t dataOffset;  ///< from the fragment's beginning
-  uint64_t dataSize;
-  struct Entry {
-    uint32_t duration, size, flags;
+/// All that is left, in the order of the file. After damage it goes on at the next whole fragment.
+std::vector<SampleRun> walkFragments(const FileBoxes& boxes, uint64_t at, const std::vector<MovieTrack>& tracks) {
+  std::vector<SampleRun> found;
+  const auto add = [&](std::vector<SampleRun> runs) {
+    for (SampleRun& run : runs) found.push_back(std::move(run));
   };
-  std::vector<Entry> entries;
-};
-
-constexpr uint32_t kNotSyncFlag = 0x00010000;
-// What tfhd and trun may tell of their samples; where they tell nothing, or more, they are not ours.
-constexpr uint32_t kBaseIsMoof = 0x020000, kDefaultDuration = 0x08, kDefaultFlags = 0x20;
-constexpr uint32_t kDataOffset = 0x001, kFirstFlags = 0x004, kEachDuration = 0x100, kEachSize = 0x200;
-
-/// What a fragment says of all samples of a track.
-struct FragmentDefaults {
-  std::optional<uint32_t> duration;
-  uint32_t flags;
-};
-
-/// Adds the samples of one "trun". False where it is not one of ours.
-bool readRun(ByteReader trun, const FragmentDefaults& defaults, SampleRun& run) {
-  const uint32_t flags = trun.u32();
-  const uint32_t count = trun.u32();
-  const uint32_t durationFlag = defaults.duration ? 0 : kEachDuration;
-  const uint32_t dataOffset = trun.u32();
-  const uint32_t firstFlags = (flags & kFirstFlags) != 0 ? trun.u32() : defaults.flags;
-  const size_t entrySize = defaults.duration ? 4 : 8;
-  const bool isGood = (flags & ~kFirstFlags) == (kDataOffset | kEachSize | durationFlag) &&
-                      dataOffset == run.dataOffset + run.dataSize && !trun.failed() && count > 0 &&
-                      trun.left() == count * entrySize;
-  if (!isGood) return false;
-  for (uint32_t i = 0; i < count; ++i) {
-    const uint32_t duration = defaults.duration ? *defaults.duration : trun.u32();
-    const uint32_t size = trun.u32();
-    if (duration == 0) return false;
-    run.entries.push_back({duration, size, i == 0 ? firstFlags : defaults.flags});
-    run.dataSize += size;
-  }
-  return true;
-}
-
-/// One track's part of a fragment; nothing where its data is not at `dataOffset`.
-std::optional<SampleRun> readRuns(std::span<const uint8_t> traf, uint64_t dataOffset,
-                                  const std::vector<MovieTrack>& tracks) {
-  ByteReader tfhd(findBox(traf, boxType("tfhd")));
-  const uint32_t flags = tfhd.u32();
-  const uint32_t trackID = tfhd.u32();
-  const auto duration = (flags & kDefaultDuration) != 0 ? std::optional(tfhd.u32()) : std::nullopt;
-  const FragmentDefaults defaults{duration, tfhd.u32()};
-  ByteReader tfdt(findBox(traf, boxType("tfdt")));
-  tfdt.skip(4);
-  const auto decodeTime = static_cast<int64_t>(tfdt.u64());
-  const auto track =
-      std::find_if(tracks.begin(), tracks.end(), [&](const MovieTrack& t) { return t.trackID == trackID; });
-  const bool isGood = track != tracks.end() && (flags & ~kDefaultDuration) == (kBaseIsMoof | kDefaultFlags) &&
-                      decodeTime >= 0 && decodeTime < kMaximumTime && !tfhd.failed() && !tfdt.failed();
-  if (!isGood) return std::nullopt;
-  SampleRun run{static_cast<size_t>(track - tracks.begin()), decodeTime, dataOffset, 0, {}};
-  while (auto box = takeBox(traf)) {
-    if (box->type == boxType("trun") && !readRun(ByteReader(box->content), defaults, run)) return std::nullopt;
-  }
-  return run.entries.empty() ? std::nullopt : std::optional(std::move(run));
-}
-
-/// Reads a fragment's head; nothing where it is not one of ours or does not fit its media data.
-std::optional<std::vector<SampleRun>> readFragment(std::span<const uint8_t> moof, const FileBox& head,
-                                                   const FileBox& data, const std::vector<MovieTrack>& tracks) {
-  std::vector<SampleRun> runs;
-  uint64_t expected = head.size + data.headSize;
-  while (auto box = takeBox(moof)) {
-    if (box->type != boxType("traf")) continue;
-    auto run = readRuns(box->content, expected, tracks);
-    if (!run) return std::nullopt;
-    expected += run->dataSize;
-    runs.push_back(std::move(*run));
-  }
-  if (runs.empty() || expected != head.size + data.size) return std::nullopt;
-  return runs;
-}
-
-void index(const SampleRun& run, uint64_t fragmentOffset, TrackIndex& index) {
-  uint64_t offset = fragmentOffset + run.dataOffset;
-  int64_t time = run.decodeTime;
-  bool isFirst = true;
-  for (const auto& entry : run.entries) {
-    index.add(time, entry.duration, entry.size, (entry.flags & kNotSyncFlag) == 0, offset, isFirst);
-    isFirst = false;
-    time += entry.duration;
-    offset += entry.size;
-  }
-}
-
-void walkFragments(const FileBoxes& boxes, MovieRemains& remains) {
-  for (;;) {
-    const auto head = boxes.at(remains.end);
-    if (!head || head->type != boxType("moof")) return;
-    const auto data = boxes.at(head->end());
-    if (!data || data->type != boxType("mdat")) return;
-    const auto bytes = boxes.read(*head);
-    if (bytes.empty()) return;
-    const auto runs = readFragment(std::span(bytes).subspan(8), *head, *data, remains.tracks);
-    if (!runs) return;
-    for (const SampleRun& run : *runs) {
-      // Times rise across fragments, or the index could not hold them.
-      const TrackIndex& track = remains.index[run.track];
-      const bool rises = track.isEmpty() || (run.decodeTime > track.lastDecodeTime() &&
-                                             run.decodeTime - track.lastDecodeTime() <= int64_t{UINT32_MAX});
-      if (!rises) return;
+  while (at < boxes.size()) {
+    if (auto fragment = readFragment(boxes, at, tracks)) {
+      add(std::move(fragment->runs));
+      at = fragment->end;
+      continue;
     }
-    for (const SampleRun& run : *runs) index(run, head->offset, remains.index[run.track]);
-    remains.end = data->end();
+    const uint64_t next = findFragment(boxes, at + 1, tracks).value_or(boxes.size());
+    add(readDamaged(boxes, at, next, tracks));
+    at = next;
   }
+  return found;
+}
+
+int64_t inMovieTime(int64_t ticks, const MovieTrack& track) {
+  return static_cast<int64_t>(static_cast<__int128>(ticks) * kMovieTimescale / track.timescale);
+}
+
+/// An index counts from its first sample: a track whose beginning is lost begins later.
+void moveStart(MovieTrack& track, int64_t firstTime) {
+  constexpr int64_t kLongestDelay = std::numeric_limits<uint32_t>::max();
+  const int64_t delay = inMovieTime(std::max<int64_t>(firstTime - track.mediaStart, 0), track);
+  if (delay <= kLongestDelay) track.startDelay = static_cast<uint64_t>(delay);
+  track.mediaStart = std::max<int64_t>(track.mediaStart - firstTime, 0);
+}
+
+TrackIndex indexOf(const std::vector<SampleRun>& runs, MovieTrack& track) {
+  TrackIndex index;
+  const auto times = timesOf(runs);
+  if (runs.empty()) return index;
+  const int64_t first = times.front().front();
+  moveStart(track, first);
+  for (size_t i = 0; i < runs.size(); ++i) {
+    uint64_t offset = runs[i].offset;
+    for (size_t j = 0; j < runs[i].entries.size(); ++j) {
+      const auto& entry = runs[i].entries[j];
+      index.add(times[i][j] - first, entry.duration, entry.size, entry.isSync, offset, j == 0);
+      offset += entry.size;
+    }
+  }
+  return index;
+}
+
+/// The movie begins with its first track that has anything left.
+void closeGapAtStart(MovieRemains& remains) {
+  uint64_t earliest = std::numeric_limits<uint64_t>::max();
+  for (size_t i = 0; i < remains.tracks.size(); ++i) {
+    if (!remains.index[i].isEmpty()) earliest = std::min(earliest, remains.tracks[i].startDelay);
+  }
+  for (size_t i = 0; i < remains.tracks.size(); ++i) {
+    if (!remains.index[i].isEmpty()) remains.tracks[i].startDelay -= earliest;
+  }
+}
+
+void indexRuns(std::vector<SampleRun> found, MovieRemains& remains) {
+  std::vector<std::vector<SampleRun>> runs(remains.tracks.size());
+  for (SampleRun& run : found) runs[run.track].push_back(std::move(run));
+  for (size_t i = 0; i < runs.size(); ++i) remains.index.push_back(indexOf(runs[i], remains.tracks[i]));
+  closeGapAtStart(remains);
 }
 
 /// The boxes that every file of the movie writer's begins with.
@@ -206,6 +99,31 @@ Result<Beginning> readBeginning(const FileBoxes& boxes) {
 
 bool isHeader(const std::optional<FileBox>& box) { return box && box->type == boxType("moov"); }
 
+/// The index that the file ends with, wherever that begins. In a finished movie whose beginning is damaged nothing else
+/// tells.
+std::optional<FileBox> findIndexAtEnd(const FileBoxes& boxes) {
+  const uint64_t size = boxes.size();
+  for (uint64_t from = size - std::min(size, FileBoxes::kMaximumSize);;) {
+    const auto found = boxes.find(boxType("moov"), from, size);
+    if (!found) return std::nullopt;
+    const auto box = *found >= 4 ? boxes.at(*found - 4) : std::nullopt;
+    if (box && box->end() == size && !readIndexedSamples(boxes, *box).empty()) return box;
+    from = *found + 4;
+  }
+}
+
+/// What is written last must be whole, where nothing tells that it reached the disk.
+std::optional<WrittenIndex> readWrittenIndex(const FileBoxes& boxes) {
+  const auto box = findIndexAtEnd(boxes);
+  const auto bytes = box ? boxes.read(*box) : std::vector<uint8_t>();
+  if (bytes.size() <= 8 || !hasWholeTables(std::span(bytes).subspan(8))) return std::nullopt;
+  ByteReader head(findBox(std::span(bytes).subspan(8), boxType("mvhd")));
+  head.skip(4 + 16 + 4);
+  const uint64_t duration = head.u64();
+  const bool isLength = duration > 0 && duration < static_cast<uint64_t>(kMaximumTime);
+  return head.failed() || !isLength ? std::nullopt : std::optional(WrittenIndex{box->offset, duration});
+}
+
 }  // namespace
 
 bool MovieRemains::hasPicture() const {
@@ -215,14 +133,27 @@ bool MovieRemains::hasPicture() const {
   return false;
 }
 
-Result<bool> isFinishedMovie(const FileBoxes& boxes) {
+bool holdsNoMedia(const FileBoxes& boxes) {
+  if (boxes.size() > kMaximumWithoutMedia) return false;
+  ByteWriter type;
+  writeFileType(type);
+  const auto wanted = type.bytes().first(std::min<size_t>(type.size(), boxes.size()));
+  if (!std::ranges::equal(boxes.read(0, wanted.size()), wanted)) return false;
+  return !boxes.find(boxType("moof"), 0, boxes.size()) && !boxes.find(boxType("mdat"), 0, boxes.size());
+}
+
+Result<MovieState> readMovieState(const FileBoxes& boxes) {
   const auto beginning = readBeginning(boxes);
-  if (!beginning) return beginning.error();
-  const auto& [second, third] = beginning.value();
-  if (second.type == boxType("free") && second.size == kPlaceholderSize && isHeader(third)) return false;
-  if (second.type != boxType("mdat") || second.headSize != kPlaceholderSize) return notOurs("no header");
-  if (!isHeader(third)) return notOurs("its index is missing");
-  return true;
+  if (beginning) {
+    const auto& [second, third] = beginning.value();
+    if (second.type == boxType("free") && second.size == kPlaceholderSize && isHeader(third))
+      return MovieState::Unfinished;
+    const bool isMedia = second.type == boxType("mdat") && second.headSize == kPlaceholderSize;
+    if (isMedia && isHeader(third) && !readIndexedSamples(boxes, *third).empty()) return MovieState::Finished;
+  }
+  if (findIndexAtEnd(boxes)) return MovieState::Finished;
+  if (holdsNoMedia(boxes)) return MovieState::Unfinished;
+  return beginning ? notOurs("neither a header nor an index") : beginning.error();
 }
 
 Result<MovieRemains> readRemains(const FileBoxes& boxes) {
@@ -231,12 +162,13 @@ Result<MovieRemains> readRemains(const FileBoxes& boxes) {
   const FileBox& header = *beginning.value().third;
   MovieRemains remains;
   remains.placeholder = beginning.value().second.offset;
-  remains.end = header.end();
+  remains.writtenIndex = readWrittenIndex(boxes);
+  if (remains.writtenIndex) return remains;
   const auto bytes = boxes.read(header);
   if (bytes.size() > 8) remains.tracks = readTracks(std::span(bytes).subspan(8));
   if (remains.tracks.empty()) return notOurs("no tracks");
-  remains.index.resize(remains.tracks.size());
-  walkFragments(boxes, remains);
+  indexRuns(walkFragments(boxes, header.end(), remains.tracks), remains);
+  if (!remains.hasPicture()) return notOurs("no picture");
   return remains;
 }
 

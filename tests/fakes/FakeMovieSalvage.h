@@ -2,6 +2,8 @@
 
 #include <cerrno>
 #include <map>
+#include <optional>
+#include <set>
 #include <string>
 #include <vector>
 
@@ -9,19 +11,23 @@
 
 namespace qv::fakes {
 
-/// Files are by their names what the test says, and no movies otherwise; salvage gives the same length each time.
+/// Files are by their names what the test says; salvage gives the same length each time.
 class FakeMovieSalvage final : public platform::MovieSalvage {
  public:
   platform::Result<platform::MovieState> stateOfMovie(const std::string& path) override {
+    if (damaged.contains(nameOf(path))) return platform::Error{"movie", 1, {}};
     const auto it = states.find(nameOf(path));
-    if (it == states.end()) return platform::Error::posix(EINVAL, path);
-    return it->second;
+    if (it != states.end()) return it->second;
+    if (others) return *others;
+    return platform::Error::posix(EINVAL, path);
   }
   platform::Result<platform::MediaTime> salvageMovie(const std::string& path) override {
     salvaged.push_back(nameOf(path));
     return length;
   }
   std::map<std::string, platform::MovieState> states;
+  std::optional<platform::MovieState> others;  ///< no movies without
+  std::set<std::string> damaged;
   platform::Result<platform::MediaTime> length = platform::MediaTime::make(3, 2);
   std::vector<std::string> salvaged;
 

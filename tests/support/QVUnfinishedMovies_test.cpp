@@ -1,5 +1,6 @@
 #include "support/QVUnfinishedMovies.h"
 
+#include <algorithm>
 #include <cerrno>
 #include <cstring>
 
@@ -76,6 +77,20 @@ TEST_F(UnfinishedMoviesTest, StayAsTheyAreWhereNoNameCanBeHad) {
   salvage();
   EXPECT_EQ(salvage_.salvaged, std::vector<std::string>{stemOf("Chess") + " 100.mp4"});
   EXPECT_TRUE(disk_.itemExists(std::string(kStore) + "Chess.mp4"));
+}
+
+/// Whatever it holds, the next recording of that application would replace it.
+TEST_F(UnfinishedMoviesTest, WhatIsDamagedIsKeptUnderANameOfItsOwn) {
+  add("Broken.mp4");
+  salvage_.damaged = {"Broken.mp4"};
+  salvage();
+  const auto kept = names();
+  const auto broken =
+      std::ranges::find_if(kept, [](const auto& name) { return name.starts_with("Broken_recovered_"); });
+  ASSERT_NE(broken, kept.end());
+  EXPECT_EQ(disk_.readFile(kStore + *broken).value(), "Broken.mp4");
+  EXPECT_EQ(log_.countContaining("\"" + *broken + "\""), 1u);
+  EXPECT_EQ(kept.size(), 6u);
 }
 
 TEST_F(UnfinishedMoviesTest, AStoreThatCannotBeReadCostsALogLine) {
