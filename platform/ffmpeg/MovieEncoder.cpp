@@ -18,6 +18,16 @@ constexpr int64_t kLongestInterval = mp4::kMovieTimescale / 10;
 constexpr int64_t kLongestGap = int64_t{mp4::kMovieTimescale} * 3600 * 12;
 constexpr int64_t kNanosecondsPerSecond = 1'000'000'000;
 
+/// Pictures that had been taken when the file failed count among neither.
+void logEnd(uint64_t pictures, uint64_t dropped, const std::optional<Error>& error) {
+  if (error) {
+    QV_LOG_ERROR(logs::kMovie, "movie not completed after %" PRIu64 " pictures, %" PRIu64 " dropped: %s", pictures,
+                 dropped, error->description().c_str());
+  } else {
+    QV_LOG(logs::kMovie, "movie finished: %" PRIu64 " pictures, %" PRIu64 " dropped", pictures, dropped);
+  }
+}
+
 }  // namespace
 
 MovieEncoder::MovieEncoder(std::shared_ptr<WriterState> state, std::unique_ptr<mp4::MovieFile> file,
@@ -194,8 +204,6 @@ mp4::MovieEnd MovieEncoder::finishTracks(const std::optional<MediaTime>& endTime
     if (tracks_[i].audio) check(tracks_[i].audio->finish(soundEnd, samples));
     write(i, samples);
   }
-  QV_LOG(logs::kMovie, "movie finished: %" PRIu64 " pictures, %" PRIu64 " dropped", pictures_,
-         state_->droppedPictures());
   return end;
 }
 
@@ -203,7 +211,9 @@ void MovieEncoder::finish(SessionFinish request) {
   if (state_->status() == AssetWriterStatus::Writing) beginFile();
   const mp4::MovieEnd end = isFileEnded_ ? mp4::MovieEnd() : finishTracks(request.endTime);
   // Moved all the way: the last reference to whatever it holds must not end on a thread of the writer's.
-  auto complete = [state = state_, completion = std::move(request.completion)](std::optional<Error> error) mutable {
+  auto complete = [state = state_, completion = std::move(request.completion),
+                   pictures = pictures_](std::optional<Error> error) mutable {
+    logEnd(pictures, state->droppedPictures(), error);
     error ? state->fail(*error) : state->complete();
     globalQueue().post(std::move(completion));
   };
