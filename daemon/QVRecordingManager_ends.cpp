@@ -37,8 +37,11 @@ void QVRecordingManager::stopCurrentRecordingSessionWithHandler() {
 }
 
 MovieFate QVRecordingManager::storeInPhotoLibrary(const std::string& owner) const {
-  return [handover = handover_, owner](const std::shared_ptr<MovieClaim>& movie, auto done) {
-    handover->storeSystemRecording(movie, owner, [done](const std::optional<URL>& kept, const auto&) { done(kept); });
+  return [handover = handover_, owner](const OutputResult& made, auto done) {
+    // What is left of a failed write stays with whoever can be told of it.
+    if (made.failure) return moviefate::handTo(owner)(made, done);
+    handover->storeSystemRecording(made.movie, owner,
+                                   [done](const std::optional<URL>& kept, const auto&) { done(kept); });
   };
 }
 

@@ -13,12 +13,15 @@ namespace logs = platform::logs;
 
 namespace {
 
+/// `handed` gets what was lost of the clip.
 void finishClip(const std::shared_ptr<ClipHandover>& handover, const Clip& clip, bool finished,
-                std::function<void()> handed) {
+                std::function<void(const std::optional<platform::Error>&)> handed) {
   clip.writer->finishWritingWithHandler(
       [handover, clip, finished, handed = std::move(handed)](const std::optional<URL>& url) {
         QV_LOG(logs::kSession, "QVRecordingSession: finishWritingWithHandler");
-        handover->clipCompleted(clip.number, url && clip.file->hasFile() ? clip.file : nullptr, finished, handed);
+        const bool isThere = url && clip.writer->isThere() && clip.file->hasFile();
+        handover->clipCompleted(clip.number, isThere ? clip.file : nullptr, finished,
+                                [handed, failure = clip.writer->failure()] { handed(failure); });
       });
 }
 
@@ -43,7 +46,11 @@ void ClipsOutput::start(ReadyHandler handler) {
       std::make_shared<ClipHandover>(context_->platform, info_.extension, info_.extensionUserInfo, std::move(events));
   cutter_ = std::make_shared<ClipCutter>(
       context_->platform, [this](int64_t number) { return makeClip(number, clips_.windowSize); },
-      [handover = handover_](const Clip& clip) { finishClip(handover, clip, false, nullptr); });
+      [handover = handover_, failed = events_.failed](const Clip& clip) {
+        finishClip(handover, clip, false, [failed](const auto& failure) {
+          if (failure) failed(recordingError(errorcode::kFailedToSave));
+        });
+      });
   cutter_->setConfiguration(configuration_.load());
   const Clip first = makeClip(1, clips_.size);
   cutter_->begin(first);
@@ -86,7 +93,8 @@ void ClipsOutput::finish(platform::MediaTime endTime, FinishHandler handler) {
     return;
   }
   if (endTime.isValid()) last->writer->endAtSourceTime(endTime);
-  finishClip(handover_, *last, true, [handler = std::move(handler)] { handler({}); });
+  finishClip(handover_, *last, true,
+             [handler = std::move(handler)](const auto& failure) { handler({.failure = failure}); });
 }
 
 }  // namespace qv

@@ -68,7 +68,6 @@ void MovieOutput::appendMicrophone(const PlacedSound& sound) {
   if (const auto to = writer()) to->appendAudio2SampleBuffer(sound.sample);
 }
 
-/// A movie is one when its file is there: what the writer says is not enough.
 void MovieOutput::finish(platform::MediaTime endTime, FinishHandler handler) {
   std::shared_ptr<QVMovieWriter> writer;
   std::shared_ptr<MovieClaim> claim;
@@ -84,9 +83,9 @@ void MovieOutput::finish(platform::MediaTime endTime, FinishHandler handler) {
   if (endTime.isValid()) writer->endAtSourceTime(endTime);
   writer->finishWritingWithHandler([claim, writer, handler = std::move(handler)](const std::optional<URL>& movie) {
     QV_LOG(logs::kSession, "QVRecordingSession: finishWritingWithHandler");
-    const bool isThere = movie && claim && claim->hasFile();
+    const bool isThere = movie && claim && writer->isThere() && claim->hasFile();
     if (movie && !isThere) QV_LOG_ERROR(logs::kSession, "the movie's file is gone");
-    handler({isThere ? claim : nullptr, writer->isSound()});
+    handler({isThere ? claim : nullptr, writer->failure()});
   });
 }
 

@@ -129,7 +129,8 @@ class QVRecording final : public platform::ScreenCaptureControllerDelegate,
   void beginEnd();
   void outputFinished(const OutputResult& result);
   void trimMovie(const std::shared_ptr<MovieClaim>& movie);
-  void disposeOfMovie(std::shared_ptr<MovieClaim> movie);
+  void disposeOfMovie(const OutputResult& made, const std::optional<platform::Error>& loss);
+  [[nodiscard]] platform::Error errorOfFailedWrite(const std::optional<platform::Error>& failure) const;
   void completeEnd(const std::optional<platform::URL>& movie, const std::optional<platform::Error>& error);
   void report(const std::optional<platform::URL>& movie);
   void reportSummaryEvent();

@@ -2,6 +2,7 @@
 
 #include "platform/threads/Log.h"
 #include "session/QVRecording.h"
+#include "support/QVDiskSpace.h"
 #include "support/QuorvelErrors.h"
 #include "writer/QVMovieWriter.h"
 
@@ -38,10 +39,12 @@ void QVRecording::finishAndCleanupSessionFiles(const std::optional<Error>& cause
 }
 
 void QVRecording::fail(const Error& error) {
-  const bool isDiskFull = error.domain == kQVRecordingErrorDomain && error.code == errorcode::kInsufficientStorage;
+  // What a disk has taken is the client's, whatever it takes no more.
+  const bool isOfDisk = error.domain == kQVRecordingErrorDomain &&
+                        (error.code == errorcode::kInsufficientStorage || error.code == errorcode::kFailedToSave);
   end({.cause = error,
        .endReason = error.code,
-       .movie = isDiskFull ? moviefate::handTo(settings_.owner) : moviefate::keep()});
+       .movie = isOfDisk ? moviefate::handTo(settings_.owner) : moviefate::keep()});
 }
 
 void QVRecording::beginEnd() {
@@ -69,20 +72,26 @@ void QVRecording::beginEnd() {
 /// A client that does not know yet that it records cannot ask for the movie.
 void QVRecording::outputFinished(const OutputResult& result) {
   if (!answer_.isGiven()) end_.movie = moviefate::remove();
-  // A stop that says success means a whole movie. What there is stays in the store, and is mended at the next start.
-  if (end_.handler && result.movie && !result.isSound) {
-    QV_LOG_ERROR(logs::kSession, "the movie could not be completed");
-    completeEnd(std::nullopt, recordingError(errorcode::kFailedToSave));
-    return;
+  // A stop that says success means a whole movie.
+  std::optional<Error> loss;
+  if (result.failure) {
+    QV_LOG_ERROR(logs::kSession, "the recording was not kept whole: %s", result.failure->description().c_str());
+    loss = errorOfFailedWrite(result.failure);
   }
   if (!result.movie) {
-    completeEnd(std::nullopt,
-                output_->makesMovie() ? std::optional(recordingError(errorcode::kFailedToSave)) : std::nullopt);
-  } else if (end_.startClipDuration > 0 && end_.endClipDuration > 0) {
+    if (output_->makesMovie() && !loss) loss = recordingError(errorcode::kFailedToSave);
+    completeEnd(std::nullopt, loss);
+  } else if (!loss && end_.startClipDuration > 0 && end_.endClipDuration > 0) {
     trimMovie(result.movie);
   } else {
-    disposeOfMovie(result.movie);
+    disposeOfMovie(result, loss);
   }
+}
+
+Error QVRecording::errorOfFailedWrite(const std::optional<Error>& failure) const {
+  const bool isDiskFull =
+      isLackOfSpace(failure) || !context_->space._srDeviceHasSufficientFreeSpaceToContinueRecording();
+  return recordingError(isDiskFull ? errorcode::kInsufficientStorage : errorcode::kFailedToSave);
 }
 
 /// The untrimmed movie goes when the trimmed one is known to be there.
@@ -91,25 +100,26 @@ void QVRecording::trimMovie(const std::shared_ptr<MovieClaim>& movie) {
   const auto trimmed =
       context_->movies->claimTrimmed(context_->names.trimmedOutputPath(settings_.bundleID), settings_.owner);
   auto writer = std::make_shared<QVMovieWriter>(context_->platform, settings_.windowSize, movie->path());
-  writer->trimMovieWithURL(movie->url(), end_.startClipDuration, end_.endClipDuration, trimmed->url(),
-                           [self = shared_from_this(), movie, trimmed](const std::optional<URL>& url) {
-                             self->context_->sequence.async([self, movie, trimmed, isTrimmed = url.has_value()] {
-                               if (isTrimmed) {
-                                 QV_LOG(logs::kSession, "finished trimming");
-                                 movie->remove(nullptr);
-                               } else {
-                                 QV_LOG_ERROR(logs::kSession, "trimming failed, handing on the untrimmed movie");
-                                 trimmed->remove(nullptr);
-                               }
-                               self->disposeOfMovie(isTrimmed ? trimmed : movie);
-                             });
-                           });
+  writer->trimMovieWithURL(
+      movie->url(), end_.startClipDuration, end_.endClipDuration, trimmed->url(),
+      [self = shared_from_this(), movie, trimmed](const std::optional<URL>& url) {
+        self->context_->sequence.async([self, movie, trimmed, isTrimmed = url && trimmed->hasFile()] {
+          if (isTrimmed) {
+            QV_LOG(logs::kSession, "finished trimming");
+            movie->remove(nullptr);
+          } else {
+            QV_LOG_ERROR(logs::kSession, "trimming failed, handing on the untrimmed movie");
+            trimmed->remove(nullptr);
+          }
+          self->disposeOfMovie({isTrimmed ? trimmed : movie}, std::nullopt);
+        });
+      });
 }
 
-void QVRecording::disposeOfMovie(std::shared_ptr<MovieClaim> movie) {
+void QVRecording::disposeOfMovie(const OutputResult& made, const std::optional<Error>& loss) {
   const auto dispose = std::exchange(end_.movie, nullptr);
-  dispose(std::move(movie), [self = shared_from_this()](const std::optional<URL>& url) {
-    self->context_->sequence.async([self, url] { self->completeEnd(url, std::nullopt); });
+  dispose(made, [self = shared_from_this(), loss](const std::optional<URL>& url) {
+    self->context_->sequence.async([self, url, loss] { self->completeEnd(url, loss); });
   });
 }
 

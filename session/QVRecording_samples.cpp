@@ -1,9 +1,6 @@
-#include <cerrno>
-
 #include "platform/threads/Log.h"
 #include "session/ClipSeam.h"
 #include "session/QVRecording.h"
-#include "support/QVDiskSpace.h"
 #include "support/QuorvelErrors.h"
 
 namespace qv {
@@ -11,14 +8,6 @@ namespace qv {
 using platform::MediaTime;
 using platform::SampleBufferRef;
 namespace logs = platform::logs;
-
-namespace {
-/// Also of a quota, whose disk has room.
-bool isLackOfSpace(const std::optional<platform::Error>& failure) {
-  return failure && failure->domain == platform::kPosixErrorDomain &&
-         (failure->code == ENOSPC || failure->code == EDQUOT);
-}
-}  // namespace
 
 /// Seconds since the first picture.
 void QVRecording::updateDuartionWithSample(const SampleBufferRef& sample) {
@@ -63,9 +52,7 @@ void QVRecording::_processSampleBuffer(const SampleBufferRef& sample, uint64_t t
   }
   if (accepted) return;
   QV_LOG_ERROR(logs::kSession, "QVRecordingSession: failed to start writer when appending video sample");
-  const bool isDiskFull =
-      isLackOfSpace(failure) || !context_->space._srDeviceHasSufficientFreeSpaceToContinueRecording();
-  fail(recordingError(isDiskFull ? errorcode::kInsufficientStorage : errorcode::kFailedToSave));
+  fail(errorOfFailedWrite(failure));
 }
 
 /// Sound comes later than it was captured: a pause and the end leave out only what was captured after they began. What

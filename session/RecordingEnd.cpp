@@ -11,17 +11,17 @@ using platform::URL;
 namespace logs = platform::logs;
 
 MovieFate handTo(const std::string& owner) {
-  return [owner](const std::shared_ptr<MovieClaim>& movie, const auto& done) {
-    const URL url = movie->url();
-    movie->handTo(owner);
+  return [owner](const OutputResult& made, const auto& done) {
+    const URL url = made.movie->url();
+    made.movie->handTo(owner);
     done(url);
   };
 }
 
 MovieFate remove() {
-  return [](const std::shared_ptr<MovieClaim>& movie, std::function<void(const std::optional<URL>&)> done) {
+  return [](const OutputResult& made, std::function<void(const std::optional<URL>&)> done) {
     QV_LOG(logs::kSession, "QVRecordingSession: cleanupSessionFiles");
-    movie->remove([done = std::move(done)](const std::optional<Error>& error) {
+    made.movie->remove([done = std::move(done)](const std::optional<Error>& error) {
       if (error) {
         QV_LOG_ERROR(logs::kSession, "error removing file with code: %i", static_cast<int>(error->code));
       }
@@ -31,7 +31,7 @@ MovieFate remove() {
 }
 
 MovieFate keep() {
-  return [](const std::shared_ptr<MovieClaim>&, const auto& done) { done(std::nullopt); };
+  return [](const OutputResult&, const auto& done) { done(std::nullopt); };
 }
 
 }  // namespace qv::moviefate

@@ -5,14 +5,14 @@
 #include <optional>
 
 #include "platform/base/Error.h"
-#include "support/QVTemporaryMovies.h"
+#include "session/RecordingOutput.h"
 
 namespace qv {
 
-/// What becomes of the movie of a recording that ends. It takes the claim over, and calls `done` (on any thread) when
-/// that is complete, with the URL that the client is told.
-using MovieFate = std::function<void(std::shared_ptr<MovieClaim> movie,
-                                     std::function<void(const std::optional<platform::URL>&)> done)>;
+/// What becomes of the movie of a recording that ends, of which there is one in `made`. It takes the claim over, and
+/// calls `done` (on any thread) when that is complete, with the URL that the client is told.
+using MovieFate =
+    std::function<void(const OutputResult& made, std::function<void(const std::optional<platform::URL>&)> done)>;
 
 namespace moviefate {
 /// The client may save or discard it. `owner` as in applicationOwner.

@@ -36,10 +36,11 @@ struct PlacedSound {
 
 /// What an output has made.
 struct OutputResult {
-  /// The finished movie. Nothing where the output makes none, or where no picture ever came.
-  std::shared_ptr<MovieClaim> movie;
-  /// Whether it is complete on the disk; what is not can still be played up to where writing failed.
-  bool isSound = true;
+  /// The movie. Nothing where the output makes none, no picture ever came, or nothing is left of it.
+  std::shared_ptr<MovieClaim> movie = nullptr;
+  /// What was lost, by what went wrong with the file; the movie can be played up to there. Nothing where all that came
+  /// is complete on the disk.
+  std::optional<platform::Error> failure = std::nullopt;
 };
 
 /// Where the samples of one recording go: chosen once, when the recording is made.

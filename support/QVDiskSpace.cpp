@@ -1,6 +1,13 @@
 #include "support/QVDiskSpace.h"
 
+#include <cerrno>
+
 namespace qv {
+
+bool isLackOfSpace(const std::optional<platform::Error>& failure) {
+  return failure && failure->domain == platform::kPosixErrorDomain &&
+         (failure->code == ENOSPC || failure->code == EDQUOT);
+}
 
 platform::Result<uint64_t> QVDiskSpace::freeBytes() const {
   return files_.disk().freeSizeOfFileSystem(files_._srTempPath());

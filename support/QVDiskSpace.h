@@ -2,6 +2,7 @@
 
 #include <chrono>
 #include <cstdint>
+#include <optional>
 
 #include "platform/base/Result.h"
 #include "support/QVTemporaryFiles.h"
@@ -30,6 +31,9 @@ inline constexpr int32_t kUrgencyRemovesMovies = 3;
 /// While something is recorded, the space must be critical for so long before urgency 3, so that a recording which ends
 /// by urgency 2 can keep its movie.
 inline constexpr std::chrono::seconds kCriticalFor{5};
+
+/// Whether this is what a write without room fails with, that of a quota's included, whose disk may have room.
+[[nodiscard]] bool isLackOfSpace(const std::optional<platform::Error>& failure);
 
 /// How much room there is, on the disk of the temporary store.
 ///

@@ -1,5 +1,7 @@
 #include "writer/QVMovieWriter.h"
 
+#include <cerrno>
+
 #include "platform/threads/Log.h"
 
 namespace qv {
@@ -95,9 +97,9 @@ void QVMovieWriter::finishNotWriting(const FinishHandler& handler) {
   if (assetWriter_) {
     QV_LOG(logs::kWriter, "not writing, returning video url set on assetwriter (most likely nil)");
     const auto error = assetWriter_->error();
-    noteFailure(error);
     QV_LOG_ERROR(logs::kWriter, "asset writer error = %i", error ? static_cast<int>(error->code) : 0);
     url = assetWriter_->outputURL();
+    lookAtFile();
   }
   if (handler) handler(url);
 }
@@ -110,11 +112,36 @@ void QVMovieWriter::finishFile(FinishHandler handler) {
     // Goes on on the writer's queue, so that the last reference never ends on the file's own thread.
     auto& queue = self->movieWriterQueue_;
     queue.async([self = std::move(self), handler = std::move(handler)] {
-      self->isSound_ = self->status() == AssetWriterStatus::Completed;
-      if (!self->isSound_) self->noteFailure(self->assetWriter_->error());
-      if (handler) handler(self->assetWriter_->outputURL());
+      const URL url = self->assetWriter_->outputURL();
+      self->lookAtFile();
+      if (handler) handler(url);
     });
   });
+}
+
+/// A success is what the file shows. Without a writer, which holds the file, it can be looked at.
+void QVMovieWriter::lookAtFile() {
+  const bool isCompleted = status() == AssetWriterStatus::Completed;
+  noteFailure(assetWriter_->error());
+  assetWriter_.reset();
+  const auto state = platform_.movieSalvage->stateOfMovie(outputPath_);
+  isSound_ = isCompleted && state && state.value() == platform::MovieState::Finished;
+  if (!isSound_) noteFailure(state ? platform::Error::posix(EIO, outputPath_) : state.error());
+  isThere_ = isSound_ || keepRest();
+}
+
+/// Makes the most of what was written before the failure. False where there is nothing.
+bool QVMovieWriter::keepRest() {
+  const auto failure = failure_.load();
+  QV_LOG_ERROR(logs::kWriter, "the movie could not be completed: %s", failure->description().c_str());
+  // Whatever is at the path now is another file.
+  if (failure->domain == platform::kPosixErrorDomain && failure->code == ENOENT) return false;
+  const auto length = platform_.movieSalvage->salvageMovie(outputPath_);
+  if (!length) {
+    QV_LOG_ERROR(logs::kWriter, "the movie stays as it is: %s", length.error().description().c_str());
+    return true;
+  }
+  return length.value() != MediaTime::zero();
 }
 
 }  // namespace qv

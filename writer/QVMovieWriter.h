@@ -52,11 +52,13 @@ class QVMovieWriter : public std::enable_shared_from_this<QVMovieWriter> {
   void appendAudio1SampleBuffer(const platform::SampleBufferRef& sample);
   void appendAudio2SampleBuffer(const platform::SampleBufferRef& sample);
   /// The handler gets the movie's URL, or nothing when no video sample was ever written. A second
-  /// finish is ignored, its handler not called. The URL says nothing of the outcome: `isSound` does.
+  /// finish is ignored, its handler not called. The URL says nothing of the outcome: `isSound` and `isThere` do.
   void finishWritingWithHandler(FinishHandler handler);
-  /// From the finish handler on: whether the movie is complete on disk. One that is not may be missing, or hold what
-  /// was written before the failure.
+  /// From the finish handler on: whether the movie is complete on disk, index included, as was looked at.
   [[nodiscard]] bool isSound() const { return isSound_.load(); }
+  /// From the finish handler on: whether there is a movie. One that is not sound holds what was written before the
+  /// failure, finished as far as the disk allows.
+  [[nodiscard]] bool isThere() const { return isThere_.load(); }
   /// The first thing that went wrong with the file (e.g. ENOSPC of the posix domain), from the time at which an append
   /// or the finish met it, or the set-up when that failed.
   [[nodiscard]] std::optional<platform::Error> failure() const { return failure_.load(); }
@@ -104,6 +106,8 @@ class QVMovieWriter : public std::enable_shared_from_this<QVMovieWriter> {
   void drainAudio(Track& track, int number);
   void finishNotWriting(const FinishHandler& handler);
   void finishFile(FinishHandler handler);
+  void lookAtFile();
+  [[nodiscard]] bool keepRest();
 
   const platform::Platform& platform_;
   const QVTemporaryFiles files_;
@@ -116,6 +120,7 @@ class QVMovieWriter : public std::enable_shared_from_this<QVMovieWriter> {
   platform::Guarded<platform::MediaTime> endTime_;
   platform::Guarded<std::optional<platform::Error>> failure_;
   std::atomic<bool> isSound_{false};
+  std::atomic<bool> isThere_{false};
 
   // Writer queue only.
   std::unique_ptr<platform::AssetWriter> assetWriter_;

@@ -16,6 +16,7 @@ FakeDevice::FakeDevice() {
   platform.assetWriter = &movies;
   platform.exportService = &exports;
   platform.movieSalvage = &salvage;
+  salvage.others = platform::MovieState::Finished;
   platform.applications = &applications;
   platform.renderServer = &applications;
   platform.userAlerts = &alerts;
