@@ -43,7 +43,14 @@ bool StartFlow::isInFront() const {
 }
 
 void StartFlow::continueAfterStops() {
-  if (!services_.context.space._srDeviceHasSufficientFreeSpaceForRecording()) {
+  const auto unwritable = services_.context.files.prepareForMovies();
+  if (unwritable && !isLackOfSpace(unwritable)) {
+    QV_LOG_ERROR(logs::kDaemon, "movies cannot be written, calling handler with error: %s",
+                 unwritable->description().c_str());
+    refuse(recordingError(errorcode::kFailedToStart));
+    return;
+  }
+  if (unwritable || !services_.context.space._srDeviceHasSufficientFreeSpaceForRecording()) {
     QV_LOG_ERROR(logs::kDaemon, "insufficient disk space for recording, calling handler with error");
     refuse(recordingError(errorcode::kInsufficientStorage));
     return;

@@ -28,6 +28,8 @@ class FileSystem {
   [[nodiscard]] virtual bool itemExists(const std::string& path) = 0;
   /// Not its missing parents.
   virtual std::optional<Error> createDirectory(const std::string& path) = 0;
+  /// Whether files can be made in this directory; what keeps them from it, otherwise. Nothing is left behind.
+  virtual std::optional<Error> checkWritable(const std::string& directory) = 0;
   /// The entries' names, in the order of the file system, without "." and "..".
   virtual Result<std::vector<std::string>> contentsOfDirectory(const std::string& path) = 0;
   virtual Result<FileAttributes> attributesOfItem(const std::string& path) = 0;

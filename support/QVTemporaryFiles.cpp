@@ -55,6 +55,12 @@ void QVTemporaryFiles::_srSetupTempDirectory() const {
   }
 }
 
+std::optional<Error> QVTemporaryFiles::prepareForMovies() const {
+  const std::string path = _srTempPath();
+  if (!disk().itemExists(path.substr(0, path.size() - 1))) _srSetupTempDirectory();
+  return disk().checkWritable(path);
+}
+
 int64_t QVTemporaryFiles::_srSizeOfTempDir(std::optional<Error>* error) const {
   const auto attributes = disk().attributesOfItem(_srTempPath());
   if (attributes) return static_cast<int64_t>(attributes.value().size);

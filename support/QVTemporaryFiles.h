@@ -47,6 +47,8 @@ class QVTemporaryFiles {
   /// Makes the directory unless something stands there. Its parents are made by the packaging. A
   /// failure is logged, and the daemon goes on without the directory.
   void _srSetupTempDirectory() const;
+  /// Makes the directory again where it has gone, and tells what keeps movies from being made in it.
+  [[nodiscard]] std::optional<platform::Error> prepareForMovies() const;
   /// The size in bytes of the directory's own entry, not of the files in it; 0 where it cannot be
   /// read, with the reason in `error` (may be null; left alone on success).
   int64_t _srSizeOfTempDir(std::optional<platform::Error>* error) const;

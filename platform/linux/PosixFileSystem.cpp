@@ -45,6 +45,15 @@ std::optional<Error> PosixFileSystem::createDirectory(const std::string& path) {
   return Error::posix(errno, path);
 }
 
+std::optional<Error> PosixFileSystem::checkWritable(const std::string& directory) {
+  const FileDescriptor nameless(::open(directory.c_str(), O_TMPFILE | O_WRONLY | O_CLOEXEC, 0600));
+  if (nameless.isValid()) return std::nullopt;
+  // Not every file system has files without names. The rights alone tell less: root has them all.
+  if (errno != EOPNOTSUPP && errno != EISDIR) return Error::posix(errno, directory);
+  if (::access(directory.c_str(), W_OK | X_OK) == 0) return std::nullopt;
+  return Error::posix(errno, directory);
+}
+
 Result<std::vector<std::string>> PosixFileSystem::contentsOfDirectory(const std::string& path) {
   std::vector<std::string> names;
   std::error_code failure;

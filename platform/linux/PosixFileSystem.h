@@ -12,6 +12,7 @@ class PosixFileSystem final : public FileSystem {
  public:
   bool itemExists(const std::string& path) override;
   std::optional<Error> createDirectory(const std::string& path) override;
+  std::optional<Error> checkWritable(const std::string& directory) override;
   Result<std::vector<std::string>> contentsOfDirectory(const std::string& path) override;
   Result<FileAttributes> attributesOfItem(const std::string& path) override;
   std::optional<Error> removeItem(const std::string& path) override;

@@ -24,7 +24,7 @@ namespace qv::fakes {
 /// Threading: thread-safe.
 class ScratchDisk final : public platform::FileSystem {
  public:
-  enum class Operation { List, Attributes, Remove, Read };
+  enum class Operation { List, Attributes, Remove, Read, Write };
 
   /// Makes a file, and the directories above it.
   void addFile(const std::string& path, const std::string& content, platform::Date modified = {}) {
@@ -52,6 +52,10 @@ class ScratchDisk final : public platform::FileSystem {
   bool itemExists(const std::string& path) override { return disk_.itemExists(at(path)); }
   std::optional<platform::Error> createDirectory(const std::string& path) override {
     return disk_.createDirectory(at(path));
+  }
+  std::optional<platform::Error> checkWritable(const std::string& directory) override {
+    const auto failure = failureOf(Operation::Write, directory);
+    return failure ? failure : disk_.checkWritable(at(directory));
   }
   platform::Result<std::vector<std::string>> contentsOfDirectory(const std::string& path) override {
     if (const auto failure = failureOf(Operation::List, path)) return *failure;
