@@ -30,8 +30,9 @@ class PatientInput final : public WriterInput {
 
 class PatientWriter final : public AssetWriter {
  public:
-  PatientWriter(std::unique_ptr<AssetWriter> inner, URL outputURL, std::promise<void>& finished)
-      : inner_(std::move(inner)), outputURL_(std::move(outputURL)), finished_(finished) {}
+  PatientWriter(std::unique_ptr<AssetWriter> inner, URL outputURL, std::shared_ptr<PatientMovies::Finish> finish)
+      : inner_(std::move(inner)), outputURL_(std::move(outputURL)), finish_(std::move(finish)) {}
+  ~PatientWriter() override { finish_->tell(); }
   [[nodiscard]] AssetWriterStatus status() const override { return inner_->status(); }
   [[nodiscard]] std::optional<Error> error() const override { return inner_->error(); }
   [[nodiscard]] const URL& outputURL() const override { return outputURL_; }
@@ -42,16 +43,16 @@ class PatientWriter final : public AssetWriter {
   void startSessionAtSourceTime(MediaTime time) override { inner_->startSessionAtSourceTime(time); }
   void endSessionAtSourceTime(MediaTime time) override { inner_->endSessionAtSourceTime(time); }
   void finishWriting(std::function<void()> completion) override {
-    inner_->finishWriting([completion = std::move(completion), &finished = finished_] {
+    inner_->finishWriting([completion = std::move(completion), finish = finish_] {
       completion();
-      finished.set_value();
+      finish->tell();
     });
   }
 
  private:
   const std::unique_ptr<AssetWriter> inner_;
   const URL outputURL_;
-  std::promise<void>& finished_;
+  const std::shared_ptr<PatientMovies::Finish> finish_;
 };
 
 }  // namespace
@@ -60,7 +61,7 @@ Result<std::unique_ptr<AssetWriter>> PatientMovies::createAssetWriter(const URL&
                                                                       const std::string& fileType) {
   auto made = service_.createAssetWriter(URL::fileURL(path_), fileType);
   if (!made) return made.error();
-  return std::unique_ptr<AssetWriter>(std::make_unique<PatientWriter>(std::move(*made), outputURL, finished_));
+  return std::unique_ptr<AssetWriter>(std::make_unique<PatientWriter>(std::move(*made), outputURL, finish_));
 }
 
 std::shared_ptr<WriterInput> PatientMovies::createWriterInput(MediaType type, const Dictionary& outputSettings) {
