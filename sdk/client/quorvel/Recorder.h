@@ -57,7 +57,7 @@ struct StopOptions {
   std::chrono::duration<double> endClip{0};    ///< off its end
 };
 
-/// Of a stop: a movie, or an error. Neither after a capture or a broadcast: there is no movie then. Of Events::stopped:
+/// Of a stop: a movie, or an error; both where the disk failed, and then the movie ends early. Neither after a capture or a broadcast: there is no movie then. Of Events::stopped:
 /// an error, perhaps with a movie.
 struct StopResult {
   std::optional<Error> error;
