@@ -80,10 +80,8 @@ Result<MediaTime> writeIndex(MovieWriter& writer, const DiskMovieFile& disk,
 }
 
 /// The file as it was. What of this fails is met at the next start: the index alone does no harm.
-void undo(DiskMovieFile& disk, uint64_t size, uint64_t placeholder) {
-  ByteWriter free;
-  writePlaceholder(free);
-  (void)writeFully(disk, free.bytes(), placeholder);
+void undo(DiskMovieFile& disk, uint64_t size, uint64_t offset, std::span<const uint8_t> placeholder) {
+  (void)writeFully(disk, placeholder, offset);
   (void)disk.truncate(size);
   (void)disk.sync();
 }
@@ -110,16 +108,19 @@ Result<MediaTime> MP4MovieSalvage::salvageMovie(const std::string& path) {
   if (holdsNoMedia(boxes)) return MediaTime::zero();
   auto remains = readRemains(boxes);
   if (!remains) return remains.error();
+  const uint64_t offset = remains->placeholder;
+  const auto placeholder = boxes.read(offset, kPlaceholderSize);
+  if (placeholder.empty()) return notRead("the placeholder is not read back");
   if (remains->writtenIndex) {
     auto length = writeHead(disk, size, *remains);
-    if (!length) undo(disk, size, remains->placeholder);
+    if (!length) undo(disk, size, offset, placeholder);
     return length;
   }
   const auto pictures = picturesOf(*remains);
   MovieWriter writer(std::move(movie->file), std::move(remains->tracks), MovieWriter::Layout::Fragmented);
   writer.adopt(remains->placeholder, size, std::move(remains->index));
   auto length = writeIndex(writer, disk, pictures);
-  if (!length) undo(disk, size, remains->placeholder);
+  if (!length) undo(disk, size, offset, placeholder);
   return length;
 }
 
