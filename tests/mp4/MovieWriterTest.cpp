@@ -439,6 +439,7 @@ TEST_F(MovieWriterTest, TellsWhatTheDiskSays) {
     int64_t writeAt(std::span<const uint8_t>, uint64_t) override { return 0; }
     int truncate(uint64_t) override { return 0; }
     int sync() override { return 0; }
+    int close() override { return 0; }
   } stuck;
   EXPECT_EQ(writeFully(stuck, std::vector<uint8_t>(9), 0)->code, EIO);
 }

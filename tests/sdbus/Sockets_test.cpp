@@ -59,10 +59,10 @@ TEST_F(SocketsTest, AServiceIsReachedUnderAPathThatFitsAnAddress) {
   const std::string longest = path_ + std::string(sizeof(sockaddr_un::sun_path) - 1 - path_.size(), 'x');
   EXPECT_EQ(codeOf(connectTo(longest)), ENOENT);
   {
-    auto served = listenAt(longest);
+    auto served = listenAt(longest, "");
     ASSERT_TRUE(served);
     EXPECT_TRUE(isClosedOnExec(served->socket) && isClosedOnExec(served->lock));
-    EXPECT_EQ(codeOf(listenAt(longest)), EADDRINUSE);
+    EXPECT_EQ(codeOf(listenAt(longest, "")), EADDRINUSE);
     struct stat lock {};
     EXPECT_EQ(::fstat(served->lock.get(), &lock), 0);
     EXPECT_EQ(lock.st_mode & 07777, 0600u);
@@ -70,14 +70,14 @@ TEST_F(SocketsTest, AServiceIsReachedUnderAPathThatFitsAnAddress) {
     EXPECT_TRUE(client && isClosedOnExec(*client));
   }
   EXPECT_EQ(codeOf(connectTo(longest)), ECONNREFUSED) << "it is dead";
-  EXPECT_TRUE(listenAt(longest));
+  EXPECT_TRUE(listenAt(longest, ""));
   for (const std::string& impossible : {longest + "x", std::string()}) {
     EXPECT_EQ(codeOf(connectTo(impossible)), ENAMETOOLONG);
-    EXPECT_EQ(codeOf(listenAt(impossible)), ENAMETOOLONG);
+    EXPECT_EQ(codeOf(listenAt(impossible, "")), ENAMETOOLONG);
   }
-  EXPECT_EQ(codeOf(listenAt(folder_.path() + "/none/service")), ENOENT);
+  EXPECT_EQ(codeOf(listenAt(folder_.path() + "/none/service", "")), ENOENT);
   ASSERT_EQ(::mkdir(path_.c_str(), 0700), 0);
-  EXPECT_EQ(codeOf(listenAt(path_)), EEXIST) << "no socket";
+  EXPECT_EQ(codeOf(listenAt(path_, "")), EEXIST) << "no socket";
 }
 
 /// In a process of its own: the descriptors have fixed places.
@@ -96,7 +96,7 @@ TEST_F(SocketsTest, AServiceIsReachedUnderAPathThatFitsAnAddress) {
 
 TEST_F(SocketsTest, TheSocketThatTheServiceManagerOpenedIsTakenByItsPath) {
   EXPECT_FALSE(adoptActivatedSocket(path_));
-  auto other = listenAt(path_ + "other"), wanted = listenAt(path_);
+  auto other = listenAt(path_ + "other", ""), wanted = listenAt(path_, "");
   EXPECT_EXIT(adopt(path_, wanted->socket.get(), other->socket.get()), testing::ExitedWithCode(0), "");
 }
 
@@ -106,7 +106,7 @@ TEST_F(SocketsTest, OnlyOneEndOfAStreamPairComesThroughARendezvous) {
   EXPECT_FALSE(accepts({}));
   EXPECT_FALSE(accepts({pair.first.get(), pair.second.get()}));
   EXPECT_FALSE(accepts({packets.first.get()}));
-  auto named = listenAt(path_);
+  auto named = listenAt(path_, "");
   auto client = connectTo(path_);
   const FileDescriptor accepted(::accept4(named->socket.get(), nullptr, nullptr, SOCK_CLOEXEC));
   const FileDescriptor unconnected(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0));
