@@ -2,33 +2,61 @@
 
 #include <fcntl.h>
 #include <stdio.h>
+#include <sys/random.h>
 #include <sys/sendfile.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
 #include <cerrno>
-#include <cstdlib>
+#include <cstdint>
+#include <utility>
 
 namespace qv::platform {
 namespace {
 
-constexpr mode_t kMode = 0644;
+constexpr mode_t kMode = 0600;
 constexpr size_t kChunk = size_t{64} << 20;  // bytes in one call
 
-/// Removes a file unless it was let go.
+/// Hard to foresee, for a directory in which others write too.
+std::string hiddenName() {
+  uint64_t number = 0;
+  (void)::getrandom(&number, sizeof number, 0);
+  return kUnfinishedCopyPrefix + std::to_string(number);
+}
+
+/// A new file in a directory, under a hidden name. It goes again, unless it was given its name.
 class Unfinished {
  public:
-  explicit Unfinished(std::string path) : path_(std::move(path)) {}
+  explicit Unfinished(const FileDescriptor& directory) : directory_(directory.get()) {
+    constexpr int kFlags = O_RDWR | O_CREAT | O_EXCL | O_NOFOLLOW | O_CLOEXEC;
+    do {
+      name_ = hiddenName();
+      file_ = FileDescriptor(::openat(directory_, name_.c_str(), kFlags, kMode));
+    } while (!file_.isValid() && errno == EEXIST);
+  }
   ~Unfinished() {
-    if (!path_.empty()) ::unlink(path_.c_str());
+    if (file_.isValid() && !name_.empty()) ::unlinkat(directory_, name_.c_str(), 0);
   }
   Unfinished(const Unfinished&) = delete;
   Unfinished& operator=(const Unfinished&) = delete;
-  const std::string& path() const { return path_; }
-  void finish() { path_.clear(); }
+  /// Invalid where it could not be made; errno says why.
+  const FileDescriptor& file() const { return file_; }
+  std::optional<Error> finishAs(const std::string& name) {
+    if (auto error = renameExclusively(directory_, name_, name)) return error;
+    name_.clear();
+    return std::nullopt;
+  }
+  bool isAt(const std::string& name) const {
+    struct stat mine {
+    }, found{};
+    return ::fstat(file_.get(), &mine) == 0 && ::fstatat(directory_, name.c_str(), &found, AT_SYMLINK_NOFOLLOW) == 0 &&
+           mine.st_dev == found.st_dev && mine.st_ino == found.st_ino;
+  }
 
  private:
-  std::string path_;
+  const int directory_;
+  std::string name_;
+  FileDescriptor file_;
 };
 
 /// From where both files stand to the end of `from`.
@@ -45,9 +73,10 @@ std::optional<Error> copyContent(int from, int to) {
   return count < 0 ? std::optional(Error::posix(errno, "copy")) : std::nullopt;
 }
 
-void flushDirectory(const std::string& path) {
-  const FileDescriptor directory(::open(path.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
-  if (directory.isValid()) (void)::fsync(directory.get());
+/// What belongs to this process's user already needs no right to be given away.
+std::optional<Error> giveTo(uid_t owner, const FileDescriptor& file) {
+  if (owner == ::geteuid() || ::fchown(file.get(), owner, static_cast<gid_t>(-1)) == 0) return std::nullopt;
+  return Error::posix(errno, "the owner of a copy");
 }
 
 }  // namespace
@@ -61,38 +90,38 @@ Result<FileDescriptor> openRegularFile(const std::string& path) {
   return file;
 }
 
-std::optional<Error> renameExclusively(const std::string& source, const std::string& destination) {
-  if (::renameat2(AT_FDCWD, source.c_str(), AT_FDCWD, destination.c_str(), RENAME_NOREPLACE) == 0) return std::nullopt;
+std::optional<Error> renameExclusively(int directory, const std::string& source, const std::string& destination) {
+  const char* const from = source.c_str();
+  const char* const to = destination.c_str();
+  if (::renameat2(directory, from, directory, to, RENAME_NOREPLACE) == 0) return std::nullopt;
   if (errno != EINVAL && errno != ENOSYS) return Error::posix(errno, destination);
   // A file system without exclusive renames: a hard link is as exclusive.
-  if (::link(source.c_str(), destination.c_str()) == 0) {
-    ::unlink(source.c_str());
+  if (::linkat(directory, from, directory, to, 0) == 0) {
+    ::unlinkat(directory, from, 0);
     return std::nullopt;
   }
   if (errno != EPERM && errno != EOPNOTSUPP) return Error::posix(errno, destination);
   // A directory, or a file system without links either.
   struct stat info {};
-  if (::lstat(destination.c_str(), &info) == 0) return Error::posix(EEXIST, destination);
-  if (::rename(source.c_str(), destination.c_str()) == 0) return std::nullopt;
+  if (::fstatat(directory, to, &info, AT_SYMLINK_NOFOLLOW) == 0) return Error::posix(EEXIST, destination);
+  if (::renameat(directory, from, directory, to) == 0) return std::nullopt;
   return Error::posix(errno, destination);
 }
 
-Result<std::string> copyIntoDirectory(const FileDescriptor& source, const std::string& directory,
+Result<std::string> copyIntoDirectory(const FileDescriptor& source, const FileDescriptor& directory, uid_t owner,
                                       const std::function<std::string(int)>& nameForAttempt) {
-  std::string temporary = directory + "/" + kUnfinishedCopyPrefix + "XXXXXX";
-  const FileDescriptor copy(::mkostemp(temporary.data(), O_CLOEXEC));
-  if (!copy.isValid()) return Error::posix(errno, directory);
-  Unfinished unfinished(temporary);
-  if (auto error = copyContent(source.get(), copy.get())) return *error;
-  if (::fchmod(copy.get(), kMode) != 0 || ::fsync(copy.get()) != 0) return Error::posix(errno, temporary);
+  Unfinished copy(directory);
+  if (!copy.file().isValid()) return Error::posix(errno, "copy");
+  if (auto error = copyContent(source.get(), copy.file().get())) return *error;
+  if (auto error = giveTo(owner, copy.file())) return *error;
+  if (::fsync(copy.file().get()) != 0) return Error::posix(errno, "copy");
   for (int attempt = 0;; ++attempt) {
     const std::string name = nameForAttempt(attempt);
-    if (name.empty()) return Error::posix(EEXIST, directory);
-    const auto error = renameExclusively(temporary, directory + "/" + name);
+    if (name.empty()) return Error::posix(EEXIST, "copy");
+    const auto error = copy.finishAs(name);
     if (!error) {
-      unfinished.finish();
-      flushDirectory(directory);
-      return name;
+      (void)::fsync(directory.get());
+      return copy.isAt(name) ? Result<std::string>(name) : Error::posix(ESTALE, name);
     }
     if (error->code != EEXIST) return *error;
   }

@@ -1,13 +1,14 @@
 #include "platform/linux/FolderPhotoLibrary.h"
 
+#include <unistd.h>
+
 #include <cerrno>
 #include <filesystem>
 #include <mutex>
-#include <system_error>
 #include <utility>
 
 #include "platform/linux/FileCopy.h"
-#include "platform/linux/SmallFile.h"
+#include "platform/linux/UserFolder.h"
 #include "platform/threads/Log.h"
 
 namespace qv::platform {
@@ -26,31 +27,31 @@ std::string numberedName(const std::filesystem::path& name, int attempt) {
 
 struct FolderPhotoLibrary::Folder {
   const std::string path;
+  const uid_t owner;
   std::once_flag swept;
 
   /// Removes copies that a former process did not finish. None of ours has begun yet.
-  void sweep() const {
-    std::error_code failure;
-    for (const auto& entry : std::filesystem::directory_iterator(path, failure)) {
-      if (!entry.path().filename().string().starts_with(kUnfinishedCopyPrefix)) continue;
-      std::error_code ignored;
-      std::filesystem::remove(entry.path(), ignored);
+  static void sweep(const FileDescriptor& directory) {
+    for (const std::string& name : namesIn(directory)) {
+      if (name.starts_with(kUnfinishedCopyPrefix)) ::unlinkat(directory.get(), name.c_str(), 0);
     }
   }
 
   std::optional<Error> add(const std::string& source) {
     const auto file = openRegularFile(source);
     if (!file) return file.error();
-    if (auto error = makeDirectories(path)) return error;
-    std::call_once(swept, [this] { sweep(); });
+    const auto directory = openFolderOfUser(owner, path);
+    if (!directory) return directory.error();
+    std::call_once(swept, [&] { sweep(directory.value()); });
     const std::filesystem::path name = std::filesystem::path(source).filename();
-    const auto copied = copyIntoDirectory(file.value(), path, [&](int attempt) { return numberedName(name, attempt); });
+    const auto copied = copyIntoDirectory(file.value(), directory.value(), owner,
+                                          [&](int attempt) { return numberedName(name, attempt); });
     return copied ? std::nullopt : std::optional(copied.error());
   }
 };
 
-FolderPhotoLibrary::FolderPhotoLibrary(const std::string& directory, Executor& executor)
-    : folder_(new Folder{directory, {}}), executor_(executor) {}
+FolderPhotoLibrary::FolderPhotoLibrary(const std::string& directory, uid_t user, Executor& executor)
+    : folder_(new Folder{directory, ::geteuid() == 0 ? user : ::geteuid(), {}}), executor_(executor) {}
 
 void FolderPhotoLibrary::createAsset(const URL& file, PhotoResourceType type,
                                      std::function<void(const std::optional<Error>&)> completion) {

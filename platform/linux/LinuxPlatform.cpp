@@ -27,7 +27,7 @@ LinuxPlatform::LinuxPlatform(const LinuxDevice& device)
       entitlements_(deviceRoot_, device.sessionUser),
       purgeableSpace_(systemTimers(), globalBackgroundQueue(), device.watchedSpace,
                       [this] { return watchedFreeSpace(); }),
-      photoLibrary_(deviceRoot_ + device.photoLibrary, globalQueue()),
+      photoLibrary_(deviceRoot_ + device.photoLibrary, device.sessionUser, globalQueue()),
       metrics_(deviceRoot_ + device.metrics, systemClock()),
       reachability_(globalQueue()),
       screenReader_(device.screenReaders) {}

@@ -34,7 +34,9 @@ struct LinuxDevice {
   std::set<std::string> screenReaders{};  ///< names of their processes
   std::string watchedPath;                ///< on the disk whose free space is watched
   FreeSpaceLimits watchedSpace{};
-  uid_t sessionUser = 0;  ///< for whom entitlements hold that name nobody (EntitlementStore)
+  /// For whom entitlements hold that name nobody (EntitlementStore), and whose the photo library is, where this process
+  /// is root.
+  uid_t sessionUser = 0;
 };
 
 /// The services that need nothing but Linux and files, for one device root. Making it reads nothing.

@@ -25,8 +25,11 @@ std::optional<Error> moveByCopy(const std::string& source, const std::string& de
   const auto file = openRegularFile(source);
   if (!file) return file.error().code == EINVAL ? Error::posix(EXDEV, source) : file.error();
   const size_t slash = destination.rfind('/');
+  const std::string into = destination.substr(0, slash);
+  const FileDescriptor directory(::open(into.c_str(), O_RDONLY | O_DIRECTORY | O_CLOEXEC));
+  if (!directory.isValid()) return Error::posix(errno, into);
   const std::string name = destination.substr(slash + 1);
-  const auto copied = copyIntoDirectory(file.value(), destination.substr(0, slash),
+  const auto copied = copyIntoDirectory(file.value(), directory, ::geteuid(),
                                         [&](int attempt) { return attempt == 0 ? name : std::string(); });
   if (!copied) return copied.error();
   if (::unlink(source.c_str()) != 0) return Error::posix(errno, source);
@@ -87,7 +90,7 @@ std::optional<Error> PosixFileSystem::removeItem(const std::string& path) {
 }
 
 std::optional<Error> PosixFileSystem::moveItem(const std::string& source, const std::string& destination) {
-  const auto error = renameExclusively(source, destination);
+  const auto error = renameExclusively(AT_FDCWD, source, destination);
   return error && error->code == EXDEV ? moveByCopy(source, destination) : error;
 }
 

@@ -36,7 +36,7 @@ class FolderPhotoLibraryTest : public testing::Test {
   kit::ScratchFolder root_;
   fakes::LogRecorder log_;
   fakes::ManualExecutor executor_;
-  FolderPhotoLibrary library_{root_.path(kFolder), executor_};
+  FolderPhotoLibrary library_{root_.path(kFolder), ::geteuid(), executor_};
 };
 
 TEST_F(FolderPhotoLibraryTest, MoviesKeepTheirNamesAndReplaceNothing) {

@@ -91,6 +91,7 @@ class MemoryFile final : public MovieFile {
     if (disk_.atSync) disk_.atSync();
     return fails() ? ENOSPC : 0;
   }
+  int close() override { return 0; }
 
  private:
   bool fails() {
