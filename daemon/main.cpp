@@ -36,7 +36,8 @@ int main() {
   // The allocator would raise this bound with the first picture that an encoder frees, and keep the heap of a
   // recording.
   ::mallopt(M_MMAP_THRESHOLD, kOwnPagesFrom);
-  // Movies are for the clients that they are handed to; nobody else but root writes here.
+  // Nobody else writes here. What others are not to read (movies, the photo library, metrics) is made so where it is
+  // made.
   ::umask(022);
   QV_LOG(logs::kDaemon, "quorveld Starting!");
   qv::PlatformChoice choice;

@@ -43,12 +43,22 @@ bool QVTemporaryFiles::isMovieAt(const std::string& path) const {
   return attributes && !attributes.value().isDirectory && attributes.value().size > 0;
 }
 
+void QVTemporaryFiles::closeToOthers() const {
+  const auto report = [](const std::optional<Error>& error) {
+    if (error) QV_LOG_ERROR(logs::kSupport, "others can read the store: %s", error->description().c_str());
+  };
+  const auto names = disk().contentsOfDirectory(_srTempPath());
+  if (!names) return;
+  report(disk().makePrivate(pathInStore(".")));
+  for (const std::string& name : names.value()) report(disk().makePrivate(pathInStore(name)));
+}
+
 void QVTemporaryFiles::_srSetupTempDirectory() const {
   QV_LOG(logs::kSupport, "_srSetupTempDirectory");
   const std::string path = _srTempPath();
   // Without its last separator: "path/" names nothing where a plain file stands at "path".
   const std::string entry = path.substr(0, path.size() - 1);
-  if (disk().itemExists(entry)) return;
+  if (disk().itemExists(entry)) return closeToOthers();
   if (const auto error = disk().createDirectory(entry)) {
     QV_CONSOLE(logs::kSupport, "error: %s", error->description().c_str());
     QV_LOG_ERROR(logs::kSupport, "error creating temp directory");

@@ -45,7 +45,8 @@ class QVTemporaryFiles {
   /// Whether there is a file of more than no bytes at this path, now.
   [[nodiscard]] bool isMovieAt(const std::string& path) const;
   /// Makes the directory unless something stands there. Its parents are made by the packaging. A
-  /// failure is logged, and the daemon goes on without the directory.
+  /// failure is logged, and the daemon goes on without the directory. A directory that others could read until now, as
+  /// former versions made it, is closed to them with all that is in it.
   void _srSetupTempDirectory() const;
   /// Makes the directory again where it has gone, and tells what keeps movies from being made in it.
   [[nodiscard]] std::optional<platform::Error> prepareForMovies() const;
@@ -76,6 +77,7 @@ class QVTemporaryFiles {
   [[nodiscard]] std::optional<platform::Date> _srGetCreationDateForFile(const platform::URL& file) const;
 
  private:
+  void closeToOthers() const;
   /// Removes one entry if its time has come; the bytes that this freed.
   [[nodiscard]] int64_t ageOut(const std::string& path, double timeToLive, const RemovalRight& mayRemove) const;
   void deleteFilesWithPrefix(const std::string& prefix) const;

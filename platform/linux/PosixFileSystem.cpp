@@ -44,7 +44,7 @@ bool PosixFileSystem::itemExists(const std::string& path) {
 }
 
 std::optional<Error> PosixFileSystem::createDirectory(const std::string& path) {
-  if (::mkdir(path.c_str(), 0777) == 0) return std::nullopt;
+  if (::mkdir(path.c_str(), 0700) == 0) return std::nullopt;
   return Error::posix(errno, path);
 }
 
@@ -55,6 +55,18 @@ std::optional<Error> PosixFileSystem::checkWritable(const std::string& directory
   if (errno != EOPNOTSUPP && errno != EISDIR) return Error::posix(errno, directory);
   if (::access(directory.c_str(), W_OK | X_OK) == 0) return std::nullopt;
   return Error::posix(errno, directory);
+}
+
+std::optional<Error> PosixFileSystem::makePrivate(const std::string& path) {
+  struct stat info {};
+  if (::lstat(path.c_str(), &info) != 0) return Error::posix(errno, path);
+  if (S_ISLNK(info.st_mode)) return std::nullopt;
+  const mode_t mode = S_ISDIR(info.st_mode) ? 0700 : 0600;
+  const uid_t self = ::geteuid();
+  if (info.st_uid != self && ::lchown(path.c_str(), self, ::getegid()) != 0) return Error::posix(errno, path);
+  if ((info.st_mode & 07777) == mode) return std::nullopt;
+  if (::fchmodat(AT_FDCWD, path.c_str(), mode, AT_SYMLINK_NOFOLLOW) != 0) return Error::posix(errno, path);
+  return std::nullopt;
 }
 
 Result<std::vector<std::string>> PosixFileSystem::contentsOfDirectory(const std::string& path) {
@@ -102,5 +114,7 @@ Result<uint64_t> PosixFileSystem::freeSizeOfFileSystem(const std::string& path) 
 }
 
 Result<std::string> PosixFileSystem::readFile(const std::string& path) { return readSmallFile(path); }
+
+Result<FileDescriptor> PosixFileSystem::openFile(const std::string& path) { return openRegularFile(path); }
 
 }  // namespace qv::platform

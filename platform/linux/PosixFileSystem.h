@@ -13,12 +13,14 @@ class PosixFileSystem final : public FileSystem {
   bool itemExists(const std::string& path) override;
   std::optional<Error> createDirectory(const std::string& path) override;
   std::optional<Error> checkWritable(const std::string& directory) override;
+  std::optional<Error> makePrivate(const std::string& path) override;
   Result<std::vector<std::string>> contentsOfDirectory(const std::string& path) override;
   Result<FileAttributes> attributesOfItem(const std::string& path) override;
   std::optional<Error> removeItem(const std::string& path) override;
   std::optional<Error> moveItem(const std::string& source, const std::string& destination) override;
   Result<uint64_t> freeSizeOfFileSystem(const std::string& path) override;
   Result<std::string> readFile(const std::string& path) override;
+  Result<FileDescriptor> openFile(const std::string& path) override;
 };
 
 }  // namespace qv::platform

@@ -10,7 +10,7 @@
 namespace qv::platform::mp4 {
 
 Result<std::unique_ptr<MovieFile>> DiskMovieFile::create(const std::string& path) {
-  FileDescriptor fd(::open(path.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_CLOEXEC, 0644));
+  FileDescriptor fd(::open(path.c_str(), O_WRONLY | O_CREAT | O_EXCL | O_CLOEXEC, 0600));
   if (!fd.isValid()) return Error::posix(errno, path);
   // For whoever looks for unfinished movies. Where the file system has no locks, nobody is kept away.
   (void)::flock(fd.get(), LOCK_EX | LOCK_NB);

@@ -35,7 +35,8 @@ class MovieFile {
 /// Threading: confined to one thread at a time.
 class DiskMovieFile final : public MovieFile {
  public:
-  /// A new file; EEXIST where there is one already. It is locked (flock) until it is closed.
+  /// A new file, for this process's user alone; EEXIST where there is one already. It is locked (flock) until it is
+  /// closed.
   static Result<std::unique_ptr<MovieFile>> create(const std::string& path);
   /// `path`: where the file was made, and must be until it is closed; empty where that does not matter.
   explicit DiskMovieFile(FileDescriptor fd, std::string path = {}) : fd_(std::move(fd)), path_(std::move(path)) {}

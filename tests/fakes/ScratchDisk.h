@@ -24,7 +24,7 @@ namespace qv::fakes {
 /// Threading: thread-safe.
 class ScratchDisk final : public platform::FileSystem {
  public:
-  enum class Operation { List, Attributes, Remove, Read, Write };
+  enum class Operation { List, Attributes, Remove, Read, Write, Open };
 
   /// Makes a file, and the directories above it.
   void addFile(const std::string& path, const std::string& content, platform::Date modified = {}) {
@@ -57,6 +57,7 @@ class ScratchDisk final : public platform::FileSystem {
     const auto failure = failureOf(Operation::Write, directory);
     return failure ? failure : disk_.checkWritable(at(directory));
   }
+  std::optional<platform::Error> makePrivate(const std::string& path) override { return disk_.makePrivate(at(path)); }
   platform::Result<std::vector<std::string>> contentsOfDirectory(const std::string& path) override {
     if (const auto failure = failureOf(Operation::List, path)) return *failure;
     auto names = disk_.contentsOfDirectory(at(path));
@@ -81,6 +82,10 @@ class ScratchDisk final : public platform::FileSystem {
   platform::Result<std::string> readFile(const std::string& path) override {
     if (const auto failure = failureOf(Operation::Read, path)) return *failure;
     return disk_.readFile(at(path));
+  }
+  platform::Result<platform::FileDescriptor> openFile(const std::string& path) override {
+    if (const auto failure = failureOf(Operation::Open, path)) return *failure;
+    return disk_.openFile(at(path));
   }
 
  private:

@@ -141,6 +141,8 @@ TEST_F(LinuxExtensionServiceTest, OpensOneFileByItsTokenOnce) {
   install("/System/Applications/Other", "com.example.other");
   const auto other = service_.useExtension(find().at(1));
   const std::string clip = root_.write("/private/var/mobile/Library/Quorvel/clip.mp4", "frames");
+  ASSERT_EQ(::chmod(clip.c_str(), 0600), 0);
+  ASSERT_EQ(::chmod(root_.path("/private/var/mobile/Library/Quorvel").c_str(), 0700), 0);
   std::filesystem::create_symlink(clip, clip + ".link");
   EXPECT_FALSE(use().issueSandboxToken(kReadOnly, clip + ".link"));
   EXPECT_FALSE(use().issueSandboxToken(kReadOnly, root_.path("/private")));
