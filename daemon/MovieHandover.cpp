@@ -1,5 +1,6 @@
 #include "daemon/MovieHandover.h"
 
+#include <cerrno>
 #include <utility>
 
 #include "platform/threads/Log.h"
@@ -53,6 +54,14 @@ MovieHandover::MovieHandover(platform::Platform& platform, platform::SerialQueue
       sequence_("com.tarnwick.quorveld.handover", sequence),
       movies_(std::move(movies)),
       mixes_(platform, movies_) {}
+
+platform::Result<platform::SharedFileDescriptor> MovieHandover::openMovie(const std::string& owner, const URL& movie) {
+  if (!outgoing_.hasRoomFor(owner)) return Error::posix(EMFILE, "open movies that were not taken");
+  auto file = movies_->openHanded(owner, movie);
+  if (file) return outgoing_.add(owner, std::move(*file));
+  QV_LOG_ERROR(logs::kDaemon, "a movie is not opened for %s: %s", owner.c_str(), file.error().description().c_str());
+  return file.error();
+}
 
 void MovieHandover::saveVideoToCameraRoll(const std::string& owner, const URL& movie, Handler handler) {
   auto save = movies_->beginSave(owner, movie);

@@ -5,6 +5,7 @@
 #include <optional>
 #include <string>
 
+#include "daemon/OutgoingMovies.h"
 #include "platform/Platform.h"
 #include "platform/threads/SerialQueue.h"
 #include "support/QVTemporaryMovies.h"
@@ -29,6 +30,10 @@ class MovieHandover : public std::enable_shared_from_this<MovieHandover> {
   MovieHandover(platform::Platform& platform, platform::SerialQueue& sequence,
                 std::shared_ptr<QVTemporaryMovies> movies);
 
+  /// Opens a movie that was handed to this application and not saved yet, for its answer. kFailedToSave for any other
+  /// movie, and EMFILE while the application has not read the answers before.
+  [[nodiscard]] platform::Result<platform::SharedFileDescriptor> openMovie(const std::string& bundleID,
+                                                                           const platform::URL& movie);
   /// Stores a movie that was handed to this application and not saved yet: with its sound mixed, or as it is where that
   /// fails.
   void saveVideoToCameraRoll(const std::string& owner, const platform::URL& movie, Handler handler);
@@ -54,6 +59,7 @@ class MovieHandover : public std::enable_shared_from_this<MovieHandover> {
   platform::SerialQueue sequence_;  ///< on the manager's; usable as long as anybody holds this
   const std::shared_ptr<QVTemporaryMovies> movies_;
   const QVAudioMixUtility mixes_;
+  OutgoingMovies outgoing_;
 };
 
 }  // namespace qv

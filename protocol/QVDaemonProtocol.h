@@ -80,6 +80,13 @@ struct SaveVideo {
   static constexpr auto arguments() { return std::tuple{Argument{"movieURL", &SaveVideo::movieURL}}; }
 };
 
+struct OpenMovie {
+  static constexpr const char kMember[] = "openMovieAtURL";
+  static constexpr const char kReply[] = "ah movie, a{sv} error";
+  platform::URL movieURL;
+  static constexpr auto arguments() { return std::tuple{Argument{"movieURL", &OpenMovie::movieURL}}; }
+};
+
 struct Pause : NoArguments {
   static constexpr const char kMember[] = "pauseRecording";
 };
@@ -155,9 +162,9 @@ struct ReportCameraUsage {
 };
 
 using All = CallList<StartRecording, SetupBroadcast, GetBroadcastImages, GetBroadcastExtensions, Stop, StopTrimmed,
-                     SaveVideo, Pause, Resume, SetMicrophoneEnabled, UpdateProcessID, Discard, DidBecomeActive,
-                     DidResignActive, GetState, SetCameraConsent, SetMicrophoneConsent, SetBroadcastURL,
-                     SetMicrophoneEnabledPersistent, ReportCameraUsage>;
+                     SaveVideo, OpenMovie, Pause, Resume, SetMicrophoneEnabled, UpdateProcessID, Discard,
+                     DidBecomeActive, DidResignActive, GetState, SetCameraConsent, SetMicrophoneConsent,
+                     SetBroadcastURL, SetMicrophoneEnabledPersistent, ReportCameraUsage>;
 
 }  // namespace request
 }  // namespace qv

@@ -73,6 +73,13 @@ bool MovieBook::isHanded(const std::string& path, const std::string& bundleID) c
   return isHandedTo(find(path), bundleID);
 }
 
+std::optional<platform::Result<platform::FileDescriptor>> MovieBook::openHanded(const std::string& path,
+                                                                                const std::string& bundleID) const {
+  std::lock_guard lock(mutex_);
+  if (!isHandedTo(find(path), bundleID)) return std::nullopt;
+  return files_.disk().openFile(path);
+}
+
 bool MovieBook::beginSave(const std::string& path, const std::string& bundleID) {
   std::lock_guard lock(mutex_);
   if (!isHandedTo(find(path), bundleID)) return false;

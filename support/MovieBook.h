@@ -35,6 +35,10 @@ class MovieBook {
 
   void hand(const std::string& path, const std::string& bundleID);
   [[nodiscard]] bool isHanded(const std::string& path, const std::string& bundleID) const;
+  /// Opens the file; nothing unless it was handed to this application. The path does not change hands meanwhile, so
+  /// this is the file that was handed.
+  [[nodiscard]] std::optional<platform::Result<platform::FileDescriptor>> openHanded(const std::string& path,
+                                                                                     const std::string& bundleID) const;
   /// False unless the movie was handed to this application.
   [[nodiscard]] bool beginSave(const std::string& path, const std::string& bundleID);
   /// From whoever made the movie: it is being saved, and is handed to this application where that fails.

@@ -6,6 +6,7 @@
 
 #include "platform/threads/Guarded.h"
 #include "support/MovieBook.h"
+#include "support/QuorvelErrors.h"
 
 namespace qv {
 namespace {
@@ -114,6 +115,14 @@ class Movies final : public QVTemporaryMovies {
   [[nodiscard]] bool isHandedTo(const std::string& bundleID, const URL& movie) const override {
     const std::string path = normalized(movie.path());
     return book_->isHanded(path, bundleID) && files_.isMovieAt(path);
+  }
+  [[nodiscard]] platform::Result<platform::FileDescriptor> openHanded(const std::string& bundleID,
+                                                                      const URL& movie) const override {
+    auto file = book_->openHanded(normalized(movie.path()), bundleID);
+    const bool isGone =
+        !file || (!*file && file->error().domain == platform::kPosixErrorDomain && file->error().code == ENOENT);
+    if (isGone) return recordingError(errorcode::kFailedToSave);
+    return std::move(*file);
   }
   std::shared_ptr<MovieSave> beginSave(const std::string& bundleID, const URL& movie) override {
     const std::string path = normalized(movie.path());

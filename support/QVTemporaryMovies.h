@@ -7,6 +7,8 @@
 #include <string>
 
 #include "platform/base/Error.h"
+#include "platform/base/FileDescriptor.h"
+#include "platform/base/Result.h"
 #include "platform/base/Value.h"
 #include "support/QVTemporaryFiles.h"
 
@@ -76,6 +78,10 @@ class QVTemporaryMovies : public std::enable_shared_from_this<QVTemporaryMovies>
 
   /// Whether this movie was handed to this application, waits for its save or discard, and is there.
   [[nodiscard]] virtual bool isHandedTo(const std::string& bundleID, const platform::URL& movie) const = 0;
+  /// Opens such a movie, for reading. What is opened stays readable when the movie is saved, discarded or replaced.
+  /// kFailedToSave where it is not this application's, is being saved, or is not there; the disk's error otherwise.
+  [[nodiscard]] virtual platform::Result<platform::FileDescriptor> openHanded(const std::string& bundleID,
+                                                                              const platform::URL& movie) const = 0;
   /// Begins to save a movie that was handed to this application and is there; nothing otherwise, and while another save
   /// of it is under way.
   [[nodiscard]] virtual std::shared_ptr<MovieSave> beginSave(const std::string& bundleID,
