@@ -123,7 +123,8 @@ void Game::stop() {
   auto handler = [this](const quorvel::StopResult& result) {
     stopped(result);
     if (result.error) return failScript();
-    answered();
+    if (options_.keep.empty() || result.movieURL.empty()) return answered();
+    keepMovie(result.movieURL);
   };
   if (options_.startClip == 0 && options_.endClip == 0) return recorder_->stop(std::move(handler));
   recorder_->stop({std::chrono::duration<double>(options_.startClip), std::chrono::duration<double>(options_.endClip)},

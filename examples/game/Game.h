@@ -14,7 +14,8 @@
 
 namespace comet {
 
-/// The game and its recording: this file, Game.cpp and Game_broadcast.cpp are the example of the client library's use.
+/// The game and its recording: this file, Game.cpp, Game_broadcast.cpp and Game_movie.cpp are the example of the client
+/// library's use.
 ///
 /// Says what happens in lines on standard output, for people and for scripts.
 class Game {
@@ -33,6 +34,7 @@ class Game {
   void stop();
   void stopped(const quorvel::StopResult& result);
   void save();
+  void keepMovie(const std::string& url);
   void discard();
   void toggleMicrophone();
   void captured(const quorvel::VideoFrame& frame);

@@ -13,7 +13,7 @@ constexpr char kUsage[] =
     "usage: quorvel-example-game [--size WxH] [--fps N] [--start] [--capture] [--microphone]\n"
     "                            [--no-sound] [--static] [--headless] [--script STEPS]\n"
     "                            [--title TEXT] [--sky RRGGBB] [--tone HZ] [--numbered]\n"
-    "                            [--trim START,END]\n"
+    "                            [--trim START,END] [--keep FILE]\n"
     "                            [--broadcast EXTENSION_ID [--broadcast-info KEY=VALUE]... [--clip-duration S]]\n"
     "steps, separated by \";\": record S, pause S, wait S, capture S, stop, save, discard, quit\n"
     "keys: r start, p pause and resume, s stop, d discard, c capture, m microphone, q quit\n";
@@ -48,6 +48,7 @@ enum Option {
   kClipDuration,
   kNumbered,
   kTrim,
+  kKeep,
   kHelp
 };
 constexpr option kOptions[] = {{"size", required_argument, nullptr, kSize},
@@ -67,6 +68,7 @@ constexpr option kOptions[] = {{"size", required_argument, nullptr, kSize},
                                {"clip-duration", required_argument, nullptr, kClipDuration},
                                {"numbered", no_argument, nullptr, kNumbered},
                                {"trim", required_argument, nullptr, kTrim},
+                               {"keep", required_argument, nullptr, kKeep},
                                {"help", no_argument, nullptr, kHelp},
                                {nullptr, 0, nullptr, 0}};
 
@@ -136,6 +138,9 @@ void apply(Options& options, int option) {
       if (std::sscanf(optarg, "%lf,%lf", &options.startClip, &options.endClip) != 2 || !(options.startClip >= 0) ||
           !(options.endClip >= 0))
         refuse("--trim wants START,END in seconds");
+      break;
+    case kKeep:
+      options.keep = optarg;
       break;
     case kHelp:
       std::printf("%s", kUsage);

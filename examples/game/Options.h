@@ -27,6 +27,7 @@ struct Options {
   double clipDuration = 0;                                         ///< seconds; 0: as the daemon does
   bool numbered = false;                                           ///< each picture carries its number
   double startClip = 0, endClip = 0;                               ///< seconds that a stop trims off
+  std::string keep;                                                ///< a stop copies its movie to this path
   std::vector<Step> script;
 };
 

@@ -13,7 +13,7 @@ import sys
 
 sys.path.insert(0, os.path.join(os.path.dirname(os.path.abspath(__file__)), ".."))
 from stage.device import Stage  # noqa: E402
-from stage.movie import beeps, flashes, keep, path_in, report, run  # noqa: E402
+from stage.movie import beeps, flashes, report, run  # noqa: E402
 from stage.processes import wait_until  # noqa: E402
 
 # A flash needs a few pictures and its beep a few milliseconds to be found; and a resume may come amid a flash.
@@ -55,18 +55,21 @@ def answer_alert(stage):
     stage.press("Right", "Return")
 
 
-def run_application(stage):
-    game = stage.start_game("--start", size="1280x720", script="record 4; pause 2; record 4; stop; quit")
+def run_application(stage, output):
+    """The movie, of which the application has kept a copy."""
+    os.makedirs(output, exist_ok=True)
+    kept = os.path.join(output, "Comet Run.mp4")
+    game = stage.start_game("--start", "--keep", kept, size="1280x720",
+                            script="record 4; pause 2; record 4; stop; quit")
     answer_alert(stage)
     line, count = "", 0
-    while not line.startswith("stopped"):
+    while not line.startswith(("kept", "error")):
         _, line = game.expect("", count)
         print("application: " + line)
         count += 1
-    movie = path_in(line)
-    if game.wait() != 0 or not movie:
+    if game.wait() != 0 or not line.startswith("kept"):
         sys.exit("demo: the application got no movie")
-    return movie
+    return kept
 
 
 def is_good(movie):
@@ -101,7 +104,7 @@ def is_good(movie):
 def main():
     build, output = sys.argv[1:]
     with Demo(build) as stage:
-        movie = keep(run_application(stage), output)
+        movie = run_application(stage, output)
     report(movie, is_good(movie))
 
 

@@ -3,8 +3,8 @@
 #include <utility>
 
 #include "platform/base/Value.h"
-#include "sdk/client/RecorderSession.h"
 #include "sdk/client/RecorderErrors.h"
+#include "sdk/client/RecorderSession.h"
 #include "sdk/client/WireValues.h"
 
 namespace quorvel {
@@ -37,6 +37,17 @@ BroadcastExtensionsResult extensionsFromWire(const IPCArguments& reply) {
   BroadcastExtensionsResult result{errorFromWire(reply[1].asDictionary()), {}};
   for (const platform::Value& extension : reply[0].asArray())
     result.extensions.push_back(extensionFromWire(extension.asDictionary()));
+  return result;
+}
+
+quorvel::OpenMovieResult openMovieFromWire(const IPCArguments& reply) {
+  quorvel::OpenMovieResult result{errorFromWire(reply[1].asDictionary()), -1, nullptr};
+  const auto& files = reply[0].asArray();
+  const auto* file = files.empty() ? nullptr : files.front().getIf<platform::SharedFileDescriptor>();
+  if (result.error) return result;
+  if (!file || !*file) return {libraryError(quorvel::kErrorUnknown, "the movie did not come with the answer"), -1, {}};
+  result.file = (*file)->get();
+  result.holder = *file;
   return result;
 }
 
@@ -204,6 +215,11 @@ void RecorderClient::setMicrophoneEnabledPersistent(bool enabled, FailureHandler
 
 void RecorderClient::reportCameraUsage(int32_t cameraPosition, FailureHandler onFailure) {
   send(request::ReportCameraUsage{cameraPosition}, std::move(onFailure));
+}
+
+void RecorderClient::openMovie(std::string movieURL, std::function<void(quorvel::OpenMovieResult)> handler) {
+  ask<quorvel::OpenMovieResult>(request::OpenMovie{platform::URL(std::move(movieURL))}, std::move(handler),
+                                openMovieFromWire);
 }
 
 uint64_t RecorderClient::droppedSamples() const { return callbacks_->droppedSamples(); }

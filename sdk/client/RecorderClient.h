@@ -51,6 +51,7 @@ class RecorderClient final : public quorvel::Recorder {
   void reportCameraUsage(int32_t cameraPosition, FailureHandler onFailure) override;
 
   [[nodiscard]] uint64_t droppedSamples() const override;
+  void openMovie(std::string movieURL, std::function<void(quorvel::OpenMovieResult)> handler) override;
 
  private:
   /// Brings a failure to the application, where it asked for it.

@@ -127,6 +127,10 @@ def movie(client, movies):
     check(float(video['duration']) > 0.5 and abs(float(video['duration']) - float(audio['duration'])) < 0.05,
           f'{video["duration"]} s of picture, {audio["duration"]} s of sound')
     check_decodes(path)
+    check(os.stat(path).st_mode & 0o777 == 0o600, f'the movie has mode {os.stat(path).st_mode:o}')
+    (descriptor,), error = client.call('openMovieAtURL', 's', url)
+    with open(descriptor.take(), 'rb') as opened, open(path, 'rb') as file:
+        check(not error and opened.read() == file.read(), f'another movie is opened: {dict(error)}')
     check(not client.received.frames and not client.received.audio, 'samples are handed over without capture')
 
     check(client.refusal('discardRecordingWithHandler') is None, 'the movie cannot be discarded')

@@ -6,7 +6,7 @@
 //   recorder->start({.windows = {window}, .width = 1280, .height = 720},
 //                   [](quorvel::StartResult started) { ... });
 //   ...
-//   recorder->stop([](quorvel::StopResult stopped) { play(stopped.movieURL); });
+//   recorder->stop([](quorvel::StopResult stopped) { save(stopped.movieURL); });
 //
 // Link with `pkg-config --cflags --libs quorvel`. docs/app-developers.md is the guide.
 
@@ -61,7 +61,16 @@ struct StopOptions {
 /// an error, perhaps with a movie.
 struct StopResult {
   std::optional<Error> error;
-  std::string movieURL;  ///< "file:///..."; empty for no movie. See filePath().
+  std::string movieURL;  ///< "file:///..."; empty for no movie. To read it: Recorder::openMovie.
+};
+
+/// A movie that is open for reading.
+struct OpenMovieResult {
+  std::optional<Error> error;
+  /// At its start, and seekable; -1 with an error. Closed with the last copy of `holder`. Read it by this descriptor:
+  /// it cannot be opened again by a path, /proc/self/fd included, where the daemon is another user.
+  int file = -1;
+  std::shared_ptr<const void> holder;  ///< keeps `file` open
 };
 
 struct BroadcastOptions {
@@ -258,6 +267,16 @@ class QUORVEL_API Recorder {
   /// Captured samples that were dropped because the application's handlers did not keep up, pictures and sound
   /// together, over the recorder's life. From any thread.
   [[nodiscard]] virtual uint64_t droppedSamples() const = 0;
+
+  // What came later stands last, where programs that are built already do not look.
+
+  /// Opens a movie that this application was handed: `movieURL` is that of a StopResult. The file at the URL is for the
+  /// daemon alone where that runs as another user, so this is how an application reads its movie. What is open stays
+  /// readable, also when the movie is saved, discarded or replaced meanwhile; it takes up the disk for as long.
+  ///
+  /// kErrorFailedToSave: not this application's movie, gone, saved already, or being saved. Any other error is the
+  /// system's, of the domain "posix".
+  virtual void openMovie(std::string movieURL, std::function<void(OpenMovieResult)> handler) = 0;
 
  protected:
   Recorder() = default;
