@@ -32,7 +32,7 @@ class MovieHandover : public std::enable_shared_from_this<MovieHandover> {
 
   /// Opens a movie that was handed to this application and not saved yet, for its answer. kFailedToSave for any other
   /// movie, and EMFILE while the application has not read the answers before.
-  [[nodiscard]] platform::Result<platform::SharedFileDescriptor> openMovie(const std::string& bundleID,
+  [[nodiscard]] platform::Result<platform::SharedFileDescriptor> openMovie(const std::string& owner,
                                                                            const platform::URL& movie);
   /// Stores a movie that was handed to this application and not saved yet: with its sound mixed, or as it is where that
   /// fails.

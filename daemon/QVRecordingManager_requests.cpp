@@ -48,11 +48,15 @@ void QVRecordingManager::addRecordingRequests() {
                                        reply({Value(context->errors.encoded(error))});
                                      });
   });
-  requests_.add<request::OpenMovie>([this](const Caller& caller, const auto& request, const IPCReply& reply) {
-    const auto movie = handover_->openMovie(caller.bundleID().value_or(std::string()), request.movieURL);
-    reply({movie ? platform::Array{Value(movie.value())} : platform::Array{},
-           Value(context_->errors.encoded(movie ? std::nullopt : std::optional(movie.error())))});
-  });
+  requests_.addIdentified<request::OpenMovie>(
+      [this](const Caller& caller, const auto& request, const IPCReply& reply) {
+        const auto movie = handover_->openMovie(caller.owner(), request.movieURL);
+        reply({movie ? platform::Array{Value(movie.value())} : platform::Array{},
+               Value(context_->errors.encoded(movie ? std::nullopt : std::optional(movie.error())))});
+      },
+      [this](const auto&, const IPCReply& reply) {
+        reply({platform::Array{}, Value(context_->errors.encoded(recordingError(errorcode::kFailedToSave)))});
+      });
   requests_.add<request::Discard>(
       [this](const Caller& caller, const auto&, const IPCReply& reply) { discardRecording(caller, reply); });
   requests_.add<request::Pause>([this](const Caller& caller, const auto&, const IPCReply&) {
