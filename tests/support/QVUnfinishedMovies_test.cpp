@@ -37,7 +37,7 @@ TEST_F(UnfinishedMoviesTest, AreFinishedUnderANameThatNoRecordingTakes) {
   salvage();
   const std::string kept = stemOf("Chess") + ".mp4";
   EXPECT_EQ(salvage_.salvaged, std::vector<std::string>{kept});
-  EXPECT_EQ(log_.countContaining("is no movie that can be finished"), 1u) << "text.mp4";
+  EXPECT_EQ(log_.countContaining("\"text.mp4\" cannot be looked at"), 1u);
   EXPECT_EQ(names(), (std::vector<std::string>{"Chess.mp4.7-1.partial", kept, "Done.mp4", "Live.mp4", "text.mp4"}));
 
   // The same application crashed at the same moment of a clock that had begun anew.
