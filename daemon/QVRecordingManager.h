@@ -16,6 +16,7 @@
 #include "daemon/StartDesk.h"
 #include "daemon/StorePurge.h"
 #include "platform/Platform.h"
+#include "platform/threads/LogQuotas.h"
 #include "ui/QVExemptionBook.h"
 
 namespace qv {
@@ -115,6 +116,7 @@ class QVRecordingManager final : public platform::IPCListenerDelegate,
   platform::Platform& platform_;
   platform::SerialQueue sequence_;
   const std::shared_ptr<RecordingContext> context_;
+  platform::LogQuotas logQuotas_;
   QVExemptionBook exemptions_;
   const QVAcknowledgementAlert acknowledgements_;
   const std::shared_ptr<QVBroadcastBook> broadcasts_;

@@ -10,11 +10,12 @@ namespace logs = platform::logs;
 
 bool QVRecordingManager::listenerShouldAcceptNewConnection(platform::IPCListener&,
                                                            const std::shared_ptr<IPCConnection>& connection) {
+  const uid_t user = connection->peer().userIdentifier;
+  const platform::LogQuotas::Scope lines(logQuotas_, user);
   QV_LOG(logs::kDaemon, "QVRecordingManager: shouldAcceptNewConnection:");
   const pid_t processID = connection->processIdentifier();
   if (processID == 0) return false;
   const std::optional<std::string> bundleID = connection->peer().bundleIdentifier;
-  const uid_t user = connection->peer().userIdentifier;
   if (const Session other = sessions_->livingOfAnotherUser(bundleID, user)) {
     QV_LOG_ERROR(logs::kDaemon, "process %d of user %u is refused: %s is in use by user %u",
                  static_cast<int>(processID), user, bundleID->c_str(), other->userIdentifier());
@@ -78,8 +79,10 @@ void QVRecordingManager::callerWasRefused(const Caller& caller, platform::PeerSt
 }
 
 void QVRecordingManager::connectionEnded(const std::weak_ptr<IPCConnection>& weakConnection, const char* line) {
-  QV_LOG(logs::kDaemon, "%s", line);
   const auto connection = weakConnection.lock();
+  std::optional<platform::LogQuotas::Scope> lines;
+  if (connection) lines.emplace(logQuotas_, connection->peer().userIdentifier);
+  QV_LOG(logs::kDaemon, "%s", line);
   const auto known = connections_.find(connection);
   if (known == connections_.end()) return;
   const std::optional<std::string> bundleID = known->second;

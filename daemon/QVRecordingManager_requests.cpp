@@ -23,7 +23,9 @@ void QVRecordingManager::handleCall(const std::shared_ptr<platform::IPCConnectio
                                     const platform::IPCOperation& operation, platform::IPCArguments arguments,
                                     IPCReply reply) {
   sequence_.assertOnQueue();
-  requests_.serve(Caller{connection}, operation, arguments, reply);
+  const Caller caller{connection};
+  const platform::LogQuotas::Scope lines(logQuotas_, caller.user());
+  requests_.serve(caller, operation, arguments, reply);
 }
 
 void QVRecordingManager::addRecordingRequests() {

@@ -8,7 +8,7 @@
 #include <mutex>
 
 #include "platform/sdbus/SdBusIPC.h"
-#include "platform/sdbus/TokenBucket.h"
+#include "platform/base/TokenBucket.h"
 
 namespace qv::platform::sdbus {
 

@@ -14,6 +14,8 @@
 #include <thread>
 #include <utility>
 
+#include "platform/threads/LogQuotas.h"
+
 namespace qv::platform {
 namespace {
 
@@ -125,6 +127,7 @@ namespace detail {
 std::atomic<LogLevel> logThreshold{levelFromEnvironment()};
 
 void writeLog(LogLevel level, LogChannel channel, const char* category, const char* format, ...) {
+  if (!LogQuotas::Scope::admitsLine()) return;
   char buffer[1024];
   va_list arguments;
   va_start(arguments, format);

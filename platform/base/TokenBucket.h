@@ -3,7 +3,7 @@
 #include <algorithm>
 #include <chrono>
 
-namespace qv::platform::sdbus {
+namespace qv::platform {
 
 /// How often something may be done: `burst` times at once, `rate` times a second for long.
 ///
@@ -44,4 +44,4 @@ class TokenBucket {
   Time filled_;
 };
 
-}  // namespace qv::platform::sdbus
+}  // namespace qv::platform
