@@ -24,27 +24,26 @@ std::string firstNumbered(const std::string& path, const Test& suits) {
 
 }  // namespace
 
-std::optional<std::string> MovieBook::takeForRecording(const std::string& path, const std::string& bundleID,
-                                                       OwnMovie own, Continuation whenSettled) {
+std::optional<std::string> MovieBook::takeForRecording(const std::string& path, const std::string& owner, OwnMovie own,
+                                                       Continuation whenSettled) {
   std::lock_guard lock(mutex_);
   std::string at = firstNumbered(path, [&](const std::string& candidate) {
     const Movie* movie = find(candidate);
     if (!movie) return true;
     if (movie->hands == Hands::Made || (movie->hands == Hands::Handed && own == OwnMovie::Keep)) return false;
-    return movie->bundleID == bundleID || movie->bundleID.empty();
+    return movie->owner == owner || movie->owner.empty();
   });
   Movie& movie = movies_[at];
   if (movie.hands == Hands::Saved || movie.hands == Hands::Stored || movie.hands == Hands::Removed) {
     movie.waiting.push_back(std::move(whenSettled));
     return std::nullopt;
   }
-  movie = {Hands::Made, bundleID, {}};
+  movie = {Hands::Made, owner, {}};
   return at;
 }
 
-std::string MovieBook::takeForCopy(const std::string& path, const std::string& bundleID) {
-  return take(path, bundleID,
-              [&](const std::string&, const Movie* movie) { return !movie || isHandedTo(movie, bundleID); });
+std::string MovieBook::takeForCopy(const std::string& path, const std::string& owner) {
+  return take(path, owner, [&](const std::string&, const Movie* movie) { return !movie || isHandedTo(movie, owner); });
 }
 
 std::string MovieBook::takeUnused(const std::string& path) {
@@ -53,50 +52,50 @@ std::string MovieBook::takeUnused(const std::string& path) {
               [&](const std::string& candidate, const Movie* movie) { return !movie && !disk.itemExists(candidate); });
 }
 
-std::string MovieBook::take(const std::string& path, const std::string& bundleID,
+std::string MovieBook::take(const std::string& path, const std::string& owner,
                             const std::function<bool(const std::string&, const Movie*)>& mayTake) {
   std::lock_guard lock(mutex_);
   std::string at =
       firstNumbered(path, [&](const std::string& candidate) { return mayTake(candidate, find(candidate)); });
-  movies_.insert_or_assign(at, Movie{Hands::Made, bundleID, {}});
+  movies_.insert_or_assign(at, Movie{Hands::Made, owner, {}});
   return at;
 }
 
-void MovieBook::hand(const std::string& path, const std::string& bundleID) {
+void MovieBook::hand(const std::string& path, const std::string& owner) {
   std::lock_guard lock(mutex_);
-  movies_.insert_or_assign(path, Movie{Hands::Handed, bundleID, {}});
-  lastHanded_[bundleID] = path;
+  movies_.insert_or_assign(path, Movie{Hands::Handed, owner, {}});
+  lastHanded_[owner] = path;
 }
 
-bool MovieBook::isHanded(const std::string& path, const std::string& bundleID) const {
+bool MovieBook::isHanded(const std::string& path, const std::string& owner) const {
   std::lock_guard lock(mutex_);
-  return isHandedTo(find(path), bundleID);
+  return isHandedTo(find(path), owner);
 }
 
 std::optional<platform::Result<platform::FileDescriptor>> MovieBook::openHanded(const std::string& path,
-                                                                                const std::string& bundleID) const {
+                                                                                const std::string& owner) const {
   std::lock_guard lock(mutex_);
-  if (!isHandedTo(find(path), bundleID)) return std::nullopt;
+  if (!isHandedTo(find(path), owner)) return std::nullopt;
   return files_.disk().openFile(path);
 }
 
-bool MovieBook::beginSave(const std::string& path, const std::string& bundleID) {
+bool MovieBook::beginSave(const std::string& path, const std::string& owner) {
   std::lock_guard lock(mutex_);
-  if (!isHandedTo(find(path), bundleID)) return false;
+  if (!isHandedTo(find(path), owner)) return false;
   movies_[path].hands = Hands::Saved;
   return true;
 }
 
-void MovieBook::beginStoring(const std::string& path, const std::string& bundleID) {
+void MovieBook::beginStoring(const std::string& path, const std::string& owner) {
   std::lock_guard lock(mutex_);
-  movies_.insert_or_assign(path, Movie{Hands::Stored, bundleID, {}});
+  movies_.insert_or_assign(path, Movie{Hands::Stored, owner, {}});
 }
 
-MovieBook::Discard MovieBook::beginDiscard(const std::string& bundleID, Continuation whenSettled) {
+MovieBook::Discard MovieBook::beginDiscard(const std::string& owner, Continuation whenSettled) {
   std::lock_guard lock(mutex_);
-  const auto last = lastHanded_.find(bundleID);
+  const auto last = lastHanded_.find(owner);
   const auto movie = last == lastHanded_.end() ? movies_.end() : movies_.find(last->second);
-  if (movie == movies_.end() || movie->second.bundleID != bundleID) return {};
+  if (movie == movies_.end() || movie->second.owner != owner) return {};
   if (movie->second.hands == Hands::Saved) {
     movie->second.waiting.push_back(std::move(whenSettled));
     return {std::nullopt, true};
@@ -135,9 +134,9 @@ void MovieBook::giveBack(const std::string& path) {
     std::lock_guard lock(mutex_);
     Movie& movie = movies_[path];
     waiting = std::exchange(movie.waiting, {});
-    if (movie.hands == Hands::Stored) lastHanded_[movie.bundleID] = path;
+    if (movie.hands == Hands::Stored) lastHanded_[movie.owner] = path;
     movie.hands = Hands::Handed;
-    if (movie.bundleID.empty()) movies_.erase(path);
+    if (movie.owner.empty()) movies_.erase(path);
   }
   for (const Continuation& goOn : waiting) goOn();
 }
@@ -153,8 +152,8 @@ const MovieBook::Movie* MovieBook::find(const std::string& path) const {
   return found == movies_.end() ? nullptr : &found->second;
 }
 
-bool MovieBook::isHandedTo(const Movie* movie, const std::string& bundleID) {
-  return movie && movie->hands == Hands::Handed && movie->bundleID == bundleID;
+bool MovieBook::isHandedTo(const Movie* movie, const std::string& owner) {
+  return movie && movie->hands == Hands::Handed && movie->owner == owner;
 }
 
 }  // namespace qv

@@ -26,30 +26,30 @@ class MovieBook {
   enum class OwnMovie { Replace, Keep };
   /// The path, which is being made from now on. Nothing where this application's movie at that path is being saved, or
   /// is on its way to being removed: `whenSettled` is called when that is over.
-  std::optional<std::string> takeForRecording(const std::string& path, const std::string& bundleID, OwnMovie own,
+  std::optional<std::string> takeForRecording(const std::string& path, const std::string& owner, OwnMovie own,
                                               Continuation whenSettled);
   /// The same for a copy, which replaces only what was handed to this application, and waits for nothing.
-  std::string takeForCopy(const std::string& path, const std::string& bundleID);
+  std::string takeForCopy(const std::string& path, const std::string& owner);
   /// The same for a path at which no file is.
   std::string takeUnused(const std::string& path);
 
-  void hand(const std::string& path, const std::string& bundleID);
-  [[nodiscard]] bool isHanded(const std::string& path, const std::string& bundleID) const;
+  void hand(const std::string& path, const std::string& owner);
+  [[nodiscard]] bool isHanded(const std::string& path, const std::string& owner) const;
   /// Opens the file; nothing unless it was handed to this application. The path does not change hands meanwhile, so
   /// this is the file that was handed.
   [[nodiscard]] std::optional<platform::Result<platform::FileDescriptor>> openHanded(const std::string& path,
-                                                                                     const std::string& bundleID) const;
+                                                                                     const std::string& owner) const;
   /// False unless the movie was handed to this application.
-  [[nodiscard]] bool beginSave(const std::string& path, const std::string& bundleID);
+  [[nodiscard]] bool beginSave(const std::string& path, const std::string& owner);
   /// From whoever made the movie: it is being saved, and is handed to this application where that fails.
-  void beginStoring(const std::string& path, const std::string& bundleID);
+  void beginStoring(const std::string& path, const std::string& owner);
   struct Discard {
     /// Of what was handed to this application last, which is being removed from now on; nothing unless it waits there.
     std::optional<std::string> path;
     /// It is being saved: `whenSettled` is called when that is over.
     bool waits = false;
   };
-  Discard beginDiscard(const std::string& bundleID, Continuation whenSettled);
+  Discard beginDiscard(const std::string& owner, Continuation whenSettled);
   /// From whoever makes or saves the movie.
   void beginRemoval(const std::string& path);
   /// From whoever else wants it away; false while somebody makes, saves or removes it.
@@ -66,14 +66,14 @@ class MovieBook {
   enum class Hands { Made, Handed, Saved, Stored, Removed };
   struct Movie {
     Hands hands = Hands::Made;
-    std::string bundleID;  ///< of its application; empty for what belongs to none
+    std::string owner;  ///< of its application; empty for what belongs to none
     std::vector<Continuation> waiting;
   };
   [[nodiscard]] const Movie* find(const std::string& path) const;
   /// Takes the first path, of this one and those numbered after it, that `mayTake`.
-  std::string take(const std::string& path, const std::string& bundleID,
+  std::string take(const std::string& path, const std::string& owner,
                    const std::function<bool(const std::string&, const Movie*)>& mayTake);
-  static bool isHandedTo(const Movie* movie, const std::string& bundleID);
+  static bool isHandedTo(const Movie* movie, const std::string& owner);
 
   const QVTemporaryFiles files_;
   mutable std::mutex mutex_;

@@ -66,10 +66,10 @@ class Claim final : public MovieClaim {
   }
   [[nodiscard]] const std::string& path() const override { return right_.path(); }
   [[nodiscard]] bool hasFile() const override { return right_.hasFile(); }
-  void handTo(const std::string& bundleID) override {
-    if (const Book book = right_.use()) book->hand(path(), bundleID);
+  void handTo(const std::string& owner) override {
+    if (const Book book = right_.use()) book->hand(path(), owner);
   }
-  std::shared_ptr<MovieSave> saveFor(const std::string& bundleID) override;
+  std::shared_ptr<MovieSave> saveFor(const std::string& owner) override;
   void remove(FileCompletion completion) override { right_.useForRemoval(std::move(completion)); }
 
  private:
@@ -90,10 +90,10 @@ class Save final : public MovieSave {
   const URL movie_;
 };
 
-std::shared_ptr<MovieSave> Claim::saveFor(const std::string& bundleID) {
+std::shared_ptr<MovieSave> Claim::saveFor(const std::string& owner) {
   const Book book = hasFile() ? right_.use() : nullptr;
   if (!book) return nullptr;
-  book->beginStoring(path(), bundleID);
+  book->beginStoring(path(), owner);
   return std::make_shared<Save>(book, path());
 }
 
@@ -102,38 +102,38 @@ class Movies final : public QVTemporaryMovies {
   explicit Movies(QVTemporaryFiles files) : files_(files), book_(std::make_shared<MovieBook>(files)) {}
   ~Movies() override { book_->dropWaiting(); }
 
-  void claimForRecording(const std::string& path, const std::string& bundleID, ClaimHandler handler) override {
-    claim(path, bundleID, MovieBook::OwnMovie::Replace, handler);
+  void claimForRecording(const std::string& path, const std::string& owner, ClaimHandler handler) override {
+    claim(path, owner, MovieBook::OwnMovie::Replace, handler);
   }
   std::shared_ptr<MovieClaim> claimNew(const std::string& path) override {
     return claimAt(book_->takeUnused(normalized(path)));
   }
-  std::shared_ptr<MovieClaim> claimTrimmed(const std::string& path, const std::string& bundleID) override {
-    return claimAt(book_->takeForCopy(normalized(path), bundleID));
+  std::shared_ptr<MovieClaim> claimTrimmed(const std::string& path, const std::string& owner) override {
+    return claimAt(book_->takeForCopy(normalized(path), owner));
   }
 
-  [[nodiscard]] bool isHandedTo(const std::string& bundleID, const URL& movie) const override {
+  [[nodiscard]] bool isHandedTo(const std::string& owner, const URL& movie) const override {
     const std::string path = normalized(movie.path());
-    return book_->isHanded(path, bundleID) && files_.isMovieAt(path);
+    return book_->isHanded(path, owner) && files_.isMovieAt(path);
   }
-  [[nodiscard]] platform::Result<platform::FileDescriptor> openHanded(const std::string& bundleID,
+  [[nodiscard]] platform::Result<platform::FileDescriptor> openHanded(const std::string& owner,
                                                                       const URL& movie) const override {
-    auto file = book_->openHanded(normalized(movie.path()), bundleID);
+    auto file = book_->openHanded(normalized(movie.path()), owner);
     const bool isGone =
         !file || (!*file && file->error().domain == platform::kPosixErrorDomain && file->error().code == ENOENT);
     if (isGone) return recordingError(errorcode::kFailedToSave);
     return std::move(*file);
   }
-  std::shared_ptr<MovieSave> beginSave(const std::string& bundleID, const URL& movie) override {
+  std::shared_ptr<MovieSave> beginSave(const std::string& owner, const URL& movie) override {
     const std::string path = normalized(movie.path());
-    if (!book_->beginSave(path, bundleID)) return nullptr;
+    if (!book_->beginSave(path, owner)) return nullptr;
     // Looked at under the right, which no purge can take any more; without a file it goes back.
     auto save = std::make_shared<Save>(book_, path);
     return files_.isMovieAt(path) ? save : nullptr;
   }
-  void discardLast(const std::string& bundleID, FileCompletion completion) override {
-    const auto discard = book_->beginDiscard(bundleID, [weak = weak_from_this(), bundleID, completion] {
-      if (const auto self = weak.lock()) self->discardLast(bundleID, completion);
+  void discardLast(const std::string& owner, FileCompletion completion) override {
+    const auto discard = book_->beginDiscard(owner, [weak = weak_from_this(), owner, completion] {
+      if (const auto self = weak.lock()) self->discardLast(owner, completion);
     });
     if (discard.path) {
       removeAndRelease(book_, *discard.path, std::move(completion));
@@ -148,14 +148,13 @@ class Movies final : public QVTemporaryMovies {
   int64_t deleteAllTempFiles() override { return files_._srDeleteAllTempFiles(purging()); }
 
  private:
-  void claim(const std::string& path, const std::string& bundleID, MovieBook::OwnMovie own,
-             const ClaimHandler& handler) {
-    const auto whenSettled = [weak = weak_from_this(), path, bundleID, handler] {
+  void claim(const std::string& path, const std::string& owner, MovieBook::OwnMovie own, const ClaimHandler& handler) {
+    const auto whenSettled = [weak = weak_from_this(), path, owner, handler] {
       const auto self = std::static_pointer_cast<Movies>(weak.lock());
       // A movie that could not be saved is its application's still, and was wanted a moment ago.
-      if (self) self->claim(path, bundleID, MovieBook::OwnMovie::Keep, handler);
+      if (self) self->claim(path, owner, MovieBook::OwnMovie::Keep, handler);
     };
-    if (const auto taken = book_->takeForRecording(normalized(path), bundleID, own, whenSettled)) {
+    if (const auto taken = book_->takeForRecording(normalized(path), owner, own, whenSettled)) {
       handler(claimAt(*taken));
     }
   }

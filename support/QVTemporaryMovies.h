@@ -27,10 +27,10 @@ class MovieClaim {
   [[nodiscard]] virtual bool hasFile() const = 0;
   /// Gives the file to an application, which may save or discard it from now on. The claim ends. Nothing happens where
   /// it has ended.
-  virtual void handTo(const std::string& bundleID) = 0;
+  virtual void handTo(const std::string& owner) = 0;
   /// Begins to save the file before any application has it; nothing, and the claim goes on, where there is no file. The
   /// claim ends. Where the save ends without success, the movie is handed to this application.
-  [[nodiscard]] virtual std::shared_ptr<class MovieSave> saveFor(const std::string& bundleID) = 0;
+  [[nodiscard]] virtual std::shared_ptr<class MovieSave> saveFor(const std::string& owner) = 0;
   /// Removes the file later on; the claim ends when it is gone, and also where that fails: then the file is nobody's.
   /// `completion` (may be empty) runs on the background queue; an ended claim removes nothing and gives ENOENT.
   virtual void remove(FileCompletion completion) = 0;
@@ -67,29 +67,27 @@ class QVTemporaryMovies : public std::enable_shared_from_this<QVTemporaryMovies>
   /// movie has, or that is being made, is numbered: "Chess.mp4", "Chess 2.mp4". The handler runs once, at once where
   /// there is nothing to wait for, else in the thread that ends the save or removal. Destroyed with this, it does not
   /// run.
-  virtual void claimForRecording(const std::string& path, const std::string& bundleID, ClaimHandler handler) = 0;
+  virtual void claimForRecording(const std::string& path, const std::string& owner, ClaimHandler handler) = 0;
   /// The same for a file that must not replace one: a path that nobody has and where no file is, numbered where need
   /// be.
   [[nodiscard]] virtual std::shared_ptr<MovieClaim> claimNew(const std::string& path) = 0;
   /// For the trimmed copy of this application's movie: a copy that was handed to it and never saved is replaced, as is
   /// a file that is nobody's; anything else is left alone by numbering.
-  [[nodiscard]] virtual std::shared_ptr<MovieClaim> claimTrimmed(const std::string& path,
-                                                                 const std::string& bundleID) = 0;
+  [[nodiscard]] virtual std::shared_ptr<MovieClaim> claimTrimmed(const std::string& path, const std::string& owner) = 0;
 
   /// Whether this movie was handed to this application, waits for its save or discard, and is there.
-  [[nodiscard]] virtual bool isHandedTo(const std::string& bundleID, const platform::URL& movie) const = 0;
+  [[nodiscard]] virtual bool isHandedTo(const std::string& owner, const platform::URL& movie) const = 0;
   /// Opens such a movie, for reading. What is opened stays readable when the movie is saved, discarded or replaced.
   /// kFailedToSave where it is not this application's, is being saved, or is not there; the disk's error otherwise.
-  [[nodiscard]] virtual platform::Result<platform::FileDescriptor> openHanded(const std::string& bundleID,
+  [[nodiscard]] virtual platform::Result<platform::FileDescriptor> openHanded(const std::string& owner,
                                                                               const platform::URL& movie) const = 0;
   /// Begins to save a movie that was handed to this application and is there; nothing otherwise, and while another save
   /// of it is under way.
-  [[nodiscard]] virtual std::shared_ptr<MovieSave> beginSave(const std::string& bundleID,
-                                                             const platform::URL& movie) = 0;
+  [[nodiscard]] virtual std::shared_ptr<MovieSave> beginSave(const std::string& owner, const platform::URL& movie) = 0;
   /// Removes the movie that was handed to this application last, unless it is saved or being saved; an earlier one is
   /// left alone in any case. `completion` (may be empty) runs on the background queue with what kept it from that, also
   /// where there was nothing.
-  virtual void discardLast(const std::string& bundleID, FileCompletion completion) = 0;
+  virtual void discardLast(const std::string& owner, FileCompletion completion) = 0;
 
   /// Like `_srDeleteFilesOlderThanTimeToLiveInSeconds` and `_srDeleteAllTempFiles`, but for what is being made or
   /// saved. What was handed and is gone by it is forgotten; what could not be removed stays handed.
