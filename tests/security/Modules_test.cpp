@@ -2,6 +2,7 @@
 #include <sys/resource.h>
 
 #include "platform/ffmpeg/MoviesLoader.h"
+#include "platform/threads/Log.h"
 #include "tests/kit/ScratchFolder.h"
 
 namespace qv::security {
@@ -28,6 +29,8 @@ TEST(ModulesTest, ALoadThatFailedForWantOfDescriptorsIsTriedAgain) {
   const kit::ScratchFolder folder;
   platform::ffmpeg::MoviesLoader loader(QV_MOVIE_MODULES);
   const auto movie = platform::URL::fileURL(folder / "movie.mp4");
+  // Its thread is begun with the first line, and a sanitizer that looks at a new thread needs descriptors.
+  QV_LOG(platform::logs::kPlatform, "the log has begun");
   {
     const NoDescriptors exhausted;
     EXPECT_FALSE(loader.createAssetWriter(movie, platform::kFileTypeMPEG4).hasValue());
