@@ -125,7 +125,9 @@ TEST_F(PeersTest, APeerThatTakesNothingIsNotWaitedFor) {
   RawPeer first(socketPath()), second(socketPath());
   Events<int64_t> failures;
   for (RawPeer* deaf : {&first, &second}) sendNumbered(*admit(*deaf), "notify", 1, failures);
-  EXPECT_EQ(failures.next(), code(IPCErrorCode::ConnectionInvalid)) << "its last reference has gone";
+  for (int i = 0; i < 2; ++i) {
+    EXPECT_EQ(failures.next(), code(IPCErrorCode::ConnectionInvalid)) << "its last reference has gone";
+  }
   EXPECT_FALSE(first.readUntil("an end")) << "it is closed";
   listener_.reset();
   server_.reset();
