@@ -8,6 +8,7 @@
 #include "platform/headless/HeadlessPlatform.h"
 #include "platform/linux/LinuxExtensionService.h"
 #include "platform/linux/LinuxPlatform.h"
+#include "platform/linux/LocalExtensionStarter.h"
 #include "platform/linux/SessionUser.h"
 #include "platform/logind/LogindKeepAlive.h"
 #include "platform/mp4/MP4MovieSalvage.h"
@@ -50,17 +51,19 @@ platform::SdBusIPCOptions messaging() {
   return options;
 }
 
+std::unique_ptr<platform::ExtensionStarter> extensionStarter() {
+  return std::make_unique<platform::LocalExtensionStarter>(
+      platform::ExtensionLaunchOptions{.dataDirectory = platform::deviceRootFromEnvironment() + kDataDirectory,
+                                       .launcherPath = platform::installedExtensionLauncher()});
+}
+
 }  // namespace
 
 struct PlatformChoice::Backends {
   platform::LinuxPlatform linux{thisDevice()};
   platform::SdBusIPCService ipc{linux.peerResolver(), messaging()};
-  platform::LinuxExtensionService extensions{ipc,
-                                             linux.bundles(),
-                                             platform::systemTimers(),
-                                             platform::globalQueue(),
-                                             {.dataDirectory = platform::deviceRootFromEnvironment() + kDataDirectory,
-                                              .launcherPath = platform::installedExtensionLauncher()}};
+  platform::LinuxExtensionService extensions{ipc, linux.bundles(), platform::systemTimers(), platform::globalQueue(),
+                                             extensionStarter()};
   // What is recorded may fill the disk, and nothing else of the daemon does.
   platform::LogindKeepAlive keepAlive{
       {.busAddress = {}, .activityHandler = [this](bool isOpen) { linux.watchFreeSpace(isOpen); }}};

@@ -13,6 +13,7 @@
 #include "platform/linux/ICULocalization.h"
 #include "platform/linux/JSONPreferenceStore.h"
 #include "platform/linux/LinuxExtensionService.h"
+#include "platform/linux/LocalExtensionStarter.h"
 #include "platform/sdbus/SdBusIPC.h"
 #include "platform/threads/Executor.h"
 #include "tests/fakes/ManualTimers.h"
@@ -49,7 +50,8 @@ class ExtensionStage : public ::testing::Test {
  protected:
   ExtensionStage()
       : service_(ipc_, bundles_, timers_, globalQueue(),
-                 {.dataDirectory = root_.path("/private/var/mobile"), .launcherPath = EXTENSION_LAUNCHER}) {
+                 std::make_unique<LocalExtensionStarter>(ExtensionLaunchOptions{
+                     .dataDirectory = root_.path("/private/var/mobile"), .launcherPath = EXTENSION_LAUNCHER})) {
     ::chmod(root_.path().c_str(), 0755);
     install(kUploadBundle, "com.example.game.upload");
   }
