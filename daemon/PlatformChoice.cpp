@@ -6,8 +6,11 @@
 #include "platform/appstream/AppStreamStore.h"
 #include "platform/ffmpeg/MoviesLoader.h"
 #include "platform/headless/HeadlessPlatform.h"
+#include "platform/linux/DeviceRoot.h"
 #include "platform/linux/LinuxExtensionService.h"
 #include "platform/linux/LinuxPlatform.h"
+#include "platform/linux/LocalExtensionStarter.h"
+#include "platform/linux/RemoteExtensionStarter.h"
 #include "platform/linux/SessionUser.h"
 #include "platform/logind/LogindKeepAlive.h"
 #include "platform/mp4/MP4MovieSalvage.h"
@@ -27,19 +30,32 @@ namespace {
 /// The screen readers that free desktops have. While one runs, a system recording is heard to begin and end.
 const std::set<std::string> kScreenReaders{"orca"};
 
+/// Its socket, where extensions are started by a service of its own; else empty, and the daemon starts them itself.
+std::string extensionService() {
+  const char* socket = ::secure_getenv("QUORVEL_EXTENSION_SERVICE");
+  return socket != nullptr ? socket : "";
+}
+
 platform::LinuxDevice thisDevice() {
-  return {.root = platform::deviceRootFromEnvironment(),
-          .bundlePath = platform::bundlePathFromEnvironment(),
-          .preferences = kPreferencesDirectory,
-          .preferenceDomain = kPreferenceDomain,
-          .photoLibrary = kPhotoLibraryDirectory,
-          .metrics = kMetricsDirectory,
-          .screenReaders = kScreenReaders,
-          .watchedPath = kTempPath,
-          .watchedSpace = {.thresholds = {kMinimumFreeSpaceForRecording, kMinimumFreeSpaceWhileRecording,
-                                          kCriticalFreeSpace},
-                           .criticalFor = kCriticalFor},
-          .sessionUser = platform::sessionUserFromEnvironment()};
+  platform::LinuxDevice device{.root = platform::deviceRootFromEnvironment(),
+                               .bundlePath = platform::bundlePathFromEnvironment(),
+                               .preferences = kPreferencesDirectory,
+                               .preferenceDomain = kPreferenceDomain,
+                               .photoLibrary = kPhotoLibraryDirectory,
+                               .metrics = kMetricsDirectory,
+                               .screenReaders = kScreenReaders,
+                               .watchedPath = kTempPath,
+                               .watchedSpace = {.thresholds = {kMinimumFreeSpaceForRecording,
+                                                               kMinimumFreeSpaceWhileRecording, kCriticalFreeSpace},
+                                                .criticalFor = kCriticalFor},
+                               .sessionUser = platform::sessionUserFromEnvironment()};
+  // Who starts no extensions has no network.
+  if (const std::string socket = extensionService(); !socket.empty()) {
+    device.reachabilityOfHost = [socket](const std::string& host) {
+      return platform::remoteReachabilityOfHost(socket, host);
+    };
+  }
+  return device;
 }
 
 /// Anybody who may connect is a peer that is not trusted, and so is every extension.
@@ -50,17 +66,22 @@ platform::SdBusIPCOptions messaging() {
   return options;
 }
 
+std::unique_ptr<platform::ExtensionStarter> extensionStarter() {
+  if (std::string socket = extensionService(); !socket.empty()) {
+    return std::make_unique<platform::RemoteExtensionStarter>(std::move(socket));
+  }
+  return std::make_unique<platform::LocalExtensionStarter>(
+      platform::ExtensionLaunchOptions{.dataDirectory = platform::deviceRootFromEnvironment() + kDataDirectory,
+                                       .launcherPath = platform::installedExtensionLauncher()});
+}
+
 }  // namespace
 
 struct PlatformChoice::Backends {
   platform::LinuxPlatform linux{thisDevice()};
   platform::SdBusIPCService ipc{linux.peerResolver(), messaging()};
-  platform::LinuxExtensionService extensions{ipc,
-                                             linux.bundles(),
-                                             platform::systemTimers(),
-                                             platform::globalQueue(),
-                                             {.dataDirectory = platform::deviceRootFromEnvironment() + kDataDirectory,
-                                              .launcherPath = platform::installedExtensionLauncher()}};
+  platform::LinuxExtensionService extensions{ipc, linux.bundles(), platform::systemTimers(), platform::globalQueue(),
+                                             extensionStarter()};
   // What is recorded may fill the disk, and nothing else of the daemon does.
   platform::LogindKeepAlive keepAlive{
       {.busAddress = {}, .activityHandler = [this](bool isOpen) { linux.watchFreeSpace(isOpen); }}};

@@ -26,7 +26,7 @@ inline constexpr rlim_t kThreads = 512;
 /// When memory runs out, extensions go before the recording does; the scale ends at 1000.
 inline constexpr int kOutOfMemoryScore = 500;
 
-// Of one process, by its cgroup, where the daemon's is delegated to it.
+// Of one process, by its cgroup, where one is delegated to whoever starts it.
 
 inline constexpr uint64_t kCgroupMemory = uint64_t{1} << 30;  // bytes
 inline constexpr uint64_t kCgroupTasks = 256;

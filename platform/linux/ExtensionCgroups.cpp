@@ -89,9 +89,8 @@ std::unique_ptr<ExtensionCgroup> ExtensionCgroups::make() {
 
 void ExtensionCgroups::prepare() {
   if (delegated_.empty()) {
-    QV_LOG(
-        logs::kExtensions,
-        "extensions run without bounds of processor time and of memory in use: no cgroup is delegated to the daemon");
+    QV_LOG(logs::kExtensions,
+           "extensions run without bounds of processor time and of memory in use: no cgroup is delegated");
     return;
   }
   moveProcessesToLeaf();

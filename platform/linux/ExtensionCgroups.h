@@ -27,8 +27,8 @@ class ExtensionCgroup {
   const std::string path_;
 };
 
-/// The daemon's own cgroup (version 2), where that was delegated to it (`Delegate=yes` of its unit). With the first
-/// that is made the daemon moves to a leaf of its own, `daemon`, for processes may only be in leaves, and one log line
+/// This process's own cgroup (version 2), where that was delegated to it (`Delegate=yes` of its unit). With the first
+/// that is made it moves to a leaf of its own, `daemon`, for processes may only be in leaves, and one log line
 /// tells what there is to bound with.
 ///
 /// Threading: thread-safe, blocking.

@@ -8,9 +8,7 @@
 #include <string>
 
 #include "platform/Extensions.h"
-#include "platform/linux/ExtensionCgroups.h"
-#include "platform/linux/ExtensionLaunch.h"
-#include "platform/linux/ExtensionUsers.h"
+#include "platform/linux/ExtensionStarter.h"
 #include "platform/threads/Guarded.h"
 #include "platform/threads/Timer.h"
 
@@ -32,9 +30,7 @@ struct ExtensionHost {
   IPCService& ipc;
   TimerService& timers;
   Executor& executor;
-  const ExtensionLaunchOptions options;
-  ExtensionUsers users{containersOf(options)};  ///< where the daemon is root
-  ExtensionCgroups cgroups{};
+  const std::unique_ptr<ExtensionStarter> starter;
   Guarded<std::map<std::string, MakeContext>> contextClasses{};  ///< by extension point
   Guarded<std::map<ExtensionRequestID, Place>> places{};         ///< of the requests that were begun
   Guarded<std::set<std::shared_ptr<ExtensionProcesses>>> uses{};

@@ -12,7 +12,6 @@
 #include <system_error>
 #include <utility>
 
-#include "platform/linux/ExtensionHost.h"
 #include "platform/linux/SmallFile.h"
 #include "protocol/ExtensionRequests.h"
 
@@ -33,8 +32,8 @@ std::optional<Error> makeContainer(const std::string& container) {
 }
 
 /// 0, the daemon's own, where it is not root and can give none.
-Result<uid_t> userOf(const ExtensionRecord& extension, ExtensionHost& host) {
-  return ::geteuid() == 0 ? host.users.userOf(extension.identifier) : Result<uid_t>(uid_t{0});
+Result<uid_t> userOf(const ExtensionRecord& extension, ExtensionUsers& users) {
+  return ::geteuid() == 0 ? users.userOf(extension.identifier) : Result<uid_t>(uid_t{0});
 }
 
 /// Of what the program writes; it waits where nobody reads.
@@ -77,12 +76,13 @@ std::string installedExtensionLauncher() {
 
 std::string containersOf(const ExtensionLaunchOptions& options) { return options.dataDirectory + "/Containers"; }
 
-Result<ExtensionLaunch> makeExtensionLaunch(const ExtensionRecord& extension, ExtensionHost& host,
-                                            const ListenerEndpoint& requests, const ListenerEndpoint& auxiliary) {
+Result<ExtensionLaunch> makeExtensionLaunch(const ExtensionRecord& extension, const ExtensionLaunchOptions& options,
+                                            const ExtensionEndpoints& endpoints, ExtensionUsers& users,
+                                            ExtensionCgroups& cgroups) {
   if (!isSafeFileStem(extension.identifier)) return Error::posix(EINVAL, extension.identifier);
-  const std::string container = containersOf(host.options) + "/" + extension.identifier;
+  const std::string container = containersOf(options) + "/" + extension.identifier;
   if (auto error = makeContainer(container)) return *error;
-  auto user = userOf(extension, host);
+  auto user = userOf(extension, users);
   if (!user) return user.error();
   ExtensionLaunch launch{.request = {},
                          .launcherLife = nullptr,
@@ -90,15 +90,15 @@ Result<ExtensionLaunch> makeExtensionLaunch(const ExtensionRecord& extension, Ex
                          .output = {},
                          .log = ExtensionLog(container, *user),
                          .container = container,
-                         .cgroup = host.cgroups.make()};
+                         .cgroup = cgroups.make()};
   if (auto error = connectOutput(launch)) return *error;
   if (auto error = connectLife(launch)) return *error;
   SpawnRequest& request = launch.request;
-  request.program = host.options.launcherPath;
-  request.arguments = {std::to_string(::getpid()), host.options.dataDirectory, extension.bundlePath, container,
+  request.program = options.launcherPath;
+  request.arguments = {std::to_string(::getpid()), options.dataDirectory, extension.bundlePath, container,
                        extension.executablePath,   std::to_string(*user)};
   request.environment = makeEnvironment(container);
-  request.descriptors = {requests.rendezvous(), auxiliary.rendezvous(), launch.launcherLife};
+  request.descriptors = {endpoints.requests, endpoints.auxiliary, launch.launcherLife};
   return launch;
 }
 

@@ -3,15 +3,14 @@
 #include <memory>
 #include <string>
 
-#include "platform/Extensions.h"
 #include "platform/base/Result.h"
 #include "platform/linux/ExtensionCgroups.h"
 #include "platform/linux/ExtensionLog.h"
+#include "platform/linux/ExtensionStarter.h"
+#include "platform/linux/ExtensionUsers.h"
 #include "platform/process/SpawnedProcess.h"
 
 namespace qv::platform {
-
-struct ExtensionHost;
 
 /// How extensions are launched on this device.
 struct ExtensionLaunchOptions {
@@ -40,9 +39,10 @@ struct ExtensionLaunch {
 /// Makes the extension's container where there is none yet, `<data directory>/Containers/<identifier>`, and puts
 /// together its launch: the user, the confinement, a minimal environment, its output in "stderr.log" of its container,
 /// and the two endpoints. Blocking.
-[[nodiscard]] Result<ExtensionLaunch> makeExtensionLaunch(const ExtensionRecord& extension, ExtensionHost& host,
-                                                          const ListenerEndpoint& requests,
-                                                          const ListenerEndpoint& auxiliary);
+[[nodiscard]] Result<ExtensionLaunch> makeExtensionLaunch(const ExtensionRecord& extension,
+                                                          const ExtensionLaunchOptions& options,
+                                                          const ExtensionEndpoints& endpoints, ExtensionUsers& users,
+                                                          ExtensionCgroups& cgroups);
 
 /// What the end of an extension's process was, for the log and for the requests that it ends.
 [[nodiscard]] Error errorOfExtensionEnd(const std::string& identifier, int status);

@@ -23,7 +23,7 @@ UserRange reservedUserRange();
 /// Which extension runs as which user, where the daemon is root: two never share one. What was assigned stands in
 /// `.users.json` of the containers' directory, and in the owners of the containers, which count where that file is
 /// missing or damaged. A user is assigned anew only when all have been, its extension was not asked for since the
-/// daemon started, and its container is gone.
+/// object was made, and its container is gone.
 ///
 /// Threading: thread-safe, blocking.
 class ExtensionUsers {

@@ -27,7 +27,8 @@ Result<SpawnedProcess> startGuard(const SpawnedProcess& process, const Extension
 
 }  // namespace
 
-Result<std::unique_ptr<LaunchedProcess>> LaunchedProcess::start(ExtensionLaunch launch, Handlers handlers) {
+Result<std::unique_ptr<LaunchedProcess>> LaunchedProcess::start(ExtensionLaunch launch,
+                                                                StartedExtensionHandlers handlers) {
   std::unique_ptr<LaunchedProcess> process(new LaunchedProcess());
   Started started;
   auto outcome = started.get_future();
@@ -38,7 +39,7 @@ Result<std::unique_ptr<LaunchedProcess>> LaunchedProcess::start(ExtensionLaunch 
   return process;
 }
 
-void LaunchedProcess::run(ExtensionLaunch launch, Started started, const Handlers& handlers) {
+void LaunchedProcess::run(ExtensionLaunch launch, Started started, const StartedExtensionHandlers& handlers) {
   const std::string launcher = launch.request.program;
   auto process = SpawnedProcess::start(std::move(launch.request));
   if (!process) return started.set_value(process.error());
@@ -67,6 +68,8 @@ std::optional<Error> LaunchedProcess::letGo(const ExtensionLaunch& launch) {
   if (::send(launch.life.get(), &go, 1, MSG_NOSIGNAL) == 1 || errno == EPIPE) return std::nullopt;
   return Error::posix(errno, "launcher");
 }
+
+void LaunchedProcess::kill() { process_.sendSignal(SIGKILL); }
 
 LaunchedProcess::~LaunchedProcess() {
   process_.sendSignal(SIGKILL);

@@ -2,13 +2,13 @@
 
 #include <sys/types.h>
 
-#include <functional>
 #include <future>
 #include <memory>
 #include <optional>
 #include <thread>
 
 #include "platform/linux/ExtensionLaunch.h"
+#include "platform/linux/ExtensionStarter.h"
 #include "platform/process/SpawnedProcess.h"
 
 namespace qv::platform {
@@ -17,28 +17,24 @@ namespace qv::platform {
 ///
 /// That thread has also made the process, since PR_SET_PDEATHSIG looks at the death of the parent's thread.
 ///
-/// Threading: thread-safe; destroy it from another thread than the one that its handlers come on.
-class LaunchedProcess {
+/// Threading: as StartedExtension.
+class LaunchedProcess final : public StartedExtension {
  public:
-  /// On the watching thread.
-  struct Handlers {
-    std::function<void(int)> didEnd;             ///< once, with the status as of waitpid
-    std::function<void(const Error&)> willKill;  ///< before that, where the process is killed for what it did
-  };
-  static Result<std::unique_ptr<LaunchedProcess>> start(ExtensionLaunch launch, Handlers handlers);
-  /// Kills the process where it still runs, and waits for its end.
-  ~LaunchedProcess();
+  /// The handlers come on the watching thread.
+  static Result<std::unique_ptr<LaunchedProcess>> start(ExtensionLaunch launch, StartedExtensionHandlers handlers);
+  /// Waits for the process's end.
+  ~LaunchedProcess() override;
   LaunchedProcess(const LaunchedProcess&) = delete;
   LaunchedProcess& operator=(const LaunchedProcess&) = delete;
 
-  [[nodiscard]] pid_t processIdentifier() const { return process_.processIdentifier(); }
-  void sendSignal(int signal) const { process_.sendSignal(signal); }
+  [[nodiscard]] pid_t processIdentifier() const override { return process_.processIdentifier(); }
+  void kill() override;
 
  private:
   using Started = std::promise<std::optional<Error>>;
 
   LaunchedProcess() = default;
-  void run(ExtensionLaunch launch, Started started, const Handlers& handlers);
+  void run(ExtensionLaunch launch, Started started, const StartedExtensionHandlers& handlers);
   std::optional<Error> letGo(const ExtensionLaunch& launch);
 
   SpawnedProcess process_;

@@ -1,11 +1,10 @@
 #include "platform/linux/LinuxExtensionProcess.h"
 
-#include <signal.h>
-
 #include <cerrno>
 #include <chrono>
 #include <utility>
 
+#include "platform/linux/ExtensionLaunch.h"
 #include "platform/threads/Log.h"
 #include "protocol/ExtensionRequests.h"
 
@@ -82,10 +81,8 @@ std::optional<Error> LinuxExtensionProcess::launch() {
   if (!requests) return requests.error();
   auto auxiliary = listen(auxiliaryListener_);
   if (!auxiliary) return auxiliary.error();
-  auto launch = makeExtensionLaunch(*extension_, *host_, *requests, *auxiliary);
-  if (!launch) return launch.error();
-  auto process = LaunchedProcess::start(
-      std::move(*launch),
+  auto process = host_->starter->start(
+      *extension_, {.requests = requests->rendezvous(), .auxiliary = auxiliary->rendezvous()},
       {.didEnd = [queue = queue_, self = weak_from_this()](
                      int status) { queue->async(self, [status](auto& ended) { ended.processEnded(status); }); },
        .willKill =
@@ -225,7 +222,7 @@ void LinuxExtensionProcess::openFile(const std::string& token, const IPCReply& r
 
 void LinuxExtensionProcess::terminate() {
   isEnding_ = true;
-  if (process_ && !status_) process_->sendSignal(SIGKILL);
+  if (process_ && !status_) process_->kill();
 }
 
 void LinuxExtensionProcess::kill(const std::string& why) {

@@ -8,7 +8,7 @@
 #include <vector>
 
 #include "platform/linux/ExtensionHost.h"
-#include "platform/linux/LaunchedProcess.h"
+#include "platform/linux/ExtensionStarter.h"
 #include "platform/linux/SandboxTokenBook.h"
 #include "platform/threads/SerialQueue.h"
 
@@ -97,7 +97,7 @@ class LinuxExtensionProcess final : public IPCListenerDelegate,
   bool requestsConnectionEnded_ = false;
   std::optional<int> status_;  ///< once the process is dead
   int oddities_ = 0;
-  std::unique_ptr<LaunchedProcess> process_;  ///< the last: its thread ends before what it reports to
+  std::unique_ptr<StartedExtension> process_;  ///< the last: its thread ends before what it reports to
 };
 
 }  // namespace qv::platform

@@ -1,48 +1,15 @@
 #include "platform/linux/LinuxExtensionService.h"
 
-#include <unistd.h>
-
-#include <set>
 #include <utility>
 
-#include "platform/linux/ExtensionManifest.h"
+#include "platform/linux/InstalledExtensions.h"
 #include "platform/linux/LinuxExtensionUse.h"
-#include "platform/threads/Log.h"
 
 namespace qv::platform {
-namespace {
-
-std::vector<ExtensionRecordRef> findExtensions(LinuxBundleService& bundles, const Value& point) {
-  std::vector<ExtensionRecordRef> extensions;
-  std::set<std::string> identifiers;
-  for (const BundleRef& bundle : bundles.installedBundles()) {
-    if (!isExtensionInfo(bundle->infoDictionary())) continue;
-    auto record = makeExtensionRecord(*bundle);
-    if (!record) {
-      QV_LOG_ERROR(logs::kExtensions, "extension %s is left out: %s", bundle->path().c_str(),
-                   record.error().description().c_str());
-    } else if (!identifiers.insert((*record)->identifier).second) {
-      QV_LOG_ERROR(logs::kExtensions, "extension %s is left out: another one is %s", bundle->path().c_str(),
-                   (*record)->identifier.c_str());
-    } else if (point.isNone() || point.asString() == (*record)->extensionPointIdentifier) {
-      extensions.push_back(std::move(*record));
-    }
-  }
-  return extensions;
-}
-
-}  // namespace
-
 LinuxExtensionService::LinuxExtensionService(IPCService& ipc, LinuxBundleService& bundles, TimerService& timers,
-                                             Executor& executor, ExtensionLaunchOptions options)
+                                             Executor& executor, std::unique_ptr<ExtensionStarter> starter)
     : bundles_(bundles),
-      host_(new ExtensionHost{.ipc = ipc, .timers = timers, .executor = executor, .options = std::move(options)}) {
-  if (::geteuid() == 0) return;
-  QV_LOG(
-      logs::kExtensions,
-      "the daemon is not root: extensions run as its own user, without a bound of threads, a view of their own of the "
-      "files, or protection of containers from each other but Landlock; the other bounds hold");
-}
+      host_(new ExtensionHost{.ipc = ipc, .timers = timers, .executor = executor, .starter = std::move(starter)}) {}
 
 LinuxExtensionService::~LinuxExtensionService() {
   for (const auto& processes : host_->uses.exchange({})) {
@@ -55,7 +22,10 @@ void LinuxExtensionService::extensionsMatchingAttributes(
     std::function<void(const std::vector<ExtensionRecordRef>&, const std::optional<Error>&)> completion) {
   host_->executor.post([&bundles = bundles_, point = valueForKey(attributes, extensioninfo::kPointIdentifier),
                         completion = std::move(completion)] {
-    const auto extensions = findExtensions(bundles, point);
+    auto extensions = installedExtensions(bundles);
+    std::erase_if(extensions, [&](const ExtensionRecordRef& extension) {
+      return !point.isNone() && point.asString() != extension->extensionPointIdentifier;
+    });
     if (completion) completion(extensions, std::nullopt);
   });
 }

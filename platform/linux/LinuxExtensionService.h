@@ -22,7 +22,7 @@ class LinuxExtensionService final : public ExtensionService {
  public:
   /// The services are borrowed.
   LinuxExtensionService(IPCService& ipc, LinuxBundleService& bundles, TimerService& timers, Executor& executor,
-                        ExtensionLaunchOptions options);
+                        std::unique_ptr<ExtensionStarter> starter);
   ~LinuxExtensionService() override;
 
   void extensionsMatchingAttributes(

@@ -1,6 +1,5 @@
 #include "platform/linux/LinuxPlatform.h"
 
-#include <cstdlib>
 #include <utility>
 
 #include "platform/linux/OwnedFiles.h"
@@ -8,14 +7,6 @@
 #include "platform/threads/Log.h"
 
 namespace qv::platform {
-namespace {
-
-std::string environment(const char* name) {
-  const char* value = std::getenv(name);
-  return value ? value : "";
-}
-
-}  // namespace
 
 LinuxPlatform::LinuxPlatform(const LinuxDevice& device)
     : deviceRoot_(device.root),
@@ -29,7 +20,7 @@ LinuxPlatform::LinuxPlatform(const LinuxDevice& device)
                       [this] { return watchedFreeSpace(); }),
       photoLibrary_(deviceRoot_ + device.photoLibrary, device.sessionUser, globalQueue()),
       metrics_(deviceRoot_ + device.metrics, systemClock()),
-      reachability_(globalQueue()),
+      reachability_(globalQueue(), RouteReachabilityService::kPatience, device.reachabilityOfHost),
       screenReader_(device.screenReaders) {}
 
 void LinuxPlatform::addTo(Platform& platform) {
@@ -68,13 +59,5 @@ void LinuxPlatform::resolve(IPCPeer& peer) {
                peer.bundleIdentifier->c_str(), foreign.c_str());
   peer.entitlements.clear();
 }
-
-std::string deviceRootFromEnvironment() {
-  std::string root = environment("QUORVEL_DEVICE_ROOT");
-  while (root.ends_with('/')) root.pop_back();
-  return root;
-}
-
-std::string bundlePathFromEnvironment() { return environment("QUORVEL_BUNDLE_PATH"); }
 
 }  // namespace qv::platform

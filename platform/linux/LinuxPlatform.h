@@ -37,6 +37,7 @@ struct LinuxDevice {
   /// For whom entitlements hold that name nobody (EntitlementStore), and whose the photo library is, where this process
   /// is root.
   uid_t sessionUser = 0;
+  HostReachability reachabilityOfHost = routeReachabilityOfHost;
 };
 
 /// The services that need nothing but Linux and files, for one device root. Making it reads nothing.
@@ -85,10 +86,5 @@ class LinuxPlatform {
   RouteReachabilityService reachability_;
   ProcessScreenReader screenReader_;
 };
-
-/// QUORVEL_DEVICE_ROOT without trailing separators; empty on a device.
-[[nodiscard]] std::string deviceRootFromEnvironment();
-/// QUORVEL_BUNDLE_PATH.
-[[nodiscard]] std::string bundlePathFromEnvironment();
 
 }  // namespace qv::platform

@@ -14,8 +14,12 @@ namespace {
 
 constexpr size_t kLongestName = 253;
 
+using Answer = std::shared_future<std::optional<uint32_t>>;
+
+}  // namespace
+
 /// The best that holds for one of the host's addresses: a link that is up goes before one that is not.
-uint32_t flagsOfHost(const std::string& host) {
+uint32_t routeReachabilityOfHost(const std::string& host) {
   addrinfo hints{};
   hints.ai_socktype = SOCK_STREAM;
   addrinfo* found = nullptr;
@@ -30,14 +34,14 @@ uint32_t flagsOfHost(const std::string& host) {
   return best;
 }
 
-}  // namespace
-
 struct RouteReachabilityService::State {
-  State(Executor& executorToUse, std::chrono::milliseconds time) : executor(executorToUse), patience(time) {}
+  State(Executor& executorToUse, std::chrono::milliseconds time, HostReachability question)
+      : executor(executorToUse), patience(time), ask(std::move(question)) {}
   Executor& executor;
   const std::chrono::milliseconds patience;
+  const HostReachability ask;
   std::mutex mutex;
-  std::map<std::string, std::shared_future<uint32_t>> running;  // guarded by mutex
+  std::map<std::string, Answer> running;  // guarded by mutex
 };
 
 /// Threading: one thread at a time.
@@ -52,14 +56,14 @@ class RouteReachabilityService::Probe final : public NetworkReachabilityProbe {
   }
 
  private:
-  std::shared_future<uint32_t> resolve() {
+  Answer resolve() {
     std::lock_guard lock(state_->mutex);
     if (const auto running = state_->running.find(host_); running != state_->running.end()) return running->second;
-    const auto promise = std::make_shared<std::promise<uint32_t>>();
-    std::shared_future<uint32_t> answer = promise->get_future().share();
+    const auto promise = std::make_shared<std::promise<std::optional<uint32_t>>>();
+    Answer answer = promise->get_future().share();
     state_->running[host_] = answer;
     state_->executor.post([state = state_, host = host_, promise] {
-      const uint32_t flags = flagsOfHost(host);
+      const auto flags = state->ask(host);
       std::lock_guard done(state->mutex);
       state->running.erase(host);
       promise->set_value(flags);
@@ -71,8 +75,9 @@ class RouteReachabilityService::Probe final : public NetworkReachabilityProbe {
   const std::string host_;
 };
 
-RouteReachabilityService::RouteReachabilityService(Executor& executor, std::chrono::milliseconds patience)
-    : state_(std::make_shared<State>(executor, patience)) {}
+RouteReachabilityService::RouteReachabilityService(Executor& executor, std::chrono::milliseconds patience,
+                                                   HostReachability ask)
+    : state_(std::make_shared<State>(executor, patience, std::move(ask))) {}
 
 std::unique_ptr<NetworkReachabilityProbe> RouteReachabilityService::createProbe(const std::string& host) {
   if (host.empty() || host.size() > kLongestName || host.find('\0') != std::string::npos) return nullptr;

@@ -5,6 +5,7 @@
 
 #include <cerrno>
 #include <filesystem>
+#include <functional>
 #include <memory>
 #include <string>
 #include <utility>
@@ -13,6 +14,7 @@
 #include "platform/linux/ICULocalization.h"
 #include "platform/linux/JSONPreferenceStore.h"
 #include "platform/linux/LinuxExtensionService.h"
+#include "platform/linux/LocalExtensionStarter.h"
 #include "platform/sdbus/SdBusIPC.h"
 #include "platform/threads/Executor.h"
 #include "tests/fakes/ManualTimers.h"
@@ -47,11 +49,16 @@ struct Flow {
 /// Threading: the test's thread.
 class ExtensionStage : public ::testing::Test {
  protected:
-  ExtensionStage()
-      : service_(ipc_, bundles_, timers_, globalQueue(),
-                 {.dataDirectory = root_.path("/private/var/mobile"), .launcherPath = EXTENSION_LAUNCHER}) {
+  using MakeStarter = std::function<std::unique_ptr<ExtensionStarter>(const std::string& root)>;
+
+  explicit ExtensionStage(const MakeStarter& makeStarter = startHere)
+      : service_(ipc_, bundles_, timers_, globalQueue(), makeStarter(root_.path())) {
     ::chmod(root_.path().c_str(), 0755);
     install(kUploadBundle, "com.example.game.upload");
+  }
+  static std::unique_ptr<ExtensionStarter> startHere(const std::string& root) {
+    return std::make_unique<LocalExtensionStarter>(
+        ExtensionLaunchOptions{.dataDirectory = root + "/private/var/mobile", .launcherPath = EXTENSION_LAUNCHER});
   }
   void install(const std::string& bundle, const std::string& identifier) {
     root_.write(bundle + "/Info.json", infoOf(identifier));

@@ -110,11 +110,14 @@ void AnotherUser::become() const {
   check(::setresuid(user_, user_, user_), "user");
 }
 
-void dropCapabilities() {
+void emptyBoundingSet() {
   for (unsigned long capability = 0; ::prctl(PR_CAPBSET_READ, capability, 0, 0, 0) >= 0; ++capability) {
     // Refused to whoever is not root, who has none to drop.
     (void)::prctl(PR_CAPBSET_DROP, capability, 0, 0, 0);
   }
+}
+
+void dropCapabilities() {
   (void)::prctl(PR_CAP_AMBIENT, PR_CAP_AMBIENT_CLEAR_ALL, 0, 0, 0);
   __user_cap_header_struct header{_LINUX_CAPABILITY_VERSION_3, 0};
   const __user_cap_data_struct none[2] = {};

@@ -26,7 +26,10 @@ class AnotherUser {
   uid_t user_;
 };
 
-/// Gives up every capability for good. Throws std::system_error.
+/// So that no program that is executed gains a capability. That takes one itself: call while still root.
+void emptyBoundingSet();
+
+/// Gives up every capability. Throws std::system_error.
 void dropCapabilities();
 
 }  // namespace qv::platform::launcher

@@ -70,6 +70,7 @@ void confine(const Plan& plan) {
   }
   std::optional<Landlock> landlock;
   if (version > 0) landlock.emplace(plan.bundle, plan.container);
+  emptyBoundingSet();
   if (user) user->become();
   dropCapabilities();
   if (::prctl(PR_SET_NO_NEW_PRIVS, 1, 0, 0, 0) != 0) {
