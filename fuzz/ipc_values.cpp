@@ -1,14 +1,8 @@
 // What a peer sends over a connection that it has opened: bytes for sd-bus, and the values in its messages.
-#include <sys/socket.h>
-#include <unistd.h>
-
-#include <cstring>
-
-#include "fuzz/Target.h"
-#include "platform/base/FileDescriptor.h"
+#include "fuzz/ServerBus.h"
 #include "platform/base/KeyedArchive.h"
 #include "platform/sdbus/BusCoding.h"
-#include "platform/sdbus/Handles.h"
+#include "tests/kit/SocketMessage.h"
 #include "tests/sdbus/RawCall.h"
 
 namespace {
@@ -55,41 +49,6 @@ int receive(sd_bus_message* message, void*, sd_bus_error*) {
   return 1;
 }
 
-void sendBytes(int socket, const void* bytes, size_t size, bool withDescriptor) {
-  iovec data{const_cast<void*>(bytes), size};
-  alignas(cmsghdr) char control[CMSG_SPACE(sizeof(int))] = {};
-  msghdr header{};
-  header.msg_iov = &data;
-  header.msg_iovlen = 1;
-  if (withDescriptor) {
-    header.msg_control = control;
-    header.msg_controllen = sizeof control;
-    cmsghdr* item = CMSG_FIRSTHDR(&header);
-    *item = {CMSG_LEN(sizeof(int)), SOL_SOCKET, SCM_RIGHTS};
-    std::memcpy(CMSG_DATA(item), &socket, sizeof socket);
-  }
-  (void)!::sendmsg(socket, &header, MSG_NOSIGNAL | MSG_DONTWAIT);
-}
-
-int processAll(sd_bus* bus) {
-  int r = 1;
-  while (r > 0) r = sd_bus_process(bus, nullptr);
-  return r;
-}
-
-sdbus::BusHandle makeBus(FileDescriptor socket) {
-  sd_bus* bus = nullptr;
-  qv::fuzz::require(sd_bus_new(&bus) >= 0, "memory");
-  sdbus::BusHandle handle(bus);
-  const int fd = socket.release();
-  sd_id128_t id{};
-  const bool made = sd_bus_set_fd(bus, fd, fd) >= 0 && sd_bus_negotiate_fds(bus, 1) >= 0 &&
-                    sd_bus_set_server(bus, 1, id) >= 0 && sd_bus_add_filter(bus, nullptr, &receive, nullptr) >= 0 &&
-                    sd_bus_start(bus) >= 0;
-  qv::fuzz::require(made, "a bus");
-  return handle;
-}
-
 }  // namespace
 
 /// The first byte tells whether a descriptor goes with the message.
@@ -113,17 +72,14 @@ std::vector<std::string> qv::fuzz::seeds() {
 
 extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
   if (size == 0) return 0;
-  int ends[2];
-  qv::fuzz::require(::socketpair(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0, ends) == 0, "sockets");
-  const FileDescriptor peer(ends[0]);
-  const sdbus::BusHandle bus = makeBus(FileDescriptor(ends[1]));
-  std::string uid;
-  for (const char digit : std::to_string(::getuid())) uid += {'3', digit};
-  using namespace std::string_literals;
-  const std::string hello = "\0AUTH EXTERNAL "s + uid + "\r\nNEGOTIATE_UNIX_FD\r\nBEGIN\r\n";
-  sendBytes(peer.get(), hello.data(), hello.size(), false);
-  qv::fuzz::require(processAll(bus.get()) == 0 && sd_bus_is_ready(bus.get()) > 0, "an authenticated bus");
-  sendBytes(peer.get(), data + 1, size - 1, (data[0] & 1) != 0);
-  processAll(bus.get());
+  const qv::fuzz::ServerBus bus(&receive, nullptr);
+  const auto sendBytes = [&bus](std::string_view bytes, bool withDescriptor) {
+    const std::vector<int> descriptors(withDescriptor ? 1 : 0, bus.peer.get());
+    (void)qv::kit::sendMessage(bus.peer.get(), bytes, descriptors, MSG_NOSIGNAL | MSG_DONTWAIT);
+  };
+  sendBytes(test::rawHello(), false);
+  qv::fuzz::require(bus.processAll() == 0 && bus.isReady(), "an authenticated bus");
+  sendBytes({reinterpret_cast<const char*>(data + 1), size - 1}, (data[0] & 1) != 0);
+  bus.processAll();
   return 0;
 }

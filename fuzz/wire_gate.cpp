@@ -1,15 +1,13 @@
 // What a peer sends to the gate in front of sd-bus. The gate takes anything; of what it passes, sd-bus makes one
 // message each, and loses no descriptor.
 #include <fcntl.h>
-#include <sys/socket.h>
 #include <unistd.h>
 
 #include <algorithm>
-#include <cstring>
 
-#include "fuzz/Target.h"
-#include "platform/sdbus/Handles.h"
+#include "fuzz/ServerBus.h"
 #include "platform/sdbus/WireGate.h"
+#include "tests/kit/SocketMessage.h"
 #include "tests/sdbus/RawCall.h"
 
 namespace {
@@ -28,27 +26,12 @@ int nextNumber() { return FileDescriptor(open()).get(); }
 /// A bus of this process, that something passed is written to.
 class Bus {
  public:
-  Bus() {
-    int ends[2];
-    qv::fuzz::require(::socketpair(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC | SOCK_NONBLOCK, 0, ends) == 0, "sockets");
-    peer_.reset(ends[0]);
-    sd_bus* bus = nullptr;
-    qv::fuzz::require(sd_bus_new(&bus) >= 0, "memory");
-    bus_.reset(bus);
-    const bool isMade = sd_bus_set_fd(bus, ends[1], ends[1]) >= 0 && sd_bus_negotiate_fds(bus, 1) >= 0 &&
-                        sd_bus_set_server(bus, 1, {}) >= 0 && sd_bus_add_filter(bus, nullptr, &count, this) >= 0 &&
-                        sd_bus_start(bus) >= 0;
-    qv::fuzz::require(isMade, "a bus");
-  }
-
   void take(sdbus::WireUnit unit) {
     send(unit);
     unit.descriptors.clear();
-    int r = 1;
-    while (r > 0) r = sd_bus_process(bus_.get(), nullptr);
-    qv::fuzz::require(r == 0, "sd-bus keeps the connection");
+    qv::fuzz::require(server_.processAll() == 0, "sd-bus keeps the connection");
   }
-  [[nodiscard]] bool isReady() const { return sd_bus_is_ready(bus_.get()) > 0; }
+  [[nodiscard]] bool isReady() const { return server_.isReady(); }
   [[nodiscard]] size_t received() const { return received_; }
 
  private:
@@ -58,28 +41,15 @@ class Bus {
   }
 
   void send(const sdbus::WireUnit& unit) const {
-    iovec data{const_cast<uint8_t*>(unit.bytes.data()), unit.bytes.size()};
-    alignas(cmsghdr) char control[CMSG_SPACE(sizeof(int) * sdbus::kMaximumWireDescriptors)] = {};
-    msghdr header{};
-    header.msg_iov = &data;
-    header.msg_iovlen = 1;
-    if (const size_t bytes = unit.descriptors.size() * sizeof(int); bytes > 0) {
-      header.msg_control = control;
-      header.msg_controllen = CMSG_SPACE(bytes);
-      cmsghdr* item = CMSG_FIRSTHDR(&header);
-      *item = {CMSG_LEN(bytes), SOL_SOCKET, SCM_RIGHTS};
-      for (size_t i = 0; i < unit.descriptors.size(); ++i) {
-        const int fd = unit.descriptors[i].get();
-        std::memcpy(CMSG_DATA(item) + i * sizeof fd, &fd, sizeof fd);
-      }
-    }
-    const ssize_t sent = ::sendmsg(peer_.get(), &header, MSG_NOSIGNAL);
-    qv::fuzz::require(sent == static_cast<ssize_t>(unit.bytes.size()), "room in a socket");
+    std::vector<int> descriptors;
+    for (const FileDescriptor& each : unit.descriptors) descriptors.push_back(each.get());
+    const std::string_view bytes(reinterpret_cast<const char*>(unit.bytes.data()), unit.bytes.size());
+    const ssize_t sent = qv::kit::sendMessage(server_.peer.get(), bytes, descriptors);
+    qv::fuzz::require(sent == static_cast<ssize_t>(bytes.size()), "room in a socket");
   }
 
-  FileDescriptor peer_;
-  sdbus::BusHandle bus_;
   size_t received_ = 0;
+  const qv::fuzz::ServerBus server_{&count, this};
 };
 
 void run(std::string_view bytes, size_t most, size_t descriptors) {

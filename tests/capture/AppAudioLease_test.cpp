@@ -27,8 +27,6 @@ TEST_F(AppAudioLeaseTest, TapDeliversStampedAudioAndRecyclesItsBuffers) {
   a_.appAudioLease->stopAppAudioCapture();
   EXPECT_TRUE(a_.tap->disposed);
   EXPECT_EQ(a_.tap->freed, 10);
-  EXPECT_EQ(device_.log.count("QVRecordingManager: Audio Queue buffer released"), 10u);
-  EXPECT_TRUE(device_.log.contains("QVRecordingManager:stopAudioCapture: Audio Queue successfully stopped"));
   a_.appAudioLease->stopAppAudioCapture();
 }
 
@@ -59,7 +57,6 @@ TEST_F(AppAudioLeaseTest, TapRunsOnTheBuffersThatItGot) {
   a_.appAudioLease.reset();
   EXPECT_EQ(a_.tap->freed, 2);
   EXPECT_TRUE(a_.tap->disposed);
-  EXPECT_EQ(device_.log.count("QVRecordingManager: error: -4"), 2u);
 }
 
 TEST_F(AppAudioLeaseTest, WhatOneRecordingEndsIsNoOthers) {
@@ -171,7 +168,6 @@ TEST_F(AppAudioLeaseTest, WhatAnUnstoppableTapStillBringsIsIgnored) {
   a_.appAudioLease->stopAppAudioCapture();
   EXPECT_TRUE(a_.appAudio.empty());
   EXPECT_EQ(a_.tap->freed, 0) << "the queue may still use its buffers";
-  EXPECT_TRUE(device_.log.contains("QVRecordingManager:stopAudioCapture:error: -66"));
 }
 
 TEST_F(AppAudioLeaseTest, SoundThatCannotBeHadIsToldLikeAStart) {
@@ -186,7 +182,6 @@ TEST_F(AppAudioLeaseTest, SoundThatCannotBeHadIsToldLikeAStart) {
   a_.tapStarts = 0;
   startTap(a_);
   EXPECT_EQ(a_.tapStarts, 1);
-  EXPECT_TRUE(device_.log.contains("QVRecordingManager: startAudioCapture error: -5"));
 
   device_.tap.failures = {{"create", -3}};
   startTap(b_);

@@ -1,11 +1,9 @@
 #include <unistd.h>
 
 #include <atomic>
-#include <optional>
 #include <thread>
 
 #include "platform/headless/HeadlessPlatform.h"
-#include "platform/headless/TestSignal.h"
 #include "platform/pulse/PulsePlatform.h"
 #include "platform/threads/Clock.h"
 #include "tests/contracts/Backends.h"
@@ -27,33 +25,18 @@ struct SoundStage {
   virtual ~SoundStage() = default;
   virtual AppAudioTapService& taps() = 0;
   virtual DeviceCaptureService& devices() = 0;
-  /// Lets them sound; their tones, in Hz.
-  virtual void play() = 0;
-  double applicationTone = 0, microphoneTone = 0;
 };
 
 class HeadlessStage final : public SoundStage {
   AppAudioTapService& taps() override { return platform_.appAudioTap(); }
   DeviceCaptureService& devices() override { return platform_.deviceCapture(); }
-  void play() override {
-    applicationTone = testsignal::kAppBeepFrequency;
-    microphoneTone = testsignal::kMicrophoneBeepFrequency;
-  }
   HeadlessPlatform platform_{{}};
 };
 
-/// The test is the process that is tapped: the players are its children.
 class PulseStage final : public SoundStage {
   AppAudioTapService& taps() override { return platform_->appAudioTap(); }
   DeviceCaptureService& devices() override { return platform_->deviceCapture(); }
-  void play() override {
-    ASSERT_TRUE(application_.open("appout", "1000") && microphone_.open("micsrc", "440"));
-    ASSERT_TRUE(application_.sound() != 0 && microphone_.sound() != 0);
-    applicationTone = 1000;
-    microphoneTone = 440;
-  }
   kit::SoundServer server_;
-  kit::TonePlayer application_{server_}, microphone_{server_};
   const std::unique_ptr<PulsePlatform> platform_ = std::move(PulsePlatform::connect(server_.address()).value());
 };
 
@@ -91,13 +74,6 @@ TEST_P(AppAudioTapContract, RunsOnTheHostClockFromItsStartToItsStop) {
   ASSERT_EQ(tap.queue().dispose(), 0);
   EXPECT_EQ(changes, 3);
   EXPECT_NE(tap.queue().start(), 0);
-}
-
-TEST_P(AppAudioTapContract, HearsItsProcess) {
-  kit::TestTap tap(stage_->taps(), ::getpid());
-  ASSERT_EQ(tap.queue().start(), 0);
-  stage_->play();
-  EXPECT_TRUE(tap.sound.waitForTone(stage_->applicationTone));
 }
 
 TEST_P(AppAudioTapContract, AStopWaitsForACallbackOrComesFromOne) {
@@ -154,13 +130,6 @@ TEST_P(MicrophoneContract, DeliversFromItsStartToItsStopWhileItHasInputAndOutput
   // The observer lives in this function: let go of it on the session's thread before leaving.
   session.setRunningObserver(nullptr);
   EXPECT_TRUE(changes.next());
-}
-
-TEST_P(MicrophoneContract, HearsItsDevice) {
-  kit::TestMicrophone microphone(stage_->devices());
-  microphone.session->startRunning();
-  stage_->play();
-  EXPECT_TRUE(microphone.sound.waitForTone(stage_->microphoneTone));
 }
 
 TEST_P(MicrophoneContract, ACallbackMayRemoveItsOutput) {

@@ -28,14 +28,6 @@ namespace {
 
 double seconds(const nlohmann::json& object, const char* key) { return std::atof(object.value(key, "0").c_str()); }
 
-/// A movie without its index, which mediainfo can tell less of.
-bool isUnfinished(const std::string& path) {
-  char head[64] = {};
-  std::ifstream(path, std::ios::binary).read(head, sizeof head);
-  const auto fileType = static_cast<size_t>(head[3]);
-  return fileType + 8 <= sizeof head && std::string_view(head + fileType + 4, 4) == "free";
-}
-
 /// Whether mediainfo, which has a reader of its own, finds the same tracks of the same lengths.
 std::string disagreement(const std::string& path, const ProbedMovie& movie) {
   constexpr double kRounding = 0.0011;  // it tells milliseconds
@@ -45,10 +37,6 @@ std::string disagreement(const std::string& path, const ProbedMovie& movie) {
   size_t tracks = 0;
   for (const auto& track : json["media"]["track"]) {
     const std::string type = track.value("@type", "");
-    if (isUnfinished(path)) {
-      tracks += type != "General";
-      continue;
-    }
     ProbedTrack expected;
     expected.duration = movie.duration;
     if (type != "General" && tracks < movie.tracks.size()) expected = movie.tracks[tracks++];
@@ -126,21 +114,21 @@ std::vector<DecodedPicture> decodePictures(const std::string& path, Turning turn
 
 std::vector<PicturePacket> packetsOfPictures(const std::string& path) {
   std::vector<PicturePacket> packets;
-  std::istringstream lines(
-      run("ffprobe -v error -select_streams v:0 -show_entries packet=pts_time,size,flags -of csv=p=0 '" + path + "'"));
+  std::istringstream lines(run(
+      "ffprobe -v error -select_streams v:0 -show_entries packet=pts_time,size,pos,flags -of csv=p=0 '" + path + "'"));
   for (std::string line; std::getline(lines, line);) {
     PicturePacket packet{};
     char flag = 0;
-    if (std::sscanf(line.c_str(), "%lf,%zu,%c", &packet.time, &packet.size, &flag) != 3) continue;
+    if (std::sscanf(line.c_str(), "%lf,%zu,%zu,%c", &packet.time, &packet.size, &packet.offset, &flag) != 4) continue;
     packet.isKey = flag == 'K';
     packets.push_back(packet);
   }
   return packets;
 }
 
-std::vector<float> decodeSound(const std::string& path, int track) {
+std::vector<float> decodeSound(const std::string& path, int track, int rate) {
   const std::string raw = run("ffmpeg -v error -nostdin -i '" + path + "' -map 0:a:" + std::to_string(track) +
-                              " -af 'pan=mono|c0=c0' -f f32le -ar 44100 - 2>/dev/null");
+                              " -af 'pan=mono|c0=c0' -f f32le -ar " + std::to_string(rate) + " - 2>/dev/null");
   std::vector<float> sound(raw.size() / sizeof(float));
   std::memcpy(sound.data(), raw.data(), sound.size() * sizeof(float));
   return sound;
@@ -148,13 +136,13 @@ std::vector<float> decodeSound(const std::string& path, int track) {
 
 /// A beep begins where its first wave is: a cosine, so at full level; the encoder smears some
 /// pre-echo before it, which stays below half.
-std::vector<double> beeps(const std::vector<float>& sound) {
+std::vector<double> beeps(const std::vector<float>& sound, int rate) {
   std::vector<double> found;
   size_t quietUntil = 0;
   for (size_t i = 0; i < sound.size(); ++i) {
     if (i < quietUntil || std::abs(sound[i]) < 0.2f) continue;
-    found.push_back(static_cast<double>(i) / 44100);
-    quietUntil = i + 44100 / 10;
+    found.push_back(static_cast<double>(i) / rate);
+    quietUntil = i + static_cast<size_t>(rate) / 10;
   }
   return found;
 }

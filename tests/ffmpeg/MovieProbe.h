@@ -43,14 +43,15 @@ void expectPictures(const std::string& path, uint32_t first, uint32_t count, dou
 void expectBeeps(const std::string& path, int track, const std::vector<double>& times);
 struct PicturePacket {
   double time;
-  size_t size;  ///< bytes
+  size_t size;    ///< bytes
+  size_t offset;  ///< in the file
   bool isKey;
 };
 std::vector<PicturePacket> packetsOfPictures(const std::string& path);
-/// The sound of the n-th audio track as shown, its left side at 44100 Hz.
-std::vector<float> decodeSound(const std::string& path, int track);
+/// The sound of the n-th audio track as shown, its left side, in samples of that rate.
+std::vector<float> decodeSound(const std::string& path, int track, int rate = 44100);
 /// Where each beep begins, in seconds.
-std::vector<double> beeps(const std::vector<float>& sound);
+std::vector<double> beeps(const std::vector<float>& sound, int rate = 44100);
 
 std::string run(const std::string& command);
 

@@ -25,13 +25,16 @@ class StillScreenTest : public ::testing::Test {
       if (i > 0) sound(time - 0.5 + (i == 4 ? 0 : offset), 22050);
       // The first picture of the second part is shown at the time at which the pause began.
       recording_.appendPicture(picture(i, time + offset, time));
-      if (i == 4) sound(kBegin + 5, 44100);  // of the pause
+      if (i != 4) continue;
+      sound(kBegin + 5, 44100);  // of the pause
+      sound(0, 1024);            // a filler without a time
     }
     sound(kBegin + 3 + kPause, 44100 * 43 / 100);
     sound(kStop + kPause, 44100);  // what the source delivers after the stop
   }
   void sound(double captureTime, int64_t frames) {
-    for (const int track : {1, 2}) recording_.appendSound(track, beepingSound(captureTime, frames));
+    recording_.appendSound(1, beepingSound(captureTime, frames));
+    recording_.appendSound(2, beepingSound(captureTime, frames * 480 / 441, {48000, 1, true, false, 0.5}));
   }
   ProbedMovie finish(std::optional<double> end) {
     if (end) recording_.writer().endSessionAtSourceTime(at(*end));
@@ -61,9 +64,8 @@ TEST_F(StillScreenTest, IsExportedInItsWholeLength) {
   for (const ExportPreset preset : {ExportPreset::PassThrough, ExportPreset::HighestQuality}) {
     const std::string copy = scratch_ / "copy.mp4";
     const double start = preset == ExportPreset::PassThrough ? 2.2 : 0;
-    const auto session = sessionFor(exports, path_, copy, preset);
-    if (start > 0) session->setTimeRange({at(start), at(3.43 - start)});
-    runToEnd(*session);
+    runToEnd(*sessionFor(exports, path_, copy, preset,
+                         start > 0 ? MediaTimeRange{at(start), at(3.43 - start)} : MediaTimeRange{}));
     const auto movie = probeGood(copy);
     for (const auto& track : movie.tracks) EXPECT_NEAR(track.duration, 3.43 - start, 1e-3) << track.type;
   }

@@ -155,10 +155,12 @@ void RecordingUnderTest::finish() {
 }
 
 std::shared_ptr<ExportSession> sessionFor(ExportService& service, const std::string& source,
-                                          const std::string& destination, ExportPreset preset) {
+                                          const std::string& destination, ExportPreset preset,
+                                          const MediaTimeRange& range) {
   auto session = service.createExportSession(service.openMovie(URL::fileURL(source)), preset);
   session->setOutputURL(URL::fileURL(destination));
   session->setOutputFileType(kFileTypeMPEG4);
+  session->setTimeRange(range);
   return session;
 }
 

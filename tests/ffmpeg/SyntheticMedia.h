@@ -62,9 +62,10 @@ class RecordingUnderTest {
   bool started_ = false;
 };
 
-/// An export of a whole movie, not begun.
+/// An export, not begun; of the whole movie where there is no range.
 std::shared_ptr<ExportSession> sessionFor(ExportService& service, const std::string& source,
-                                          const std::string& destination, ExportPreset preset);
+                                          const std::string& destination, ExportPreset preset,
+                                          const MediaTimeRange& range = {});
 /// Expects that it ends so.
 void runToEnd(ExportSession& session, ExportStatus wanted = ExportStatus::Completed);
 

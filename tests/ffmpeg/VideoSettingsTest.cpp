@@ -30,13 +30,15 @@ TEST_F(VideoSettingsTest, FillsTracksOfEverySize) {
     std::filesystem::remove(path_);
     RecordingUnderTest recording(service_, path_, static_cast<uint32_t>(c.codedWidth),
                                  static_cast<uint32_t>(c.codedHeight));
-    for (uint32_t i = 0; i < 10; ++i) recording.appendPicture(picture(0xFFFF, i / 30.0, i / 30.0, c.width, c.height));
+    for (uint32_t i = 0; i < 10; ++i)  // the window changes its size
+      recording.appendPicture(picture(0xFFFF, i / 30.0, i / 30.0, i < 5 ? c.width : 90, c.height));
     recording.finish();
     EXPECT_EQ(recording.writer().status(), AssetWriterStatus::Completed);
     const auto movie = probeGood(path_);
     ASSERT_EQ(movie.tracks.size(), 1u);
     EXPECT_EQ(movie.tracks[0].width, c.codedWidth);
     EXPECT_EQ(movie.tracks[0].height, c.codedHeight);
+    EXPECT_EQ(decodePictures(path_).size(), 10u);
     const std::string luma =
         run("ffmpeg -v error -nostdin -i '" + path_ + "' -frames:v 1 -f rawvideo -pix_fmt gray - 2>/dev/null");
     ASSERT_EQ(luma.size(), static_cast<size_t>(c.codedWidth * c.codedHeight));

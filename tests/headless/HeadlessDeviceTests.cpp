@@ -8,7 +8,6 @@
 #include "tests/kit/Events.h"
 #include "tests/kit/FakePacedClock.h"
 #include "tests/kit/FrameRecorder.h"
-#include "tests/kit/SoundRecorder.h"
 
 namespace qv::platform {
 namespace {
@@ -68,20 +67,6 @@ TEST_F(HeadlessDeviceTest, SkipsTicksWhileAllFramesAreHeld) {
   EXPECT_EQ(recorder_->frames(), delivered + 3);
   EXPECT_EQ(testsignal::decodeFrameNumber(pictureOf(recorder_->last())), static_cast<uint32_t>(delivered) + 2)
       << "only delivered frames count";
-}
-
-TEST_F(HeadlessDeviceTest, BeepsWithTheSecond) {
-  kit::TestTap tap(platform_.appAudioTap(), 1);
-  ASSERT_EQ(0, tap.queue().start());
-  clock_.advance(10ms, 250);
-  ASSERT_EQ(0, tap.queue().stop());
-  const auto samples = tap.sound.from(0);
-  ASSERT_EQ(samples.size(), kit::kSoundRate * 5 / 2);
-  for (size_t i = 0; i < samples.size(); ++i) {
-    // A time rounded twice is a nanosecond off.
-    const uint64_t time = tap.sound.begin() + i * 1'000'000'000 / kit::kSoundRate;
-    ASSERT_NEAR(samples[i], testsignal::beepSample(time, testsignal::kAppBeepFrequency), 1) << i;
-  }
 }
 
 TEST(HeadlessAlerts, AnswerAsTheEnvironmentSays) {

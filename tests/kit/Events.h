@@ -41,12 +41,6 @@ class Events {
       if (isWanted(event) || testing::Test::HasFailure()) return event;
     }
   }
-  /// All that there are when there are at least `count`; they stay.
-  std::vector<Event> atLeast(size_t count) {
-    std::unique_lock lock(mutex_);
-    await(lock, [&] { return events_.size() >= count; });
-    return {events_.begin(), events_.end()};
-  }
   [[nodiscard]] bool isEmpty() const { return count() == 0; }
   [[nodiscard]] size_t count() const {
     std::lock_guard lock(mutex_);

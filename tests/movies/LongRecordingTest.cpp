@@ -1,5 +1,3 @@
-#include <cmath>
-#include <cstring>
 #include <set>
 
 #include "tests/daemon/DaemonTest.h"
@@ -88,21 +86,8 @@ class LongRecordingTest : public DaemonTest {
     client_.request("resumeRecordingWithWindowLayerContextID", {Value(uint32_t{5})});
   }
 
-  std::vector<double> beepStarts(int track) const {
-    constexpr double kRate = 8000;
-    const std::string raw = platform::test::run("ffmpeg -v error -nostdin -i '" + path_ +
-                                                "' -map 0:a:" + std::to_string(track) + " -ac 1 -ar 8000 -f s16le -");
-    std::vector<double> starts;
-    double loudUntil = -1;
-    for (size_t i = 0; i < raw.size() / 2; ++i) {
-      int16_t sample = 0;
-      std::memcpy(&sample, raw.data() + 2 * i, sizeof sample);
-      if (std::abs(sample) < 4000) continue;
-      const double time = static_cast<double>(i) / kRate;
-      if (time - loudUntil > 0.3) starts.push_back(time);
-      loudUntil = time;
-    }
-    return starts;
+  std::vector<double> beepsOf(int track) const {
+    return platform::test::beeps(platform::test::decodeSound(path_, track, 8000), 8000);
   }
   /// The beeps are at the pictures whose second they began with.
   static void checkBeeps(const std::vector<platform::test::DecodedPicture>& shown, const std::set<uint32_t>& expected,
@@ -150,8 +135,8 @@ TEST_F(LongRecordingTest, StaysInSyncForAnHourAndTwentyPauses) {
     ASSERT_EQ(shown[i].number, kept_[i]) << i;
     ASSERT_NEAR(shown[i].time, static_cast<double>(i) / 10, 1e-4) << i;
   }
-  checkBeeps(shown, applicationBeeps_, beepStarts(0), "application");
-  checkBeeps(shown, microphoneBeeps_, beepStarts(1), "microphone");
+  checkBeeps(shown, applicationBeeps_, beepsOf(0), "application");
+  checkBeeps(shown, microphoneBeeps_, beepsOf(1), "microphone");
   EXPECT_GT(applicationBeeps_.size(), microphoneBeeps_.size());
 }
 

@@ -30,9 +30,9 @@ class PatientInput final : public WriterInput {
 
 class PatientWriter final : public AssetWriter {
  public:
-  PatientWriter(std::unique_ptr<AssetWriter> inner, URL outputURL, std::shared_ptr<PatientMovies::Finish> finish)
-      : inner_(std::move(inner)), outputURL_(std::move(outputURL)), finish_(std::move(finish)) {}
-  ~PatientWriter() override { finish_->tell(); }
+  PatientWriter(std::unique_ptr<AssetWriter> inner, URL outputURL, std::shared_ptr<kit::Events<bool>> finished)
+      : inner_(std::move(inner)), outputURL_(std::move(outputURL)), finished_(std::move(finished)) {}
+  ~PatientWriter() override { finished_->add(true); }
   [[nodiscard]] AssetWriterStatus status() const override { return inner_->status(); }
   [[nodiscard]] std::optional<Error> error() const override { return inner_->error(); }
   [[nodiscard]] const URL& outputURL() const override { return outputURL_; }
@@ -43,16 +43,16 @@ class PatientWriter final : public AssetWriter {
   void startSessionAtSourceTime(MediaTime time) override { inner_->startSessionAtSourceTime(time); }
   void endSessionAtSourceTime(MediaTime time) override { inner_->endSessionAtSourceTime(time); }
   void finishWriting(std::function<void()> completion) override {
-    inner_->finishWriting([completion = std::move(completion), finish = finish_] {
+    inner_->finishWriting([completion = std::move(completion), finished = finished_] {
       completion();
-      finish->tell();
+      finished->add(true);
     });
   }
 
  private:
   const std::unique_ptr<AssetWriter> inner_;
   const URL outputURL_;
-  const std::shared_ptr<PatientMovies::Finish> finish_;
+  const std::shared_ptr<kit::Events<bool>> finished_;
 };
 
 }  // namespace
@@ -61,7 +61,7 @@ Result<std::unique_ptr<AssetWriter>> PatientMovies::createAssetWriter(const URL&
                                                                       const std::string& fileType) {
   auto made = service_.createAssetWriter(URL::fileURL(path_), fileType);
   if (!made) return made.error();
-  return std::unique_ptr<AssetWriter>(std::make_unique<PatientWriter>(std::move(*made), outputURL, finish_));
+  return std::unique_ptr<AssetWriter>(std::make_unique<PatientWriter>(std::move(*made), outputURL, finished_));
 }
 
 std::shared_ptr<WriterInput> PatientMovies::createWriterInput(MediaType type, const Dictionary& outputSettings) {

@@ -1,11 +1,10 @@
 #pragma once
 
-#include <future>
 #include <memory>
-#include <mutex>
 #include <string>
 
 #include "platform/ffmpeg/FFmpegMovies.h"
+#include "tests/kit/Events.h"
 
 namespace qv::platform::test {
 
@@ -19,21 +18,13 @@ class PatientMovies final : public AssetWriterService {
   Result<std::unique_ptr<AssetWriter>> createAssetWriter(const URL& outputURL, const std::string& fileType) override;
   std::shared_ptr<WriterInput> createWriterInput(MediaType type, const Dictionary& outputSettings) override;
   /// Until the movie is complete and whoever asked for that was told, or its writer has gone. Of one movie.
-  void waitForFinish() { finish_->promise.get_future().wait(); }
-
-  /// Whoever tells of it may do so while this goes away.
-  struct Finish {
-    std::promise<void> promise;
-    std::once_flag once;
-    void tell() {
-      std::call_once(once, [this] { promise.set_value(); });
-    }
-  };
+  void waitForFinish() { EXPECT_TRUE(finished_->next()); }
 
  private:
   const std::string path_;
   ffmpeg::FFmpegAssetWriterService service_;
-  const std::shared_ptr<Finish> finish_ = std::make_shared<Finish>();
+  /// Whoever tells of it may do so while this goes away.
+  const std::shared_ptr<kit::Events<bool>> finished_ = std::make_shared<kit::Events<bool>>();
 };
 
 }  // namespace qv::platform::test

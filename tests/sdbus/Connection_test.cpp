@@ -68,8 +68,7 @@ TEST_F(ConnectionTest, ACallMayHoldTheLastOfItsConnectionWhenThePeerGoes) {
   Events<int64_t> ended;
   IPCConnection& connection = *client;
   connection.call(
-      "echo", {Value(Dictionary{})}, [client](const IPCArguments&) {},
-      [&ended](const Error& error) { ended.add(error.code); });
+      "echo", {Value(Dictionary{})}, [client](const IPCArguments&) {}, into(ended));
   const auto accepted = delegate_.connections.next();
   const auto unanswered = delegate_.object->takeCall();
   client.reset();
@@ -209,7 +208,7 @@ TEST_F(ConnectionTest, InvalidationIsToldOnceAndFailsOpenCalls) {
   listen();
   const auto client = connectClient();
   Events<int64_t> failures;
-  client->call("nothing", {}, {}, [&](const Error& error) { failures.add(error.code); });
+  client->call("nothing", {}, {}, into(failures));
   const Call open = delegate_.object->takeCall();
   client->invalidate();
   client->invalidate();
@@ -277,7 +276,7 @@ TEST_F(ConnectionTest, DroppingTheLastReferenceEndsTheConnectionSilently) {
   listen();
   auto client = connectClient();
   Events<int64_t> failures;
-  client->call("nothing", {}, {}, [&](const Error& error) { failures.add(error.code); });
+  client->call("nothing", {}, {}, into(failures));
   const Call open = delegate_.object->takeCall();  // dropped, it would be answered
   client.reset();
   EXPECT_EQ(failures.next(), code(IPCErrorCode::ConnectionInvalid));

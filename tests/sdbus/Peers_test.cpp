@@ -34,7 +34,7 @@ class PeersTest : public SdBusTest {
   void sendNumbered(IPCConnection& connection, const char* member, uint32_t number, Events<int64_t>& failures) {
     IPCArguments arguments{Value(number)};
     if (std::string_view(member) == "sample") arguments.push_back(Value(Data(60000)));
-    connection.call(member, std::move(arguments), {}, [&failures](const Error& error) { failures.add(error.code); });
+    connection.call(member, std::move(arguments), {}, into(failures));
   }
 };
 
@@ -85,7 +85,7 @@ TEST_F(PeersTest, FramesThatThePeerHasNotAnsweredAreBounded) {
   const auto unanswered = admit(deaf);
   Events<int64_t> failures;
   for (int i = 0; i < 5; ++i) {
-    unanswered->call("frame", frame, {}, [&failures](const Error& error) { failures.add(error.code); });
+    unanswered->call("frame", frame, {}, into(failures));
   }
   EXPECT_EQ(failures.next(), code(IPCErrorCode::MessageDropped));
   unanswered->invalidate();
@@ -140,7 +140,7 @@ TEST_F(PeersTest, CallsBeyondTheBoundOfUnansweredOnesAreRefused) {
   Events<int64_t> failures;
   std::vector<Call> open;
   for (int i = 0; i < 9; ++i) {
-    client->call("nothing", {}, {}, [&](const Error& error) { failures.add(error.code); });
+    client->call("nothing", {}, {}, into(failures));
   }
   EXPECT_EQ(failures.next(), code(IPCErrorCode::RemoteError));
   for (int i = 0; i < 8; ++i) open.push_back(delegate_.object->takeCall());
@@ -174,7 +174,7 @@ TEST_F(PeersTest, GarbageEndsItsConnectionOnly) {
   RawPeer peer(socketPath());
   const auto server = admit(peer);
   Events<int64_t> failures;
-  server->call("echo", {Value(1.0)}, {}, [&failures](const Error& error) { failures.add(error.code); });
+  server->call("echo", {Value(1.0)}, {}, into(failures));
   EXPECT_TRUE(peer.readUntil("echo"));
   peer.send(rawReply("\1s\0\0\xFF\xFF\xFF\x7F"s));
   EXPECT_EQ(failures.next(), code(IPCErrorCode::RemoteError));

@@ -1,5 +1,7 @@
 #pragma once
 
+#include <unistd.h>
+
 #include <cstdint>
 #include <string>
 
@@ -31,6 +33,14 @@ inline std::string rawCall(const std::string& interface, const std::string& memb
                         number(1) + number(uint32_t(fields.size())) + fields;
   while (message.size() % 8 != 0) message += '\0';
   return message + body;
+}
+
+/// How a client of this user begins.
+inline std::string rawHello() {
+  using namespace std::string_literals;
+  std::string uid;
+  for (const char digit : std::to_string(::getuid())) uid += {'3', digit};
+  return "\0AUTH EXTERNAL "s + uid + "\r\nNEGOTIATE_UNIX_FD\r\nBEGIN\r\n";
 }
 
 /// The reply with one variant to the first call of a peer.

@@ -22,15 +22,7 @@ class RawPeer {
     path.copy(address.sun_path, sizeof address.sun_path - 1);
     EXPECT_EQ(::connect(socket_.get(), reinterpret_cast<sockaddr*>(&address), sizeof address), 0);
   }
-  void authenticate() {
-    std::string uid;
-    for (const char digit : std::to_string(::getuid())) {
-      uid += '3';
-      uid += digit;
-    }
-    using namespace std::string_literals;
-    send("\0AUTH EXTERNAL "s + uid + "\r\nNEGOTIATE_UNIX_FD\r\nBEGIN\r\n");
-  }
+  void authenticate() { send(rawHello()); }
   bool send(const std::string& bytes) {
     return ::send(socket_.get(), bytes.data(), bytes.size(), MSG_NOSIGNAL) == static_cast<ssize_t>(bytes.size());
   }

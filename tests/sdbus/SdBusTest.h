@@ -93,6 +93,10 @@ class SdBusTest : public ::testing::Test {
     const auto* error = std::get_if<Error>(&outcome);
     return error ? error->code : 0;
   }
+  /// Where the code of a call's failure goes.
+  static std::function<void(const Error&)> into(Events<int64_t>& failures) {
+    return [&failures](const Error& error) { failures.add(error.code); };
+  }
   static void echo(const Call& served) { served.reply(served.arguments); }
   /// A client of a service that echoes.
   std::shared_ptr<IPCConnection> connectEcho() {

@@ -12,6 +12,7 @@
 #include <vector>
 
 #include "tests/kit/ScratchFolder.h"
+#include "tests/kit/SocketMessage.h"
 
 namespace qv::platform::sdbus {
 namespace {
@@ -35,17 +36,7 @@ class SocketsTest : public testing::Test {
  protected:
   /// Whether a listener takes what is sent to it in one message.
   bool accepts(const std::vector<int>& fds) {
-    char byte = 'c';
-    iovec data{&byte, 1};
-    alignas(cmsghdr) char control[CMSG_SPACE(sizeof(int) * 2)] = {};
-    msghdr header{};
-    header.msg_iov = &data;
-    header.msg_iovlen = 1;
-    header.msg_control = control;
-    header.msg_controllen = fds.empty() ? 0 : CMSG_SPACE(sizeof(int) * fds.size());
-    *reinterpret_cast<cmsghdr*>(control) = {CMSG_LEN(sizeof(int) * fds.size()), SOL_SOCKET, SCM_RIGHTS};
-    std::copy(fds.begin(), fds.end(), reinterpret_cast<int*>(CMSG_DATA(reinterpret_cast<cmsghdr*>(control))));
-    EXPECT_EQ(::sendmsg(rendezvous_.second.get(), &header, 0), 1);
+    EXPECT_EQ(kit::sendMessage(rendezvous_.second.get(), "c", fds), 1);
     const auto accepted = acceptFrom(rendezvous_.first.get());
     EXPECT_FALSE(acceptFrom(rendezvous_.first.get())) << "nothing is left";
     return accepted.value().isValid();

@@ -22,23 +22,17 @@ TEST_F(StockClientsTest, BusctlCallsAndIntrospects) {
   EXPECT_EQ(run({"call", name, path, interface, "echo", "v", "u", "7"}).second, "v u 7\n");
   EXPECT_EQ(run({"--expect-reply=no", "call", name, path, interface, "notify", "u", "7"}).first, 0);
   EXPECT_NE(run({"call", name, path, interface, "echo", "s", "text"}).first, 0);
-  std::string expected = "<interface name=\"" + interface + "\">\n";
-  for (const IPCOperation& operation : testInterface().operations) {
-    const auto add = [&](const char* direction, const auto& types, const auto& names) {
-      for (size_t i = 0; i < types.size(); ++i) {
-        expected += "   <arg type=\"" + types[i] + "\" name=\"" +
-                    (i < names.size() ? names[i] : "arg" + std::to_string(i)) + "\" direction=\"" + direction +
-                    "\"/>\n";
-      }
-    };
-    expected += "  <method name=\"" + operation.member + "\">\n";
-    add("in", operation.arguments, operation.argumentNames);
-    add("out", operation.reply.value_or(std::vector<std::string>{}), operation.replyNames);
-    if (!operation.reply) expected += "   <annotation name=\"org.freedesktop.DBus.Method.NoReply\" value=\"true\"/>\n";
-    expected += "  </method>\n";
-  }
   const std::string xml = run({"--xml-interface", "introspect", name, path}).second;
-  EXPECT_NE(xml.find(expected + " </interface>"), std::string::npos) << xml << expected;
+  for (const char* part : {R"(  <method name="echo">
+   <arg type="v" name="value" direction="in"/>
+   <arg type="v" name="value" direction="out"/>
+  </method>)",
+                           R"(  <method name="notify">
+   <arg type="u" name="number" direction="in"/>
+   <annotation name="org.freedesktop.DBus.Method.NoReply" value="true"/>
+  </method>)"}) {
+    EXPECT_NE(xml.find(part), std::string::npos) << xml;
+  }
   const auto bus = [&](std::vector<std::string> arguments) {
     arguments.insert(arguments.begin(), {"call", name, "/org/freedesktop/DBus", "org.freedesktop.DBus"});
     return run(arguments).second;

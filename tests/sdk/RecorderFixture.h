@@ -15,6 +15,14 @@
 
 namespace qv::client {
 
+using platform::Array;
+using platform::Data;
+using platform::Dictionary;
+using platform::IPCArguments;
+using platform::Value;
+using Log = std::vector<std::string>;
+using namespace std::chrono_literals;
+
 /// A recorder, and a daemon that does only what the test makes it do.
 class RecorderFixture : public ::testing::Test, protected platform::IPCListenerDelegate {
  protected:

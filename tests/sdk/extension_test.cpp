@@ -3,8 +3,6 @@
 #include <unistd.h>
 
 #include <cstring>
-#include <future>
-#include <thread>
 
 #include "platform/sdbus/SdBusIPC.h"
 #include "platform/threads/Guarded.h"
@@ -27,13 +25,6 @@ using platform::MediaTime;
 using platform::Value;
 using namespace std::chrono_literals;
 
-template <typename T>
-T valueOf(std::future<T> future) {
-  // A time that only a hang reaches.
-  if (future.wait_for(30s) != std::future_status::ready) throw std::runtime_error("nothing came");
-  return future.get();
-}
-
 platform::SampleTimingInfo timingAt(int64_t milliseconds) {
   return {MediaTime::invalid(), MediaTime::make(milliseconds, 1000), {}};
 }
@@ -54,11 +45,11 @@ class Accepting {
   }
   /// Calls and waits: the reply, or nothing for an error.
   std::optional<IPCArguments> call(const char* member, IPCArguments arguments) {
-    std::promise<std::optional<IPCArguments>> answered;
+    kit::Events<std::optional<IPCArguments>> answers;
     connection().call(
-        member, std::move(arguments), [&](const IPCArguments& reply) { answered.set_value(reply); },
-        [&](const platform::Error&) { answered.set_value(std::nullopt); });
-    return valueOf(answered.get_future());
+        member, std::move(arguments), [&](const IPCArguments& reply) { answers.add(reply); },
+        [&](const platform::Error&) { answers.add(std::nullopt); });
+    return answers.next();
   }
 
  private:
@@ -79,7 +70,7 @@ struct Diary {
   std::optional<quorvel::AudioSample> sound;
   std::function<void(quorvel::Broadcast&)> beginning;  ///< of the author's object, in its constructor
   quorvel::Broadcast* broadcast = nullptr;
-  std::promise<void> gone;
+  kit::Events<bool> gone;
 };
 
 class Author final : public quorvel::SampleExtension {
@@ -88,7 +79,7 @@ class Author final : public quorvel::SampleExtension {
     diary_.broadcast = &broadcast;
     if (diary_.beginning) diary_.beginning(broadcast);
   }
-  ~Author() override { diary_.gone.set_value(); }
+  ~Author() override { diary_.gone.add(true); }
   void started(quorvel::Dictionary userInfo) override {
     say("started " + std::get<std::string>(userInfo.at("url").content));
   }
@@ -177,8 +168,8 @@ TEST_F(ExtensionLibrary, TakesSamplesAndTellsOfItsService) {
   send(payloadOf(FrontmostMessage{"com.example.game"}));
   auto pixels = *platform::SharedFrame::create({4, 4, 16, platform::PixelFormat::BGRX});
   std::memset(pixels->mutableBytes().data(), 0x55, 64);
-  std::promise<void> returned;
-  std::shared_ptr<void> hold(nullptr, [&](void*) { returned.set_value(); });
+  kit::Events<bool> returned;
+  std::shared_ptr<void> hold(nullptr, [&](void*) { returned.add(true); });
   send(videoPayload(platform::SharedFrameRef(std::move(hold), pixels.get())));
   send(audioPayload(2, 200));
   // Malformed ones are answered all the same, or the daemon would wait for them.
@@ -197,7 +188,7 @@ TEST_F(ExtensionLibrary, TakesSamplesAndTellsOfItsService) {
   EXPECT_EQ(diary.sound->bytes, (platform::Data{1, 2, 3, 4}));
   EXPECT_EQ(diary.sound->format.sampleRate, 44100);
   diary.frame.reset();
-  valueOf(returned.get_future());  // the daemon may use the memory again
+  returned.next();  // the daemon may use the memory again
 
   diary.broadcast->updateServiceInfo({{"viewers", {int64_t{3}}}});
   EXPECT_EQ(daemon.calls->takeCall().arguments[0], Value(Dictionary{{"viewers", int64_t{3}}}));
@@ -210,7 +201,7 @@ TEST_F(ExtensionLibrary, TakesSamplesAndTellsOfItsService) {
   EXPECT_EQ(error->localizedDescription(), "no");
 
   daemon.connection().invalidate();
-  valueOf(diary.gone.get_future());
+  diary.gone.next();
   requests_.connection().invalidate();
   process_->waitForHost();
 }
@@ -221,7 +212,7 @@ TEST_F(ExtensionLibrary, AnEndpointWhoseOwnerHasGoneIsRefused) {
   auto endpoint = Accepting(ipc_, broadcastDaemonProtocol(), broadcastExtensionProtocol()).endpoint();
   const bool isTaken = auxiliary_.call("setEndpoint", {endpoint.rendezvous()}).has_value();
   // Whether the loss is seen at once or by the connection, no author's object stays.
-  if (isTaken) valueOf(diary.gone.get_future());
+  if (isTaken) diary.gone.next();
   EXPECT_TRUE(diary.words.load().empty());
 }
 
@@ -298,14 +289,14 @@ TEST_F(ExtensionLibrary, AListenerTakesBroadcastsWithoutALaunch) {
   ASSERT_TRUE(connection);
   (*connection)->setRemoteInterface(broadcastExtensionProtocol());
   (*connection)->resume();
-  std::promise<void> answered;
+  kit::Events<bool> answered;
   (*connection)
       ->call("processPayload", {Dictionary{{broadcastpayload::kActionType, int64_t{4}}}},
-             [&](const IPCArguments&) { answered.set_value(); }, {});
-  valueOf(answered.get_future());
+             [&](const IPCArguments&) { answered.add(true); }, {});
+  answered.next();
   EXPECT_EQ(diary.words.load(), std::vector<std::string>{"finished"});
   listener.reset();
-  valueOf(diary.gone.get_future());
+  diary.gone.next();
 }
 
 TEST_F(ExtensionLibrary, WhatIsSaidInAConstructorArrivesFirstAndInOrder) {
@@ -322,7 +313,7 @@ TEST_F(ExtensionLibrary, WhatIsSaidInAConstructorArrivesFirstAndInOrder) {
     EXPECT_EQ(daemon.calls->takeCall().member, member);
   }
   daemon.connection().invalidate();
-  valueOf(diary.gone.get_future());
+  diary.gone.next();
 }
 
 }  // namespace

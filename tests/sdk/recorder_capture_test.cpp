@@ -9,11 +9,9 @@ namespace qv::client {
 namespace {
 
 using platform::AudioStreamDescription;
-using platform::Data;
 using platform::MediaTime;
 using platform::SampleTimingInfo;
 using platform::SharedFrame;
-using namespace std::chrono_literals;
 
 const SampleTimingInfo kTiming{MediaTime::make(1, 60), MediaTime::make(5'000'000'000, platform::kHostTimescale),
                                MediaTime::invalid()};
@@ -118,16 +116,13 @@ TEST_F(RecorderCapture, SoundLiesOnTheTimelineOfThePictures) {
   sendSound(4190, 10, 3);  // the microphone has an end of its own
   tellPauses(10'000);
   sendSound(11'500, 100);  // after a gap
-  ASSERT_EQ(samples_.size(), 6u);
-  EXPECT_EQ(samples_[1].presentationTime, 1100ms);
-  EXPECT_EQ(samples_[2].presentationTime, 1200ms);
-  EXPECT_EQ(samples_[2].frameCount, 80);
+  // When each begins, and how long it is.
+  using Placed = std::vector<std::pair<quorvel::SampleTime, int64_t>>;
+  Placed placed;
+  for (const auto& sample : samples_) placed.emplace_back(sample.presentationTime, sample.frameCount);
+  EXPECT_EQ(placed, (Placed{{1000ms, 100}, {1100ms, 100}, {1200ms, 80}, {1280ms, 100}, {1190ms, 10}, {1500ms, 100}}));
   EXPECT_EQ(samples_[2].bytes.size(), 160u);
   EXPECT_EQ(samples_[2].bytes.front(), 20);
-  EXPECT_EQ(samples_[3].presentationTime, 1280ms);
-  EXPECT_EQ(samples_[3].frameCount, 100);
-  EXPECT_EQ(samples_[4].presentationTime, 1190ms);
-  EXPECT_EQ(samples_[5].presentationTime, 1500ms);
 
   samples_.clear();
   tellPauses(0);

@@ -7,11 +7,6 @@
 namespace qv::client {
 namespace {
 
-using platform::Dictionary;
-using platform::Value;
-using Log = std::vector<std::string>;
-using namespace std::chrono_literals;
-
 class RecorderConnection : public RecorderFixture {};
 
 TEST_F(RecorderConnection, NothingConnectsBeforeTheFirstRequest) {

@@ -9,10 +9,6 @@
 namespace qv::client {
 namespace {
 
-using platform::Array;
-using platform::Dictionary;
-using platform::Value;
-
 class RecorderMovie : public RecorderFixture {
  protected:
   quorvel::OpenMovieResult open(platform::IPCArguments answer) {

@@ -5,13 +5,6 @@
 namespace qv::client {
 namespace {
 
-using platform::Array;
-using platform::Data;
-using platform::Dictionary;
-using platform::IPCArguments;
-using platform::Value;
-using Log = std::vector<std::string>;
-
 const Dictionary kDeclined = platform::encodeError(platform::Error{
     quorvel::kErrorDomain, -5801, {{platform::kLocalizedDescriptionKey, Value("Die Aufnahme wurde abgelehnt.")}}});
 

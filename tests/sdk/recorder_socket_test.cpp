@@ -1,8 +1,6 @@
 #include <gtest/gtest.h>
 #include <stdlib.h>
 
-#include <future>
-
 #include "platform/sdbus/SdBusIPC.h"
 #include "protocol/QVDaemonProtocol.h"
 #include "protocol/SampleCoding.h"
@@ -15,14 +13,6 @@ namespace {
 
 using platform::Dictionary;
 using namespace std::chrono_literals;
-
-/// A value that another thread brings; throws after a time that only a hang reaches.
-template <typename T>
-T take(std::promise<T>& promise) {
-  auto future = promise.get_future();
-  if (future.wait_for(30s) != std::future_status::ready) throw std::runtime_error("nothing came");
-  return future.get();
-}
 
 /// The library as applications get it, over a real socket, with a daemon of the test's in this process.
 class RecorderSocket : public ::testing::Test {
@@ -42,12 +32,12 @@ class RecorderSocket : public ::testing::Test {
   }
   void send(OutgoingCall call) { daemonEnd_->call(call.member, std::move(call.arguments), {}, {}); }
   void startRecording() {
-    std::promise<quorvel::StartResult> started;
+    kit::Events<quorvel::StartResult> started;
     recorder_->start({.windows = {42}, .width = 4, .height = 4, .capture = true},
-                     [&](quorvel::StartResult result) { started.set_value(std::move(result)); });
+                     [&](quorvel::StartResult result) { started.add(std::move(result)); });
     daemon_.object->takeCall().reply({Dictionary(), false, false});
     daemonEnd_ = daemon_.connections.next();
-    EXPECT_FALSE(take(started).error);
+    EXPECT_FALSE(started.next().error);
   }
 
   const kit::ScratchFolder folder_;
@@ -62,14 +52,10 @@ class RecorderSocket : public ::testing::Test {
 /// Samples may be dropped, what tells their timeline may not, and neither overtakes the other.
 TEST_F(RecorderSocket, EachSampleIsPlacedByTheTimelineToldBeforeIt) {
   constexpr int kSamples = 200;
-  std::vector<quorvel::SampleTime> times;
-  std::promise<bool> isComplete;
+  kit::Events<quorvel::SampleTime> times;
   quorvel::RecorderOptions options;
   options.executor = [](const std::function<void()>& work) { work(); };
-  options.events.audioSample = [&](const quorvel::AudioSample& sample) {
-    times.push_back(sample.presentationTime);
-    if (times.size() == kSamples) isComplete.set_value(true);
-  };
+  options.events.audioSample = [&](const quorvel::AudioSample& sample) { times.add(sample.presentationTime); };
   recorder_ = quorvel::Recorder::create(std::move(options));
   startRecording();
   const platform::AudioStreamDescription format{
@@ -81,8 +67,7 @@ TEST_F(RecorderSocket, EachSampleIsPlacedByTheTimelineToldBeforeIt) {
     send(timelineCallOf(platform::MediaTime::make(10 * i, 1000)));
     send(captureCallOf(SoundMessage{SampleType::AppAudio, {1, 2}, format, 1, timing}));
   }
-  ASSERT_TRUE(take(isComplete));
-  for (int i = 0; i < kSamples; ++i) EXPECT_EQ(times[static_cast<size_t>(i)], i * 1ms);
+  for (int i = 0; i < kSamples; ++i) ASSERT_EQ(times.next(), i * 1ms);
 }
 
 }  // namespace

@@ -5,7 +5,6 @@
 
 #include "support/QuorvelErrors.h"
 #include "tests/fakes/FakeDevice.h"
-#include "tests/fakes/LogRecorder.h"
 #include "writer/QVAudioMixUtility.h"
 
 namespace qv {
@@ -114,20 +113,17 @@ TEST_F(MovieWriterTest, HandsOnOnlyUsableCompressionProperties) {
                             {settings::kMaxKeyFrameInterval, Value(1e12)},
                             {settings::kProfileLevel, Value(int32_t{100})}};
   EXPECT_EQ(with(unusable), defaults);
-  const Dictionary usable = with({{settings::kMaxKeyFrameInterval, Value(30.0)},
-                                  {settings::kAverageBitRate, Value(int64_t{1})},
-                                  {settings::kExpectedSourceFrameRate, Value(int64_t{240})},
-                                  {settings::kProfileLevel, Value(settings::kProfileMainAutoLevel)},
-                                  {"Quality", Value(0.5)}});
-  EXPECT_EQ(valueForKey(usable, settings::kMaxKeyFrameInterval), Value(int64_t{30}));
-  EXPECT_EQ(valueForKey(usable, settings::kAverageBitRate), Value(int64_t{1}));
-  EXPECT_EQ(valueForKey(usable, settings::kExpectedSourceFrameRate), Value(int64_t{240}));
-  EXPECT_EQ(valueForKey(usable, settings::kProfileLevel), Value(settings::kProfileMainAutoLevel));
-  EXPECT_EQ(valueForKey(usable, "Quality"), Value(0.5));  // for the encoder to know
+  Dictionary usable{{settings::kMaxKeyFrameInterval, Value(30.0)},
+                    {settings::kAverageBitRate, Value(int64_t{1})},
+                    {settings::kExpectedSourceFrameRate, Value(int64_t{240})},
+                    {settings::kProfileLevel, Value(settings::kProfileMainAutoLevel)},
+                    {"Quality", Value(0.5)}};  // for the encoder to know
+  const Dictionary handedOn = with(usable);
+  usable[settings::kMaxKeyFrameInterval] = Value(int64_t{30});
+  EXPECT_EQ(handedOn, usable);
 }
 
 TEST_F(MovieWriterTest, TimelineStartsAtTheFirstFrameAndTimesRise) {
-  fakes::LogRecorder log;
   const auto writer = started();
   writer->appendAudio1SampleBuffer(audioAt(5));
   EXPECT_TRUE(writer->appendVideoSampleBuffer(nullptr, {}));
@@ -146,9 +142,6 @@ TEST_F(MovieWriterTest, TimelineStartsAtTheFirstFrameAndTimesRise) {
   writer->appendAudio2SampleBuffer(audioAt(105));
   writer->appendAudio2SampleBuffer(audioAt(104));
   writer->appendAudio2SampleBuffer(nullptr);
-  platform::flushLog();
-  EXPECT_EQ(log.countContaining("discarding audio 1 sample buffer"), 1u);
-  EXPECT_EQ(log.countContaining("discarding audio 2 sample buffer"), 1u);
   EXPECT_EQ(device_.movies.video().times(), (std::vector<int64_t>{100, 90, 200, 300}));
   EXPECT_EQ(device_.movies.appAudio().times(), std::vector<int64_t>{110});
   EXPECT_EQ(device_.movies.microphone().times(), std::vector<int64_t>{105});
@@ -291,7 +284,6 @@ TEST_F(MovieWriterTest, TrimsAtOnceWithoutTheirWriter) {
 
 TEST_F(MovieWriterTest, TrimCutsWholeSecondsAndReportsFailure) {
   const auto writer = started();
-  fakes::LogRecorder log;
   const URL movie = URL::fileURL("/m.mp4");
   std::optional<URL> trimmed;
   const auto trim = [&](double start, double end) {
@@ -310,8 +302,6 @@ TEST_F(MovieWriterTest, TrimCutsWholeSecondsAndReportsFailure) {
   trim(1, 1);
   EXPECT_EQ(trimmed, std::nullopt);
   EXPECT_FALSE(device_.disk.itemExists("/t.mp4"));
-  platform::flushLog();
-  EXPECT_EQ(log.countContaining("Export Trim Video Failed, due to error: " + std::to_string(ENODATA)), 1u);
   trimmed = movie;
   (void)device_.disk.removeItem("/m.mp4");
   trim(1, 1);
@@ -332,7 +322,6 @@ TEST_F(MovieWriterTest, MixesOrTellsWhyNot) {
   device_.disk.addFile("/m.mp4", "movie");
   device_.exports.holds = true;
   for (const auto end : {ExportStatus::Completed, ExportStatus::Failed, ExportStatus::Cancelled}) {
-    fakes::LogRecorder log;
     std::shared_ptr<MovieClaim> mixed;
     std::optional<platform::Error> failure;
     mixes.mixAudioForMovie(URL::fileURL("/m.mp4"), [&](const auto& claim, const auto& error) {
@@ -350,9 +339,6 @@ TEST_F(MovieWriterTest, MixesOrTellsWhyNot) {
     EXPECT_EQ(mixed != nullptr, isMixed);
     EXPECT_EQ(failure, isMixed ? std::nullopt : std::optional(recordingError(errorcode::kFailedToSave)));
     EXPECT_EQ(device_.disk.itemExists(session.output.path()), isMixed);
-    platform::flushLog();
-    EXPECT_EQ(log.contains("QVAudioMixUtility: audio mix export failed"), end == ExportStatus::Failed);
-    EXPECT_EQ(log.contains("QVAudioMixUtility: audio mix export cancelled"), end == ExportStatus::Cancelled);
   }
   std::optional<platform::Error> failure;
   mixes.mixAudioForMovie(std::nullopt, [&](const auto&, const auto& error) { failure = error; });

@@ -10,45 +10,28 @@ using kit::WindowProcess;
 using kit::XClient;
 using kit::XServer;
 
-class RenderServerTest : public kit::XServerTest {
- protected:
-  std::unique_ptr<X11Platform> connect() {
-    auto platform = X11Platform::connect(display(), {});
-    EXPECT_TRUE(platform);
-    return platform ? std::move(platform.value()) : nullptr;
-  }
-};
+using RenderServerTest = kit::XServerTest;
 
 TEST_F(RenderServerTest, NamesTheProcessThatMadeTheWindow) {
-  auto platform = connect();
+  auto platform = X11Platform::connect(display(), {});
+  ASSERT_TRUE(platform);
+  auto& renderServer = platform.value()->renderServer();
   WindowProcess other(display());
   XClient own(display());
   const auto window = own.show({});
-  EXPECT_EQ(platform->renderServer().ownerOfContext(window), ::getpid());
-  EXPECT_EQ(platform->renderServer().ownerOfContext(other.window()), other.pid());
-}
-
-TEST_F(RenderServerTest, NamesNobodyForWhatIsNoWindowOfAClient) {
-  auto platform = connect();
-  auto& renderServer = platform->renderServer();
-  XClient own(display());
-  const auto window = own.show({});
+  EXPECT_EQ(renderServer.ownerOfContext(window), ::getpid());
+  EXPECT_EQ(renderServer.ownerOfContext(other.window()), other.pid());
   EXPECT_EQ(renderServer.ownerOfContext(0), std::nullopt);
   EXPECT_EQ(renderServer.ownerOfContext(0xdeadbeef), std::nullopt);
   EXPECT_EQ(renderServer.ownerOfContext(own.root()), std::nullopt);
   EXPECT_EQ(renderServer.ownerOfContext(window + 77), std::nullopt) << "an unused id of a living client";
   own.destroy(window);
   EXPECT_EQ(renderServer.ownerOfContext(window), std::nullopt);
-}
-
-TEST_F(RenderServerTest, NamesNobodyForAWindowOfADeadProcess) {
-  auto platform = connect();
-  WindowProcess other(display());
   other.kill();
   // The dead client's range of ids goes to the next client: its windows are not the old ones.
   XClient successor(display());
   successor.sync();
-  EXPECT_EQ(platform->renderServer().ownerOfContext(other.window()), std::nullopt);
+  EXPECT_EQ(renderServer.ownerOfContext(other.window()), std::nullopt);
 }
 
 TEST_F(RenderServerTest, ConnectsAnewAfterTheServerCameBack) {

@@ -1,5 +1,3 @@
-#include <signal.h>
-
 #include <future>
 
 #include "platform/x11/X11Platform.h"
@@ -81,17 +79,6 @@ TEST_F(UserAlertTest, TakesAndReturnsTheKeyboardUnderAWindowManager) {
   EXPECT_TRUE(kit::pressKeys(display_, {"a"}));  // the user is busy with it
   EXPECT_EQ(answerByKeys(twoButtons_, {"Right", "Return"}), UserAlertAnswer::Default);
   user_->waitForFocus(game.window());
-}
-
-TEST_F(UserAlertTest, DestroyingTakesTheAlertAwayWithoutAnAnswer) {
-  auto alert = present(twoButtons_);
-  auto answer = answer_.get_future();
-  const auto window = user_->waitForFocusedWindow(twoButtons_.header);
-  const auto process = platform_->renderServer().ownerOfContext(window);
-  ASSERT_TRUE(process);
-  alert.reset();
-  EXPECT_EQ(::kill(*process, 0), -1) << "it was waited for";
-  EXPECT_EQ(answer.wait_for(0s), std::future_status::timeout);
 }
 
 TEST_F(UserAlertTest, CannotBeShownWithoutDisplayButtonOrProgram) {
