@@ -1,5 +1,7 @@
 #pragma once
 
+#include <cmath>
+
 #include "extensions/AnswerDeadline.h"
 #include "protocol/QVBroadcastProtocols.h"
 #include "tests/daemon/DaemonTest.h"
@@ -48,10 +50,7 @@ class BroadcastFixture : public DaemonTest {
   }
   /// The same to the microphone.
   void speak(double tenths) {
-    device_.deviceCapture.send(
-        platform::SampleBuffer::makeAudio(std::make_shared<platform::DataBlock>(std::vector<uint8_t>(8820)),
-                                          captureManager_.createAudioFormatDescription(), 4410,
-                                          platform::MediaTime::fromSeconds(tenths / 10, platform::kHostTimescale)));
+    DaemonTest::speak(std::llround(tenths * kSecond / 10), 4410);
     device_.run();
   }
   void frame(int64_t tenths) { sendFrame(tenths * kSecond / 10); }

@@ -145,6 +145,31 @@ std::string DaemonTest::contentAt(const std::string& url) {
   return content ? content.value() : std::string();
 }
 
+void DaemonTest::record(TestClient& client, const TestClient::StartOptions& options) {
+  EXPECT_EQ(client.start(options)->code(), 0);
+  sendFrame(kSecond);
+}
+
+std::string DaemonTest::stop(TestClient& client) {
+  const auto answer = client.stop();
+  EXPECT_EQ(answer->code(1), 0);
+  const std::string movie = answer->values[0].asString();
+  EXPECT_NE(contentAt(movie), "") << movie;
+  return movie;
+}
+
+std::string DaemonTest::recordMovie(TestClient& client) {
+  record(client);
+  return stop(client);
+}
+
+void DaemonTest::speak(int64_t time, uint32_t frames) {
+  device_.deviceCapture.send(platform::SampleBuffer::makeAudio(
+      std::make_shared<platform::DataBlock>(std::vector<uint8_t>(size_t{frames} * 2, 9)),
+      captureManager_.createAudioFormatDescription(), frames,
+      platform::MediaTime::make(time, platform::kHostTimescale)));
+}
+
 bool DaemonTest::areSourcesOff() {
   const auto runs = [](const auto& source) { return source->running; };
   const auto& session = device_.deviceCapture.session;

@@ -123,6 +123,16 @@ class DaemonTest : public testing::Test {
   /// What a file holds; nothing where there is none.
   std::string contentAt(const std::string& url);
   bool areSourcesOff();
+  /// A recording that has a picture.
+  void record(TestClient& client, const TestClient::StartOptions& options = {});
+  /// The URL of a stop that is answered with a movie that is there.
+  std::string stop(TestClient& client);
+  std::string recordMovie(TestClient& client);
+  static int64_t save(TestClient& client, const std::string& movie) {
+    return client.request("saveVideoToCameraRoll", {platform::Value(movie)})->code();
+  }
+  /// To the microphone, from a host time in nanoseconds on.
+  void speak(int64_t time, uint32_t frames);
   int openTransactions() { return device_.keepAlive.count; }
 
   fakes::FakeDevice device_;

@@ -29,8 +29,9 @@ TEST_F(ArbitrationTest, ANewConnectionReplacesTheOldOneAndKeepsTheSession) {
 
 TEST_F(ArbitrationTest, ADisconnectedApplicationLosesItsRecordingASystemRecordingGoesOn) {
   auto client = game();
-  client.start();
+  record(client);
   client.disconnect();
+  EXPECT_EQ(contentAt(device_.movies.last().url.absoluteString()), "") << "nobody's";
   EXPECT_EQ(openTransactions(), 0);
   auto system = systemUI();
   EXPECT_EQ(system.start({.width = 1920, .height = 1080, .system = true})->code(), 0);
@@ -121,37 +122,31 @@ TEST_F(ArbitrationTest, ASystemRecordingFollowsTheFront) {
   }
 }
 
-TEST_F(ArbitrationTest, TheFollowerSeesAnApplicationComeOrGoDuringTheStart) {
+TEST_F(ArbitrationTest, TheFollowerSeesAChangeDuringTheStartAndOutlivesTheFormerRecordingsEnd) {
   install("First", "com.example.first", 1);
-  auto system = systemUI();
-  for (const bool comes : {true, false}) {
-    const size_t former = device_.movies.movies.size();
-    if (!comes) device_.applications.frontmost = "com.example.first";
-    system.postStart({.system = true});
-    while (device_.movies.movies.size() == former) ASSERT_TRUE(device_.executor.runOne());
-    device_.applications.frontmost = comes ? std::optional("com.example.first") : std::nullopt;
-    device_.run();
-    ASSERT_TRUE(device_.tap.tap);
-    EXPECT_EQ(device_.tap.tap->running, comes);
-    EXPECT_EQ(device_.tap.tap->process, 1);
-    system.stop();
-  }
-}
-
-TEST_F(ArbitrationTest, TheFollowerSeesASwitchDuringTheStartAndOutlivesTheFormerRecordingsEnd) {
   install("Other", "com.example.other-system", 400);
   TestClient other(device_, "com.example.other-system", 400, {{"com.tarnwick.private.quorvel", Value(true)}});
   auto system = systemUI();
-  system.start({.system = true});
-  sendFrame(kSecond);
-  device_.applications.frontmost = "com.example.game";
-  other.postStart({.system = true});
-  // The front is asked for when the recording begins; before it has started it changes.
-  while (device_.movies.movies.size() < 2) ASSERT_TRUE(device_.executor.runOne());
-  device_.applications.frontmost = "com.example.chat";
-  device_.run();
-  EXPECT_EQ(device_.tap.tap->process, 200);
-  EXPECT_EQ(system.takeEnds(), std::vector<int64_t>{errorcode::kInterrupted});
+  const struct {
+    std::optional<std::string> before, after;
+    pid_t tapped;
+  } cases[] = {{std::nullopt, "com.example.first", 1},
+               {"com.example.first", std::nullopt, 1},
+               {"com.example.game", "com.example.chat", 200}};
+  for (const auto& [before, after, tapped] : cases) {
+    record(system, {.system = true});
+    const size_t former = device_.movies.movies.size();
+    device_.applications.frontmost = before;
+    other.postStart({.system = true});
+    // The front is asked for when the recording begins; before it has started it changes.
+    while (device_.movies.movies.size() == former) ASSERT_TRUE(device_.executor.runOne());
+    device_.applications.frontmost = after;
+    device_.run();
+    ASSERT_TRUE(device_.tap.tap);
+    EXPECT_EQ(device_.tap.tap->running, after.has_value());
+    EXPECT_EQ(device_.tap.tap->process, tapped);
+    EXPECT_EQ(system.takeEnds(), std::vector<int64_t>{errorcode::kInterrupted});
+  }
   // The former client goes: that recording's end is long over.
   system.disconnect();
   ASSERT_TRUE(device_.applications.handler);
@@ -162,8 +157,7 @@ TEST_F(ArbitrationTest, TheFollowerSeesASwitchDuringTheStartAndOutlivesTheFormer
 
 TEST_F(ArbitrationTest, ADeviceThatInterruptsKeepsTheSystemRecordingInThePhotoLibrary) {
   auto system = systemUI();
-  system.start({.system = true});
-  sendFrame(kSecond);
+  record(system, {.system = true});
   device_.photoLibrary.failure = platform::Error::posix(ENOSPC);
   manager_->stopSystemRecordingWithInterruption();
   device_.run();
@@ -171,8 +165,7 @@ TEST_F(ArbitrationTest, ADeviceThatInterruptsKeepsTheSystemRecordingInThePhotoLi
   EXPECT_EQ(contentAt(system.lastMovie()), "movie 0") << "a refused one is its application's";
   device_.photoLibrary.failure.reset();
   device_.photoLibrary.stored.clear();
-  system.start({.system = true});
-  sendFrame(kSecond);
+  record(system, {.system = true});
   // What is recorded from the warning on is left out, unless the warning is taken back.
   manager_->notifySystemRecordingMayBeStopped();
   manager_->notifySystemRecordingResumed();

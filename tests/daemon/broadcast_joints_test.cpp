@@ -62,9 +62,7 @@ TEST_F(BroadcastJointsTest, ALateAnswerOfAFormerBroadcastChangesNothingOfTheNext
 TEST_F(BroadcastJointsTest, SamplesLeaveTheUnsavedMovieAlone) {
   auto client = game();
   install(client, kSamples);
-  client.start();
-  sendFrame(kSecond);
-  const std::string movie = client.stop()->values[0].asString();
+  const std::string movie = recordMovie(client);
   EXPECT_EQ(setUp(client), 0);
   const auto started = startSamples(client);
   ASSERT_TRUE(*started);
@@ -72,7 +70,7 @@ TEST_F(BroadcastJointsTest, SamplesLeaveTheUnsavedMovieAlone) {
   sendFrame(2 * kSecond);
   client.stop();
   EXPECT_EQ(contentAt(movie), "movie 0");
-  EXPECT_EQ(client.request("saveVideoToCameraRoll", {Value(movie)})->code(), 0);
+  EXPECT_EQ(save(client, movie), 0);
 }
 
 TEST_F(BroadcastJointsTest, TheExtensionIsToldWhoIsInFrontWhenItBegins) {

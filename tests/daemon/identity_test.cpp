@@ -18,9 +18,6 @@ class IdentityTest : public BroadcastFixture {
     EXPECT_EQ(client.answer()->code(), 0);
     sendFrame(kSecond);
   }
-  static int64_t save(TestClient& client, const std::string& movie) {
-    return client.request("saveVideoToCameraRoll", {Value(movie)})->code();
-  }
   fakes::LogRecorder log_;
 };
 
@@ -33,15 +30,13 @@ TEST_F(IdentityTest, AnotherUserIsKeptOutAsLongAsTheApplicationIsThere) {
   EXPECT_TRUE(stranger.start()->failure);
   EXPECT_FALSE(client.isEnded());
   EXPECT_TRUE(client.isRecording());
-  EXPECT_EQ(client.stop()->code(1), 0);
-  EXPECT_NE(contentAt(client.answer()->values[0].asString()), "");
+  stop(client);
   EXPECT_EQ(log_.countContaining("com.example.game is in use by user 0"), 2u);
 }
 
 TEST_F(IdentityTest, ASystemRecordingWithoutItsClientKeepsAnotherUserOut) {
   auto system = systemUI();
-  system.start({.system = true});
-  sendFrame(kSecond);
+  record(system, {.system = true});
   system.disconnect();
   const platform::Dictionary entitlements{{"com.tarnwick.private.quorvel", Value(true)}};
   TestClient other(device_, "com.example.system", 301, entitlements, true, kStranger);
@@ -61,8 +56,7 @@ TEST_F(IdentityTest, AnotherUserInheritsNothingAndTakesNothing) {
     auto client = game();
     install(client, kSamples);
     startAllowed(client);
-    client.stop();
-    movie = client.answer()->values[0].asString();
+    movie = stop(client);
     client.request("setBroadcastURL", {Value("https://live")});
     EXPECT_EQ(setUp(client), 0);
     client.disconnect();
@@ -76,8 +70,7 @@ TEST_F(IdentityTest, AnotherUserInheritsNothingAndTakesNothing) {
     const size_t asked = device_.alerts.shown.size();
     startAllowed(stranger);
     EXPECT_EQ(device_.alerts.shown.size(), asked + 1) << "what the user allowed was another application";
-    stranger.stop();
-    EXPECT_NE(stranger.answer()->values[0].asString(), movie);
+    EXPECT_NE(stop(stranger), movie);
     stranger.disconnect();
   }
   auto back = game();
@@ -132,16 +125,14 @@ TEST_F(IdentityTest, AProcessThatHasBecomeAnotherProgramIsRefusedAndLosesItsConn
 TEST_F(IdentityTest, AnApplicationThatWasUpdatedKeepsItsRecordingAndStartsNoOther) {
   suppressAlert();
   auto client = game();
-  client.start();
-  sendFrame(kSecond);
+  record(client);
   client.isUpdated();
   client.request("updateProcessIDForAudioCaptureWithPID", {Value(int32_t{-1})});
   EXPECT_EQ(device_.tap.tap->process, 100);
   EXPECT_EQ(client.start()->code(), errorcode::kFailedToStart);
   EXPECT_EQ(log_.countContaining("no longer com.example.game's"), 2u);
   EXPECT_TRUE(client.isRecording());
-  EXPECT_EQ(client.stop()->code(1), 0);
-  EXPECT_NE(contentAt(client.answer()->values[0].asString()), "");
+  stop(client);
 }
 
 }  // namespace

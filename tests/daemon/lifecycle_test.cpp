@@ -47,8 +47,7 @@ TEST_F(LifecycleTest, FileNamesHoldWhateverAnAppIsCalled) {
 
 TEST_F(LifecycleTest, PauseStopsTheSourcesAndResumeKeepsTheFile) {
   auto client = game();
-  client.start();
-  sendFrame(kSecond);
+  record(client);
   client.request("resumeRecordingWithWindowLayerContextID", {Value(uint32_t{77})});
   EXPECT_TRUE(client.isRecording()) << "nothing is paused";
   client.request("pauseRecording");
@@ -81,8 +80,7 @@ TEST_F(LifecycleTest, ATapThatRunsTooLateDoesNotStartTheScreen) {
 TEST_F(LifecycleTest, ARefusedFrameEndsTheRecording) {
   device_.movies.startFails = true;
   auto client = game();
-  client.start();
-  sendFrame(kSecond);
+  record(client);
   EXPECT_EQ(client.takeEnds(), std::vector<int64_t>{errorcode::kFailedToSave});
   const auto& payload = device_.metrics.messages.back().payload;
   EXPECT_EQ(valueForKey(payload, "EndReason").asInteger(), errorcode::kFailedToSave);
@@ -96,10 +94,7 @@ TEST_F(LifecycleTest, MetricsCountBothStretchesOfAPausedRecording) {
   device_.clock.advanceSeconds(7.25);
   sendFrame(kSecond);
   ASSERT_TRUE(device_.tap.fill(10, kSecond));
-  const auto heard = platform::SampleBuffer::makeAudio(std::make_shared<platform::DataBlock>(std::vector<uint8_t>(20)),
-                                                       captureManager_.createAudioFormatDescription(), 10,
-                                                       platform::MediaTime::make(1, platform::kHostTimescale));
-  for (int i = 0; i < 2; ++i) device_.deviceCapture.send(heard);
+  for (int i = 0; i < 2; ++i) speak(1, 10);
   device_.run();
   client.request("pauseRecording");
   device_.clock.advanceSeconds(100);
@@ -133,8 +128,7 @@ TEST_F(LifecycleTest, MetricsCountBothStretchesOfAPausedRecording) {
 
 TEST_F(LifecycleTest, ShuttingDownCompletesTheMovie) {
   auto client = game();
-  client.start();
-  sendFrame(kSecond);
+  record(client);
   bool down = false;
   manager_->shutDown([&] { down = true; });
   device_.run();

@@ -13,13 +13,6 @@ using platform::Value;
 /// How applications read their movies.
 class OpenedMoviesTest : public QuietDaemonTest {
  protected:
-  std::string recordMovie(TestClient& client) {
-    EXPECT_EQ(client.start()->code(), 0);
-    sendFrame(kSecond);
-    const auto answer = client.stop();
-    EXPECT_EQ(answer->code(1), 0);
-    return answer->values[0].asString();
-  }
   static std::optional<TestClient::Answer> open(TestClient& client, const std::string& movie) {
     return client.request("openMovieAtURL", {Value(movie)});
   }

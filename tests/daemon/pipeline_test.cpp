@@ -21,13 +21,6 @@ class PipelineTest : public DaemonTest {
   void resume() { client_.request("resumeRecordingWithWindowLayerContextID", {Value(uint32_t{5})}); }
   /// In tenths of a second.
   void frame(int64_t tenths) { sendFrame(tenths * kSecond / 10); }
-  /// To the microphone.
-  void speak(int64_t time, uint32_t frames) {
-    device_.deviceCapture.send(platform::SampleBuffer::makeAudio(
-        std::make_shared<platform::DataBlock>(std::vector<uint8_t>(size_t{frames} * 2, 9)),
-        captureManager_.createAudioFormatDescription(), frames,
-        platform::MediaTime::make(time, platform::kHostTimescale)));
-  }
   std::vector<int64_t> writtenTenths() {
     auto times = device_.movies.video().times();
     for (int64_t& time : times) time /= kSecond / 10;
@@ -155,6 +148,7 @@ TEST_F(PipelineTest, AFileThatFailsEndsTheRecordingByItsCauseAndIsHandedOver) {
     frame(11);
     EXPECT_EQ(client_.takeEnds(), std::vector<int64_t>{code}) << failure.description();
     EXPECT_EQ(client_.lastMovie(), device_.movies.last().url.absoluteString());
+    EXPECT_EQ(device_.salvage.salvaged.back(), "Game.mp4");
     EXPECT_TRUE(isInStore());
   }
   device_.disk.setFreeSize(kRoom);

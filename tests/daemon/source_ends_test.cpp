@@ -34,8 +34,7 @@ TEST_F(SourceEndsTest, ALateFailureOfOneRecordingLeavesTheSourcesOfTheNextOn) {
     for (int pieces = 0; pieces < kPieces; ++pieces) {
       auto first = game();
       auto second = chat();
-      first.start({.microphone = true});
-      sendFrame(kSecond);
+      record(first, {.microphone = true});
       auto& controller = device_.screen.last();
       const auto delegate = controller.delegate.lock();
       const auto started = second.postStart({.microphone = true});
@@ -62,8 +61,7 @@ TEST_F(SourceEndsTest, AChangeOfSoundThatMeetsTheEndStartsNothing) {
   for (const auto& [member, value] : changes) {
     for (int pieces = 0; pieces < kPieces; ++pieces) {
       auto system = systemUI();
-      system.start({.system = true});
-      sendFrame(kSecond);
+      record(system, {.system = true});
       const auto stopped = system.post("stopRecordingWithHandler");
       runWork(pieces);
       system.post(member, {value});
@@ -134,6 +132,10 @@ TEST_F(SourceEndsTest, AChangeOfProcessInAPauseIsTakenUpByTheResume) {
 TEST_F(SourceEndsTest, ASystemRecordingTakesTheMicrophoneWhenItIsOnAnApplicationWhatItsUserAllowed) {
   const auto& session = device_.deviceCapture.session;
   const auto switchOn = [](TestClient& client) { client.request("setMicrophoneEnabled", {Value(true)}); };
+  auto client = game();
+  client.start();
+  switchOn(client);
+  EXPECT_EQ(session, nullptr) << "nobody was asked";
   auto system = systemUI();
   system.start({.system = true});
   EXPECT_EQ(session, nullptr);
@@ -149,14 +151,6 @@ TEST_F(SourceEndsTest, ASystemRecordingTakesTheMicrophoneWhenItIsOnAnApplication
   recordingOf(system)->resumeSessionWithContextID(0);
   device_.run();
   EXPECT_TRUE(session != first && session->running);
-  system.stop();
-
-  device_.deviceCapture.session.reset();
-  auto client = game();
-  client.start();
-  switchOn(client);
-  EXPECT_EQ(session, nullptr) << "nobody was asked";
-  client.stop();
 }
 
 TEST_F(SourceEndsTest, SoundBeforeALateFirstFrameGoesBackToItsTap) {

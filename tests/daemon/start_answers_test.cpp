@@ -54,8 +54,7 @@ TEST_F(StartAnswersTest, AStartWhoseEndHasAKnownCauseIsAnsweredThatCause) {
 
 TEST_F(StartAnswersTest, AStartBetweenAReportedMediaResetAndItsCompletionRecords) {
   auto client = game();
-  client.start();
-  sendFrame(kSecond);
+  record(client);
   auto& controller = device_.screen.last();
   controller.delegate.lock()->screenCaptureControllerMediaServicesWereReset(controller);
   EXPECT_EQ(client.start()->code(), 0);

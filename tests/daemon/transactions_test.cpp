@@ -41,34 +41,27 @@ class TransactionsTest : public QuietDaemonTest {
 };
 
 const std::vector<TransactionsTest::Case>& TransactionsTest::ends() {
+  const auto ask = [](std::vector<const char*> members) {
+    return [members](auto&, TestClient& client) {
+      for (const char* member : members) client.request(member);
+    };
+  };
+  constexpr auto kStop = "stopRecordingWithHandler", kDiscard = "discardRecordingWithHandler";
   static const std::vector<Case> cases{
-      {"stop", [](auto&, TestClient& client) { client.stop(); }},
+      {"stop", ask({kStop})},
+      {"two stops", ask({kStop, kStop})},
+      {"stop in a pause", ask({"pauseRecording", kStop})},
+      {"discard after a stop", ask({kDiscard, kStop, kDiscard})},
       {"stop with clips",
        [](auto&, TestClient& client) {
          client.request("stopRecordingWithStartClipDuration", {Value(1.0), Value(1.0)});
-       }},
-      {"discard after a stop",
-       [](auto&, TestClient& client) {
-         client.request("discardRecordingWithHandler");
-         client.stop();
-         client.request("discardRecordingWithHandler");
        }},
       {"a resume with another's window",
        [](auto&, TestClient& client) {
          client.request("pauseRecording");
          client.request("resumeRecordingWithWindowLayerContextID", {Value(uint32_t{77})});
        }},
-      {"stop in a pause",
-       [](auto&, TestClient& client) {
-         client.request("pauseRecording");
-         client.stop();
-       }},
       {"disconnection", [](auto&, TestClient& client) { client.disconnect(); }},
-      {"two stops",
-       [](auto&, TestClient& client) {
-         client.stop();
-         client.stop();
-       }},
       {"another start",
        [](TransactionsTest& t, TestClient&) {
          auto other = t.chat();
@@ -150,8 +143,7 @@ TEST_F(TransactionsTest, EveryEndOfARecordingClosesItsOwn) {
 
 TEST_F(TransactionsTest, ADividedDisplayEndsAnApplicationsRecordingWithItsMovie) {
   auto client = game();
-  client.start();
-  sendFrame(kSecond);
+  record(client);
   showLayout({0});
   showLayout({0, 2});  // what is above applications does not divide the display
   showLayout({0});
@@ -159,9 +151,8 @@ TEST_F(TransactionsTest, ADividedDisplayEndsAnApplicationsRecordingWithItsMovie)
   EXPECT_TRUE(client.isRecording());
   showLayout({0});
   EXPECT_EQ(client.takeEnds(), std::vector<int64_t>{errorcode::kContentResize});
-  EXPECT_EQ(client.request("saveVideoToCameraRoll", {Value(client.lastMovie())})->code(), 0);
-  client.start();
-  sendFrame(kSecond);
+  EXPECT_EQ(save(client, client.lastMovie()), 0);
+  record(client);
   showLayout({0, 1});
   EXPECT_EQ(client.takeEnds(), std::vector<int64_t>{errorcode::kContentResize});
   client.start();

@@ -82,13 +82,6 @@ class Client:
         """The reply's values: none, one, or a tuple."""
         return self.connection.call_blocking(None, PATH, interface, member, signature, arguments, timeout=PATIENCE)
 
-    def send(self, member, signature='', *arguments):
-        """Sends without waiting; the list that is returned gets the reply, or the error."""
-        answers = []
-        self.connection.call_async(None, PATH, DAEMON, member, signature, arguments, answers.append, answers.append,
-                                   timeout=PATIENCE)
-        return answers
-
     def refusal(self, member, signature='', *arguments, interface=DAEMON):
         """The name of the D-Bus error with which the call fails."""
         try:
@@ -100,12 +93,11 @@ class Client:
     def state(self):
         return {str(key): value for key, value in self.call('synchronousGetCurrentState').items()}
 
-    def start(self, size=(640.0, 360.0), contexts=None, microphone=False, system=False, capture=False):
+    def start(self, contexts=None, system=False, capture=False):
         """The error's code, 0 for none. A process is its own context on a device without windows."""
         contexts = [os.getpid()] if contexts is None else contexts
-        error, self.microphone, _camera = self.call(
-            'startRecordingWindowLayerContextIDs', START_SIGNATURE, contexts, size, microphone, False, False, system,
-            capture, [])
+        error, _microphone, _camera = self.call('startRecordingWindowLayerContextIDs', START_SIGNATURE, contexts,
+                                                (640.0, 360.0), False, False, False, system, capture, [])
         return code_of(error)
 
     def stop(self):

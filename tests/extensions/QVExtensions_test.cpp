@@ -58,14 +58,6 @@ TEST_F(QVExtensionsTest, WithoutAServiceThereIsAnError) {
   extensionsWithMatchingPointName(nullptr, {}, nullptr);
 }
 
-TEST(ExtensionItemTest, HasOneAttachmentOfTheGenericType) {
-  const auto item = itemWithTitle("title", Value(true));
-  EXPECT_EQ(item.attributedTitle, "title");
-  ASSERT_EQ(item.attachments.size(), 1u);
-  EXPECT_EQ(item.attachments[0].typeIdentifier, platform::kGenericDataType);
-  EXPECT_EQ(item.attachments[0].value, Value(true));
-}
-
 TEST_F(QVExtensionsTest, OnlyTheDeclaredSampleModeIsOne) {
   EXPECT_EQ(processMode(*device_.extensions.install("a", "p", "QVBroadcastProcessModeSampleBuffer")),
             BroadcastProcessMode::Samples);

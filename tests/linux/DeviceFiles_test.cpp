@@ -112,15 +112,11 @@ TEST_F(EntitlementsTest, HoldForTheUsersThatTheyName) {
   EXPECT_EQ(log_.countContaining("\"users\" is no array"), 4u);
 }
 
-TEST_F(EntitlementsTest, AreReadFromTheBundlesFile) {
-  EXPECT_EQ(entitlements(), (Dictionary{{"com.tarnwick.private.quorvel", Value(true)}}));
-  EXPECT_TRUE(entitlements("com.example.other").empty());
-  EXPECT_TRUE(log_.lines().empty());
-}
-
 TEST_F(EntitlementsTest, IdentifiersCannotLeaveTheDirectory) {
   root_.write("/etc/quorvel/outside.json", R"({"com.tarnwick.private.quorvel": true})");
-  for (const char* identifier : {"../outside", "..", "", ".", "a/../com.example.remote", "com.example.remote\n"}) {
+  EXPECT_EQ(entitlements(), (Dictionary{{"com.tarnwick.private.quorvel", Value(true)}}));
+  for (const char* identifier :
+       {"com.example.other", "../outside", "..", "", ".", "a/../com.example.remote", "com.example.remote\n"}) {
     EXPECT_TRUE(entitlements(identifier).empty()) << identifier;
   }
 }

@@ -16,6 +16,7 @@ namespace {
 
 class FolderPhotoLibraryTest : public testing::Test {
  protected:
+  explicit FolderPhotoLibraryTest(uid_t user = ::geteuid()) : library_(root_.path(kFolder), user, executor_) {}
   int64_t add(const std::string& path, PhotoResourceType type = PhotoResourceType::Video) {
     std::optional<int64_t> code;
     library_.createAsset(URL::fileURL(path), type,
@@ -36,7 +37,7 @@ class FolderPhotoLibraryTest : public testing::Test {
   kit::ScratchFolder root_;
   fakes::LogRecorder log_;
   fakes::ManualExecutor executor_;
-  FolderPhotoLibrary library_{root_.path(kFolder), ::geteuid(), executor_};
+  FolderPhotoLibrary library_;
 };
 
 TEST_F(FolderPhotoLibraryTest, MoviesKeepTheirNamesAndReplaceNothing) {
@@ -74,6 +75,70 @@ TEST_F(FolderPhotoLibraryTest, UnfinishedCopiesOfAFormerProcessGo) {
 TEST_F(FolderPhotoLibraryTest, AnUnusableFolderIsAnError) {
   root_.write("/private/var/mobile/Media", "a file in the way");
   EXPECT_EQ(add(root_.write("/tmp/movie.mp4", "m")), ENOTDIR);
+}
+
+/// A daemon of root, and the library of a user who may write where it lies.
+class UserPhotoLibraryTest : public FolderPhotoLibraryTest {
+ protected:
+  static constexpr uid_t kUser = 4711;
+
+  UserPhotoLibraryTest() : FolderPhotoLibraryTest(kUser) {}
+  void SetUp() override {
+    if (::geteuid() != 0) GTEST_SKIP() << "to give files to another user takes root";
+  }
+  void expect(const std::string& path, uid_t owner, unsigned mode) {
+    struct stat info {};
+    ASSERT_EQ(::lstat(root_.path(path).c_str(), &info), 0) << path;
+    EXPECT_EQ(info.st_uid, owner) << path;
+    EXPECT_EQ(info.st_mode & 07777, mode) << path;
+  }
+
+  const std::string movie_ = root_.write("/store/Chess.mp4", "a movie");
+};
+
+TEST_F(UserPhotoLibraryTest, FolderAndMoviesAreTheUsersAlone) {
+  EXPECT_EQ(add(movie_), 0);
+  expect(kFolder, kUser, 0700);
+  expect(kFolder + "/Chess.mp4", kUser, 0600);
+  // Who owns it may let others in.
+  ASSERT_EQ(::chmod(root_.path(kFolder).c_str(), 0755), 0);
+  EXPECT_EQ(add(movie_), 0);
+  expect(kFolder, kUser, 0755);
+  expect(kFolder + "/Chess 2.mp4", kUser, 0600);
+}
+
+TEST_F(UserPhotoLibraryTest, ALibraryThatWasRootsIsGivenWithItsMoviesAndNothingElse) {
+  root_.write(kFolder + "/old.mp4", "old");
+  const std::string secret = root_.write("/etc/secret", "root's");
+  ASSERT_EQ(::symlink(secret.c_str(), root_.path(kFolder + "/link").c_str()), 0);
+  ASSERT_EQ(::link(secret.c_str(), root_.path(kFolder + "/hard.mp4").c_str()), 0);
+  ASSERT_EQ(::chmod(secret.c_str(), 0640), 0);
+  EXPECT_EQ(add(movie_), 0);
+  expect(kFolder, kUser, 0700);
+  expect(kFolder + "/old.mp4", kUser, 0600);
+  expect("/etc/secret", 0, 0640);
+}
+
+TEST_F(UserPhotoLibraryTest, LinksOfTheUserLeadNowhere) {
+  const std::string secret = root_.write("/etc/secret", "root's");
+  EXPECT_EQ(add(movie_), 0);
+  ASSERT_EQ(::symlink(secret.c_str(), root_.path(kFolder + "/Chess 2.mp4").c_str()), 0);
+  EXPECT_EQ(add(movie_), 0);
+  expect(kFolder + "/Chess 3.mp4", kUser, 0600);
+  EXPECT_EQ(root_.read("/etc/secret"), "root's");
+  // In place of the whole folder.
+  ASSERT_EQ(::rename(root_.path(kFolder).c_str(), root_.path("/private/var/mobile/Media/away").c_str()), 0);
+  ASSERT_EQ(::symlink(root_.path("/etc").c_str(), root_.path(kFolder).c_str()), 0);
+  EXPECT_EQ(add(movie_), ENOTDIR);
+  expect("/etc", 0, 0755);
+  EXPECT_FALSE(root_.exists("/etc/Chess.mp4"));
+}
+
+TEST_F(UserPhotoLibraryTest, AFolderOfAThirdUserIsRefused) {
+  root_.write(kFolder + "/theirs.mp4", "theirs");
+  ASSERT_EQ(::chown(root_.path(kFolder).c_str(), kUser + 1, 0), 0);
+  EXPECT_EQ(add(movie_), EPERM);
+  expect(kFolder, kUser + 1, 0755);
 }
 
 }  // namespace

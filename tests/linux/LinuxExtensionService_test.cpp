@@ -130,9 +130,6 @@ TEST_F(LinuxExtensionServiceTest, ReachesItsContainerTheNetworkAndNothingElse) {
         std::string("/etc/shadow"), "/proc/" + std::to_string(::getpid()) + "/environ"}) {
     EXPECT_TRUE(isRefused("read", path)) << path;
   }
-  EXPECT_TRUE(isRefused("local socket", ""));
-  EXPECT_TRUE(isRefused("fork", ""));
-  EXPECT_TRUE(isRefused("signal", std::to_string(::getpid())));
   EXPECT_EQ(run("environment", "TMPDIR"), "set");
   EXPECT_EQ(run("environment", "PWD"), "unset");
 }

@@ -37,11 +37,12 @@ class ProcessIdentityTest : public testing::Test {
     EXPECT_TRUE(process.awaitLine("runs"));
     return process;
   }
-  IPCPeer resolved(pid_t pid) {
+  IPCPeer resolved(pid_t pid, bool isPinned = true) {
     IPCPeer peer;
     peer.processIdentifier = pid;
     peer.userIdentifier = ::geteuid();
-    peer.processHandle = shareFileDescriptor(FileDescriptor(static_cast<int>(::syscall(SYS_pidfd_open, pid, 0))));
+    const int handle = isPinned ? static_cast<int>(::syscall(SYS_pidfd_open, pid, 0)) : -1;
+    if (isPinned) peer.processHandle = shareFileDescriptor(FileDescriptor(handle));
     linux_.peerResolver()(peer);
     return peer;
   }
@@ -75,6 +76,14 @@ TEST_F(ProcessIdentityTest, HoldsUntilTheProcessBecomesAnotherProgramOrEnds) {
   process.kill();
   EXPECT_EQ(anew.standing(), PeerStanding::AnotherProgram);
   EXPECT_EQ(resolved(process.pid()).identity, nullptr);
+}
+
+TEST_F(ProcessIdentityTest, WhoIsOutsideOrNotPinnedHasNoBundle) {
+  const IPCPeer outside = resolved(::getpid());
+  EXPECT_EQ(outside.bundleIdentifier, std::nullopt);
+  EXPECT_TRUE(outside.entitlements.empty());
+  const auto process = start();
+  EXPECT_EQ(resolved(process.pid(), false).bundleIdentifier, std::nullopt);
 }
 
 TEST_F(ProcessIdentityTest, HoldsOnlyAsLongAsTheExecutableIsTheBundles) {

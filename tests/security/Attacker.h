@@ -1,10 +1,7 @@
 #pragma once
 
 #include <fcntl.h>
-#include <sys/socket.h>
 #include <sys/syscall.h>
-#include <sys/un.h>
-#include <unistd.h>
 
 #include <algorithm>
 #include <cerrno>
@@ -17,6 +14,7 @@
 
 #include "platform/base/FileDescriptor.h"
 #include "tests/kit/Events.h"
+#include "tests/security/ByHand.h"
 
 namespace qv::security {
 
@@ -26,27 +24,14 @@ class Attacker {
   explicit Attacker(const std::string& path) : socket_(::socket(AF_UNIX, SOCK_STREAM | SOCK_CLOEXEC, 0)) {
     const timeval bound{kit::kNever.count(), 0};
     ::setsockopt(socket_.get(), SOL_SOCKET, SO_RCVTIMEO, &bound, sizeof bound);
-    sockaddr_un address{};
-    address.sun_family = AF_UNIX;
-    path.copy(address.sun_path, sizeof address.sun_path - 1);
-    isConnected_ = ::connect(socket_.get(), reinterpret_cast<sockaddr*>(&address), sizeof address) == 0;
+    isConnected_ = connectSocket(socket_.get(), path);
   }
   [[nodiscard]] bool isConnected() const { return isConnected_; }
-  [[nodiscard]] int socket() const { return socket_.get(); }
 
-  static std::string hello() {
-    std::string digits;
-    for (const char digit : std::to_string(::getuid())) digits += {'3', digit};
-    using namespace std::string_literals;
-    return "\0AUTH EXTERNAL "s + digits + "\r\nNEGOTIATE_UNIX_FD\r\nBEGIN\r\n";
-  }
   /// Until the service has answered to it.
   void authenticate() {
     send(hello());
-    std::string answer;
-    char byte = 0;
-    while (!answer.ends_with("AGREE_UNIX_FD\r\n") && ::read(socket_.get(), &byte, 1) == 1) answer += byte;
-    EXPECT_TRUE(answer.ends_with("AGREE_UNIX_FD\r\n"));
+    EXPECT_TRUE(readAgreement(socket_.get()));
   }
   /// False where the service has hung up.
   bool send(const std::string& bytes, size_t descriptors = 0) {

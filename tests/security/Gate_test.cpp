@@ -1,34 +1,17 @@
 #include <signal.h>
 #include <sys/wait.h>
 
-#include "tests/fakes/LogRecorder.h"
-#include "tests/sdbus/RawCall.h"
-#include "tests/sdbus/SdBusTest.h"
-#include "tests/security/Attacker.h"
+#include "tests/security/AttackTest.h"
 
 namespace qv::security {
 namespace {
 
 using platform::FileDescriptor;
-using platform::IPCArguments;
-using platform::Value;
-using platform::test::rawCall;
-using platform::test::RecordingExportedObject;
-using platform::test::SdBusTest;
-using platform::test::testInterface;
 
-using kit::Events;
-
-class GateTest : public SdBusTest {
+class GateTest : public AttackTest {
  protected:
-  explicit GateTest(platform::SdBusIPCOptions options = {}) : SdBusTest(std::move(options)) {}
-  std::string path() const { return directory_ + "/test.service"; }
-  /// Everything before this has been read; and somebody else is served.
-  void expectService(platform::IPCConnection& honest) {
-    EXPECT_EQ(valuesOf(call(honest, "echo", {Value("well")})), IPCArguments{Value("well")});
-  }
+  using AttackTest::AttackTest;
   static std::string notify(size_t descriptors = 0) {
-    using namespace std::string_literals;
     return rawCall(testInterface().name, "notify", "u", "\1\0\0\0"s, 1, "/com/tarnwick/quorveld",
                    static_cast<uint32_t>(descriptors));
   }
@@ -66,7 +49,7 @@ TEST_F(GateTest, DescriptorBombsCostNothing) {
 TEST_F(GateTest, DescriptorsDuringTheAuthenticationEndIt) {
   const auto honest = connectEcho();
   Attacker attacker(path());
-  attacker.send(Attacker::hello().substr(0, 5), 4);
+  attacker.send(hello().substr(0, 5), 4);
   EXPECT_TRUE(attacker.isDropped());
   expectService(*honest);
 }
@@ -74,14 +57,13 @@ TEST_F(GateTest, DescriptorsDuringTheAuthenticationEndIt) {
 TEST_F(GateTest, MessagesAndDescriptorsMayComeWithTheEndOfTheAuthentication) {
   listen();
   Attacker eager(path());
-  EXPECT_TRUE(eager.send(Attacker::hello() + notify()));
+  EXPECT_TRUE(eager.send(hello() + notify()));
   EXPECT_EQ(delegate_.object->takeCall().member, "notify");
   Attacker pieces(path());
-  for (const char byte : Attacker::hello() + notify()) EXPECT_TRUE(pieces.send(std::string(1, byte)));
+  for (const char byte : hello() + notify()) EXPECT_TRUE(pieces.send(std::string(1, byte)));
   EXPECT_EQ(delegate_.object->takeCall().member, "notify");
-  using namespace std::string_literals;
   Attacker bringing(path());
-  EXPECT_TRUE(bringing.send(Attacker::hello()));
+  EXPECT_TRUE(bringing.send(hello()));
   EXPECT_TRUE(
       bringing.send(rawCall(testInterface().name, "echo", "v", "\1h\0\0\0\0\0\0"s, 1, "/com/tarnwick/quorveld", 1), 1));
   const auto received = delegate_.object->takeCall();
@@ -103,8 +85,8 @@ TEST_F(GateTest, ALargeMessagePassesAndATooLargeOneDoesNot) {
 }
 
 TEST_F(GateTest, AConnectionLeftToAnotherProcessIsUseless) {
-  Events<std::string> called;
-  delegate_.object->answer = [&called](const RecordingExportedObject::ReceivedCall& received) {
+  kit::Events<std::string> called;
+  delegate_.object->answer = [&called](const platform::test::Call& received) {
     called.add(received.member);
     echo(received);
   };
@@ -114,17 +96,13 @@ TEST_F(GateTest, AConnectionLeftToAnotherProcessIsUseless) {
   const fakes::LogRecorder log;
   // The child connects, and becomes a program that might have more rights; the parent keeps the socket.
   FileDescriptor socket(::socket(AF_UNIX, SOCK_STREAM, 0));
-  sockaddr_un address{};
-  address.sun_family = AF_UNIX;
-  path().copy(address.sun_path, sizeof address.sun_path - 1);
   int became[2];
   ASSERT_EQ(::pipe2(became, O_CLOEXEC), 0);
   const FileDescriptor reading(became[0]);
   FileDescriptor writing(became[1]);
   const pid_t child = ::fork();
   if (child == 0) {
-    if (::connect(socket.get(), reinterpret_cast<sockaddr*>(&address), sizeof address) != 0) ::_exit(1);
-    ::execl("/bin/sleep", "sleep", "600", nullptr);
+    if (connectSocket(socket.get(), path())) ::execl("/bin/sleep", "sleep", "600", nullptr);
     ::_exit(1);
   }
   ASSERT_GT(child, 0);
@@ -133,7 +111,7 @@ TEST_F(GateTest, AConnectionLeftToAnotherProcessIsUseless) {
   EXPECT_EQ(::read(reading.get(), &byte, 1), 0);  // it has connected, and become another
   const auto left = delegate_.connections.next();
   EXPECT_EQ(left->processIdentifier(), child);
-  const std::string bytes = Attacker::hello() + notify();
+  const std::string bytes = hello() + notify();
   EXPECT_EQ(::send(socket.get(), bytes.data(), bytes.size(), MSG_NOSIGNAL), static_cast<ssize_t>(bytes.size()));
   EXPECT_EQ(delegate_.ended.next(), "invalidated");
   expectService(*honest);
@@ -145,31 +123,29 @@ TEST_F(GateTest, AConnectionLeftToAnotherProcessIsUseless) {
 
 /// Extensions reach us, and we them, by endpoints: no less is asked of their bytes.
 TEST_F(GateTest, APeerBehindAnEndpointPassesTheGateToo) {
+  const auto connected = [this](platform::IPCService& from, platform::IPCListener& to,
+                                platform::IPCListenerDelegate& delegate) {
+    to.setDelegate(&delegate, *queue_);
+    EXPECT_FALSE(to.resume());
+    auto connection = from.connect(to.endpoint()).value();
+    configure(*connection);
+    connection->resume();
+    return connection;
+  };
   const auto anonymous = server_->createAnonymousListener();
-  anonymous->setDelegate(&delegate_, *queue_);
-  ASSERT_FALSE(anonymous->resume());
-  auto connection = client_->connect(anonymous->endpoint());
-  ASSERT_TRUE(connection);
-  configure(**connection);
-  (*connection)->resume();
+  const auto client = connected(*client_, *anonymous, delegate_);
   delegate_.object->answer = echo;
-  expectService(**connection);
+  expectService(*client);
   const Value tooLarge{platform::Data(2 << 20)};
-  EXPECT_EQ(codeOf(call(**connection, "echo", {tooLarge})),
-            platform::test::code(platform::IPCErrorCode::ConnectionInvalid));
+  EXPECT_EQ(codeOf(call(*client, "echo", {tooLarge})), platform::test::code(platform::IPCErrorCode::ConnectionInvalid));
 
   // We are the client of this one.
   const auto theirs = client_->createAnonymousListener();
   fakes::AcceptingDelegate extension(testInterface(), testInterface());
-  theirs->setDelegate(&extension, *queue_);
-  ASSERT_FALSE(theirs->resume());
-  auto ours = server_->connect(theirs->endpoint());
-  ASSERT_TRUE(ours);
-  configure(**ours);
-  (*ours)->resume();
+  const auto ours = connected(*server_, *theirs, extension);
   const auto accepted = extension.connections.next();
   extension.object->answer = echo;
-  expectService(**ours);
+  expectService(*ours);
   accepted->call("echo", {tooLarge}, {}, {});
   EXPECT_EQ(clientEnded_.next(), "invalidated");
   EXPECT_EQ(extension.ended.next(), "invalidated");
@@ -193,7 +169,7 @@ TEST_F(UnfinishedTest, WhatIsNotEndedInTimeIsDropped) {
   {
     Attacker silent(path());
     Attacker mumbling(path());
-    mumbling.send(Attacker::hello().substr(0, 20));
+    mumbling.send(hello().substr(0, 20));
     Attacker stopping(path());
     stopping.authenticate();
     stopping.send(notify() + notify());

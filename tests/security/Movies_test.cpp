@@ -341,24 +341,10 @@ TEST_F(LossTest, AStoreThatCannotBeWrittenRefusesStartsWithThatReason) {
   EXPECT_EQ(client.start()->code(), errorcode::kFailedToStart);
 }
 
-TEST_F(LossTest, AFailedWriteHandsItsMovieToTheClient) {
-  auto client = game();
-  client.start();
-  sendFrame(kSecond);
-  device_.movies.last().status = platform::AssetWriterStatus::Failed;
-  sendFrame(2 * kSecond);
-  const auto end = client.takeEnd();
-  ASSERT_TRUE(end);
-  EXPECT_EQ(end->code, errorcode::kFailedToSave);
-  EXPECT_EQ(contentAt(end->movie), "movie 0");
-  EXPECT_EQ(device_.salvage.salvaged, std::vector<std::string>{"Game.mp4"});
-}
-
 /// A copy in the library would be all that is left of it, and nobody would know that it is not whole.
 TEST_F(LossTest, WhatIsNotWholeStaysOutOfThePhotoLibrary) {
   auto device = systemUI();
-  device.start({.system = true});
-  sendFrame(kSecond);
+  record(device, {.system = true});
   device_.salvage.others = platform::MovieState::Unfinished;
   auto client = game();
   client.start();

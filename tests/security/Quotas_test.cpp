@@ -2,35 +2,22 @@
 
 #include <atomic>
 
-#include "tests/fakes/LogRecorder.h"
-#include "tests/sdbus/RawCall.h"
-#include "tests/sdbus/SdBusTest.h"
-#include "tests/security/Attacker.h"
+#include "tests/security/AttackTest.h"
 
 namespace qv::security {
 namespace {
 
-using platform::IPCArguments;
-using platform::Value;
-using platform::test::rawCall;
-using platform::test::SdBusTest;
-using platform::test::testInterface;
 using Clock = std::chrono::steady_clock;
-using namespace std::string_literals;
 
-class QuotasTest : public SdBusTest {
+class QuotasTest : public AttackTest {
  protected:
-  explicit QuotasTest(platform::SdBusIPCOptions options = {}) : SdBusTest(forAnybody(std::move(options))) {
+  explicit QuotasTest(platform::SdBusIPCOptions options = {}) : AttackTest(forAnybody(std::move(options))) {
     ::chmod(directory_.c_str(), 0755);
   }
   static platform::SdBusIPCOptions forAnybody(platform::SdBusIPCOptions options) {
     options.unfinishedMilliseconds = std::chrono::milliseconds(10 * kit::kNever).count();
     if (::getuid() == 0) options.socketGroup = std::to_string(kSomebody);
     return options;
-  }
-  std::string path() const { return directory_ + "/test.service"; }
-  void expectService(platform::IPCConnection& honest) {
-    EXPECT_EQ(valuesOf(call(honest, "echo", {Value("well")})), IPCArguments{Value("well")});
   }
   static size_t dropped(std::vector<Attacker>& attackers) {
     return static_cast<size_t>(std::ranges::count_if(attackers, [](Attacker& each) { return each.wasDropped(); }));

@@ -12,7 +12,7 @@
 #include "platform/base/FileDescriptor.h"
 #include "platform/base/Value.h"
 #include "tests/kit/Process.h"
-#include "tests/kit/ScratchFolder.h"
+#include "tests/security/DaemonRoot.h"
 
 namespace qv {
 namespace {
@@ -50,11 +50,6 @@ class StoreAttack : public testing::Test {
   void SetUp() override {
     if (::geteuid() != 0) GTEST_SKIP() << "to be another user takes root";
     if (!kit::isInstalled("setpriv")) GTEST_SKIP() << "there is no setpriv";
-    fs::permissions(root_.path(), fs::perms(0755));
-    root_.write("/etc/quorvel/device.json", R"({"internalBuild": true})");
-    root_.write("/private/var/mobile/Library/Preferences/com.tarnwick.quorveld.json", R"({"QVSuppressAlert": true})");
-    fs::create_directories(root_.path("/System/Library/Frameworks"));
-    fs::copy(QV_FRAMEWORK_DIR, root_.path("/System/Library/Frameworks/Quorvel.framework"), fs::copy_options::recursive);
     root_.write(kStore + "/left over"s, "of a former version");
     daemon_.emplace(
         DAEMON, std::vector<std::string>{},
@@ -101,7 +96,7 @@ class StoreAttack : public testing::Test {
     return info.st_mode & 07777;
   }
 
-  const kit::ScratchFolder root_;
+  const security::DaemonRoot root_;
   std::optional<kit::Process> daemon_;
 };
 

@@ -3,16 +3,13 @@
 ///   security_client SOCKET [DESCRIPTOR]       the descriptor of a connection that a former program has made
 ///   security_client -                         it does nothing
 ///
-/// It takes commands on descriptor 3 and says one line for each: user N, connect, start, start system, stop, save URL,
+/// It takes commands on descriptor 3 and says one line for each: user N, connect, start, start system, stop,
 /// become PROGRAM (with its connection), lend N PROGRAM (a child of user N connects, asks for a system recording, and
 /// becomes that program at once), answer (that this child would have got). What is said of a request: "ok", a code,
 /// "refused" or "closed"; of a stop the movie's URL.
 #include <fcntl.h>
 #include <signal.h>
 #include <sys/prctl.h>
-#include <sys/socket.h>
-#include <sys/un.h>
-#include <unistd.h>
 
 #include <cstdint>
 #include <cstdio>
@@ -22,14 +19,16 @@
 #include <string>
 
 #include "tests/sdbus/RawCall.h"
+#include "tests/security/ByHand.h"
 
 namespace {
 
-using namespace std::string_literals;
+using qv::security::hello;
+using qv::security::readAgreement;
 
 constexpr const char kInterface[] = "com.tarnwick.quorveld.QVDaemonProtocol";
 constexpr int kCommands = 3;
-constexpr int64_t kCodes[] = {-5803, -5810, -5812};
+constexpr int64_t kCodes[] = {-5803, -5810};
 
 template <typename T>
 std::string bytesOf(T value) {
@@ -47,17 +46,6 @@ std::string startCall(bool system) {
 
 std::string call(const std::string& member) { return qv::platform::test::rawCall(kInterface, member, "", ""); }
 
-std::string saveCall(const std::string& url) {
-  return qv::platform::test::rawCall(kInterface, "saveVideoToCameraRoll", "s",
-                                     bytesOf(static_cast<uint32_t>(url.size())) + url + '\0');
-}
-
-std::string authentication() {
-  std::string user;
-  for (const char digit : std::to_string(::getuid())) user += "3"s + digit;
-  return "\0AUTH EXTERNAL "s + user + "\r\nNEGOTIATE_UNIX_FD\r\nBEGIN\r\n";
-}
-
 class Link {
  public:
   Link(std::string path, int descriptor) : path_(std::move(path)), socket_(descriptor) {}
@@ -66,22 +54,9 @@ class Link {
     if (socket_ >= 0) ::close(socket_);
     socket_ = ::socket(AF_UNIX, SOCK_STREAM, 0);
   }
-  bool connect() const {
-    sockaddr_un address{};
-    address.sun_family = AF_UNIX;
-    path_.copy(address.sun_path, sizeof address.sun_path - 1);
-    return ::connect(socket_, reinterpret_cast<sockaddr*>(&address), sizeof address) == 0;
-  }
+  bool connect() const { return qv::security::connectSocket(socket_, path_); }
   bool send(const std::string& bytes) const {
     return ::send(socket_, bytes.data(), bytes.size(), MSG_NOSIGNAL) == static_cast<ssize_t>(bytes.size());
-  }
-  /// The bytes of the authentication's answer, up to the last line of it.
-  bool readAuthentication() const {
-    std::string line;
-    for (char next = 0; ::read(socket_, &next, 1) == 1; line += next) {
-      if (line.ends_with("AGREE_UNIX_FD\r") && next == '\n') return true;
-    }
-    return false;
   }
   /// The next answer to a call; empty when the connection has ended.
   std::string readAnswer() const {
@@ -131,7 +106,7 @@ std::string request(const Link& link, const std::string& bytes) {
 
 std::string connectAnew(Link& link) {
   link.open();
-  if (!link.connect() || !link.send(authentication()) || !link.readAuthentication()) return "closed";
+  if (!link.connect() || !link.send(hello()) || !readAgreement(link.descriptor())) return "closed";
   return request(link, call("synchronousGetCurrentState"));
 }
 
@@ -144,7 +119,7 @@ std::string lend(Link& link, uid_t user, const std::string& program) {
   const pid_t child = ::fork();
   if (child == 0) {
     const bool isSent = ::setresuid(user, user, user) == 0 && ::prctl(PR_SET_PDEATHSIG, SIGKILL) == 0 &&
-                        link.connect() && link.send(authentication()) && link.send(startCall(true)) &&
+                        link.connect() && link.send(hello()) && link.send(startCall(true)) &&
                         ::write(sent[1], "", 1) == 1;
     if (isSent) ::execl(program.c_str(), program.c_str(), "-", nullptr);
     ::kill(::getpid(), SIGKILL);
@@ -172,11 +147,10 @@ std::string perform(Link& link, const char* path, const std::string& command) {
     return lend(link, user, argument);
   }
   words >> argument;
-  if (verb == "answer") return link.readAuthentication() ? meaningOf(link.readAnswer()) : "closed";
+  if (verb == "answer") return readAgreement(link.descriptor()) ? meaningOf(link.readAnswer()) : "closed";
   if (verb == "connect") return connectAnew(link);
   if (verb == "start") return request(link, startCall(argument == "system"));
   if (verb == "stop") return request(link, call("stopRecordingWithHandler"));
-  if (verb == "save") return request(link, saveCall(argument));
   if (verb == "become") {
     ::execl(argument.c_str(), argument.c_str(), path, std::to_string(link.descriptor()).c_str(), nullptr);
   }

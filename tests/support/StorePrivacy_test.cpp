@@ -17,13 +17,11 @@ class StorePrivacyTest : public SupportTest {
   const std::string movie_ = files_.pathInStore("Chess.mp4");
 };
 
-TEST_F(StorePrivacyTest, TheStoreIsMadeForTheDaemonAlone) {
+TEST_F(StorePrivacyTest, AStoreThatOthersCouldReadIsClosedToThemWithItsMovies) {
   disk_.addDirectory("/root/private/var/mobile/Library");
   files_._srSetupTempDirectory();
-  EXPECT_EQ(modeOf(store_), 0700u);
-}
-
-TEST_F(StorePrivacyTest, AStoreThatOthersCouldReadIsClosedToThemWithItsMovies) {
+  EXPECT_EQ(modeOf(store_), 0700u) << "as it is made";
+  ASSERT_EQ(::chmod(disk_.at(store_).c_str(), 0755), 0);
   disk_.addFile(movie_, "movie");
   disk_.addFile("/root/etc/hosts", "not of the store");
   ASSERT_EQ(::symlink("../../../../../etc/hosts", disk_.at(files_.pathInStore("link.mp4")).c_str()), 0);
