@@ -21,7 +21,10 @@ std::vector<Finding> findAll() {
     const auto more = checkDaemon();
     findings.insert(findings.end(), more.begin(), more.end());
   } catch (const Failure& failure) {
-    findings.push_back({"answers", Finding::State::Fault, failure.text, "look into its log: journalctl -u quorveld"});
+    // What went wrong, and what to do, as everywhere in one line.
+    const size_t end = std::min(failure.text.rfind(": "), failure.text.size());
+    const std::string advice = end + 2 < failure.text.size() ? failure.text.substr(end + 2) : "look into its log";
+    findings.push_back({"answers", Finding::State::Fault, failure.text.substr(0, end), advice});
   }
   return findings;
 }
