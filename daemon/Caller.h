@@ -9,6 +9,9 @@
 
 namespace qv {
 
+/// Of the device's own clients: recordings of the whole screen, and what else is not for everybody.
+inline constexpr const char kSystemClientEntitlement[] = "com.tarnwick.private.quorvel";
+
 /// Who makes a request.
 ///
 /// Threading: a value; of the sequence.
@@ -23,9 +26,7 @@ struct Caller {
   /// What it is now, compared with what it was when it connected.
   [[nodiscard]] platform::PeerStanding standing() const { return connection->peer().standing(); }
   /// One of the system's own clients.
-  [[nodiscard]] bool isPrivileged() const {
-    return connection->valueForEntitlement("com.tarnwick.private.quorvel").asBool();
-  }
+  [[nodiscard]] bool isPrivileged() const { return connection->valueForEntitlement(kSystemClientEntitlement).asBool(); }
 };
 
 }  // namespace qv

@@ -2,6 +2,7 @@
 
 #include <cstdlib>
 
+#include "daemon/ChosenServices.h"
 #include "daemon/SoundChoice.h"
 #include "platform/appstream/AppStreamStore.h"
 #include "platform/ffmpeg/MoviesLoader.h"
@@ -91,6 +92,7 @@ struct PlatformChoice::Backends {
   platform::HeadlessPlatform headless{platform::HeadlessOptions{}};
   SoundChoice sound{headless};
   std::unique_ptr<platform::X11Platform> x11;
+  ChosenServices services{sound, movies};
   std::shared_ptr<platform::DisplayLayoutMonitor> layoutMonitor;
 };
 
@@ -122,13 +124,15 @@ void PlatformChoice::chooseScreen() {
     if (!bundle || bundle->bundleIdentifier().empty()) return std::nullopt;
     return bundle->bundleIdentifier();
   };
+  std::optional<platform::Error> fault;
   const char* display = std::getenv("DISPLAY");
   if (display != nullptr && *display != '\0') {
     auto connected = platform::X11Platform::connect({}, std::move(dependencies));
     if (connected) {
       backends_->x11 = std::move(*connected);
     } else {
-      QV_LOG_ERROR(logs::kPlatform, "display %s: %s", display, connected.error().description().c_str());
+      fault = connected.error();
+      QV_LOG_ERROR(logs::kPlatform, "display %s: %s", display, fault->description().c_str());
     }
   }
   if (backends_->x11) {
@@ -143,6 +147,8 @@ void PlatformChoice::chooseScreen() {
     platform_.renderServer = &backends_->headless.renderServer();
     platform_.userAlerts = &backends_->headless.userAlerts();
   }
+  backends_->services.setDisplay(backends_->x11.get(), std::move(fault));
+  platform_.services = &backends_->services;
   QV_LOG(logs::kPlatform, "screen, applications and alerts: %s", backends_->x11 ? "X11" : "headless");
 }
 

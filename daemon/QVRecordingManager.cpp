@@ -54,7 +54,8 @@ QVRecordingManager::QVRecordingManager(platform::Platform& platform, QVCaptureMa
                                       }
                                     }}),
       alerts_(*platform_.globalQueue),
-      requests_([this](const Caller& caller, platform::PeerStanding standing) { callerWasRefused(caller, standing); }) {
+      requests_([this](const Caller& caller, platform::PeerStanding standing) { callerWasRefused(caller, standing); }),
+      status_(sequence_, *context_, *sessions_, *foreground_, exemptions_, logQuotas_) {
   context_->files._srSetupTempDirectory();
   QVUnfinishedMovies(context_->files, *platform_.movieSalvage, *platform_.localization)._srSalvageUnfinishedMovies();
   addRecordingRequests();

@@ -14,6 +14,7 @@
 #include "daemon/SessionAlerts.h"
 #include "daemon/SessionRegistry.h"
 #include "daemon/StartDesk.h"
+#include "daemon/StatusDesk.h"
 #include "daemon/StorePurge.h"
 #include "platform/Platform.h"
 #include "platform/threads/LogQuotas.h"
@@ -130,6 +131,7 @@ class QVRecordingManager final : public platform::IPCListenerDelegate,
   StorePurge purge_;
   SessionAlerts alerts_;
   RequestTable requests_;
+  StatusDesk status_;
   std::unique_ptr<platform::IPCListener> publicListener_;
 };
 

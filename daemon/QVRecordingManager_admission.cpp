@@ -2,6 +2,7 @@
 #include "platform/threads/Log.h"
 #include "protocol/QVClientProtocol.h"
 #include "protocol/QVDaemonProtocol.h"
+#include "protocol/QVStatusProtocol.h"
 
 namespace qv {
 
@@ -23,6 +24,7 @@ bool QVRecordingManager::listenerShouldAcceptNewConnection(platform::IPCListener
   }
   QV_LOG(logs::kDaemon, "accepted client connection PID: %d", static_cast<int>(processID));
   connection->setExportedInterface(daemonProtocol(), shared_from_this());
+  connection->setExportedInterface(statusProtocol(), std::shared_ptr<StatusDesk>(shared_from_this(), &status_));
   connection->setRemoteInterface(clientProtocol());
   connection->setTargetQueue(sequence_);
   const std::weak_ptr<IPCConnection> weakConnection = connection;

@@ -74,6 +74,13 @@ platform::DeviceCaptureService& SoundChoice::deviceCapture() {
   return server != nullptr ? server->deviceCapture() : headless_.deviceCapture();
 }
 
+platform::ServiceState SoundChoice::state() {
+  look();
+  const char* const backend = pulse() != nullptr ? "PulseAudio" : "headless";
+  const auto answer = platform::PulsePlatform::connect();
+  return {backend, answer ? std::nullopt : std::optional(answer.error())};
+}
+
 int32_t SoundChoice::createInputQueue(const platform::AudioStreamDescription& format,
                                       platform::AppAudioInputCallback callback, uint32_t flags,
                                       std::unique_ptr<platform::AppAudioTapQueue>& queue) {

@@ -5,6 +5,7 @@
 
 #include "platform/AppAudioTap.h"
 #include "platform/DeviceCapture.h"
+#include "platform/DeviceServices.h"
 #include "platform/Sounds.h"
 #include "platform/headless/HeadlessPlatform.h"
 #include "platform/pulse/PulsePlatform.h"
@@ -33,6 +34,8 @@ class SoundChoice final : public platform::AppAudioTapService,
   std::shared_ptr<platform::AudioDataOutput> createAudioDataOutput() override;
   platform::AudioSession& audioSession() override;
   void play(uint32_t soundID) override;
+  /// Asks the server whether it answers now, and takes it up like a recording's start.
+  [[nodiscard]] platform::ServiceState state();
 
  private:
   class BothAudioSessions;

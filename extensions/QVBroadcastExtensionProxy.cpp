@@ -121,6 +121,11 @@ void QVBroadcastExtensionProxy::processPayload(BroadcastPayload payload, Payload
   unsendable = sendPending();
 }
 
+uint64_t QVBroadcastExtensionProxy::droppedFrames() const {
+  std::lock_guard lock(mutex_);
+  return payloads_.waiting.droppedFrames();
+}
+
 /// Sending only queues the message, so it can be done with the mutex held: that keeps the order.
 BroadcastPayloadQueue::Items QVBroadcastExtensionProxy::sendPending() {
   BroadcastPayloadQueue::Items unsendable;

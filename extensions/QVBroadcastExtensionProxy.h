@@ -60,6 +60,8 @@ class QVBroadcastExtensionProxy final : public platform::IPCListenerDelegate,
   /// `invalidateConnection`, so call with no lock held that it takes. Actions are given up with the link only, samples
   /// also where the extension does not keep up.
   void processPayload(BroadcastPayload payload, PayloadAnswer::Handler completion);
+  /// Pictures that were given up because the extension does not keep up.
+  [[nodiscard]] uint64_t droppedFrames() const;
   /// Ends the connection and kills the extension's process. When it returns, nothing is held any more: the waiting
   /// ready handler and the open payloads have been told, and the handlers that were set are let go without a call.
   void invalidateConnection();
@@ -113,7 +115,7 @@ class QVBroadcastExtensionProxy final : public platform::IPCListenerDelegate,
   EarlyHandler<platform::Error> errorHandler_;
   platform::RareLog drops_;
 
-  std::mutex mutex_;  ///< for all below
+  mutable std::mutex mutex_;  ///< for all below
   std::unique_ptr<platform::IPCListener> listener_;
   std::shared_ptr<platform::ExtensionUse> use_;
   platform::ListenerEndpoint listenerEndpoint_;

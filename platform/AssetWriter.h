@@ -62,6 +62,18 @@ class WriterInput {
   virtual bool append(const SampleBufferRef& sample) = 0;
 };
 
+/// What can be told of a movie while it is written, and after it.
+///
+/// Threading: thread-safe.
+class AssetWriterCounts {
+ public:
+  virtual ~AssetWriterCounts() = default;
+  /// The name of the video encoder, as its library has it, e.g. "libx264"; empty until it is chosen.
+  [[nodiscard]] virtual std::string videoEncoder() const = 0;
+  /// Pictures that found the queue to the encoder full.
+  [[nodiscard]] virtual uint64_t droppedPictures() const = 0;
+};
+
 /// Writes one movie file that a crash leaves playable up to at most a second before it.
 ///
 /// Life: add inputs; `startWriting`, once; `startSessionAtSourceTime`, once; append; optionally
@@ -80,6 +92,8 @@ class AssetWriter {
   [[nodiscard]] virtual AssetWriterStatus status() const = 0;
   [[nodiscard]] virtual std::optional<Error> error() const = 0;
   [[nodiscard]] virtual const URL& outputURL() const = 0;
+  /// It may outlive the writer. Never nothing.
+  [[nodiscard]] virtual std::shared_ptr<const AssetWriterCounts> counts() const = 0;
   virtual void addInput(std::shared_ptr<WriterInput> input) = 0;
   /// Creates the file. False, with `error`, where that fails or it was called before.
   virtual bool startWriting() = 0;

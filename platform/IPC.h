@@ -139,7 +139,7 @@ struct IPCPeer {
 /// for each connection, on the IPC thread: it reads small local files and nothing slower.
 using IPCPeerResolver = std::function<void(IPCPeer&)>;
 
-/// One end of a connection between two processes. Both ends may export an object and call.
+/// One end of a connection between two processes. Both ends may export interfaces and call.
 ///
 /// Set handlers, interfaces and queue before `resume`; nothing is read before it. Handlers run
 /// on the connection's queue. The loss of the peer is told once: by the invalidation handler; a
@@ -163,6 +163,8 @@ class IPCConnection {
     return valueForKey(peer().entitlements, name);
   }
 
+  /// For each interface that the peer may call, with the object that serves it. A second one of the same name takes the
+  /// first one's place.
   virtual void setExportedInterface(const IPCInterface& interface, std::shared_ptr<IPCExportedObject> object) = 0;
   virtual void setRemoteInterface(const IPCInterface& interface) = 0;
   virtual void setInterruptionHandler(std::function<void()> handler) = 0;

@@ -9,6 +9,8 @@
 #include "platform/Bundles.h"
 #include "platform/DeviceCapture.h"
 #include "platform/DeviceInfo.h"
+#include "platform/DeviceServices.h"
+#include "platform/Entitlements.h"
 #include "platform/ExportSession.h"
 #include "platform/Extensions.h"
 #include "platform/FileSystem.h"
@@ -70,6 +72,8 @@ struct Platform {
   ExtensionService* extensions = nullptr;
   StoreLookupService* storeLookup = nullptr;
   NetworkReachabilityService* reachability = nullptr;
+  EntitlementQuery* entitlements = nullptr;
+  DeviceServicesQuery* services = nullptr;
 };
 
 }  // namespace qv::platform

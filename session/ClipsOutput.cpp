@@ -62,7 +62,15 @@ Clip ClipsOutput::makeClip(int64_t number, platform::Size size) {
   auto writer = std::make_shared<QVMovieWriter>(context_->platform, size, file->path());
   writer->setBroadcastConfig(configuration_.load());
   writer->setSystemRecording(clips_.systemRecording);
+  written_.store({writer, counts().droppedPictures.value_or(0)});
   return {number, std::move(file), std::move(writer)};
+}
+
+OutputCounts ClipsOutput::counts() const {
+  const Written written = written_.load();
+  const auto counts = written.last ? written.last->counts() : nullptr;
+  if (!counts) return {"", written.droppedBefore};
+  return {counts->videoEncoder(), written.droppedBefore + counts->droppedPictures()};
 }
 
 void ClipsOutput::configurationReceived(const QVBroadcastConfiguration& configuration) {

@@ -32,6 +32,8 @@ class ClipsOutput final : public RecordingOutput, public std::enable_shared_from
   void pause() override;
   /// The handler runs when the last clip was handed over; the extension then has its time to send it.
   void finish(platform::MediaTime endTime, FinishHandler handler) override;
+  /// Of all clips together.
+  [[nodiscard]] OutputCounts counts() const override;
 
  private:
   [[nodiscard]] Clip makeClip(int64_t number, platform::Size size);
@@ -43,6 +45,11 @@ class ClipsOutput final : public RecordingOutput, public std::enable_shared_from
   const OutputEvents events_;
   /// What the extension last asked for; it counts from the next clip on.
   platform::Guarded<QVBroadcastConfiguration> configuration_;
+  struct Written {
+    std::shared_ptr<const QVMovieWriter> last;  ///< of the newest clip
+    uint64_t droppedBefore = 0;                 ///< pictures, of the clips before
+  };
+  platform::Guarded<Written> written_;
   std::shared_ptr<ClipHandover> handover_;
   std::shared_ptr<ClipCutter> cutter_;
 };

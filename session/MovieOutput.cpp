@@ -94,6 +94,12 @@ std::optional<platform::Error> MovieOutput::failure() const {
   return of ? of->failure() : std::nullopt;
 }
 
+OutputCounts MovieOutput::counts() const {
+  const auto of = writer();
+  const auto counts = of ? of->counts() : nullptr;
+  return counts ? OutputCounts{counts->videoEncoder(), counts->droppedPictures()} : OutputCounts{};
+}
+
 void MovieOutput::notifyRecordingMayBeStopped() {
   if (const auto to = writer()) to->notifyRecordingMayBeStopped();
 }

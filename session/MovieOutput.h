@@ -32,6 +32,7 @@ class MovieOutput final : public RecordingOutput, public std::enable_shared_from
   [[nodiscard]] bool makesMovie() const override { return true; }
   [[nodiscard]] std::string moviePath() const override;
   [[nodiscard]] std::optional<platform::Error> failure() const override;
+  [[nodiscard]] OutputCounts counts() const override;
   void notifyRecordingMayBeStopped() override;
   void notifyRecordingResumed() override;
 

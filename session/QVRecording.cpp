@@ -38,6 +38,16 @@ int32_t QVRecording::frontmostPIDForAudioTap() const {
   return frontmostPIDForAudioTap_;
 }
 
+RecordingFigures QVRecording::figures() const {
+  RecordingFigures figures{.since = since_, .output = output_->counts()};
+  if (reportingAgent_) figures.pictures = reportingAgent_->videoFrameCount();
+  const auto attributes = context_->platform.fileSystem->attributesOfItem(output_->moviePath());
+  if (attributes) figures.bytes = attributes.value().size;
+  std::lock_guard lock(shouldStopLock_);
+  figures.recorded = timing_.recorded(firstSampleTimestamp_);
+  return figures;
+}
+
 void QVRecording::prepare(std::function<void()> handler) {
   output_->prepare([weakSelf = weak_from_this(), handler = std::move(handler)](const std::optional<Error>& error) {
     const auto self = weakSelf.lock();
@@ -53,6 +63,7 @@ void QVRecording::startSessionWithHandler(int32_t processID, std::function<void(
   if (!isRecording()) return;
   QV_LOG(logs::kSession, "QVRecordingSession: startSession");
   reportingAgent_ = std::make_unique<QVReportingAgent>(_serviceNameForReporting(), *context_->platform.metrics);
+  since_ = context_->platform.clock->now();
   {
     std::lock_guard lock(shouldStopLock_);
     frontmostPIDForAudioTap_ = processID;

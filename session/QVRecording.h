@@ -36,6 +36,15 @@ class QVRecordingObserver {
   virtual void recordingDidUpdateDuration(double seconds) = 0;
 };
 
+/// What can be told of a recording that goes on.
+struct RecordingFigures {
+  std::optional<platform::Date> since = std::nullopt;          ///< when its output was started; nothing before
+  platform::MediaTime recorded = platform::MediaTime::zero();  ///< from the first picture to the last, less the pauses
+  int64_t pictures = 0;
+  uint64_t bytes = 0;  ///< of its movie's file so far; 0 without
+  OutputCounts output = {};
+};
+
 /// One recording of one application, from a start that has passed its checks to its end. It owns what it takes, and
 /// gives it back when it ends, in its destructor at the latest: the keep-alive transaction, the answer that its client
 /// waits for, the report of its end, its file and its output, its sources, its metrics.
@@ -67,6 +76,8 @@ class QVRecording final : public platform::ScreenCaptureControllerDelegate,
   [[nodiscard]] bool writesMovies() const;
   [[nodiscard]] bool microphoneEnabled() const;
   [[nodiscard]] int32_t frontmostPIDForAudioTap() const;
+  /// So far. Sequence only; it looks at the file.
+  [[nodiscard]] RecordingFigures figures() const;
 
   // --- Lifecycle, in this order. A handler does not run when the recording ends first: its answer tells that.
   void prepare(std::function<void()> handler);
@@ -164,6 +175,7 @@ class QVRecording final : public platform::ScreenCaptureControllerDelegate,
   /// Made when the output starts; without it there is nothing to be finished or summed up. Its counters are added to
   /// from capture threads, as long as there are sources.
   std::unique_ptr<QVReportingAgent> reportingAgent_;
+  std::optional<platform::Date> since_;
 };
 
 }  // namespace qv

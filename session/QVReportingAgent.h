@@ -30,8 +30,9 @@ class QVReportingAgent {
   void addVideoFrame() { ++videoFrameCount_; }
   void addAppAudioFrame() { ++appAudioFrameCount_; }
   void addMicFrame() { ++micFrameCount_; }
-  /// The counts so far. Offered, not called by this daemon.
+  /// The counts so far.
   [[nodiscard]] int64_t videoFrameCount() const { return videoFrameCount_; }
+  /// Offered, not called by this daemon, as the next.
   [[nodiscard]] int64_t appAudioFrameCount() const { return appAudioFrameCount_; }
   [[nodiscard]] int64_t micFrameCount() const { return micFrameCount_; }
   /// Seconds.

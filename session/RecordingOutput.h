@@ -1,5 +1,6 @@
 #pragma once
 
+#include <cstdint>
 #include <functional>
 #include <memory>
 #include <optional>
@@ -43,6 +44,13 @@ struct OutputResult {
   std::optional<platform::Error> failure = std::nullopt;
 };
 
+/// What can be told of an output while it runs.
+struct OutputCounts {
+  std::string videoEncoder = {};  ///< empty where nothing is encoded, or not yet
+  /// That whoever takes them was too slow for; nothing where they are not counted.
+  std::optional<uint64_t> droppedPictures = std::nullopt;
+};
+
 /// Where the samples of one recording go: chosen once, when the recording is made.
 ///
 /// Order: `prepare`; `start`; samples, `pause` and `resume`; `finish`. An output that is destroyed unfinished lets go
@@ -76,6 +84,8 @@ class RecordingOutput {
   [[nodiscard]] virtual std::string moviePath() const { return {}; }
   /// What went wrong with its file, where that is known.
   [[nodiscard]] virtual std::optional<platform::Error> failure() const { return std::nullopt; }
+  /// So far. It waits for nothing.
+  [[nodiscard]] virtual OutputCounts counts() const { return {}; }
   virtual void notifyRecordingMayBeStopped() {}
   virtual void notifyRecordingResumed() {}
 };

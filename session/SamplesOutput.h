@@ -36,6 +36,7 @@ class SamplesOutput final : public RecordingOutput, public std::enable_shared_fr
   void tellFrontmostApplication(const std::string& bundleID) override;
   /// Tells the extension, and waits for its answer for 10 s at most.
   void finish(platform::MediaTime endTime, FinishHandler handler) override;
+  [[nodiscard]] OutputCounts counts() const override;
 
  private:
   using Link = std::shared_ptr<QVBroadcastExtensionProxy>;
@@ -56,7 +57,7 @@ class SamplesOutput final : public RecordingOutput, public std::enable_shared_fr
   const platform::Platform& platform_;
   const BroadcastPlan plan_;
   const OutputEvents events_;
-  std::mutex mutex_;
+  mutable std::mutex mutex_;
   Link broadcastUploadExtensionProxy_;
   platform::RareLog absences_;
 };

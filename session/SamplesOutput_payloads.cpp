@@ -10,6 +10,11 @@ namespace qv {
 using platform::SampleBufferRef;
 namespace logs = platform::logs;
 
+OutputCounts SamplesOutput::counts() const {
+  std::lock_guard lock(mutex_);
+  return {.droppedPictures = broadcastUploadExtensionProxy_ ? broadcastUploadExtensionProxy_->droppedFrames() : 0};
+}
+
 SamplesOutput::Link SamplesOutput::link() {
   std::lock_guard lock(mutex_);
   if (!broadcastUploadExtensionProxy_ && absences_.count()) {

@@ -55,6 +55,10 @@ void TimingGate::accountForPause(MediaTime time) {
                           : MediaTime::make(sampleTimeOffset_.value + gap.value, gap.timescale);
 }
 
+MediaTime TimingGate::recorded(MediaTime first) const {
+  return lastSampleTimestamp_.isValid() ? lastSampleTimestamp_ - first - sampleTimeOffset_ : MediaTime::zero();
+}
+
 MediaTime TimingGate::endTime(MediaTime stoppedAt) const {
   if (!lastSampleTimestamp_.isValid()) return MediaTime::invalid();
   return (stoppedAt - sampleTimeOffset_).convertedTo(lastSampleTimestamp_.timescale);

@@ -17,6 +17,8 @@ class TimingGate {
   void resumed() { sessionWasResumed_ = lastSampleTimestamp_.isValid(); }
   /// A picture in the recording's timeline.
   [[nodiscard]] PlacedPicture place(const platform::SampleBufferRef& sample, uint64_t transformFlags);
+  /// From the first picture, of this time, to the last one, less the pauses between them. Zero without a picture.
+  [[nodiscard]] platform::MediaTime recorded(platform::MediaTime first) const;
   /// The pauses that are closed.
   [[nodiscard]] platform::MediaTime pauses() const { return sampleTimeOffset_; }
   /// Whether a pause waits for its first picture: what is heard meanwhile belongs to the pause.

@@ -72,6 +72,19 @@ bool MovieBook::isHanded(const std::string& path, const std::string& owner) cons
   return isHandedTo(find(path), owner);
 }
 
+std::map<std::string, MovieStanding> MovieBook::standings() const {
+  std::lock_guard lock(mutex_);
+  std::map<std::string, MovieStanding> all;
+  for (const auto& [path, movie] : movies_) {
+    const auto hands = movie.hands == Hands::Made      ? MovieStanding::Hands::Recorded
+                       : movie.hands == Hands::Handed  ? MovieStanding::Hands::Handed
+                       : movie.hands == Hands::Removed ? MovieStanding::Hands::Removed
+                                                       : MovieStanding::Hands::Saved;
+    all.emplace(path, MovieStanding{hands, movie.owner});
+  }
+  return all;
+}
+
 std::optional<platform::Result<platform::FileDescriptor>> MovieBook::openHanded(const std::string& path,
                                                                                 const std::string& owner) const {
   std::lock_guard lock(mutex_);

@@ -11,6 +11,13 @@
 
 namespace qv {
 
+/// What becomes of a movie of the store now.
+struct MovieStanding {
+  enum class Hands { Recorded, Handed, Saved, Removed };
+  Hands hands = Hands::Recorded;
+  std::string owner;  ///< of its application; empty for what belongs to none
+};
+
 /// Which path of the temporary store is in whose hands. A path that is not in the book is nobody's. Paths are lexically
 /// normal, and a taken one may be the number's: "Chess 2.mp4" for "Chess.mp4".
 ///
@@ -35,6 +42,8 @@ class MovieBook {
 
   void hand(const std::string& path, const std::string& owner);
   [[nodiscard]] bool isHanded(const std::string& path, const std::string& owner) const;
+  /// What becomes of each path now.
+  [[nodiscard]] std::map<std::string, MovieStanding> standings() const;
   /// Opens the file; nothing unless it was handed to this application. The path does not change hands meanwhile, so
   /// this is the file that was handed.
   [[nodiscard]] std::optional<platform::Result<platform::FileDescriptor>> openHanded(const std::string& path,

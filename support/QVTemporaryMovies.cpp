@@ -142,6 +142,8 @@ class Movies final : public QVTemporaryMovies {
     }
   }
 
+  std::map<std::string, MovieStanding> standings() const override { return book_->standings(); }
+
   int64_t deleteFilesOlderThanTimeToLiveInSeconds(double timeToLive) override {
     return files_._srDeleteFilesOlderThanTimeToLiveInSeconds(timeToLive, purging());
   }

@@ -2,6 +2,7 @@
 
 #include <cstdint>
 #include <functional>
+#include <map>
 #include <memory>
 #include <optional>
 #include <string>
@@ -10,6 +11,7 @@
 #include "platform/base/FileDescriptor.h"
 #include "platform/base/Result.h"
 #include "platform/base/Value.h"
+#include "support/MovieBook.h"
 #include "support/QVTemporaryFiles.h"
 
 namespace qv {
@@ -89,6 +91,8 @@ class QVTemporaryMovies : public std::enable_shared_from_this<QVTemporaryMovies>
   /// where there was nothing.
   virtual void discardLast(const std::string& owner, FileCompletion completion) = 0;
 
+  /// What becomes of each movie that is not nobody's, by path.
+  [[nodiscard]] virtual std::map<std::string, MovieStanding> standings() const = 0;
   /// Like `_srDeleteFilesOlderThanTimeToLiveInSeconds` and `_srDeleteAllTempFiles`, but for what is being made or
   /// saved. What was handed and is gone by it is forgotten; what could not be removed stays handed.
   virtual int64_t deleteFilesOlderThanTimeToLiveInSeconds(double timeToLive) = 0;

@@ -62,6 +62,8 @@ class QVMovieWriter : public std::enable_shared_from_this<QVMovieWriter> {
   /// The first thing that went wrong with the file (e.g. ENOSPC of the posix domain), from the time at which an append
   /// or the finish met it, or the set-up when that failed.
   [[nodiscard]] std::optional<platform::Error> failure() const { return failure_.load(); }
+  /// Of its encoder, from the set-up on; nothing before.
+  [[nodiscard]] std::shared_ptr<const platform::AssetWriterCounts> counts() const { return counts_.load(); }
   /// The movie is to end at the last frame written so far, unless the recording resumes.
   void notifyRecordingMayBeStopped();
   void notifyRecordingResumed();
@@ -119,6 +121,7 @@ class QVMovieWriter : public std::enable_shared_from_this<QVMovieWriter> {
   platform::Guarded<platform::MediaTime> trimVideoPresentationTime_;
   platform::Guarded<platform::MediaTime> endTime_;
   platform::Guarded<std::optional<platform::Error>> failure_;
+  platform::Guarded<std::shared_ptr<const platform::AssetWriterCounts>> counts_;
   std::atomic<bool> isSound_{false};
   std::atomic<bool> isThere_{false};
 

@@ -64,6 +64,7 @@ void QVMovieWriter::dispatchedSetupAssetWriter() {
     return;
   }
   assetWriter_ = std::move(*created);
+  counts_.store(assetWriter_->counts());
   createInputs();
 }
 

@@ -29,6 +29,7 @@ class FFmpegAssetWriter final : public AssetWriter {
   [[nodiscard]] AssetWriterStatus status() const override { return state_->status(); }
   [[nodiscard]] std::optional<Error> error() const override { return state_->error(); }
   [[nodiscard]] const URL& outputURL() const override { return outputURL_; }
+  [[nodiscard]] std::shared_ptr<const AssetWriterCounts> counts() const override { return state_; }
   void addInput(std::shared_ptr<WriterInput> input) override;
   bool startWriting() override;
   void startSessionAtSourceTime(MediaTime time) override;

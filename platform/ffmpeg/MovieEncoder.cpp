@@ -44,6 +44,7 @@ std::optional<Error> MovieEncoder::open(const std::vector<TrackPlan>& plans, Vid
       auto encoder = videoEncoders.open(settings);
       if (!encoder) return encoder.error();
       track.video = std::move(*encoder);
+      state_->setVideoEncoder(track.video->name());
       expectedInterval_ = mp4::kMovieTimescale / settings.frameRate;
     } else {
       auto encoder = AACEncoder::open(parseAudioSettings(plan.settings));

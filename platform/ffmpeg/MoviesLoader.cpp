@@ -1,5 +1,8 @@
 #include "platform/ffmpeg/MoviesLoader.h"
 
+#include <unistd.h>
+
+#include <cerrno>
 #include <utility>
 
 #include "platform/ffmpeg/MoviesModule.h"
@@ -66,6 +69,11 @@ Result<AssetWriterService*> MoviesLoader::assetWriters() {
 
 Result<ExportService*> MoviesLoader::exports() {
   return loaded<OpenExports>(exports_, pathOfModule(directory_, kExportsModule), kExportsModuleEntry);
+}
+
+std::optional<Error> MoviesLoader::whyNotThere() const {
+  const std::string path = pathOfModule(directory_, kMoviesModule);
+  return ::access(path.c_str(), R_OK) == 0 ? std::nullopt : std::optional(Error::posix(errno, path));
 }
 
 void MoviesLoader::prepareForWriting() {

@@ -23,6 +23,8 @@ class MoviesLoader final : public AssetWriterService, public ExportService {
   /// `directory`: of the modules; empty for the places above.
   explicit MoviesLoader(std::string directory = {});
 
+  /// Nothing where the module of recordings can be read. It is not loaded for that.
+  [[nodiscard]] std::optional<Error> whyNotThere() const;
   /// Loads what recordings need and tries out the encoders, on the global queue: it takes tens of milliseconds.
   void prepareForWriting() override;
   Result<std::unique_ptr<AssetWriter>> createAssetWriter(const URL& outputURL, const std::string& fileType) override;

@@ -139,6 +139,8 @@ VideoEncoder::VideoEncoder(const VideoSettings& settings, CodecContext context, 
       packet_(av_packet_alloc()),
       configuration_(mp4::makeAVCConfiguration({context_->extradata, static_cast<size_t>(context_->extradata_size)})) {}
 
+std::string VideoEncoder::name() const { return context_->codec->name; }
+
 bool VideoEncoder::liesAcross(const PixelBuffer& image) const {
   const FrameLayout& layout = image.sharedFrame()->layout();
   return (layout.width > layout.height && settings_.width < settings_.height) ||

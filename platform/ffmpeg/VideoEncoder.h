@@ -29,6 +29,8 @@ class VideoEncoder {
   /// Encodes one picture; what failed, or nothing.
   static std::optional<Error> tryOut(const H264Codec& codec, const std::string& node, const VideoSettings& settings);
 
+  /// libavcodec's name of it.
+  [[nodiscard]] std::string name() const;
   /// Whether a picture is wide where the track is tall, or the other way round.
   [[nodiscard]] bool liesAcross(const PixelBuffer& image) const;
   /// Pictures are turned by a quarter so that they fill the track, and the track turns them back when it is shown: a

@@ -7,6 +7,16 @@ std::optional<Error> WriterState::error() const {
   return error_;
 }
 
+std::string WriterState::videoEncoder() const {
+  std::lock_guard lock(mutex_);
+  return videoEncoder_;
+}
+
+void WriterState::setVideoEncoder(const std::string& name) {
+  std::lock_guard lock(mutex_);
+  videoEncoder_ = name;
+}
+
 void WriterState::fail(const Error& error) {
   std::lock_guard lock(mutex_);
   if (!error_) error_ = error;

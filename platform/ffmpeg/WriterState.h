@@ -35,7 +35,7 @@ using WriterItem = std::variant<QueuedSample, QueuedPictureTimes, SessionStart, 
 /// What a writer, its inputs and its encoder thread share: the status and the queue between them.
 ///
 /// Threading: thread-safe.
-class WriterState {
+class WriterState final : public AssetWriterCounts {
  public:
   /// Pictures that wait for the encoder: a tenth of a second at 60 per second.
   static constexpr size_t kMaximumPictures = 6;
@@ -57,7 +57,9 @@ class WriterState {
   /// Waits for items; empty when the writer goes away.
   std::vector<WriterItem> take();
   void close();
-  [[nodiscard]] uint64_t droppedPictures() const { return droppedPictures_.load(std::memory_order_relaxed); }
+  [[nodiscard]] uint64_t droppedPictures() const override { return droppedPictures_.load(std::memory_order_relaxed); }
+  [[nodiscard]] std::string videoEncoder() const override;
+  void setVideoEncoder(const std::string& name);
   /// A sample that was taken has been dealt with: there is room for the next.
   void sampleDone(MediaType type);
 
@@ -69,6 +71,7 @@ class WriterState {
   mutable std::mutex mutex_;
   std::condition_variable changed_;
   std::optional<Error> error_;
+  std::string videoEncoder_;
   std::vector<WriterItem> items_;
   size_t pictures_ = 0;  ///< queued or being encoded
   size_t audioSamples_ = 0;

@@ -4,7 +4,7 @@
 
 #include <string>
 
-#include "platform/base/Value.h"
+#include "platform/Entitlements.h"
 
 namespace qv::platform {
 
@@ -20,11 +20,11 @@ namespace qv::platform {
 /// logged; "users" of another type is too, and then the file grants nothing.
 ///
 /// Threading: thread-safe, blocking.
-class EntitlementStore {
+class EntitlementStore final : public EntitlementQuery {
  public:
   EntitlementStore(const std::string& deviceRoot, uid_t sessionUser);
-  /// Of a bundle that this user runs, without "users". Empty where there are none.
-  [[nodiscard]] Dictionary entitlementsForBundle(const std::string& bundleIdentifier, uid_t user) const;
+  /// Without "users".
+  [[nodiscard]] Dictionary entitlementsForBundle(const std::string& bundleIdentifier, uid_t user) const override;
 
  private:
   [[nodiscard]] Dictionary read(const std::string& bundleIdentifier) const;

@@ -35,6 +35,7 @@ void LinuxPlatform::addTo(Platform& platform) {
   platform.metrics = &metrics_;
   platform.reachability = &reachability_;
   platform.screenReader = &screenReader_;
+  platform.entitlements = &entitlements_;
 }
 
 std::optional<uint64_t> LinuxPlatform::watchedFreeSpace() {

@@ -56,7 +56,7 @@ class LinuxPlatform {
   LinuxPlatform& operator=(const LinuxPlatform&) = delete;
 
   /// Sets the device root, fileSystem, bundles, localization, preferences, deviceInfo,
-  /// purgeableSpace, photoLibrary, metrics, reachability and screenReader.
+  /// purgeableSpace, photoLibrary, metrics, reachability, screenReader and entitlements.
   void addTo(Platform& platform);
   /// Fills in a peer's bundle identifier, entitlements and identity. It borrows this object, as the identities do. A
   /// process that has ended, or whose executable lies in no bundle or was deleted, keeps none of them; one whose

@@ -30,8 +30,10 @@ BusDriver::BusDriver(std::shared_ptr<IPCContext> context, FileDescriptor socket,
       socket_(std::move(socket)) {}
 
 void BusDriver::setExportedInterface(const IPCInterface& interface) {
-  exported_ = InterfaceTable::shared(interface);
-  exportedMethods_ = exported_->methods(&BusDriver::onMethod);
+  std::erase_if(exported_, [&](const Exported& other) { return other.table->name() == interface.name; });
+  auto table = InterfaceTable::shared(interface);
+  auto methods = table->methods(&BusDriver::onMethod);
+  exported_.push_back({this, std::move(table), std::move(methods)});
 }
 
 void BusDriver::post(void (BusDriver::*work)()) {
@@ -79,8 +81,9 @@ int BusDriver::prepareBus() {
     if ((r = addBusObject(bus)) < 0) return r;
   }
   if ((r = sd_bus_add_filter(bus, nullptr, &BusDriver::onMessage, this)) < 0) return r;
-  if (exported_) {
-    r = sd_bus_add_object_vtable(bus, nullptr, kObjectPath, exported_->name().c_str(), exportedMethods_.data(), this);
+  for (Exported& exported : exported_) {
+    r = sd_bus_add_object_vtable(bus, nullptr, kObjectPath, exported.table->name().c_str(), exported.methods.data(),
+                                 &exported);
     if (r < 0) return r;
   }
   if ((r = sd_bus_start(bus)) < 0) return r;

@@ -2,6 +2,7 @@
 
 #include <atomic>
 #include <chrono>
+#include <list>
 #include <memory>
 #include <optional>
 #include <string>
@@ -72,6 +73,12 @@ class BusDriver final : public std::enable_shared_from_this<BusDriver> {
   void close();
 
  private:
+  /// An interface that is served here. sd-bus keeps pointers to it and to its methods.
+  struct Exported {
+    BusDriver* driver;
+    std::shared_ptr<const InterfaceTable> table;
+    std::vector<sd_bus_vtable> methods;
+  };
   struct SentCall {
     uint64_t id;
     std::shared_ptr<const InterfaceTable> table;
@@ -133,9 +140,9 @@ class BusDriver final : public std::enable_shared_from_this<BusDriver> {
   void sendDrainMarker();
 
   // BusDriver_receive.cpp
-  static int onMethod(sd_bus_message* message, void* driver, sd_bus_error* error);
+  static int onMethod(sd_bus_message* message, void* exported, sd_bus_error* error);
   static int onMessage(sd_bus_message* message, void* driver, sd_bus_error* error);
-  int receiveCall(sd_bus_message* message, sd_bus_error* error);
+  int receiveCall(const Exported& exported, sd_bus_message* message, sd_bus_error* error);
   void receiveReply(sd_bus_message* message);
   void endCall(uint64_t id, std::variant<IPCArguments, Error> outcome);
 
@@ -153,8 +160,7 @@ class BusDriver final : public std::enable_shared_from_this<BusDriver> {
   std::unique_ptr<GatedInput> input_;
   Deadline deadline_;
   EventLoop::Timer pause_;  ///< while the peer is not read because of its user's quota
-  std::shared_ptr<const InterfaceTable> exported_;
-  std::vector<sd_bus_vtable> exportedMethods_;
+  std::list<Exported> exported_;
   BusHandle bus_;
   EventLoop::Watch watch_;
   uint32_t watchedEvents_ = 0;

@@ -31,8 +31,9 @@ bool isGarbage(int decodingError) {
 
 }  // namespace
 
-int BusDriver::onMethod(sd_bus_message* message, void* driver, sd_bus_error* error) {
-  return static_cast<BusDriver*>(driver)->receiveCall(message, error);
+int BusDriver::onMethod(sd_bus_message* message, void* exported, sd_bus_error* error) {
+  const Exported& of = *static_cast<Exported*>(exported);
+  return of.driver->receiveCall(of, message, error);
 }
 
 int BusDriver::onMessage(sd_bus_message* message, void* driver, sd_bus_error*) {
@@ -44,9 +45,9 @@ int BusDriver::onMessage(sd_bus_message* message, void* driver, sd_bus_error*) {
   return 1;
 }
 
-int BusDriver::receiveCall(sd_bus_message* message, sd_bus_error* error) {
+int BusDriver::receiveCall(const Exported& exported, sd_bus_message* message, sd_bus_error* error) {
   const char* member = sd_bus_message_get_member(message);
-  const IPCOperation* operation = member ? exported_->operation(member) : nullptr;
+  const IPCOperation* operation = member ? exported.table->operation(member) : nullptr;
   if (!operation) return sd_bus_error_set(error, SD_BUS_ERROR_UNKNOWN_METHOD, "unknown operation");
   if (received_.size() >= context_->options.maximumUnansweredCalls) {
     return sd_bus_error_set(error, SD_BUS_ERROR_LIMITS_EXCEEDED, "too many unanswered calls");
@@ -62,7 +63,7 @@ int BusDriver::receiveCall(sd_bus_message* message, sd_bus_error* error) {
     received_.emplace(token, ReceivedCall{MessageHandle(sd_bus_message_ref(message)), operation});
   }
   if (const auto client = client_.lock())
-    client->driverReceivedCall(exported_, *operation, std::move(arguments), token);
+    client->driverReceivedCall(exported.table, *operation, std::move(arguments), token);
   return 1;
 }
 

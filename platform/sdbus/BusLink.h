@@ -16,7 +16,9 @@ namespace qv::platform::sdbus {
 class BusLinkOwner {
  public:
   virtual ~BusLinkOwner() = default;
-  virtual void linkReceivedCall(const IPCOperation& operation, IPCArguments arguments, IPCReply reply) = 0;
+  /// `interface` is the name of the exported interface that the operation belongs to.
+  virtual void linkReceivedCall(const std::string& interface, const IPCOperation& operation, IPCArguments arguments,
+                                IPCReply reply) = 0;
   /// Told once. `mayReturn`: a named service that went away.
   virtual void linkEnded(bool mayReturn) = 0;
 };

@@ -47,7 +47,8 @@ void BusLink::driverReceivedCall(std::shared_ptr<const InterfaceTable> table, co
         const auto strong = owner.lock();
         if (!strong) return;
         const bool handsReply = operation.reply && answer;
-        strong->linkReceivedCall(operation, std::move(arguments), handsReply ? IPCReply(answer) : IPCReply());
+        strong->linkReceivedCall(table->name(), operation, std::move(arguments),
+                                 handsReply ? IPCReply(answer) : IPCReply());
         // Whoever asks for an answer to a one-way operation learns that it was handled.
         if (answer && !operation.reply) answer->succeed({});
         answer.reset();

@@ -21,7 +21,7 @@ void SdBusIPCConnection::setExportedInterface(const IPCInterface& interface,
                                               std::shared_ptr<IPCExportedObject> object) {
   link_->setExportedInterface(interface);
   std::lock_guard lock(mutex_);
-  exportedObject_ = std::move(object);
+  exportedObjects_[interface.name].swap(object);
 }
 
 void SdBusIPCConnection::setRemoteInterface(const IPCInterface& interface) { link_->setRemoteInterface(interface); }
@@ -55,11 +55,13 @@ void SdBusIPCConnection::call(std::string_view member, IPCArguments arguments, C
   link_->call(member, std::move(arguments), std::move(completion), std::move(errorHandler));
 }
 
-void SdBusIPCConnection::linkReceivedCall(const IPCOperation& operation, IPCArguments arguments, IPCReply reply) {
+void SdBusIPCConnection::linkReceivedCall(const std::string& interface, const IPCOperation& operation,
+                                          IPCArguments arguments, IPCReply reply) {
   std::shared_ptr<IPCExportedObject> object;
   {
     std::lock_guard lock(mutex_);
-    if (!invalidated_) object = exportedObject_;
+    const auto found = exportedObjects_.find(interface);
+    if (!invalidated_ && found != exportedObjects_.end()) object = found->second;
   }
   if (object) object->handleCall(shared_from_this(), operation, std::move(arguments), std::move(reply));
 }
@@ -68,12 +70,12 @@ void SdBusIPCConnection::linkReceivedCall(const IPCOperation& operation, IPCArgu
 void SdBusIPCConnection::linkEnded(bool mayReturn) {
   std::function<void()> interruption;
   std::function<void()> invalidation;
-  std::shared_ptr<IPCExportedObject> object;
+  decltype(exportedObjects_) objects;  // let go of without the lock
   {
     std::lock_guard lock(mutex_);
     interruption = std::exchange(interruptionHandler_, nullptr);
     invalidation = std::exchange(invalidationHandler_, nullptr);
-    object = std::exchange(exportedObject_, nullptr);
+    objects.swap(exportedObjects_);
   }
   if (mayReturn && interruption) {
     interruption();

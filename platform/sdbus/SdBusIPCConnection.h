@@ -1,14 +1,16 @@
 #pragma once
 
+#include <map>
 #include <memory>
 #include <mutex>
+#include <string>
 
 #include "platform/IPC.h"
 #include "platform/sdbus/BusLink.h"
 
 namespace qv::platform::sdbus {
 
-/// A connection as its owner holds it: handlers, exported object and peer. The link below does the
+/// A connection as its owner holds it: handlers, exported objects and peer. The link below does the
 /// sending and receiving, and outlives it until what was sent is out.
 ///
 /// Threading: thread-safe.
@@ -29,7 +31,8 @@ class SdBusIPCConnection final : public IPCConnection,
   void invalidate() override;
   void call(std::string_view member, IPCArguments arguments, Completion completion, ErrorHandler errorHandler) override;
 
-  void linkReceivedCall(const IPCOperation& operation, IPCArguments arguments, IPCReply reply) override;
+  void linkReceivedCall(const std::string& interface, const IPCOperation& operation, IPCArguments arguments,
+                        IPCReply reply) override;
   void linkEnded(bool mayReturn) override;
 
  private:
@@ -38,7 +41,7 @@ class SdBusIPCConnection final : public IPCConnection,
   const std::shared_ptr<BusLink> link_;
   const IPCPeer peer_;
   std::mutex mutex_;
-  std::shared_ptr<IPCExportedObject> exportedObject_;
+  std::map<std::string, std::shared_ptr<IPCExportedObject>> exportedObjects_;  ///< by their interfaces
   std::function<void()> interruptionHandler_;
   std::function<void()> invalidationHandler_;
   bool invalidated_ = false;

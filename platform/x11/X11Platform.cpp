@@ -49,6 +49,10 @@ ScreenCaptureService& X11Platform::screenCapture() { return services_->screenCap
 ApplicationService& X11Platform::applications() { return services_->applications; }
 RenderServer& X11Platform::renderServer() { return services_->renderServer; }
 UserAlertService& X11Platform::alerts() { return services_->alerts; }
+std::optional<Error> X11Platform::whyNotThere() const {
+  return QueryConnection(services_->queries->display()).connect();
+}
+
 std::shared_ptr<DisplayLayoutMonitor> X11Platform::createLayoutMonitor() {
   return std::make_shared<X11DisplayLayoutMonitor>(services_->queries->display(), services_->bundleOfProcess);
 }

@@ -44,6 +44,8 @@ class X11Platform {
   RenderServer& renderServer();
   UserAlertService& alerts();
   std::shared_ptr<DisplayLayoutMonitor> createLayoutMonitor();
+  /// Nothing where the server answers now. It is asked by a connection of its own.
+  [[nodiscard]] std::optional<Error> whyNotThere() const;
 
  private:
   struct Services;

@@ -17,6 +17,7 @@ SCREEN = (1920, 1080)
 KEPT = ("PATH", "LD_LIBRARY_PATH", "ASAN_OPTIONS", "LSAN_OPTIONS", "UBSAN_OPTIONS", "TSAN_OPTIONS")
 SOCKET = "com.tarnwick.quorveld"
 SYSTEM_UI = "com.example.quorvel.system-ui"
+TOOL = "com.tarnwick.quorvelctl"
 GAME = "examples/game/Game.app/bin/quorvel-example-game"
 
 
@@ -65,7 +66,8 @@ class Device:
         os.makedirs(self.media)
         shutil.copytree(os.path.join(SOURCE, "framework/Quorvel.framework"), self.framework)
         self.write_device(audioCaptureDevice=True)
-        bundles = [os.path.join(self.build, "examples/game"), os.path.join(self.build, "examples/system-ui"), self.bundles]
+        bundles = [*(os.path.join(self.build, name) for name in ("examples/game", "examples/system-ui", "tools/quorvelctl")),
+                   self.bundles]
         self.environment = {**{name: os.environ[name] for name in KEPT if name in os.environ},
                             "LC_ALL": "C.UTF-8", "LANGUAGE": "en", "HOME": self.directory, "TMPDIR": self.directory,
                             "XDG_RUNTIME_DIR": self.directory, "NO_AT_BRIDGE": "1",
@@ -136,9 +138,9 @@ class Device:
         self.write_device(internalBuild=True)
         self.write_preferences({"QVSuppressAlert": True})
 
-    def allow_system_recordings(self):
-        """To the example's system UI."""
-        self.write(f"etc/quorvel/entitlements/{SYSTEM_UI}.json", {"com.tarnwick.private.quorvel": True})
+    def allow_system_recordings(self, bundle=SYSTEM_UI):
+        """To the example's system UI, or to another bundle."""
+        self.write(f"etc/quorvel/entitlements/{bundle}.json", {"com.tarnwick.private.quorvel": True})
 
     def install(self, name, identifier, program):
         """An application of that bundle identifier; its executable."""

@@ -13,12 +13,11 @@ namespace qv::client {
 using platform::IPCArguments;
 
 DaemonLink::DaemonLink(platform::IPCService& ipc, platform::TimerService& timers,
-                       std::shared_ptr<platform::SerialQueue> queue,
-                       std::shared_ptr<platform::IPCExportedObject> exported, Delegate delegate)
+                       std::shared_ptr<platform::SerialQueue> queue, Interfaces interfaces, Delegate delegate)
     : ipc_(ipc),
       timers_(timers),
       queue_(std::move(queue)),
-      exported_(std::move(exported)),
+      interfaces_(std::move(interfaces)),
       delegate_(std::move(delegate)) {}
 
 bool DaemonLink::ensureConnected() {
@@ -37,8 +36,8 @@ bool DaemonLink::ensureConnected() {
     if (const auto self = weak.lock()) self->lose(generation);
   };
   connection_->setTargetQueue(*queue_);
-  connection_->setExportedInterface(clientProtocol(), exported_);
-  connection_->setRemoteInterface(daemonProtocol());
+  if (interfaces_.callbacks) connection_->setExportedInterface(clientProtocol(), interfaces_.callbacks);
+  connection_->setRemoteInterface(interfaces_.remote);
   connection_->setInterruptionHandler(onLoss);
   connection_->setInvalidationHandler(onLoss);
   connection_->resume();
@@ -52,7 +51,7 @@ void DaemonLink::request(OutgoingCall call, Completion completion, FailureHandle
   if (!ensureConnected()) return onFailure(libraryError(quorvel::kErrorConnectionInvalid));
   const uint64_t identifier = ++lastRequest_;
   outstanding_[identifier] = std::move(onFailure);
-  const size_t replyCount = daemonProtocol().operation(call.member)->reply->size();
+  const size_t replyCount = interfaces_.remote.operation(call.member)->reply->size();
   auto completed = [weak = weak_from_this(), identifier, replyCount,
                     completion = std::move(completion)](const IPCArguments& reply) {
     if (const auto self = weak.lock()) {

@@ -24,6 +24,10 @@ namespace qv::client {
 /// Threading: on its queue only, which its callbacks run on too.
 class DaemonLink : public std::enable_shared_from_this<DaemonLink> {
  public:
+  struct Interfaces {
+    const platform::IPCInterface& remote;                    ///< the one that is called; it outlives the link
+    std::shared_ptr<platform::IPCExportedObject> callbacks;  ///< what the daemon calls; nothing where it calls nothing
+  };
   struct Delegate {
     /// A connection stands: the first one, or one after a loss.
     std::function<void()> connected;
@@ -37,7 +41,7 @@ class DaemonLink : public std::enable_shared_from_this<DaemonLink> {
   static constexpr std::chrono::milliseconds kLongestRetry{30'000};
 
   DaemonLink(platform::IPCService& ipc, platform::TimerService& timers, std::shared_ptr<platform::SerialQueue> queue,
-             std::shared_ptr<platform::IPCExportedObject> exported, Delegate delegate);
+             Interfaces interfaces, Delegate delegate);
 
   /// For an operation with a reply; `completion` gets as many values as the operation's table says.
   void request(OutgoingCall call, Completion completion, FailureHandler onFailure);
@@ -56,7 +60,7 @@ class DaemonLink : public std::enable_shared_from_this<DaemonLink> {
   platform::IPCService& ipc_;
   platform::TimerService& timers_;
   const std::shared_ptr<platform::SerialQueue> queue_;
-  const std::shared_ptr<platform::IPCExportedObject> exported_;
+  const Interfaces interfaces_;
   const Delegate delegate_;
   std::shared_ptr<platform::IPCConnection> connection_;
   uint64_t generation_ = 0;  // of the connection, so that a late word of a former one is known

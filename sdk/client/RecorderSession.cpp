@@ -47,8 +47,9 @@ std::shared_ptr<RecorderSession> RecorderSession::create(platform::IPCService& i
   delegate.lost = [weak] {
     if (const auto self = weak.lock()) self->lost();
   };
-  session->link_ = std::make_shared<DaemonLink>(ipc, timers, std::move(queue), std::make_shared<DaemonCalls>(weak),
-                                                std::move(delegate));
+  session->link_ = std::make_shared<DaemonLink>(
+      ipc, timers, std::move(queue), DaemonLink::Interfaces{daemonProtocol(), std::make_shared<DaemonCalls>(weak)},
+      std::move(delegate));
   return session;
 }
 

@@ -5,12 +5,13 @@
 #include "platform/threads/Executor.h"
 #include "platform/threads/Timer.h"
 #include "sdk/client/RecorderClient.h"
+#include "sdk/client/StatusClient.h"
 
 namespace quorvel {
 
 namespace {
 
-/// One messaging service, with its thread, for all recorders of the process; it goes with the last.
+/// One messaging service, with its thread, for all that the process has of this library; it goes with the last.
 std::shared_ptr<qv::platform::IPCService> sharedMessaging() {
   static std::mutex mutex;
   static std::weak_ptr<qv::platform::IPCService> shared;
@@ -30,6 +31,11 @@ std::shared_ptr<qv::platform::IPCService> sharedMessaging() {
 std::unique_ptr<Recorder> Recorder::create(RecorderOptions options) {
   return std::make_unique<qv::client::RecorderClient>(sharedMessaging(), qv::platform::systemTimers(),
                                                       qv::platform::globalQueue(), std::move(options));
+}
+
+std::unique_ptr<StatusReader> StatusReader::create() {
+  return std::make_unique<qv::client::StatusClient>(sharedMessaging(), qv::platform::systemTimers(),
+                                                    qv::platform::globalQueue());
 }
 
 }  // namespace quorvel

@@ -1,5 +1,6 @@
 #pragma once
 
+#include <functional>
 #include <memory>
 #include <string>
 
@@ -9,7 +10,7 @@ namespace qv::fakes {
 
 /// Accepts every connection, with `object` exported, and keeps it.
 ///
-/// Threading: thread-safe; `accepts` is set before anybody connects.
+/// Threading: thread-safe; `accepts` and `configure` are set before anybody connects.
 class AcceptingDelegate final : public platform::IPCListenerDelegate {
  public:
   AcceptingDelegate(const platform::IPCInterface& exported, const platform::IPCInterface& remote)
@@ -21,11 +22,13 @@ class AcceptingDelegate final : public platform::IPCListenerDelegate {
     connection->setRemoteInterface(remote_);
     connection->setInvalidationHandler([events = events_] { events->add("invalidated"); });
     connection->setInterruptionHandler([events = events_] { events->add("interrupted"); });
+    if (configure) configure(*connection);
     connection->resume();
     connections.add(connection);
     return true;
   }
   bool accepts = true;
+  std::function<void(platform::IPCConnection&)> configure;  ///< before the connection is resumed
   const std::shared_ptr<RecordingExportedObject> object = std::make_shared<RecordingExportedObject>();
   kit::Events<std::shared_ptr<platform::IPCConnection>> connections;
 

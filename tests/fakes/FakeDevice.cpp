@@ -31,6 +31,8 @@ FakeDevice::FakeDevice() {
   platform.photoLibrary = &photoLibrary;
   platform.metrics = &metrics;
   platform.extensions = &extensions;
+  platform.services = &services;
+  platform.entitlements = &entitlements;
   disk.addDirectory(kStore);
   disk.setFreeSize(1'000'000'000);
 }

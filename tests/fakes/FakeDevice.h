@@ -60,6 +60,8 @@ struct FakeDevice {
   FakePhotoLibrary photoLibrary{disk};
   FakeMetrics metrics;
   FakeExtensionService extensions{executor};
+  FakeDeviceServices services;
+  FakeEntitlements entitlements;
   platform::Platform platform;
   QVTemporaryFiles files{platform};
   QVBundleTexts texts{platform};

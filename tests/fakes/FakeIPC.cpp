@@ -120,16 +120,16 @@ void FakeIPCConnection::receiveCall(const std::string& interface, const std::str
     const auto self = weak.lock();
     if (self) self->sendToOther([serial, with](FakeIPCConnection& caller) { caller.receiveAnswer(serial, with); });
   };
-  const IPCOperation* operation = exportedInterface_.name == interface ? exportedInterface_.operation(member) : nullptr;
-  const auto object = exportedObject_;
-  if (!operation || !object) return answer(errorReply(kUnknownMethodErrorName, member));
+  const Exported exported = exported_[interface];
+  const IPCOperation* operation = exported.interface.operation(member);
+  if (!operation || !exported.object) return answer(errorReply(kUnknownMethodErrorName, member));
   IPCReply reply;
   if (operation->reply) {
     reply = IPCReply(std::make_shared<ReplySink>(answer));
   } else {
     answer(IPCArguments{});
   }
-  object->handleCall(shared_from_this(), *operation, std::move(arguments), std::move(reply));
+  exported.object->handleCall(shared_from_this(), *operation, std::move(arguments), std::move(reply));
 }
 
 void FakeIPCConnection::receiveAnswer(uint64_t serial, const Result<IPCArguments>& answer) {
@@ -158,7 +158,7 @@ void FakeIPCConnection::end(bool byPeer) {
   interruptionHandler_ = invalidationHandler_ = nullptr;
   if (!byPeer) sendToOther([](FakeIPCConnection& other) { other.end(true); });
   // Last: it may own this very connection.
-  const auto released = std::move(exportedObject_);
+  const auto released = std::move(exported_);
 }
 
 void RecordingExportedObject::handleCall(const std::shared_ptr<platform::IPCConnection>&, const IPCOperation& operation,

@@ -37,8 +37,7 @@ class FakeIPCConnection final : public platform::IPCConnection, public std::enab
   const platform::IPCPeer& peer() const override { return peer_; }
   void setExportedInterface(const platform::IPCInterface& interface,
                             std::shared_ptr<platform::IPCExportedObject> object) override {
-    exportedInterface_ = interface;
-    exportedObject_ = std::move(object);
+    exported_[interface.name] = {interface, std::move(object)};
   }
   void setRemoteInterface(const platform::IPCInterface& interface) override { remoteInterface_ = interface; }
   void setInterruptionHandler(std::function<void()> handler) override { interruptionHandler_ = std::move(handler); }
@@ -70,8 +69,12 @@ class FakeIPCConnection final : public platform::IPCConnection, public std::enab
   std::weak_ptr<FakeIPCConnection> other_;
   bool resumed_ = false, ended_ = false;
   std::vector<std::function<void()>> inbox_;  ///< until it is resumed
-  platform::IPCInterface exportedInterface_, remoteInterface_;
-  std::shared_ptr<platform::IPCExportedObject> exportedObject_;
+  struct Exported {
+    platform::IPCInterface interface;
+    std::shared_ptr<platform::IPCExportedObject> object;
+  };
+  std::map<std::string, Exported> exported_;  ///< by interface
+  platform::IPCInterface remoteInterface_;
   std::function<void()> interruptionHandler_, invalidationHandler_;
   uint64_t nextSerial_ = 1;
   std::map<uint64_t, Pending> pending_;

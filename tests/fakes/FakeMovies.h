@@ -40,6 +40,11 @@ class FakeAssetWriterService final : public platform::AssetWriterService {
     bool realTime = false, ready = true;
     std::vector<platform::SampleBufferRef> samples;
   };
+  struct Counts final : platform::AssetWriterCounts {
+    std::string videoEncoder() const override { return "fake264"; }
+    uint64_t droppedPictures() const override { return dropped; }
+    uint64_t dropped = 0;
+  };
   /// What became of one writer; outlives it.
   struct Movie {
     platform::URL url;
@@ -52,12 +57,14 @@ class FakeAssetWriterService final : public platform::AssetWriterService {
     platform::MediaTime sessionEnd;
     std::function<void()> completion;
     bool startFails = false, finishFails = false;
+    std::shared_ptr<Counts> counts = std::make_shared<Counts>();
   };
   struct Writer final : platform::AssetWriter {
     Writer(FakeAssetWriterService& fake, std::shared_ptr<Movie> to) : service(fake), movie(std::move(to)) {}
     platform::AssetWriterStatus status() const override { return movie->status; }
     std::optional<platform::Error> error() const override { return movie->error; }
     const platform::URL& outputURL() const override { return movie->url; }
+    std::shared_ptr<const platform::AssetWriterCounts> counts() const override { return movie->counts; }
     void addInput(std::shared_ptr<platform::WriterInput> input) override {
       movie->inputs.push_back(std::static_pointer_cast<Input>(input));
     }

@@ -10,6 +10,8 @@
 #include <vector>
 
 #include "platform/Applications.h"
+#include "platform/DeviceServices.h"
+#include "platform/Entitlements.h"
 #include "platform/FileSystem.h"
 #include "platform/IPC.h"
 #include "platform/KeepAlive.h"
@@ -22,6 +24,27 @@
 #include "platform/UserAlert.h"
 
 namespace qv::fakes {
+
+/// Services that answer, until the test says otherwise.
+class FakeDeviceServices final : public platform::DeviceServicesQuery {
+ public:
+  platform::DeviceServices look() override {
+    ++looks;
+    return found;
+  }
+  platform::DeviceServices found{{"X11"}, {"PulseAudio"}, {"libavcodec"}};
+  int looks = 0;
+};
+
+/// By bundle identifier, for every user.
+class FakeEntitlements final : public platform::EntitlementQuery {
+ public:
+  [[nodiscard]] platform::Dictionary entitlementsForBundle(const std::string& bundle, uid_t) const override {
+    const auto found = all.find(bundle);
+    return found == all.end() ? platform::Dictionary() : found->second;
+  }
+  std::map<std::string, platform::Dictionary> all;
+};
 
 /// Alerts stay until the test answers them.
 class FakeUserAlerts final : public platform::UserAlertService {

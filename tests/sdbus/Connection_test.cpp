@@ -144,6 +144,20 @@ TEST_F(ConnectionTest, AnErrorReplyIsToldByItsName) {
   }
 }
 
+TEST_F(ConnectionTest, EachInterfaceHasItsObject) {
+  IPCInterface second = testInterface();
+  second.name += ".Second";
+  const auto object = std::make_shared<RecordingExportedObject>();
+  object->answer = [](const Call& served) { served.reply({Value("second")}); };
+  delegate_.object->answer = echo;
+  delegate_.configure = [&](IPCConnection& connection) { connection.setExportedInterface(second, object); };
+  listen();
+  const auto client = connectClient();
+  EXPECT_EQ(std::get<IPCArguments>(call(*client, "echo", {Value("first")})), IPCArguments{Value("first")});
+  client->setRemoteInterface(second);
+  EXPECT_EQ(std::get<IPCArguments>(call(*client, "echo", {Value("first")})), IPCArguments{Value("second")});
+}
+
 TEST_F(ConnectionTest, AnInterfaceThatCannotBeServedEndsTheConnection) {
   listen();
   const auto client = makeClient();
