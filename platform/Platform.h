@@ -25,6 +25,7 @@
 #include "platform/ScreenCapture.h"
 #include "platform/ScreenReader.h"
 #include "platform/Sounds.h"
+#include "platform/StatusBar.h"
 #include "platform/StoreLookup.h"
 #include "platform/UserAlert.h"
 #include "platform/threads/Clock.h"
@@ -57,6 +58,7 @@ struct Platform {
   ApplicationService* applications = nullptr;
   RenderServer* renderServer = nullptr;
   UserAlertService* userAlerts = nullptr;
+  StatusBarOverrideCoordinator* statusBar = nullptr;
   SystemSounds* sounds = nullptr;
   ScreenReader* screenReader = nullptr;
   FileSystem* fileSystem = nullptr;
