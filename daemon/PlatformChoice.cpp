@@ -136,12 +136,14 @@ void PlatformChoice::chooseScreen() {
     platform_.applications = &backends_->x11->applications();
     platform_.renderServer = &backends_->x11->renderServer();
     platform_.userAlerts = &backends_->x11->alerts();
+    platform_.statusBar = &backends_->x11->statusBar();
     backends_->layoutMonitor = backends_->x11->createLayoutMonitor();
   } else {
     platform_.screenCapture = &backends_->headless.screenCapture();
     platform_.applications = &backends_->headless.applications();
     platform_.renderServer = &backends_->headless.renderServer();
     platform_.userAlerts = &backends_->headless.userAlerts();
+    platform_.statusBar = &backends_->headless.statusBar();
   }
   QV_LOG(logs::kPlatform, "screen, applications and alerts: %s", backends_->x11 ? "X11" : "headless");
 }
