@@ -1,5 +1,6 @@
 #include "session/QVRecording.h"
 
+#include <algorithm>
 #include <utility>
 
 #include "platform/threads/Log.h"
@@ -36,6 +37,13 @@ bool QVRecording::microphoneEnabled() const {
 int32_t QVRecording::frontmostPIDForAudioTap() const {
   std::lock_guard lock(shouldStopLock_);
   return frontmostPIDForAudioTap_;
+}
+
+double QVRecording::recordedSeconds() const {
+  std::lock_guard lock(shouldStopLock_);
+  const bool goesOn = state_ == State::Running && !timing_.isInPause();
+  const auto end = timing_.endTime(goesOn ? context_->platform.clock->hostTime() : stoppedAt_);
+  return end.isValid() ? std::max(0.0, (end - firstSampleTimestamp_).seconds()) : 0;
 }
 
 void QVRecording::prepare(std::function<void()> handler) {

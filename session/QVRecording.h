@@ -67,6 +67,8 @@ class QVRecording final : public platform::ScreenCaptureControllerDelegate,
   [[nodiscard]] bool writesMovies() const;
   [[nodiscard]] bool microphoneEnabled() const;
   [[nodiscard]] int32_t frontmostPIDForAudioTap() const;
+  /// How long its pictures have been going on, without the pauses; 0 before the first. Thread-safe.
+  [[nodiscard]] double recordedSeconds() const;
 
   // --- Lifecycle, in this order. A handler does not run when the recording ends first: its answer tells that.
   void prepare(std::function<void()> handler);
