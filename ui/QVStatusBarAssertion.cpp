@@ -16,7 +16,8 @@ constexpr double kLongest = 1e12;  // seconds; more is no time that anybody sees
 }  // namespace
 
 void QVStatusBarAssertion::showDoubleHeightStatusBarWithPid(int32_t processID) {
-  QV_LOG(logs::kUI, "the indicator is shown, for process %d", processID);
+  QV_LOG(logs::kUI, "%s for process %d", coordinator ? "the indicator is shown" : "no indicator is to be shown",
+         processID);
   shown_ = {qvLocalizedRecordingDuration(0, paused), stringWithTimeInterval(0), paused};
   if (coordinator) assertion = coordinator->acquire(shown_, weak_from_this());
   tellTime();

@@ -6,6 +6,7 @@
 
 #include "platform/threads/Log.h"
 #include "platform/x11/CaptureSource.h"
+#include "platform/x11/IndicatorTraces.h"
 
 namespace qv::platform {
 namespace {
@@ -132,6 +133,8 @@ void IndicatorWindow::ensureWindow(XcbConnection& connection) {
   const xcb_atom_t kind = connection.atom("_NET_WM_WINDOW_TYPE_NOTIFICATION");  // shares the screen with nobody
   xcb_change_property(connection.get(), XCB_PROP_MODE_REPLACE, window_, connection.atom("_NET_WM_WINDOW_TYPE"),
                       XCB_ATOM_ATOM, 32, 1, &kind);
+  xcb_change_property(connection.get(), XCB_PROP_MODE_REPLACE, connection.root(), connection.atom(kIndicatorProperty),
+                      XCB_ATOM_WINDOW, 32, 1, &window_);
 }
 
 void IndicatorWindow::paint(XcbConnection& connection, uint8_t depth) {

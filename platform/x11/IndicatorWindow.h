@@ -15,7 +15,8 @@ namespace qv::platform {
 /// it, it is raised again 50 ms later, and it is made anew where another client has taken it away. It never has the
 /// keyboard. Its picture is the window's background, so the server repaints it by itself.
 ///
-/// It is no part of what is captured of an application's windows, but of the screen it is.
+/// It is no part of what is captured of an application's windows (a property of the root tells those who capture which
+/// window it is, see IndicatorTraces.h), but of the screen it is.
 ///
 /// Threading: as StatusBarOverrideAssertion. All that it does is done on its loop; its end waits for that.
 class IndicatorWindow final : public StatusBarOverrideAssertion, private DesktopWatchClient {

@@ -86,9 +86,11 @@ TEST_F(IndicatorTest, CoversWhateverIsShownButNotAnApplicationsPictureAndIsPress
   app_->raise(game);
   app_->fill(game, kBlue);
   EXPECT_TRUE(isSeenOver(kBlue)) << "it is raised again";
+  app_->setNoBackground(game);  // the server fills in what is on the screen, when the capture begins
   const auto movie = std::make_shared<kit::FrameRecorder>();
   const auto recording = capture(DisplayCloneMode::CloneContexts, {game}, movie);
   ASSERT_TRUE(movie->waitForFrames(1));
+  EXPECT_EQ(find(*movie->last()->image(), kRed).count, 0u);
   app_->fill(game, kGreen);  // what it paints while it is captured
   EXPECT_TRUE(movie->waitForPicture([](const PixelBuffer& image) {
     return find(image, kGreen).count == kit::XServer::kWidth * kStrip;
