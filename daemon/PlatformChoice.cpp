@@ -140,12 +140,14 @@ void PlatformChoice::chooseScreen() {
     platform_.applications = &backends_->x11->applications();
     platform_.renderServer = &backends_->x11->renderServer();
     platform_.userAlerts = &backends_->x11->alerts();
+    platform_.statusBar = &backends_->x11->statusBar();
     backends_->layoutMonitor = backends_->x11->createLayoutMonitor();
   } else {
     platform_.screenCapture = &backends_->headless.screenCapture();
     platform_.applications = &backends_->headless.applications();
     platform_.renderServer = &backends_->headless.renderServer();
     platform_.userAlerts = &backends_->headless.userAlerts();
+    platform_.statusBar = &backends_->headless.statusBar();
   }
   backends_->services.setDisplay(backends_->x11.get(), std::move(fault));
   platform_.services = &backends_->services;

@@ -34,6 +34,8 @@ QVRecordingManager::QVRecordingManager(platform::Platform& platform, QVCaptureMa
       foreground_(std::make_shared<ForegroundFollower>(*platform_.applications, sequence_)),
       layoutRule_(std::make_shared<DisplayLayoutRule>(
           sequence_, [this] { endRecordingsOfApplications(recordingError(errorcode::kContentResize)); })),
+      notices_(std::make_shared<RecordingNotices>(
+          context_, [this](const std::shared_ptr<QVRecording>& recording) { stopForUser(recording); })),
       sessions_(std::make_shared<SessionRegistry>(context_)),
       starts_(startServices()),
       purge_(context_,

@@ -10,6 +10,7 @@
 #include "daemon/ForegroundFollower.h"
 #include "daemon/MovieHandover.h"
 #include "daemon/QVBroadcastBook.h"
+#include "daemon/RecordingNotices.h"
 #include "daemon/RequestTable.h"
 #include "daemon/SessionAlerts.h"
 #include "daemon/SessionRegistry.h"
@@ -106,6 +107,9 @@ class QVRecordingManager final : public platform::IPCListenerDelegate,
   void stopRecordingSession(const Session& session, const std::function<void(QVRecording&)>& end);
   void stopCurrentRecordingSessionWithHandler();
   [[nodiscard]] MovieFate storeInPhotoLibrary(const std::string& owner) const;
+  /// The same for a recording that nothing waits for: its sound is mixed first.
+  [[nodiscard]] MovieFate saveInPhotoLibrary(const std::string& owner) const;
+  void stopForUser(const std::shared_ptr<QVRecording>& recording);
   void interruptOtherRecordingSessionAgainstSession(const Session& session);
   void endRecordingsOfApplications(const platform::Error& cause);
   void recordingStarted(const Session& session);
@@ -124,6 +128,7 @@ class QVRecordingManager final : public platform::IPCListenerDelegate,
   const std::shared_ptr<MovieHandover> handover_;
   const std::shared_ptr<ForegroundFollower> foreground_;
   const std::shared_ptr<DisplayLayoutRule> layoutRule_;
+  const std::shared_ptr<RecordingNotices> notices_;
   /// The connections of all clients. The one of an application with a session is its proxy's.
   std::map<std::shared_ptr<platform::IPCConnection>, std::optional<std::string>> connections_;
   const std::shared_ptr<SessionRegistry> sessions_;

@@ -62,6 +62,7 @@ void QVRecordingManager::adoptConnection(const Session& session, const std::stri
     starts_.cancelPendingStart(bundleID);
   }
   session->setClientProxy(std::make_shared<QVClientProxy>(context_->errors, bundleID, connection));
+  if (Caller{connection}.isPrivileged()) notices_->systemClientConnected(session->clientProxy());
 }
 
 /// Another program is nobody's application, and goes. One that was updated while it runs is still the application: what

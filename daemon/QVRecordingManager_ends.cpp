@@ -45,6 +45,25 @@ MovieFate QVRecordingManager::storeInPhotoLibrary(const std::string& owner) cons
   };
 }
 
+MovieFate QVRecordingManager::saveInPhotoLibrary(const std::string& owner) const {
+  return [handover = handover_, owner](const OutputResult& made, auto done) {
+    if (made.failure) return moviefate::handTo(owner)(made, done);
+    handover->saveInterrupted(made.movie, owner, [done](const auto& kept, const auto&) { done(kept); });
+  };
+}
+
+/// Nothing is lost: an application is handed its movie, and that of a system recording goes to the photo library.
+void QVRecordingManager::stopForUser(const std::shared_ptr<QVRecording>& recording) {
+  const RecordingSettings& settings = recording->settings();
+  const Session session = sessions_->find(settings.bundleID);
+  if (!session || session->recording() != recording) return;
+  stopRecordingSession(session, [this, &settings](QVRecording& stopped) {
+    stopped.end(
+        {.cause = recordingError(errorcode::kInterrupted),
+         .movie = settings.systemRecording ? saveInPhotoLibrary(settings.owner) : moviefate::handTo(settings.owner)});
+  });
+}
+
 void QVRecordingManager::interruptOtherRecordingSessionAgainstSession(const Session& session) {
   QV_LOG(logs::kDaemon, "QVRecordingManager:interruptRecordingSessions");
   for (const Session& other : sessions_->recordingSessions()) {
@@ -64,6 +83,7 @@ void QVRecordingManager::endRecordingsOfApplications(const Error& cause) {
 
 void QVRecordingManager::recordingStarted(const Session& session) {
   if (!session->isRecording()) return;
+  notices_->recordingStarted(session->recording());
   if (session->isSystemRecording()) {
     foreground_->follow(session->recording());
   } else {
@@ -72,6 +92,7 @@ void QVRecordingManager::recordingStarted(const Session& session) {
 }
 
 void QVRecordingManager::recordingSessionWillStop(const Session&, const std::shared_ptr<QVRecording>& recording) {
+  notices_->recordingWillStop(*recording);
   if (recording->settings().systemRecording) foreground_->clearSystemRecordingUI(*recording);
   layoutRule_->ignore();
 }

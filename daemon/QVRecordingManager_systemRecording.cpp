@@ -25,12 +25,9 @@ void QVRecordingManager::stopSystemRecordingWithHandler(const std::function<void
 
 void QVRecordingManager::stopSystemRecordingWithInterruption() {
   sequence_.async(weak_from_this(), [](QVRecordingManager& manager) {
-    manager.stopSystemRecordingWithHandler([handover = manager.handover_](QVRecording& recording) {
-      const auto save = [handover, owner = recording.settings().owner](const OutputResult& made, auto done) {
-        if (made.failure) return moviefate::handTo(owner)(made, done);
-        handover->saveInterrupted(made.movie, owner, [done](const auto& kept, const auto&) { done(kept); });
-      };
-      recording.end({.cause = recordingError(errorcode::kInterrupted), .movie = save});
+    manager.stopSystemRecordingWithHandler([&manager](QVRecording& recording) {
+      recording.end({.cause = recordingError(errorcode::kInterrupted),
+                     .movie = manager.saveInPhotoLibrary(recording.settings().owner)});
     });
   });
 }

@@ -27,6 +27,7 @@
 #include "platform/ScreenCapture.h"
 #include "platform/ScreenReader.h"
 #include "platform/Sounds.h"
+#include "platform/StatusBar.h"
 #include "platform/StoreLookup.h"
 #include "platform/UserAlert.h"
 #include "platform/threads/Clock.h"
@@ -59,6 +60,7 @@ struct Platform {
   ApplicationService* applications = nullptr;
   RenderServer* renderServer = nullptr;
   UserAlertService* userAlerts = nullptr;
+  StatusBarOverrideCoordinator* statusBar = nullptr;
   SystemSounds* sounds = nullptr;
   ScreenReader* screenReader = nullptr;
   FileSystem* fileSystem = nullptr;

@@ -71,7 +71,7 @@ void QVClientProxy::recordingLockInterrupted(const platform::Error& error) {
 }
 
 void QVClientProxy::recordingTimerDidUpdate(const std::string& time) {
-  QV_LOG(logs::kDaemon, "QVClientProxy:recordingTimerDidUpdate:");
+  QV_LOG_DEBUG(logs::kDaemon, "QVClientProxy:recordingTimerDidUpdate:");
   send(callback::RecordingTimerDidUpdate{time},
        "QVClientProxy:recordingTimerDidUpdate: error getting remote proxy: %d");
 }

@@ -28,7 +28,7 @@ class QVClientProxy {
   void setConnection(const std::shared_ptr<platform::IPCConnection>& connection) { connection_.store(connection); }
   [[nodiscard]] const std::string& bundleIdentifier() const { return bundleIdentifier_; }
 
-  /// Offered, not called by this daemon.
+  /// For the system's own clients: whether anything is recorded.
   void updateScreenRecordingState(bool recording);
   void stopRecordingWithError(const std::optional<platform::Error>& error,
                               const std::optional<platform::URL>& movieURL);
@@ -39,7 +39,7 @@ class QVClientProxy {
   /// The sum of the pauses before the samples that follow.
   void captureTimelineDidChange(platform::MediaTime pauses);
   void recordingLockInterrupted(const platform::Error& error);
-  /// Offered, not called by this daemon.
+  /// For the system's own clients: how long, as "1:05".
   void recordingTimerDidUpdate(const std::string& time);
 
  private:

@@ -1,5 +1,6 @@
 #include "session/QVRecording.h"
 
+#include <algorithm>
 #include <utility>
 
 #include "platform/threads/Log.h"
@@ -46,6 +47,13 @@ RecordingFigures QVRecording::figures() const {
   std::lock_guard lock(shouldStopLock_);
   figures.recorded = timing_.recorded(firstSampleTimestamp_);
   return figures;
+}
+
+double QVRecording::recordedSeconds() const {
+  std::lock_guard lock(shouldStopLock_);
+  const bool goesOn = state_ == State::Running && !timing_.isInPause();
+  const auto end = timing_.endTime(goesOn ? context_->platform.clock->hostTime() : stoppedAt_);
+  return end.isValid() ? std::max(0.0, (end - firstSampleTimestamp_).seconds()) : 0;
 }
 
 void QVRecording::prepare(std::function<void()> handler) {

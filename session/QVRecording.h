@@ -78,6 +78,8 @@ class QVRecording final : public platform::ScreenCaptureControllerDelegate,
   [[nodiscard]] int32_t frontmostPIDForAudioTap() const;
   /// So far. Sequence only; it looks at the file.
   [[nodiscard]] RecordingFigures figures() const;
+  /// How long its pictures have been going on, without the pauses; 0 before the first. Thread-safe.
+  [[nodiscard]] double recordedSeconds() const;
 
   // --- Lifecycle, in this order. A handler does not run when the recording ends first: its answer tells that.
   void prepare(std::function<void()> handler);

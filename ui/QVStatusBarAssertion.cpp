@@ -3,19 +3,57 @@
 #include <chrono>
 #include <cstdio>
 
+#include "platform/threads/Log.h"
 #include "ui/FormattedText.h"
 
 namespace qv {
+
+namespace logs = platform::logs;
 
 namespace {
 constexpr std::chrono::milliseconds kTick{500};
 constexpr double kLongest = 1e12;  // seconds; more is no time that anybody sees
 }  // namespace
 
-void QVStatusBarAssertion::showDoubleHeightStatusBarWithPid(int32_t) {}
-void QVStatusBarAssertion::invalidateDoubleHeightStatusBar() {}
-void QVStatusBarAssertion::updateDoubleHeightStatusBarWithDuration(double, bool) {}
-void QVStatusBarAssertion::updateStatusStringWithTimer(platform::TimerHandle&) {}
+void QVStatusBarAssertion::showDoubleHeightStatusBarWithPid(int32_t processID) {
+  QV_LOG(logs::kUI, "%s for process %d", coordinator ? "the indicator is shown" : "no indicator is to be shown",
+         processID);
+  shown_ = {qvLocalizedRecordingDuration(0, paused), stringWithTimeInterval(0), paused};
+  if (coordinator) assertion = coordinator->acquire(shown_, weak_from_this());
+  tellTime();
+  startRepeatingTimer();
+}
+
+void QVStatusBarAssertion::invalidateDoubleHeightStatusBar() {
+  timer_.reset();
+  assertion.reset();
+}
+
+void QVStatusBarAssertion::updateDoubleHeightStatusBarWithDuration(double duration, bool isPaused) {
+  const auto former = shown_;
+  if (paused != isPaused) shown_.text = qvLocalizedRecordingDuration(duration, isPaused);  // read from files
+  shown_.isPaused = paused = isPaused;
+  shown_.time = stringWithTimeInterval(duration);
+  if (assertion && shown_ != former) assertion->update(shown_);
+  if (shown_.time != former.time) tellTime();
+}
+
+void QVStatusBarAssertion::updateStatusStringWithTimer(platform::TimerHandle&) {
+  const auto owner = assertionDelegate.lock();
+  if (!owner) return;
+  const auto progress = owner->statusBarAssertionProgress();
+  updateDoubleHeightStatusBarWithDuration(progress.seconds, progress.isPaused);
+}
+
+void QVStatusBarAssertion::tellTime() {
+  if (const auto owner = assertionDelegate.lock()) owner->statusBarAssertionDidUpdateTime(shown_.time);
+}
+
+void QVStatusBarAssertion::statusBarOverrideWasPressed() {
+  platform_.mainQueue->async(weak_from_this(), [](QVStatusBarAssertion& self) {
+    if (const auto owner = self.assertionDelegate.lock()) owner->statusBarAssertionWasPressed();
+  });
+}
 
 void QVStatusBarAssertion::startRepeatingTimer() {
   platform_.mainQueue->async(weak_from_this(), [](QVStatusBarAssertion& self) {

@@ -13,37 +13,51 @@
 
 namespace qv {
 
-/// The owner of an indicator, to be told about it.
+/// The owner of an indicator: knows what is to be told, and is told what happens to it.
 ///
 /// Threading: called on the main queue.
 class QVStatusBarAssertionDelegate {
  public:
   virtual ~QVStatusBarAssertionDelegate() = default;
+  struct Progress {
+    double seconds = 0;  ///< recorded so far, without pauses
+    bool isPaused = false;
+  };
+  [[nodiscard]] virtual Progress statusBarAssertionProgress() = 0;
+  /// The elapsed time reads so from now on.
+  virtual void statusBarAssertionDidUpdateTime(const std::string& time) = 0;
+  virtual void statusBarAssertionWasPressed() = 0;
 };
 
-/// The model of the indicator that tells the user that a recording or a broadcast is running: its state,
-/// its timer, its texts. The operations that show something do nothing, since a television has no status
-/// bar; a device that has one fills them in. Offered, not called by this daemon.
+/// The indicator that tells the user that a recording or a broadcast is running: its state, its timer, its texts.
 ///
-/// Threading: main queue only, except `startRepeatingTimer` and `stringWithTimeInterval`, which any thread may call.
-class QVStatusBarAssertion : public std::enable_shared_from_this<QVStatusBarAssertion> {
+/// It is shown from `showDoubleHeightStatusBarWithPid` until it is invalidated, or destroyed. Twice a second it asks
+/// its delegate how far the recording has come, and shows what differs. Without a coordinator it shows nothing, and
+/// tells the delegate the time all the same.
+///
+/// Threading: main queue only, except `startRepeatingTimer` and `stringWithTimeInterval`, which any thread may call,
+/// and the destructor.
+class QVStatusBarAssertion : public platform::StatusBarOverrideCoordinatorDelegate,
+                             public std::enable_shared_from_this<QVStatusBarAssertion> {
  public:
   /// Both are borrowed, and must outlive this.
   QVStatusBarAssertion(const platform::Platform& platform, const QVBundleTexts& texts)
       : platform_(platform), texts_(texts) {}
-  virtual ~QVStatusBarAssertion() = default;
+  ~QVStatusBarAssertion() override = default;
   QVStatusBarAssertion(const QVStatusBarAssertion&) = delete;
   QVStatusBarAssertion& operator=(const QVStatusBarAssertion&) = delete;
 
+  // Set before it is shown:
   bool microphoneEnabled = false;
   bool broadcasting = false;
   bool paused = false;
   std::string broadcastServiceName;
-  std::shared_ptr<platform::StatusBarOverrideCoordinatorDelegate> delegate;
-  std::shared_ptr<QVStatusBarAssertionDelegate> assertionDelegate;
-  std::shared_ptr<platform::StatusBarOverrideAssertion> assertion;
-  std::shared_ptr<platform::StatusBarOverrideCoordinator> coordinator;
+  std::weak_ptr<QVStatusBarAssertionDelegate> assertionDelegate;
+  platform::StatusBarOverrideCoordinator* coordinator = nullptr;  ///< borrowed; may be null
+  /// While it is shown, and there is a coordinator.
+  std::unique_ptr<platform::StatusBarOverrideAssertion> assertion;
 
+  /// `processID`: whose recording it is, for the log.
   virtual void showDoubleHeightStatusBarWithPid(int32_t processID);
   virtual void invalidateDoubleHeightStatusBar();
   /// `duration` in seconds.
@@ -63,11 +77,16 @@ class QVStatusBarAssertion : public std::enable_shared_from_this<QVStatusBarAsse
   /// What the indicator says, in the user's language. The duration does not appear in it.
   [[nodiscard]] std::string qvLocalizedRecordingDuration(double duration, bool isPaused) const;
 
+  void statusBarOverrideWasPressed() override;
+
  private:
+  void tellTime();
+
   const platform::Platform& platform_;
   const QVBundleTexts& texts_;
   std::shared_ptr<platform::TimerHandle> timer_;
   std::optional<platform::Date> timerStartDate_;
+  platform::StatusBarOverride shown_;
 };
 
 }  // namespace qv

@@ -4,6 +4,7 @@
 #include "platform/headless/HeadlessAlerts.h"
 #include "platform/headless/HeadlessApplications.h"
 #include "platform/headless/HeadlessScreen.h"
+#include "platform/headless/HeadlessStatusBar.h"
 #include "platform/sound/PacedDeviceCapture.h"
 #include "platform/sound/PacedTapQueue.h"
 
@@ -37,6 +38,7 @@ class HeadlessPlatform {
   HeadlessApplications& applications() { return applications_; }
   RenderServer& renderServer() { return renderServer_; }
   UserAlertService& userAlerts() { return alerts_; }
+  StatusBarOverrideCoordinator& statusBar() { return statusBar_; }
   SystemSounds& sounds() { return *sounds_; }
 
  private:
@@ -46,6 +48,7 @@ class HeadlessPlatform {
   HeadlessApplications applications_;
   HeadlessRenderServer renderServer_;
   HeadlessAlerts alerts_;
+  HeadlessStatusBar statusBar_;
   const std::unique_ptr<SystemSounds> sounds_;
 };
 

@@ -5,6 +5,8 @@
 
 #include <algorithm>
 
+#include "platform/x11/IndicatorTraces.h"
+
 namespace qv::platform {
 namespace {
 
@@ -83,6 +85,7 @@ void ClonedWindow::namePixmap(uint16_t borderWidth) {
   namedWidth_ = static_cast<uint16_t>(size->width - 2 * border);
   namedHeight_ = static_cast<uint16_t>(size->height - 2 * border);
   namedBorder_ = borderWidth;
+  wipeIndicatorFrom(connection_, window_);
 }
 
 void ClonedWindow::readStackingPath() {

@@ -44,8 +44,8 @@ void DesktopWatch::lookIn(std::chrono::milliseconds delay) {
 void DesktopWatch::look() {
   isLookDue_ = false;
   timer_.end();
-  while (connection_->pollEvent()) {  // what they tell is read now
-  }
+  // What they tell is read now.
+  while (const auto event = connection_->pollEvent()) (void)client_.desktopEventConcerns(*event);
   client_.lookAtDesktop(*connection_);
   rest();
 }

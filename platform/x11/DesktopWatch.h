@@ -15,7 +15,7 @@ class DesktopWatchClient {
   virtual ~DesktopWatchClient() = default;
   /// A connection was made: choose its events, and read what is there now.
   virtual void desktopConnected(XcbConnection& connection) = 0;
-  /// Whether the event is a reason to look.
+  /// Whether the event is a reason to look. Told of each, once.
   virtual bool desktopEventConcerns(const xcb_generic_event_t& event) = 0;
   /// Read what is there now. Events that came before have been taken.
   virtual void lookAtDesktop(XcbConnection& connection) = 0;

@@ -6,6 +6,7 @@
 #include "platform/x11/X11DisplayLayoutMonitor.h"
 #include "platform/x11/X11RenderServer.h"
 #include "platform/x11/X11ScreenCapture.h"
+#include "platform/x11/X11StatusBar.h"
 #include "platform/x11/X11UserAlert.h"
 
 namespace qv::platform {
@@ -26,7 +27,8 @@ struct X11Platform::Services {
         screenCapture(display, *dependencies.clock),
         bundleOfProcess(std::move(dependencies.bundleIdentifierOfProcess)),
         applications(queries, bundleOfProcess),
-        alerts(display) {}
+        alerts(display),
+        statusBar(display, dependencies.moduleDirectory) {}
 
   const std::shared_ptr<QueryConnection> queries;
   X11ScreenCaptureService screenCapture;
@@ -34,6 +36,7 @@ struct X11Platform::Services {
   X11ApplicationService applications;
   X11RenderServer renderServer{*queries};
   X11UserAlertService alerts;
+  X11StatusBar statusBar;
 };
 
 Result<std::unique_ptr<X11Platform>> X11Platform::connect(const std::string& display, X11Dependencies dependencies) {
@@ -49,6 +52,7 @@ ScreenCaptureService& X11Platform::screenCapture() { return services_->screenCap
 ApplicationService& X11Platform::applications() { return services_->applications; }
 RenderServer& X11Platform::renderServer() { return services_->renderServer; }
 UserAlertService& X11Platform::alerts() { return services_->alerts; }
+StatusBarOverrideCoordinator& X11Platform::statusBar() { return services_->statusBar; }
 std::optional<Error> X11Platform::whyNotThere() const {
   return QueryConnection(services_->queries->display()).connect();
 }

@@ -2,6 +2,7 @@
 
 #include <sys/types.h>
 
+#include <filesystem>
 #include <functional>
 #include <memory>
 #include <optional>
@@ -11,6 +12,7 @@
 #include "platform/DisplayLayout.h"
 #include "platform/RenderServer.h"
 #include "platform/ScreenCapture.h"
+#include "platform/StatusBar.h"
 #include "platform/UserAlert.h"
 #include "platform/base/Result.h"
 #include "platform/threads/Clock.h"
@@ -20,8 +22,10 @@ namespace qv::platform {
 struct X11Dependencies {
   /// The bundle identifier of a process; nothing for one that belongs to no bundle. Called on any
   /// thread.
-  std::function<std::optional<std::string>(pid_t)> bundleIdentifierOfProcess;
+  std::function<std::optional<std::string>(pid_t)> bundleIdentifierOfProcess = nullptr;
   Clock* clock = &systemClock();
+  /// Where the module of the indicator stands, as for pathOfModule.
+  std::filesystem::path moduleDirectory = {};
 };
 
 /// The services of an X server (MIT-SHM 1.2, Composite 0.2, DAMAGE, XFIXES 2, X-Resource 1.2;
@@ -43,6 +47,7 @@ class X11Platform {
   ApplicationService& applications();
   RenderServer& renderServer();
   UserAlertService& alerts();
+  StatusBarOverrideCoordinator& statusBar();
   std::shared_ptr<DisplayLayoutMonitor> createLayoutMonitor();
   /// Nothing where the server answers now. It is asked by a connection of its own.
   [[nodiscard]] std::optional<Error> whyNotThere() const;

@@ -20,6 +20,7 @@ FakeDevice::FakeDevice() {
   platform.applications = &applications;
   platform.renderServer = &applications;
   platform.userAlerts = &alerts;
+  platform.statusBar = &statusBar;
   platform.sounds = &sounds;
   platform.screenReader = &sounds;
   platform.fileSystem = &disk;

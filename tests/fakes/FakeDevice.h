@@ -52,6 +52,7 @@ struct FakeDevice {
   FakeMovieSalvage salvage;
   FakeApplications applications;
   FakeUserAlerts alerts;
+  FakeStatusBar statusBar;
   FakeSounds sounds;
   ScratchPreferences preferences{disk.at("/private/var/mobile/Library/Preferences")};
   ScratchBundles bundles{disk, "", preferences.localization};

@@ -21,6 +21,7 @@
 #include "platform/RenderServer.h"
 #include "platform/ScreenReader.h"
 #include "platform/Sounds.h"
+#include "platform/StatusBar.h"
 #include "platform/UserAlert.h"
 
 namespace qv::fakes {
@@ -69,6 +70,30 @@ class FakeUserAlerts final : public platform::UserAlertService {
 
   std::vector<std::shared_ptr<Shown>> shown;
   bool fails = false;
+};
+
+/// What it shows stands in `shown`; the test presses it.
+class FakeStatusBar final : public platform::StatusBarOverrideCoordinator {
+ public:
+  struct Override final : platform::StatusBarOverrideAssertion {
+    explicit Override(FakeStatusBar& to) : bar(to) {}
+    ~Override() override { bar.shown.reset(); }
+    void update(const platform::StatusBarOverride& now) override { bar.shown = now; }
+    FakeStatusBar& bar;
+  };
+  std::unique_ptr<platform::StatusBarOverrideAssertion> acquire(
+      const platform::StatusBarOverride& now,
+      std::weak_ptr<platform::StatusBarOverrideCoordinatorDelegate> to) override {
+    shown = now;
+    delegate = std::move(to);
+    return std::make_unique<Override>(*this);
+  }
+  void press() {
+    if (const auto to = delegate.lock()) to->statusBarOverrideWasPressed();
+  }
+
+  std::optional<platform::StatusBarOverride> shown;
+  std::weak_ptr<platform::StatusBarOverrideCoordinatorDelegate> delegate;
 };
 
 class FakeApplications final : public platform::ApplicationService, public platform::RenderServer {

@@ -11,6 +11,12 @@
 
 namespace qv::kit {
 
+/// 0xRRGGBB of a pixel.
+inline uint32_t colorIn(const platform::PixelBuffer& image, size_t x, size_t y) {
+  const uint8_t* pixel = image.sharedFrame()->bytes().data() + y * image.sharedFrame()->layout().stride + 4 * x;
+  return static_cast<uint32_t>(pixel[0] | pixel[1] << 8 | pixel[2] << 16);
+}
+
 /// Keeps the last picture and counts; a waiter is told of each.
 ///
 /// Threading: thread-safe.

@@ -65,6 +65,12 @@ void XClient::configure(xcb_window_t window, uint16_t mask, std::initializer_lis
   sync();
 }
 
+void XClient::setNoBackground(xcb_window_t window) {
+  const uint32_t none = XCB_BACK_PIXMAP_NONE;
+  xcb_change_window_attributes(connection_, window, XCB_CW_BACK_PIXMAP, &none);
+  sync();
+}
+
 void XClient::resize(xcb_window_t window, uint16_t width, uint16_t height) {
   configure(window, XCB_CONFIG_WINDOW_WIDTH | XCB_CONFIG_WINDOW_HEIGHT, {width, height});
 }

@@ -51,6 +51,7 @@ class XClient {
   xcb_window_t show(const WindowOptions& options);
   void fill(xcb_window_t window, uint32_t color);
   void fillRect(xcb_window_t window, uint32_t color, int16_t x, int16_t y, uint16_t width, uint16_t height);
+  void setNoBackground(xcb_window_t window);
   void resize(xcb_window_t window, uint16_t width, uint16_t height);
   void move(xcb_window_t window, int16_t x, int16_t y);
   void raise(xcb_window_t window);

@@ -8,14 +8,10 @@
 namespace qv::platform {
 namespace {
 
+using kit::colorIn;
 using kit::XServer;
 
 constexpr uint32_t kRed = 0xFF0000, kGreen = 0x00FF00, kBlue = 0x0000FF, kWhite = 0xFFFFFF, kBlack = 0;
-
-uint32_t colorIn(const PixelBuffer& image, size_t x, size_t y) {
-  const uint8_t* pixel = image.sharedFrame()->bytes().data() + y * image.sharedFrame()->layout().stride + 4 * x;
-  return static_cast<uint32_t>(pixel[0] | pixel[1] << 8 | pixel[2] << 16);
-}
 
 /// Scaling may lose the lowest bits of a plain colour.
 bool isNear(uint32_t a, uint32_t b) {

@@ -57,8 +57,8 @@ struct StopOptions {
   std::chrono::duration<double> endClip{0};    ///< off its end
 };
 
-/// Of a stop: a movie, or an error; both where the disk failed, and then the movie ends early. Neither after a capture or a broadcast: there is no movie then. Of Events::stopped:
-/// an error, perhaps with a movie.
+/// Of a stop: a movie, or an error; both where the disk failed, and then the movie ends early. Neither after a capture
+/// or a broadcast: there is no movie then. Of Events::stopped: an error, perhaps with a movie.
 struct StopResult {
   std::optional<Error> error;
   std::string movieURL;  ///< "file:///..."; empty for no movie. To read it: Recorder::openMovie.
@@ -129,7 +129,7 @@ struct Events {
   std::function<void()> interrupted = {};
   /// A connection to the daemon was made: the first, or one after an interruption.
   std::function<void()> connected = {};
-  /// No daemon sends this at present.
+  /// With the system's entitlement: something begins or ends to be recorded, for whichever application.
   std::function<void(bool recording)> recordingStateChanged = {};
   /// Whatever the extension of the broadcast tells of its service; it replaces what came before.
   std::function<void(Dictionary)> broadcastServiceInfoChanged = {};
@@ -144,8 +144,9 @@ struct Events {
   std::function<void(VideoFrame)> videoFrame = {};
   /// Of a capture: a run of sound of one source. Where 64 wait for the executor, a new one is dropped.
   std::function<void(AudioSample)> audioSample = {};
-  /// No daemon sends these two at present.
+  /// No daemon sends this at present.
   std::function<void(Error)> recordingLockInterrupted = {};
+  /// With the system's entitlement: how long that has been recorded, without pauses, as "1:05".
   std::function<void(std::string time)> recordingTimerChanged = {};
 };
 
