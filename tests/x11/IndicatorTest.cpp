@@ -105,8 +105,8 @@ TEST_F(IndicatorTest, CoversWhateverIsShownButNotAnApplicationsPictureAndIsPress
 TEST_F(IndicatorTest, CoversManagedWindowsAndLeavesThemTheKeyboard) {
   if (!kit::isInstalled("openbox") || !kit::isInstalled("xdotool")) GTEST_SKIP() << "openbox or xdotool is missing";
   const kit::XServer own;
-  open(own.display());
   const kit::WindowManager manager(own.display());
+  open(own.display());  // afterwards: only the platform's threads take turns in connecting
   const auto game = app_->show({.width = kit::XServer::kWidth, .height = kit::XServer::kHeight, .color = kGreen});
   const auto bar = platform_->statusBar().acquire(shown_, {});
   ASSERT_TRUE(isSeenOver(kGreen));
