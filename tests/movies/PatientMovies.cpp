@@ -36,6 +36,7 @@ class PatientWriter final : public AssetWriter {
   [[nodiscard]] AssetWriterStatus status() const override { return inner_->status(); }
   [[nodiscard]] std::optional<Error> error() const override { return inner_->error(); }
   [[nodiscard]] const URL& outputURL() const override { return outputURL_; }
+  [[nodiscard]] std::shared_ptr<const AssetWriterCounts> counts() const override { return inner_->counts(); }
   void addInput(std::shared_ptr<WriterInput> input) override {
     inner_->addInput(static_cast<PatientInput&>(*input).join(*inner_));
   }
