@@ -21,6 +21,8 @@ struct MetricsMessage {
   uint16_t category = 0;
   uint16_t type = 0;
   Dictionary payload;
+  /// Pictures that the recording's output had no room for; nothing where it counts none.
+  std::optional<uint64_t> droppedPictures = std::nullopt;
 };
 
 /// Threading: thread-safe.

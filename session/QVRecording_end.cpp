@@ -181,6 +181,7 @@ bool QVRecording::writesMovies() const {
 void QVRecording::reportSummaryEvent() {
   reportingAgent_->setRecordedFileSize(getRecordedFileSize());
   reportingAgent_->setEndReason(end_.endReason);
+  reportingAgent_->setDroppedPictures(output_->counts().droppedPictures);
   reportingAgent_->reportEventWithType(QVReportingAgent::kSessionSummaryEvent,
                                        reportingAgent_->collectSummaryEventMetrics());
 }

@@ -83,6 +83,7 @@ void QVReportingAgent::reportEventWithType(uint16_t eventType, const Dictionary&
   message.serviceName = serviceName_;
   message.category = eventType;
   message.payload = dictionary;
+  message.droppedPictures = droppedPictures_.load();
   if (const auto error = metrics_.sendMessage(message)) {
     QV_LOG_ERROR(logs::kSession, "eventType:%d error code %d.", eventType, static_cast<int>(error->code));
   }

@@ -2,6 +2,7 @@
 
 #include <atomic>
 #include <cstdint>
+#include <optional>
 #include <string>
 
 #include "platform/Metrics.h"
@@ -43,6 +44,8 @@ class QVReportingAgent {
   void setCameraUsed(int32_t position);
   /// Bytes.
   void setRecordedFileSize(uint64_t size) { recordedFileSize_ = size; }
+  /// Of the output; nothing where it counts none.
+  void setDroppedPictures(std::optional<uint64_t> count) { droppedPictures_.store(count); }
   /// 0 for a normal stop, else the error code.
   void setEndReason(int64_t reason) { endReason_ = reason; }
 
@@ -64,6 +67,7 @@ class QVReportingAgent {
   std::atomic<uint64_t> recordedFileSize_{0};
   std::atomic<int64_t> endReason_{0};
   platform::Guarded<platform::Size> videoCaptureSize_;
+  platform::Guarded<std::optional<uint64_t>> droppedPictures_;
 };
 
 }  // namespace qv

@@ -1,9 +1,11 @@
 #include "platform/linux/JSONLineMetricsReporter.h"
 
 #include <fcntl.h>
+#include <sys/random.h>
 #include <sys/stat.h>
 #include <unistd.h>
 
+#include <array>
 #include <cerrno>
 #include <cstdio>
 #include <utility>
@@ -18,8 +20,22 @@ namespace {
 constexpr size_t kMaximumFileSize = 1 << 20;
 constexpr int kOldFiles = 4;
 
-std::string lineFor(const MetricsMessage& message, Date now) {
-  const Dictionary line{
+/// 128 random bits in hexadecimal digits: no two events of any device have the same.
+Result<std::string> makeIdentifier() {
+  std::array<uint8_t, 16> bytes{};
+  if (::getrandom(bytes.data(), bytes.size(), 0) != static_cast<ssize_t>(bytes.size()))
+    return Error::posix(errno, "getrandom");
+  std::string text;
+  for (const uint8_t byte : bytes) {
+    constexpr char kDigits[] = "0123456789abcdef";
+    text += {kDigits[byte >> 4], kDigits[byte & 15]};
+  }
+  return text;
+}
+
+std::string lineFor(const MetricsMessage& message, const std::string& identifier, Date now) {
+  Dictionary line{
+      {"id", Value(identifier)},
       {"time", Value(now)},
       {"clientType", Value(message.clientType)},
       {"clientVersion", Value(message.clientVersion)},
@@ -32,6 +48,7 @@ std::string lineFor(const MetricsMessage& message, Date now) {
       {"type", Value(int32_t{message.type})},
       {"payload", Value(message.payload)},
   };
+  if (message.droppedPictures) line.emplace("droppedPictures", Value(*message.droppedPictures));
   return serializeJSON(Value(line)) + "\n";
 }
 
@@ -46,7 +63,9 @@ JSONLineMetricsReporter::JSONLineMetricsReporter(std::string directory, const Cl
     : directory_(std::move(directory)), path_(directory_ + "/metrics.jsonl"), clock_(clock) {}
 
 std::optional<Error> JSONLineMetricsReporter::sendMessage(const MetricsMessage& message) {
-  const std::string line = lineFor(message, clock_.now());
+  const auto identifier = makeIdentifier();
+  if (!identifier) return identifier.error();
+  const std::string line = lineFor(message, identifier.value(), clock_.now());
   if (line.size() > kMaximumFileSize) return Error::posix(EMSGSIZE, "metrics message");
   std::lock_guard lock(mutex_);
   if (auto error = makeDirectories(directory_)) return error;

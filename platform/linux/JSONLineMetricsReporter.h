@@ -8,9 +8,9 @@
 
 namespace qv::platform {
 
-/// Appends each message as one line of JSON to <directory>/metrics.jsonl. A file that would grow over
-/// 1 MiB becomes metrics.jsonl.1, the older ones .2 to .4; the fourth goes. A line is whole or not
-/// there at all.
+/// Appends each message as one line of JSON to <directory>/metrics.jsonl, with an identifier of its own ("id"), by
+/// which whoever collects the lines knows one that came twice. A file that would grow over 1 MiB becomes
+/// metrics.jsonl.1, the older ones .2 to .4; the fourth goes. A line is whole or not there at all.
 ///
 /// Threading: thread-safe, blocking.
 class JSONLineMetricsReporter final : public MetricsReporter {

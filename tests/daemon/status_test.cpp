@@ -64,6 +64,7 @@ TEST_F(StatusTest, WhatIsRecordedIsToldToItsUserAndToOthersThatItIs) {
   for (const char* open : {"kind", "systemRecording", "state", "since"}) EXPECT_EQ(seen.erase(open), 1U) << open;
   EXPECT_TRUE(seen.empty());
   client.stop();
+  EXPECT_EQ(device_.metrics.messages.back().droppedPictures, 3U) << "the event of its end has them, too";
   EXPECT_TRUE(ask(0, status::GetRecordings{}).empty());
   EXPECT_EQ(valueForKey(ask(kViewer, status::GetMovies{}).at(0).asDictionary(), "state"), Value("waiting"));
   EXPECT_TRUE(ask(kOther, status::GetMovies{}).empty());

@@ -37,6 +37,13 @@ TEST_F(JSONLineMetricsReporterTest, EachMessageIsOneLine) {
   EXPECT_EQ(valueForKey(message, "category").asInteger(), 3);
   EXPECT_EQ(valueForKey(message, "payload"), Value(Dictionary{{"text", Value("two\nlines")}}));
   EXPECT_EQ(content.find('\n', end + 1), content.size() - 1);
+  EXPECT_FALSE(message.contains("droppedPictures"));
+
+  const auto second = parseJSON(content.substr(end + 1));
+  ASSERT_TRUE(second);
+  const std::string identifier = valueForKey(message, "id").asString();
+  EXPECT_EQ(identifier.size(), 32u);
+  EXPECT_NE(valueForKey(second.value().asDictionary(), "id").asString(), identifier);
 }
 
 TEST_F(JSONLineMetricsReporterTest, FullFilesAreRotatedAndTheOldestGoes) {
