@@ -10,6 +10,7 @@ import asyncio
 import logging
 import os
 import socket
+import struct
 from collections import deque
 from itertools import count
 from typing import Any, Callable, Iterable, Optional
@@ -113,7 +114,7 @@ class Connection:
             answered(None)
             future.set_exception(ConnectionLost())
             return future
-        # Before it counts as pending: values that have no such form raise here.
+        # Before it counts as pending: it raises ValueError where the values have no such form.
         self._send(jeepney.new_method_call(address, member, signature or None, values), serial)
         self._pending[serial] = future, answered
         return future
@@ -144,7 +145,10 @@ class Connection:
 
     def _send(self, message: Message, serial: int) -> None:
         descriptors = array.array("i")
-        data = message.serialise(serial, fds=descriptors)
+        try:
+            data = message.serialise(serial, fds=descriptors)
+        except (struct.error, AttributeError, TypeError, OverflowError) as error:
+            raise ValueError(f"{message.body} cannot be sent: {error}") from error
         # Copies: the caller's may be closed before these are sent.
         self._outbox.append((memoryview(data), [os.dup(descriptor) for descriptor in descriptors]))
         if len(self._outbox) == 1:

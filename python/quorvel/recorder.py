@@ -95,8 +95,8 @@ class Recorder:
         endpoint = [] if listener_endpoint is None else [listener_endpoint]
         connection = await self._link.connection()
         self._starts += 1
-        if self._is_recording:
-            self._replaced.append(self._number)
+        replaces = [self._number] if self._is_recording else []
+        self._replaced += replaces
         attempt = _Start(self._starts)
         try:
             error, has_microphone, has_camera = await self._link.send(
@@ -106,6 +106,10 @@ class Recorder:
         except asyncio.CancelledError:
             attempt.is_abandoned = True
             self._abandon(attempt)
+            raise
+        except ValueError:  # it was not sent
+            if replaces:
+                self._replaced.pop()
             raise
         _raise(error)
         return Started(has_microphone, has_camera)

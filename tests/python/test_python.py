@@ -176,6 +176,11 @@ async def broadcasts():
         state = await recorder.current_state()
         expected = quorvel.State(microphone_enabled_persistent=True, broadcast_url='https://example.com/live')
         check(state == expected, state)
+        try:
+            await recorder.start([-1], *SIZE)
+            raise AssertionError('a window below 0 was sent')
+        except ValueError:
+            pass
         for user_info in ({'x': 2**63}, {1: 'x'}, {'x': object()}):
             try:
                 await recorder.setup_broadcast('com.example.python', CLIPS, user_info=user_info)
