@@ -165,6 +165,8 @@ async def broadcasts():
     async with quorvel.Recorder() as recorder:
         known = await recorder.system_broadcast_extensions()
         check(CLIPS in [extension.bundle_id for extension in known], known)
+        early = await refused(recorder.start([ME], *SIZE, broadcast=True))
+        check(early.code is ErrorCode.INVALID_BROADCAST_SESSION, f'a broadcast without a set-up: {early.key}')
         configuration = quorvel.BroadcastConfiguration(2, {'AverageBitRate': 2_000_000, 'ProfileLevel': 'none'})
         await recorder.setup_broadcast('com.example.python', CLIPS, configuration,
                                        {'list': [1, 0.5, b'x', {'y': True}]})
@@ -266,6 +268,22 @@ def run_lost_daemon():
         device.end_application(application)
 
 
+async def ask_status():
+    async with quorvel.StatusReader() as reader:
+        unmet = {entry['condition']: entry.get('code') for entry in await reader.start_conditions('com.nobody')
+                 if not entry['met']}
+        check(unmet.get('bundle') == ErrorCode.FAILED_TO_START and (await reader.device())['freeBytes'] > 0, unmet)
+        check(await reader.recordings() == await reader.movies() == [], 'nothing was recorded yet')
+
+
+def status():
+    """By a process of no bundle: this one."""
+    with Device() as device:
+        device.start_daemon()
+        os.environ['XDG_RUNTIME_DIR'] = device.directory
+        asyncio.run(ask_status())
+
+
 class Stage(stages.Stage):
     def prepare(self):
         self.allow_recordings()
@@ -320,6 +338,6 @@ if __name__ == '__main__':
     if 'application' in sys.argv:
         sys.stderr = sys.stdout  # what the test hears
     main({'application': lambda case: asyncio.run(APPLICATION[case]()), 'sound_timeline': sound_timeline,
-          'error_codes': error_codes, 'examples': examples,
+          'error_codes': error_codes, 'examples': examples, 'status': status,
           'cancellation': run_cancellation, 'lost_daemon': run_lost_daemon,
           **{case: lambda case=case: as_application(case) for case in ('movie', 'capture', 'broadcasts')}})

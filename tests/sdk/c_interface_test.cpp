@@ -86,7 +86,8 @@ TEST_F(CInterface, WhatIsRetainedOutlivesTheHandlerAndTheRecorder) {
 
 TEST_F(CInterface, AnErrorCanBeKeptAndNothingRunsAfterTheRecorder) {
   stopDaemon();
-  quorvel_recorder_start(recorder_, nullptr, Program::started, &program_);
+  const quorvel_start_options options = QUORVEL_START_OPTIONS_INIT;
+  quorvel_recorder_start(recorder_, &options, Program::started, &program_);
   runUntil([&] { return !program_.codes.empty(); });
   ASSERT_NE(program_.error, nullptr);
   EXPECT_EQ(program_.error->code, QUORVEL_ERROR_CONNECTION_INVALID);
