@@ -5,7 +5,7 @@
 The daemon knows an application by the bundle around its executable, and the executable of a Python program is its
 interpreter. So the bundle gets an interpreter of its own: a copy, for a link leads the daemon to /usr/bin. Start the
 application with that one, `MyApp.app/bin/python3 program.py`. Packages are the system's. Say the same again after an
-update of Python: the information stays, the interpreter is copied anew.
+update of Python: the interpreter is copied anew, and what else is in the bundle, or in its Info.json, stays.
 """
 from __future__ import annotations
 
@@ -23,7 +23,7 @@ def interpreter() -> str:
 
 
 def make_bundle(path: str, identifier: str, name: str) -> str:
-    """The bundle's interpreter. What is in the bundle besides stays; running processes keep what they run."""
+    """The bundle's interpreter. OSError where it cannot be made. Running processes keep what they run."""
     programs = os.path.join(path, "bin")
     os.makedirs(programs, exist_ok=True)
     own = os.path.join(programs, "python3")
@@ -31,10 +31,22 @@ def make_bundle(path: str, identifier: str, name: str) -> str:
     _replace(own, lambda file: shutil.copy2(source, file))
     _write(os.path.join(path, "pyvenv.cfg"), f"home = {os.path.dirname(source)}\n"
            "include-system-site-packages = true\nversion = {}.{}.{}\n".format(*sys.version_info))
-    info = {"CFBundleIdentifier": identifier, "CFBundleDisplayName": name, "CFBundleName": name,
+    information = os.path.join(path, "Info.json")
+    info = {**_read(information), "CFBundleIdentifier": identifier, "CFBundleDisplayName": name, "CFBundleName": name,
             "CFBundleExecutable": "bin/python3"}
-    _write(os.path.join(path, "Info.json"), json.dumps(info, indent=2, ensure_ascii=False) + "\n")
+    _write(information, json.dumps(info, indent=2, ensure_ascii=False) + "\n")
     return own
+
+
+def _read(path: str) -> dict:
+    """Nothing where there is no such file."""
+    try:
+        with open(path, encoding="utf-8") as file:
+            return dict(json.load(file))
+    except FileNotFoundError:
+        return {}
+    except (ValueError, TypeError) as error:
+        raise OSError(f"{path} cannot be read: {error}") from error
 
 
 def _write(path: str, content: str) -> None:
