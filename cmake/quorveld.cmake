@@ -41,11 +41,11 @@ function(qv_module name)
   install(TARGETS ${name} LIBRARY DESTINATION lib/quorveld)
 endfunction()
 
-# qv_sdk_library(name LIBRARY static-library ENTRY source PC template HEADERS header ...)
+# qv_sdk_library(name LIBRARY static-library ENTRY source ... PC template HEADERS header ...)
 # The shared library that others link, and name_static, the same in a form for tests, which sanitizers see through.
 # Nothing but the public names leaves it, and it stays loaded: its threads live as long as the process.
 function(qv_sdk_library name)
-  cmake_parse_arguments(ARG "" "LIBRARY;ENTRY;PC" "HEADERS" ${ARGN})
+  cmake_parse_arguments(ARG "" "LIBRARY;PC" "ENTRY;HEADERS" ${ARGN})
   include(GNUInstallDirs)
   set(map ${PROJECT_SOURCE_DIR}/sdk/common/quorvel.map)
   add_library(${name} SHARED ${ARG_ENTRY})

@@ -1,12 +1,7 @@
-#include <gtest/gtest.h>
-#include <stdlib.h>
-
-#include "platform/sdbus/SdBusIPC.h"
-#include "protocol/QVDaemonProtocol.h"
+#include "platform/base/SampleBuffer.h"
 #include "protocol/SampleCoding.h"
 #include "sdk/client/quorvel/Recorder.h"
-#include "tests/fakes/AcceptingDelegate.h"
-#include "tests/kit/ScratchFolder.h"
+#include "tests/sdk/DaemonSocket.h"
 
 namespace qv::client {
 namespace {
@@ -14,23 +9,9 @@ namespace {
 using platform::Dictionary;
 using namespace std::chrono_literals;
 
-/// The library as applications get it, over a real socket, with a daemon of the test's in this process.
-class RecorderSocket : public ::testing::Test {
+/// The library as applications get it.
+class RecorderSocket : public DaemonSocket {
  protected:
-  RecorderSocket() {
-    ::setenv("XDG_RUNTIME_DIR", folder_.path().c_str(), 1);
-    service_ = std::make_unique<platform::SdBusIPCService>();
-    listener_ = service_->createListener(kServiceName);
-    listener_->setDelegate(&daemon_, queue_);
-    EXPECT_FALSE(listener_->resume());
-  }
-  ~RecorderSocket() override {
-    recorder_.reset();
-    listener_.reset();
-    service_.reset();
-    queue_.sync([] {});
-  }
-  void send(OutgoingCall call) { daemonEnd_->call(call.member, std::move(call.arguments), {}, {}); }
   void startRecording() {
     kit::Events<quorvel::StartResult> started;
     recorder_->start({.windows = {42}, .width = 4, .height = 4, .capture = true},
@@ -40,12 +21,6 @@ class RecorderSocket : public ::testing::Test {
     EXPECT_FALSE(started.next().error);
   }
 
-  const kit::ScratchFolder folder_;
-  platform::SerialQueue queue_{"test daemon"};
-  fakes::AcceptingDelegate daemon_{daemonProtocol(), clientProtocol()};
-  std::unique_ptr<platform::SdBusIPCService> service_;
-  std::unique_ptr<platform::IPCListener> listener_;
-  std::shared_ptr<platform::IPCConnection> daemonEnd_;
   std::unique_ptr<quorvel::Recorder> recorder_;
 };
 
