@@ -1,4 +1,13 @@
 add_compile_options(-Wall -Wextra -Wshadow -Werror)
+# Sources are compiled eight at a time: most of a source's time goes into the headers that they share. So a name that
+# a source keeps for itself is one in its folder. The build for ThreadSanitizer (CMakePresets.json) compiles each alone,
+# which shows what a source forgot to include.
+option(QV_UNITY "compile several sources of a target at a time" ON)
+set(CMAKE_UNITY_BUILD ${QV_UNITY})
+set(CMAKE_UNITY_BUILD_BATCH_SIZE 8)
+if(QV_UNITY)
+  add_compile_options(-Wno-subobject-linkage)  # a unit of several sources is a header to GCC
+endif()
 if(QV_SANITIZE STREQUAL "address")
   add_compile_options(-fsanitize=address,undefined -fno-sanitize-recover=all -fno-omit-frame-pointer)
   add_link_options(-fsanitize=address,undefined)

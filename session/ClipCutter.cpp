@@ -17,10 +17,6 @@ namespace {
 constexpr auto kPicturePatience = std::chrono::nanoseconds(1'000'000'000 / 30);
 const MediaTime kShortStep = MediaTime::make(1, 1000);
 
-MediaTime endOf(const SampleBuffer& sample) {
-  return sample.duration().isNumeric() ? sample.captureTime() + sample.duration() : sample.captureTime();
-}
-
 /// The same image as if it had been captured at `captureTime`, the same distance before its presentation.
 SampleBufferRef pictureAt(const SampleBuffer& source, MediaTime captureTime) {
   const MediaTime time = captureTime.convertedTo(source.captureTime().timescale);
@@ -79,7 +75,7 @@ void ClipCutter::_processAudioSampleBufferForMP4ClipHandler(const SampleBufferRe
     broadcastFragmentStartTime_ = time;
   }
   const bool isOver = (time - broadcastFragmentStartTime_).seconds() > configuration_.effectiveClipDuration();
-  if (isOver && lastPicture_ && !seam_) cutClip(time, endOf(*sample));
+  if (isOver && lastPicture_ && !seam_) cutClip(time, sample->captureEnd());
 }
 
 void ClipCutter::appendMicrophone(const SampleBufferRef& sample) {

@@ -17,10 +17,6 @@ namespace {
 const MediaTime kPatience = MediaTime::make(1, 1);
 const MediaTime kFrameInterval = MediaTime::make(1, 30);
 
-MediaTime endOf(const SampleBuffer& sample) {
-  return sample.duration().isNumeric() ? sample.captureTime() + sample.duration() : sample.captureTime();
-}
-
 SampleBufferRef part(const SampleBufferRef& sample, int64_t from, int64_t to) {
   const platform::AudioStreamDescription& format = sample->audioFormat()->streamDescription;
   const auto bytes = sample->data()->bytes();
@@ -36,7 +32,7 @@ SampleBufferRef part(const SampleBufferRef& sample, int64_t from, int64_t to) {
 
 SplitSound splitSound(const SampleBufferRef& sample, MediaTime time) {
   if (sample->captureTime() >= time) return {nullptr, sample};
-  if (endOf(*sample) <= time) return {sample, nullptr};
+  if (sample->captureEnd() <= time) return {sample, nullptr};
   const platform::AudioStreamDescription& format = sample->audioFormat()->streamDescription;
   const double seconds = (time - sample->captureTime()).seconds();
   const auto frames = static_cast<int64_t>(std::llround(seconds * format.sampleRate));
@@ -76,7 +72,7 @@ void ClipSeam::append(Track& track, const SampleBufferRef& sample) {
 }
 
 void ClipSeam::appendAcross(Track& track, const SampleBufferRef& sample) {
-  track.end = endOf(*sample);
+  track.end = sample->captureEnd();
   const auto [before, after] = splitSound(sample, time_);
   if (before) ((*ending_).*track.append)(before);
   if (after) ((*beginning_).*track.append)(after);

@@ -55,6 +55,10 @@ class SampleBuffer {
   [[nodiscard]] MediaTime presentationTime() const { return timing_.front().presentationTimeStamp; }
   [[nodiscard]] MediaTime duration() const { return timing_.front().duration; }
   [[nodiscard]] MediaTime captureTime() const { return captureTime_; }
+  /// `captureTime` and `duration`, where that is known.
+  [[nodiscard]] MediaTime captureEnd() const {
+    return duration().isNumeric() ? captureTime_ + duration() : captureTime_;
+  }
 
  private:
   SampleBuffer() = default;

@@ -63,6 +63,13 @@ std::string URL::path() const {
   return decoded.find('\0') == std::string::npos ? decoded : std::string();
 }
 
+Value::Value() = default;
+Value::Value(const Value& other) = default;
+Value::Value(Value&& other) noexcept = default;
+Value& Value::operator=(const Value& other) = default;
+Value& Value::operator=(Value&& other) noexcept = default;
+Value::~Value() = default;
+
 bool Value::isNumber() const {
   return visit([](const auto& content) { return std::is_arithmetic_v<std::decay_t<decltype(content)>>; });
 }

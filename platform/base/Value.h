@@ -54,7 +54,14 @@ class Value {
   using Storage = std::variant<std::monostate, bool, int32_t, uint32_t, int64_t, uint64_t, double, std::string, Data,
                                Array, Dictionary, Date, URL, SharedFileDescriptor>;
 
-  Value() = default;
+  // Out of line: what a variant of so many kinds needs is compiled once, not in each source.
+  Value();
+  Value(const Value& other);
+  Value(Value&& other) noexcept;
+  Value& operator=(const Value& other);
+  Value& operator=(Value&& other) noexcept;
+  ~Value();
+
   Value(bool v) : storage_(v) {}
   Value(int32_t v) : storage_(v) {}
   Value(uint32_t v) : storage_(v) {}

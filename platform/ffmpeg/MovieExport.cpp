@@ -17,7 +17,7 @@ constexpr int64_t kRangeTolerance = mp4::kMovieTimescale / 60;
 /// Samples of a track that are written in one piece.
 constexpr size_t kChunkSamples = 128;
 
-Error unreadable(const std::string& text) { return mp4::movieError(mp4::kMovieNotReadable, text); }
+Error notExportable(const std::string& text) { return mp4::movieError(mp4::kMovieNotReadable, text); }
 
 }  // namespace
 
@@ -56,11 +56,11 @@ std::optional<Error> MovieExport::chooseRange() {
   const int64_t duration = reader_->duration();
   range_ = {0, duration};
   if (!plan_.range.start.isValid() && !plan_.range.duration.isValid()) return std::nullopt;
-  if (!plan_.range.start.isNumeric() || !plan_.range.duration.isNumeric()) return unreadable("no such time range");
+  if (!plan_.range.start.isNumeric() || !plan_.range.duration.isNumeric()) return notExportable("no such time range");
   const int64_t start = plan_.range.start.valueAt(mp4::kMovieTimescale);
   const int64_t length = plan_.range.duration.valueAt(mp4::kMovieTimescale);
   if (start < 0 || length <= 0 || start >= duration || length > duration - start + kRangeTolerance) {
-    return unreadable("the time range is not part of the movie");
+    return notExportable("the time range is not part of the movie");
   }
   range_ = {start, std::min(duration, start + length)};
   return std::nullopt;
@@ -168,7 +168,7 @@ std::optional<Error> MovieExport::finishMedia() {
     if (!output.copier) continue;
     const mp4::MovieTrack& track = output.copier->track();
     if (track.kind == mp4::MovieTrack::Kind::Video && !output.copier->reachedEnd()) {
-      return unreadable("the movie is cut short");
+      return notExportable("the movie is cut short");
     }
     writer_->setTrackStart(i, track.mediaStart, track.startDelay);
   }

@@ -49,7 +49,7 @@ Result<Frame> toSurface(const AVFrame& semiPlanar, AVBufferRef* surfaces) {
   return surface;
 }
 
-Result<FrameUpload> setUp(AVCodecContext& context, const std::string& node) {
+Result<FrameUpload> setUpVAAPI(AVCodecContext& context, const std::string& node) {
   context.pix_fmt = AV_PIX_FMT_VAAPI;
   if (auto error = makeSurfaces(context, node)) return *error;
   return FrameUpload(
@@ -63,7 +63,7 @@ Result<FrameUpload> setUp(AVCodecContext& context, const std::string& node) {
 }  // namespace
 
 H264Codec vaapiCodec() {
-  return {.name = "h264_vaapi", .nodes = "/dev/dri/renderD*", .oneNodeEach = true, .setUp = setUp};
+  return {.name = "h264_vaapi", .nodes = "/dev/dri/renderD*", .oneNodeEach = true, .setUp = setUpVAAPI};
 }
 
 }  // namespace qv::platform::ffmpeg

@@ -17,7 +17,7 @@ constexpr ProfileTools kTools[] = {
     {FF_PROFILE_H264_MAIN, "main", "cabac=1:no-deblock=0:deblock=0,0:analyse=i4x4"},
     {FF_PROFILE_H264_HIGH, "high", "cabac=1:8x8dct=1:no-deblock=0:deblock=0,0:analyse=i4x4,i8x8"}};
 
-Result<FrameUpload> setUp(AVCodecContext& context, const std::string&) {
+Result<FrameUpload> setUpX264(AVCodecContext& context, const std::string&) {
   context.pix_fmt = AV_PIX_FMT_YUV420P;
   context.qmin = kMinimumQuantiser;
   context.thread_count = 0;
@@ -33,7 +33,7 @@ Result<FrameUpload> setUp(AVCodecContext& context, const std::string&) {
 
 }  // namespace
 
-H264Codec x264Codec() { return {.name = "libx264", .canChangeRate = true, .setUp = setUp}; }
+H264Codec x264Codec() { return {.name = "libx264", .canChangeRate = true, .setUp = setUpX264}; }
 
 std::vector<H264Codec> h264Codecs() { return {vaapiCodec(), v4l2Codec(), x264Codec()}; }
 

@@ -1,10 +1,10 @@
 #include "platform/pulse/MixTimeline.h"
 
-#include <time.h>
-
 #include <algorithm>
 #include <cstdlib>
 #include <utility>
+
+#include "platform/threads/Clock.h"
 
 namespace qv::platform {
 namespace {
@@ -13,16 +13,13 @@ constexpr int64_t kNanosecondsPerSecond = 1'000'000'000;
 
 int16_t clip(int32_t value) { return static_cast<int16_t>(std::clamp(value, -32768, 32767)); }
 
-int64_t hostNow() {
-  timespec now{};
-  ::clock_gettime(CLOCK_MONOTONIC, &now);
-  return now.tv_sec * kNanosecondsPerSecond + now.tv_nsec;
-}
-
 }  // namespace
 
 MixTimeline::MixTimeline(uint32_t sampleRate)
-    : sampleRate_(sampleRate), capacity_(size_t{2} * sampleRate), sums_(2 * capacity_), next_(frameAt(hostNow())) {}
+    : sampleRate_(sampleRate),
+      capacity_(size_t{2} * sampleRate),
+      sums_(2 * capacity_),
+      next_(frameAt(hostNanoseconds())) {}
 
 int64_t MixTimeline::frameAt(int64_t hostTime) const {
   const int64_t rest = hostTime % kNanosecondsPerSecond * sampleRate_;

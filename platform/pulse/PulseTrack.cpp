@@ -1,10 +1,9 @@
 #include "platform/pulse/PulseTrack.h"
 
-#include <time.h>
-
 #include <algorithm>
 #include <cstdlib>
 
+#include "platform/threads/Clock.h"
 #include "platform/threads/Log.h"
 
 namespace qv::platform {
@@ -18,12 +17,6 @@ pa_sample_spec specOf(const MixTimeline& timeline) { return {PA_SAMPLE_S16NE, ti
 pa_stream* makeStream(pa_context* context, const MixTimeline& timeline) {
   const pa_sample_spec spec = specOf(timeline);
   return pa_stream_new(context, "recording", &spec, nullptr);
-}
-
-int64_t hostNow() {
-  timespec now{};
-  ::clock_gettime(CLOCK_MONOTONIC, &now);
-  return now.tv_sec * 1'000'000'000 + now.tv_nsec;
 }
 
 }  // namespace
@@ -80,7 +73,7 @@ void PulseTrack::anchor(int64_t pending) {
   int64_t age = pending / kFrameSize * 1'000'000'000 / rate;
   const bool isReported = pa_stream_get_latency(stream_, &latency, &isNegative) == 0;
   if (isReported) age = (isNegative != 0 ? -1 : 1) * static_cast<int64_t>(latency) * 1000;
-  const int64_t measured = timeline_->frameAt(hostNow() - age);
+  const int64_t measured = timeline_->frameAt(hostNanoseconds() - age);
   const bool settlesNow = anchored_ && !settled_ && isReported && counted_ >= rate / 10;
   const bool isOff = settled_ && isReported && std::abs(measured - position_) > rate / 25;
   if (anchored_ && !settlesNow && !isOff) return;

@@ -15,7 +15,6 @@
 namespace qv::platform::sdbus {
 namespace {
 
-constexpr int kMessagesPerTurn = 64;  // then others have theirs
 /// Answers that sd-bus gives by itself (errors, introspection) wait in its own queue: a peer that
 /// asks without reading is not read either beyond this many.
 constexpr uint64_t kMaximumBusQueue = 64;

@@ -22,6 +22,8 @@ namespace qv::platform::sdbus {
 struct IPCContext;
 
 inline constexpr const char kObjectPath[] = "/com/tarnwick/quorveld";
+/// Sent, and read, at a turn of the loop; then others have theirs.
+inline constexpr int kMessagesPerTurn = 64;
 
 /// What a driver tells the link whose messages it moves, all on the I/O thread.
 class BusDriverClient {

@@ -10,8 +10,6 @@
 namespace qv::platform::sdbus {
 namespace {
 
-constexpr int kMessagesPerTurn = 64;  // then others have theirs
-
 /// A broken connection shows in the next step of sd-bus, once what the peer sent has been read.
 bool isBroken(int error) { return error == -ENOTCONN || error == -EPIPE || error == -ECONNRESET; }
 

@@ -12,11 +12,7 @@ class SystemClock final : public Clock {
     ::clock_gettime(CLOCK_REALTIME, &t);
     return {static_cast<double>(t.tv_sec) + static_cast<double>(t.tv_nsec) * 1e-9};
   }
-  MediaTime hostTime() const override {
-    timespec t{};
-    ::clock_gettime(CLOCK_MONOTONIC, &t);
-    return MediaTime::make(int64_t{t.tv_sec} * kHostTimescale + t.tv_nsec, kHostTimescale);
-  }
+  MediaTime hostTime() const override { return MediaTime::make(hostNanoseconds(), kHostTimescale); }
 };
 
 }  // namespace
@@ -24,6 +20,12 @@ class SystemClock final : public Clock {
 Clock& systemClock() {
   static SystemClock clock;
   return clock;
+}
+
+int64_t hostNanoseconds() {
+  timespec t{};
+  ::clock_gettime(CLOCK_MONOTONIC, &t);
+  return int64_t{t.tv_sec} * kHostTimescale + t.tv_nsec;
 }
 
 }  // namespace qv::platform

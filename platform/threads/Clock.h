@@ -21,6 +21,9 @@ class Clock {
 /// The machine's own clocks.
 Clock& systemClock();
 
+/// The host clock where pictures and sound are stamped: nanoseconds of CLOCK_MONOTONIC.
+int64_t hostNanoseconds();
+
 /// A host time in system units (nanoseconds of CLOCK_MONOTONIC) as a time on the host clock.
 constexpr MediaTime mediaTimeFromHostTime(uint64_t hostTime) {
   return MediaTime::make(static_cast<int64_t>(hostTime), kHostTimescale);

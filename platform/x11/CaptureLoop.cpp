@@ -5,8 +5,8 @@
 #include <xcb/damage.h>
 
 #include <algorithm>
-#include <ctime>
 
+#include "platform/threads/Clock.h"
 #include "platform/threads/Log.h"
 #include "platform/x11/CloneSource.h"
 #include "platform/x11/ScreenSource.h"
@@ -22,13 +22,9 @@ constexpr size_t kPoolCapacity = 14;
 /// Below half a second by what a loaded machine may oversleep.
 constexpr nanoseconds kHeartbeat = std::chrono::milliseconds(450);
 /// Longer than any grab takes on a loaded machine; a server that is silent for longer is lost.
-constexpr std::chrono::milliseconds kReplyLimit{5000};
+constexpr std::chrono::milliseconds kCaptureReplyLimit{5000};
 
-nanoseconds monotonicNow() {
-  timespec now{};
-  clock_gettime(CLOCK_MONOTONIC, &now);
-  return std::chrono::seconds(now.tv_sec) + nanoseconds(now.tv_nsec);
-}
+nanoseconds monotonicNow() { return nanoseconds(hostNanoseconds()); }
 
 /// Tells the server which versions are spoken: it refuses requests of these extensions otherwise.
 bool negotiateExtensions(XcbConnection& connection) {
@@ -59,7 +55,7 @@ CaptureLoop::CaptureLoop(CaptureParameters parameters, CaptureEvents events, Clo
       pool_(kPoolCapacity) {}
 
 void CaptureLoop::run() {
-  auto opened = XcbConnection::open(parameters_.display, kReplyLimit);
+  auto opened = XcbConnection::open(parameters_.display, kCaptureReplyLimit);
   if (!opened) {
     QV_LOG_ERROR(logs::kScreen, "screen capture: %s", opened.error().description().c_str());
     return events_.serverLost();

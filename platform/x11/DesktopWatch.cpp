@@ -7,7 +7,7 @@
 namespace qv::platform {
 namespace {
 constexpr std::chrono::milliseconds kReconnectInterval{1000};
-constexpr std::chrono::milliseconds kReplyLimit{2000};
+constexpr std::chrono::milliseconds kDesktopReplyLimit{2000};
 }  // namespace
 
 DesktopWatch::DesktopWatch(EventLoop& loop, DesktopWatchClient& client, std::string display,
@@ -27,7 +27,7 @@ void DesktopWatch::end() {
 }
 
 void DesktopWatch::connect() {
-  if (auto opened = XcbConnection::open(display_, kReplyLimit)) {
+  if (auto opened = XcbConnection::open(display_, kDesktopReplyLimit)) {
     connection_ = std::move(opened.value());
     client_.desktopConnected(*connection_);
   }

@@ -14,7 +14,7 @@
 namespace qv::platform {
 namespace {
 
-constexpr std::chrono::milliseconds kReplyLimit{2000};
+constexpr std::chrono::milliseconds kAlertReplyLimit{2000};
 
 /// What an alert shares with its thread, which outlives it when it is destroyed from within its
 /// handler, or while its handler runs.
@@ -85,7 +85,7 @@ class X11UserAlert final : public UserAlert {
 
 std::unique_ptr<UserAlert> X11UserAlertService::present(const UserAlertRequest& request,
                                                         std::function<void(UserAlertAnswer)> handler) {
-  auto connection = XcbConnection::open(display_, kReplyLimit);
+  auto connection = XcbConnection::open(display_, kAlertReplyLimit);
   if (!connection) {
     QV_LOG_ERROR(logs::kUI, "no alert: %s", connection.error().description().c_str());
     return nullptr;

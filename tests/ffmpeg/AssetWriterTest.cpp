@@ -15,7 +15,7 @@
 namespace qv::platform::test {
 namespace {
 
-constexpr double kStart = 1000.25;
+constexpr double kRecordingStart = 1000.25;
 
 class AssetWriterTest : public ::testing::Test {
  protected:
@@ -27,7 +27,7 @@ class AssetWriterTest : public ::testing::Test {
 TEST_F(AssetWriterTest, WritesEveryPictureAtItsTimeAndLeavesOutASilentTrack) {
   RecordingUnderTest recording(service_, path_, 320, 180, {0, 1, -1, 0, 0, 0});
   for (uint32_t i = 0; i < 180; ++i) {
-    const double now = kStart + i / 60.0;
+    const double now = kRecordingStart + i / 60.0;
     recording.appendPicture(picture(i, now, now));
     if (i % 6 == 0) recording.appendSound(1, beepingSound(now - 0.1, 4410));
   }

@@ -14,8 +14,8 @@
 namespace qv::platform::test {
 namespace {
 
-constexpr double kStart = 500.0;
-constexpr uint32_t kPictures = 240;  // 8 s at 30 per second
+constexpr double kSourceStart = 500.0;
+constexpr uint32_t kSourcePictures = 240;  // 8 s at 30 per second
 
 /// One movie with numbered pictures, beeps on the seconds in one track and off them in the other.
 class ExportTest : public ::testing::Test {
@@ -25,8 +25,8 @@ class ExportTest : public ::testing::Test {
     source_ = *scratch_ / "source.mp4";
     ffmpeg::FFmpegAssetWriterService writers;
     RecordingUnderTest recording(writers, source_, 320, 180, {0, 1, -1, 0, 0, 0});
-    for (uint32_t i = 0; i < kPictures; ++i) {
-      const double now = kStart + i / 30.0;
+    for (uint32_t i = 0; i < kSourcePictures; ++i) {
+      const double now = kSourceStart + i / 30.0;
       recording.appendPicture(picture(i, now, now));
       recording.appendSound(1, beepingSound(now, 1470));
       if (i >= 15) recording.appendSound(2, beepingSound(now, 1470, {44100, 1, true, false, 0.25}));
@@ -59,7 +59,7 @@ TEST_F(ExportTest, TrimsToTheFrameAndTheBeep) {
   std::mt19937 random(7);
   for (int round = 0; round < 8; ++round) {
     const uint32_t first = random() % 200;
-    const uint32_t count = 20 + random() % (kPictures - first - 20);
+    const uint32_t count = 20 + random() % (kSourcePictures - first - 20);
     const std::string path = results_ / ("trim" + std::to_string(round) + ".mp4");
     run(source_, path, ExportPreset::PassThrough, {MediaTime::make(first, 30), MediaTime::make(count, 30)});
     const auto movie = probeGood(path);
@@ -103,7 +103,7 @@ TEST_F(ExportTest, MixesTracksAtTheirLevelsAndCopiesThePicture) {
   ASSERT_EQ(movie.tracks.size(), 2u);
   EXPECT_EQ(movie.tracks[0].rotation, -90);
   for (const auto& track : movie.tracks) EXPECT_NEAR(track.duration, 8.0, 1e-4);
-  EXPECT_EQ(decodePictures(path).size(), kPictures);
+  EXPECT_EQ(decodePictures(path).size(), kSourcePictures);
   const auto sound = decodeSound(path, 0);
   const auto heard = beeps(sound);
   ASSERT_EQ(heard.size(), 8u);
@@ -131,7 +131,7 @@ TEST_F(ExportTest, EncodesOtherCodecsAnewAndLeavesOutMissingSound) {
   const auto movie = probeGood(path);
   ASSERT_EQ(movie.tracks.size(), 1u);
   EXPECT_EQ(movie.tracks[0].codec, "h264");
-  EXPECT_EQ(decodePictures(path).size(), kPictures);
+  EXPECT_EQ(decodePictures(path).size(), kSourcePictures);
 }
 
 TEST_F(ExportTest, FailsWithoutLeavingAnything) {
@@ -216,7 +216,7 @@ TEST_F(ExportTest, LoadsModulesOnFirstUseAndReportsMissingOnes) {
   EXPECT_EQ(loader.openMovie(URL::fileURL(source_))->duration().seconds(), 8.0);
   const std::string path = results_ / "recorded.mp4";
   RecordingUnderTest recording(loader, path);
-  recording.appendPictures(30, 30, kStart);
+  recording.appendPictures(30, 30, kSourceStart);
   recording.finish();
   EXPECT_EQ(probe(path).errors, "");
 

@@ -12,7 +12,7 @@ namespace {
 
 using platform::MovieState;
 
-constexpr const char kStore[] = "/root/private/var/mobile/Library/Quorvel/";
+constexpr const char kMoviesStore[] = "/root/private/var/mobile/Library/Quorvel/";
 
 class UnfinishedMoviesTest : public SupportTest {
  protected:
@@ -22,13 +22,13 @@ class UnfinishedMoviesTest : public SupportTest {
     salvage_.states = {
         {"Chess.mp4", MovieState::Unfinished}, {"Done.mp4", MovieState::Finished}, {"Live.mp4", MovieState::InUse}};
   }
-  void add(const std::string& name) { disk_.addFile(kStore + name, name, {fakes::FakeClock::kStart}); }
+  void add(const std::string& name) { disk_.addFile(kMoviesStore + name, name, {fakes::FakeClock::kStart}); }
   void salvage() { QVUnfinishedMovies(files_, *platform_.movieSalvage, localization_)._srSalvageUnfinishedMovies(); }
   /// Under which a movie of this name is kept, without the extension.
   std::string stemOf(const std::string& name) {
     return name + "_recovered_" + localization_.formatDate({fakes::FakeClock::kStart}, "MM-dd-yyyy HH-mm-ss");
   }
-  std::vector<std::string> names() { return disk_.contentsOfDirectory(kStore).value(); }
+  std::vector<std::string> names() { return disk_.contentsOfDirectory(kMoviesStore).value(); }
 
   fakes::FakeMovieSalvage salvage_;
 };
@@ -55,28 +55,28 @@ TEST_F(UnfinishedMoviesTest, AreFinishedUnderANameThatNoRecordingTakes) {
 
   salvage_.length = platform::MediaTime::zero();
   salvage();
-  EXPECT_FALSE(disk_.itemExists(kStore + kept));
+  EXPECT_FALSE(disk_.itemExists(kMoviesStore + kept));
 }
 
 TEST_F(UnfinishedMoviesTest, StayAsTheyAreWhereNoNameCanBeHad) {
   const std::string longName(240, 'x');
   add(longName + ".mp4");
   salvage_.states[longName + ".mp4"] = MovieState::Unfinished;
-  disk_.failOn(fakes::ScratchDisk::Operation::Attributes, std::string(kStore) + "Chess.mp4", EIO);
+  disk_.failOn(fakes::ScratchDisk::Operation::Attributes, std::string(kMoviesStore) + "Chess.mp4", EIO);
   auto before = names();
   salvage();
   EXPECT_EQ(names(), before);
   EXPECT_EQ(log_.countContaining(std::strerror(ENAMETOOLONG)), 1u);
   EXPECT_EQ(log_.countContaining(std::strerror(EIO)), 1u);
 
-  disk_.failOn(fakes::ScratchDisk::Operation::Attributes, std::string(kStore) + "Chess.mp4", 0);
+  disk_.failOn(fakes::ScratchDisk::Operation::Attributes, std::string(kMoviesStore) + "Chess.mp4", 0);
   add(stemOf("Chess") + ".mp4");
   for (int number = 2; number < 100; ++number) add(stemOf("Chess") + " " + std::to_string(number) + ".mp4");
   salvage();
   add("Chess.mp4");
   salvage();
   EXPECT_EQ(salvage_.salvaged, std::vector<std::string>{stemOf("Chess") + " 100.mp4"});
-  EXPECT_TRUE(disk_.itemExists(std::string(kStore) + "Chess.mp4"));
+  EXPECT_TRUE(disk_.itemExists(std::string(kMoviesStore) + "Chess.mp4"));
 }
 
 /// Whatever it holds, the next recording of that application would replace it.
@@ -88,13 +88,13 @@ TEST_F(UnfinishedMoviesTest, WhatIsDamagedIsKeptUnderANameOfItsOwn) {
   const auto broken =
       std::ranges::find_if(kept, [](const auto& name) { return name.starts_with("Broken_recovered_"); });
   ASSERT_NE(broken, kept.end());
-  EXPECT_EQ(disk_.readFile(kStore + *broken).value(), "Broken.mp4");
+  EXPECT_EQ(disk_.readFile(kMoviesStore + *broken).value(), "Broken.mp4");
   EXPECT_EQ(log_.countContaining("\"" + *broken + "\""), 1u);
   EXPECT_EQ(kept.size(), 6u);
 }
 
 TEST_F(UnfinishedMoviesTest, AStoreThatCannotBeReadCostsALogLine) {
-  disk_.failOn(fakes::ScratchDisk::Operation::List, kStore, EIO);
+  disk_.failOn(fakes::ScratchDisk::Operation::List, kMoviesStore, EIO);
   salvage();
   EXPECT_EQ(log_.lines().size(), 1u);
   EXPECT_TRUE(salvage_.salvaged.empty());

@@ -8,7 +8,7 @@
 namespace qv::platform {
 namespace {
 
-constexpr uint32_t kGreen = 0x00FF00, kBlue = 0x0000FF, kRed = 0xFF0000;
+constexpr uint32_t kWindowGreen = 0x00FF00, kWindowBlue = 0x0000FF, kWindowRed = 0xFF0000;
 
 constexpr size_t kStrip = 40;  // rows at the top in which the indicator stands; the pointer lies below
 
@@ -56,7 +56,7 @@ class IndicatorTest : public kit::XServerTest {
   /// Whether the screen comes to show the indicator's sign in its upper right corner, over this colour.
   bool isSeenOver(uint32_t color) {
     return seen_->waitForPicture([&](const PixelBuffer& image) {
-      const Found sign = find(image, kRed);
+      const Found sign = find(image, kWindowRed);
       return kit::colorIn(image, 100, 400) == color && sign.count > 40 && sign.left > image.width() / 2;
     });
   }
@@ -70,28 +70,29 @@ class IndicatorTest : public kit::XServerTest {
 
 TEST_F(IndicatorTest, CoversWhateverIsShownButNotAnApplicationsPictureAndIsPressed) {
   open(display());
-  const auto game = app_->show({.width = kit::XServer::kWidth, .height = kit::XServer::kHeight, .color = kGreen});
+  const auto game = app_->show({.width = kit::XServer::kWidth, .height = kit::XServer::kHeight, .color = kWindowGreen});
   const auto user = std::make_shared<PressRecorder>();
   auto bar = platform_->statusBar().acquire(shown_, user);
-  ASSERT_TRUE(isSeenOver(kGreen));
-  const Found dot = find(*seen_->last()->image(), kRed), text = find(*seen_->last()->image(), kText);
+  ASSERT_TRUE(isSeenOver(kWindowGreen));
+  const Found dot = find(*seen_->last()->image(), kWindowRed), text = find(*seen_->last()->image(), kText);
   EXPECT_GT(text.count, 50u);
   EXPECT_GT(text.left, dot.right);
   app_->raise(game);
-  app_->fill(game, kBlue);
-  EXPECT_TRUE(isSeenOver(kBlue)) << "it is raised again";
+  app_->fill(game, kWindowBlue);
+  EXPECT_TRUE(isSeenOver(kWindowBlue)) << "it is raised again";
   app_->setNoBackground(game);  // the server fills in what is on the screen, when the capture begins
   const auto movie = std::make_shared<kit::FrameRecorder>();
   const auto recording = capture(DisplayCloneMode::CloneContexts, {game}, movie);
   ASSERT_TRUE(movie->waitForFrames(1));
-  EXPECT_EQ(find(*movie->last()->image(), kRed).count, 0u);
-  app_->fill(game, kGreen);  // what it paints while it is captured
+  EXPECT_EQ(find(*movie->last()->image(), kWindowRed).count, 0u);
+  app_->fill(game, kWindowGreen);  // what it paints while it is captured
   EXPECT_TRUE(movie->waitForPicture([](const PixelBuffer& image) {
-    return find(image, kGreen).count == kit::XServer::kWidth * kStrip;
+    return find(image, kWindowGreen).count == kit::XServer::kWidth * kStrip;
   })) << "nothing but the window's own pixels";
   bar->update({shown_.text, "0:06", true});
-  EXPECT_TRUE(seen_->waitForPicture([&](const PixelBuffer& image) { return find(image, kRed).count > dot.count; }))
-      << "two bars while it is paused";
+  EXPECT_TRUE(seen_->waitForPicture([&](const PixelBuffer& image) {
+    return find(image, kWindowRed).count > dot.count;
+  })) << "two bars while it is paused";
   if (kit::isInstalled("xdotool")) {
     const auto x = std::to_string(dot.left + 3), y = std::to_string(dot.top + 3);
     kit::Process click("xdotool", {"mousemove", x, y, "click", "1"}, {"DISPLAY=" + display()});
@@ -99,7 +100,7 @@ TEST_F(IndicatorTest, CoversWhateverIsShownButNotAnApplicationsPictureAndIsPress
     EXPECT_TRUE(user->presses.next());
   }
   bar.reset();
-  EXPECT_TRUE(seen_->waitForPicture([](const PixelBuffer& image) { return find(image, kRed).count == 0; }));
+  EXPECT_TRUE(seen_->waitForPicture([](const PixelBuffer& image) { return find(image, kWindowRed).count == 0; }));
 }
 
 TEST_F(IndicatorTest, CoversManagedWindowsAndLeavesThemTheKeyboard) {
@@ -107,12 +108,12 @@ TEST_F(IndicatorTest, CoversManagedWindowsAndLeavesThemTheKeyboard) {
   const kit::XServer own;
   const kit::WindowManager manager(own.display());
   open(own.display());  // afterwards: only the platform's threads take turns in connecting
-  const auto game = app_->show({.width = kit::XServer::kWidth, .height = kit::XServer::kHeight, .color = kGreen});
+  const auto game = app_->show({.width = kit::XServer::kWidth, .height = kit::XServer::kHeight, .color = kWindowGreen});
   const auto bar = platform_->statusBar().acquire(shown_, {});
-  ASSERT_TRUE(isSeenOver(kGreen));
+  ASSERT_TRUE(isSeenOver(kWindowGreen));
   ASSERT_TRUE(kit::activateWindow(own.display(), game));
-  app_->fill(game, kBlue);
-  EXPECT_TRUE(isSeenOver(kBlue));
+  app_->fill(game, kWindowBlue);
+  EXPECT_TRUE(isSeenOver(kWindowBlue));
   app_->waitForFocus(game);
 }
 
