@@ -6,7 +6,7 @@ option(QV_UNITY "compile several sources of a target at a time" ON)
 set(CMAKE_UNITY_BUILD ${QV_UNITY})
 set(CMAKE_UNITY_BUILD_BATCH_SIZE 8)
 if(QV_UNITY)
-  add_compile_options(-Wno-subobject-linkage)  # a unit of several sources is a header to GCC
+  add_compile_options($<$<COMPILE_LANGUAGE:CXX>:-Wno-subobject-linkage>)  # a unit of several sources is a header to GCC
 endif()
 if(QV_SANITIZE STREQUAL "address")
   add_compile_options(-fsanitize=address,undefined -fno-sanitize-recover=all -fno-omit-frame-pointer)
