@@ -6,7 +6,9 @@
 What becomes of a block of the page stands in a comment before it, "<!-- guide: ... -->":
 
     after PAGE#SECTION       (no block) the blocks of another page's section come first
-    run [in the sources]     typed into a terminal; so are blocks of sh without a comment. It must end with 0
+    run              typed into a terminal; so are blocks of sh without a comment. It must end with 0
+    demo             the same in the sources, and it may end otherwise: demos judge how fast the machine is. What it must
+                     have said stands in an "expect" below
     terminal NAME [until COMMAND]    typed into a terminal of that name, where it goes on; what went on there before ends
     expect                   lines, in this order, among what the last commands say; "..." in them is anything
     file NAME                written there
@@ -169,16 +171,19 @@ class Reader:
         if block.order.startswith("not run: "):
             self.left_out += 1
             return None
-        orders = {"run": self.run, "terminal": self.use_terminal, "expect": self.expect, "file": self.write,
+        orders = {"run": self.run, "demo": self.show, "terminal": self.use_terminal, "expect": self.expect, "file": self.write,
                   "json": self.parse, "compile": self.compile, "from": self.compare}
         if word not in orders:
             raise Failure(f"is neither run nor marked as not run:\n{block.text}")
         self.done += 1
         return orders[word](rest, block.text)
 
-    def run(self, where, text):
+    def run(self, _, text):
         self.last = self.own
-        self.last.run(f"(cd {SOURCES}\n{text})\n" if where == "in the sources" else text)
+        self.last.run(text)
+
+    def show(self, _, text):
+        self.run(_, f"(cd {SOURCES}\n{text}) || true\n")
 
     def use_terminal(self, words, text):
         name, _, until = words.partition(" until ")
