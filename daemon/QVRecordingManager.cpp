@@ -59,7 +59,9 @@ QVRecordingManager::QVRecordingManager(platform::Platform& platform, QVCaptureMa
       requests_([this](const Caller& caller, platform::PeerStanding standing) { callerWasRefused(caller, standing); }),
       status_(sequence_, *context_, *sessions_, *foreground_, exemptions_, logQuotas_) {
   context_->files._srSetupTempDirectory();
-  QVUnfinishedMovies(context_->files, *platform_.movieSalvage, *platform_.localization)._srSalvageUnfinishedMovies();
+  // What becomes of each is logged.
+  (void)QVUnfinishedMovies(context_->files, *platform_.movieSalvage, *platform_.localization)
+      ._srSalvageUnfinishedMovies();
   addRecordingRequests();
   addApplicationRequests();
   addBroadcastRequests();

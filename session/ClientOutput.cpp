@@ -29,7 +29,8 @@ void ClientOutput::appendMicrophone(const PlacedSound& sound) {
 }
 
 void ClientOutput::packageVideoSampleBufferForCapture(QVClientProxy& to, const SampleBufferRef& sample) {
-  to.captureHandlerWithSample({.surface = sample->image()->sharedFrame(), .timing = sample->timing().front()});
+  to.captureHandlerWithSample({.surface = sample->image()->sharedFrame(), .timing = sample->timing().front()},
+                              droppedPictures_);
 }
 
 void ClientOutput::packageAudioSampleBufferForCapture(const PlacedSound& sound, SampleType type) {

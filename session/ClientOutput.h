@@ -1,5 +1,6 @@
 #pragma once
 
+#include <atomic>
 #include <functional>
 #include <memory>
 #include <mutex>
@@ -22,6 +23,7 @@ class ClientOutput final : public RecordingOutput {
   void appendAppAudio(const PlacedSound& sound) override;
   void appendMicrophone(const PlacedSound& sound) override;
   void finish(platform::MediaTime, FinishHandler handler) override { handler({}); }
+  [[nodiscard]] OutputCounts counts() const override { return {.droppedPictures = droppedPictures_->load()}; }
 
  private:
   void packageVideoSampleBufferForCapture(QVClientProxy& to, const platform::SampleBufferRef& sample);
@@ -29,6 +31,8 @@ class ClientOutput final : public RecordingOutput {
   void tellTimeline(QVClientProxy& to, platform::MediaTime pauses);
 
   const Client client_;
+  /// Whether a picture was sent is known later than this may live.
+  const std::shared_ptr<std::atomic<uint64_t>> droppedPictures_ = std::make_shared<std::atomic<uint64_t>>(0);
   /// Sound and pictures come on threads of their own; a sample follows the timeline that it belongs to.
   std::mutex mutex_;
   /// Invalid until the first sample: a client may have a former capture's in mind.

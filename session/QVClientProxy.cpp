@@ -6,22 +6,33 @@ namespace qv {
 
 namespace logs = platform::logs;
 
+namespace {
+
+bool isDrop(const platform::Error& error) {
+  return error.domain == platform::kIPCErrorDomain &&
+         error.code == static_cast<int64_t>(platform::IPCErrorCode::MessageDropped);
+}
+
+}  // namespace
+
 QVClientProxy::QVClientProxy(const QuorvelErrors& errors, std::string bundleIdentifier,
                              const std::shared_ptr<platform::IPCConnection>& connection)
     : errors_(errors), bundleIdentifier_(std::move(bundleIdentifier)), connection_(connection) {}
 
-void QVClientProxy::send(OutgoingCall call, const char* failureLine,
-                         const std::shared_ptr<platform::RareLog>& failures) {
+void QVClientProxy::send(OutgoingCall call, const char* failureLine, const std::shared_ptr<platform::RareLog>& failures,
+                         const std::shared_ptr<std::atomic<uint64_t>>& dropped) {
   const auto target = connection();
   if (!target) return;
-  target->call(call.member, std::move(call.arguments), nullptr, [failureLine, failures](const platform::Error& error) {
+  const auto failed = [failureLine, failures, dropped](const platform::Error& error) {
+    if (dropped && isDrop(error)) ++*dropped;
     const auto number = failures ? failures->count() : std::optional<uint64_t>(1);
     if (!number) return;
     std::string line = failureLine;
     line.replace(line.find("%d"), 2, std::to_string(static_cast<int>(error.code)));
     if (*number > 1) line += " (" + std::to_string(*number) + " times)";
     QV_LOG_ERROR(logs::kDaemon, "%s", line.c_str());
-  });
+  };
+  target->call(call.member, std::move(call.arguments), nullptr, failed);
 }
 
 void QVClientProxy::updateScreenRecordingState(bool recording) {
@@ -48,9 +59,11 @@ void QVClientProxy::updateBroadcastURL(const platform::URL& broadcastURL) {
   send(callback::UpdateBroadcastURL{broadcastURL}, "QVClientProxy:updateBroadcastURL: error getting remote proxy: %d");
 }
 
-void QVClientProxy::captureHandlerWithSample(const PictureMessage& picture) {
+void QVClientProxy::captureHandlerWithSample(const PictureMessage& picture,
+                                             const std::shared_ptr<std::atomic<uint64_t>>& dropped) {
   QV_LOG_DEBUG(logs::kDaemon, "QVClientProxy:captureHandlerWithSample:");
-  send(captureCallOf(picture), "QVClientProxy:captureHandlerWithSample: error getting remote proxy: %d", lostFrames_);
+  send(captureCallOf(picture), "QVClientProxy:captureHandlerWithSample: error getting remote proxy: %d", lostFrames_,
+       dropped);
 }
 
 void QVClientProxy::captureHandlerWithAudioSample(SoundMessage sound) {

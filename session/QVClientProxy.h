@@ -1,5 +1,6 @@
 #pragma once
 
+#include <atomic>
 #include <memory>
 #include <optional>
 #include <string>
@@ -34,7 +35,8 @@ class QVClientProxy {
                               const std::optional<platform::URL>& movieURL);
   void updateBroadcastServiceInfo(const platform::Dictionary& serviceInfo);
   void updateBroadcastURL(const platform::URL& broadcastURL);
-  void captureHandlerWithSample(const PictureMessage& picture);
+  /// Counts in `dropped` (may be nothing) what the client was too slow to be sent; maybe after this has gone.
+  void captureHandlerWithSample(const PictureMessage& picture, const std::shared_ptr<std::atomic<uint64_t>>& dropped);
   void captureHandlerWithAudioSample(SoundMessage sound);
   /// The sum of the pauses before the samples that follow.
   void captureTimelineDidChange(platform::MediaTime pauses);
@@ -43,8 +45,9 @@ class QVClientProxy {
   void recordingTimerDidUpdate(const std::string& time);
 
  private:
-  /// `failures` (may be nothing) counts those of a member that is sent all the time.
-  void send(OutgoingCall call, const char* failureLine, const std::shared_ptr<platform::RareLog>& failures = nullptr);
+  /// `failures` (may be nothing) counts those of a member that is sent all the time, `dropped` what did not fit.
+  void send(OutgoingCall call, const char* failureLine, const std::shared_ptr<platform::RareLog>& failures = nullptr,
+            const std::shared_ptr<std::atomic<uint64_t>>& dropped = nullptr);
 
   const QuorvelErrors& errors_;
   const std::string bundleIdentifier_;

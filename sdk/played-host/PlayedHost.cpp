@@ -1,7 +1,7 @@
 // Plays the device for one broadcast extension, so that it can be tried without one:
 //
-//   played-host PROGRAM samples SECONDS KEY=VALUE...     a flash and a beep each second, 640x360 at 30 frames/s
-//   played-host PROGRAM clips FILE.mp4,FILE.mp4,... KEY=VALUE...
+//   quorvel-played-host PROGRAM samples SECONDS KEY=VALUE...     a flash and a beep each second, 640x360 at 30 frames/s
+//   quorvel-played-host PROGRAM clips FILE.mp4,FILE.mp4,... KEY=VALUE...
 //
 // Prints what the extension says. KEY=VALUE become the user information. With the environment's PAUSE=SECONDS,
 // the stream pauses for a second at that time; ORIENTATION=N is the EXIF orientation that the pictures come with.

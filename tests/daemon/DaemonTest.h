@@ -60,6 +60,8 @@ class TestClient {
   bool isRecording() { return valueForKey(state(), "isRecording").asBool(); }
   void disconnect();
   void leave() { connection_->invalidate(); }
+  /// It does not read what it is sent.
+  void fallBehind() { std::dynamic_pointer_cast<fakes::FakeIPCConnection>(connection_)->fallBehind(); }
   /// Its process executes another program, and keeps the connection.
   void becomeAnotherProgram() { identity_->now = platform::PeerStanding::AnotherProgram; }
   /// Its executable is replaced while it runs.

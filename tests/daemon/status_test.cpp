@@ -70,6 +70,17 @@ TEST_F(StatusTest, WhatIsRecordedIsToldToItsUserAndToOthersThatItIs) {
   EXPECT_TRUE(ask(kOther, status::GetMovies{}).empty());
 }
 
+TEST_F(StatusTest, PicturesThatAClientIsTooSlowForAreCounted) {
+  auto client = gameOf(kViewer);
+  ASSERT_EQ(client.start({.capture = true})->code(), 0);
+  sendFrame(kSecond);
+  client.fallBehind();
+  sendFrame(2 * kSecond);
+  sendFrame(3 * kSecond);
+  Dictionary seen = ask(kViewer, status::GetRecordings{}).at(0).asDictionary();
+  EXPECT_EQ((std::pair{seen["pictures"].asInteger(), seen["droppedPictures"].asInteger()}), (std::pair{3L, 2L}));
+}
+
 TEST_F(StatusTest, AStartIsRefusedAsItsConditionsTell) {
   auto client = game();
   auto system = systemUI();

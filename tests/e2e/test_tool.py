@@ -8,6 +8,7 @@ import shutil
 import struct
 import subprocess
 import termios
+import xml.etree.ElementTree
 
 from harness import BUILD, Device, check, main, wait_until
 from stage import device as stages, movie
@@ -160,30 +161,37 @@ def daemon_without_modules(device):
     device.start_daemon()
 
 
+# What is broken, how, whether a daemon is started then, and what doctor must name. (There is no display or sound here.)
+BROKEN = (
+    ('no daemon', lambda device: None, False, {'daemon'}),
+    ('a daemon that died', dead_daemon, False, {'daemon'}),
+    ('a daemon that does not know the tool', daemon_without_the_tool, False, {'bundle'}),
+    ('no module of movies', daemon_without_modules, False, {'encoder'}),
+    ('no entitlement', lambda device: os.remove(device.entitlement), True, {'entitlement'}),
+    ('an entitlement that all may write', lambda device: os.chmod(device.entitlement, 0o666), True, {'entitlement'}),
+    ('an entitlement of somebody else', lambda device: device.write(
+        device.entitlement, {'com.tarnwick.private.quorvel': True, 'users': [12345]}), True, {'entitlement'}),
+    ('a file where the store should be', lambda device: device.write(device.movies, ''), True, {'store', 'space'}),
+    ('a full disk', lambda device: device.mount_disk(device.media, '50m'), True, {'space'}),
+    ('no texts', lambda device: shutil.rmtree(device.framework), True, {'texts'}),
+    ('a tool without its bundle', lambda device: device.environment.update(QUORVEL_BUNDLE_PATH=device.bundles), True,
+     {'recorder', 'bundle'}),
+)
+
+
 def doctor():
-    """Each of these set-ups is broken in one place, and doctor names it. (There is neither display nor sound here.)"""
-    def found(names, breaking, starts=True):
+    """Each of these set-ups is broken in one place, and doctor names it."""
+    for what, breaking, starts, names in BROKEN:
         with ToolDevice() as device:
             breaking(device)
             if starts:
                 device.start_daemon()
-            check(device.faults() == names, f'{device.faults()}, not {names}')
-
-    here = {'display', 'sound'}
-    found({'daemon'}, lambda device: None, starts=False)
-    found({'daemon'}, dead_daemon, starts=False)
-    found(here | {'bundle'}, daemon_without_the_tool, starts=False)
-    found(here | {'encoder'}, daemon_without_modules, starts=False)
-    found(here | {'entitlement'}, lambda device: os.remove(device.entitlement))
-    found(here | {'entitlement'}, lambda device: os.chmod(device.entitlement, 0o666))
-    found(here | {'store', 'space'}, lambda device: device.write(device.movies, 'no directory'))
-    found(here | {'space'}, lambda device: device.mount_disk(device.media, '50m'))
-    found(here | {'texts'}, lambda device: shutil.rmtree(device.framework))
-    found(here | {'recorder', 'bundle'}, lambda device: device.environment.update(QUORVEL_BUNDLE_PATH=device.bundles))
+            expected = names if names == {'daemon'} else names | {'display', 'sound'}
+            check(device.faults() == expected, f'{what}: {device.faults()}, not {expected}')
 
 
 def healthy_device():
-    """Nothing is wrong with one that has all; then its display dies."""
+    """Nothing is wrong with one that has all; then its display dies, and its sound server."""
     with stages.Stage(BUILD) as stage:
         stage.allow_system_recordings(stages.TOOL)
         done = stage.run([TOOL, 'doctor'], check=False)
@@ -191,7 +199,55 @@ def healthy_device():
         stage.end(stage.display_server)
         done = stage.run([TOOL, 'doctor'], check=False)
         check(done.returncode == FAILED and 'FAULT  display: X11' in done.stdout, done.stdout)
+        stage.end(stage.sound_server)
+        wait_until('the fault', lambda: 'FAULT  sound' in stage.run([TOOL, 'doctor'], check=False).stdout)
+
+
+def recover():
+    """What a crash cut off is seen, and mended, without a daemon; with one, what it could not mend is told."""
+    def look(*options):
+        done = device.run([TOOL, 'recover', '--json', *options], check=False)
+        return done.returncode, {each['name']: each for each in json.loads(done.stdout)['movies']}
+
+    with ToolDevice() as device:
+        daemon = device.start_daemon()
+        device.start_tool('record', '--size', '640x360')
+        wait_until('two seconds', lambda: wait_for_pictures(device)['seconds'] > 2)
+        daemon.kill()
+        device.children.remove(daemon)
+        name, = map(os.path.basename, device.movie_files())
+        check(look('--look') == (FAILED, {name: {'name': name, 'state': 'unfinished'}}), look('--look'))
+        code, movies = look()
+        (kept, mended), = movies.items()
+        check(code == 0 and mended['state'] == 'mended' and mended['seconds'] > 1, movies)
+        movie.check_decodes(os.path.join(device.movies, kept))
+        check('recovered' in device.tool('recover'), 'it is not told a second time')
+        damaged = 'Chess_recovered_01-01-2026 00-00-00.mp4'
+        device.write(os.path.join(device.movies, damaged), 'no movie')
+        device.start_daemon()
+        code, movies = look()
+        check(code == FAILED and movies.keys() == {kept, damaged} and 'error' in movies[damaged], movies)
+
+
+def plot():
+    """The picture's bars are as high as what was measured; what cannot be written leaves the former picture."""
+    events = [{'time': 1767268800 + 60 * at, 'serviceName': 'InAppRecording', 'droppedPictures': 10 * at, 'payload': {
+        'ActiveDuration': 10, 'VideoFrameCount': 300 * at, 'VideoCaptureRate': 60, 'RecordedFileSize': 4_000_000,
+        'EndReason': 0}} for at in (1, 2)]
+    with ToolDevice() as device:
+        device.write('private/var/mobile/Library/Logs/Quorvel/metrics.jsonl', '\n'.join(map(json.dumps, events)) + '\n{"torn')
+        device.tool('metrics', '--plot', device.file('plot.svg'))
+        picture = xml.etree.ElementTree.parse(device.file('plot.svg')).getroot()
+        bars = [each for each in picture.iter('{http://www.w3.org/2000/svg}rect') if each.get('fill') != '#fff']
+        heights = [float(each.get('height')) for each in bars]
+        check(len(heights) == 6 and [heights[1] / heights[0], heights[3] / heights[2], heights[5] / heights[4]] == [2, 2, 1],
+              f'{heights}')
+        device.tool('metrics', '--plot', device.file('none/plot.svg'), code=NOT_WRITABLE, says='No such file')
+        device.mount_disk(device.file('small'), '4k')
+        device.write(device.file('small/plot.svg'), 'former')
+        device.tool('metrics', '--plot', device.file('small/plot.svg'), code=NOT_WRITABLE, says='No space')
+        check(os.listdir(device.file('small')) == ['plot.svg'], 'a part of a picture is left')
 
 
 if __name__ == '__main__':
-    main({case.__name__: case for case in (records, outputs, daemons, doctor, healthy_device)})
+    main({case.__name__: case for case in (records, outputs, daemons, doctor, healthy_device, recover, plot)})

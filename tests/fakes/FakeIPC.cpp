@@ -104,6 +104,7 @@ void FakeIPCConnection::call(std::string_view member, IPCArguments arguments, Co
   if (ended_) return refuse(IPCErrorCode::ConnectionInvalid);
   const IPCOperation* operation = remoteInterface_.operation(member);
   if (!operation) return refuse(IPCErrorCode::UnknownOperation);
+  if (dropsMedia_ && operation->isMedia) return refuse(IPCErrorCode::MessageDropped);
   auto typed = argumentsFor(arguments, operation->arguments);
   if (!typed) return refuse(IPCErrorCode::InvalidArguments);
   const uint64_t serial = nextSerial_++;

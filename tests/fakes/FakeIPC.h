@@ -45,6 +45,10 @@ class FakeIPCConnection final : public platform::IPCConnection, public std::enab
   void setTargetQueue(platform::SerialQueue& queue) override;
   void resume() override;
   void invalidate() override { end(false); }
+  /// The other end has no room for further media messages.
+  void fallBehind() {
+    if (const auto other = other_.lock()) other->dropsMedia_ = true;
+  }
   void call(std::string_view member, platform::IPCArguments arguments, Completion completion,
             ErrorHandler errorHandler) override;
 
@@ -67,7 +71,7 @@ class FakeIPCConnection final : public platform::IPCConnection, public std::enab
   const bool named_;
   std::unique_ptr<platform::SerialQueue> queue_;
   std::weak_ptr<FakeIPCConnection> other_;
-  bool resumed_ = false, ended_ = false;
+  bool resumed_ = false, ended_ = false, dropsMedia_ = false;
   std::vector<std::function<void()>> inbox_;  ///< until it is resumed
   struct Exported {
     platform::IPCInterface interface;

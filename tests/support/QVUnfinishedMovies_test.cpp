@@ -23,7 +23,9 @@ class UnfinishedMoviesTest : public SupportTest {
         {"Chess.mp4", MovieState::Unfinished}, {"Done.mp4", MovieState::Finished}, {"Live.mp4", MovieState::InUse}};
   }
   void add(const std::string& name) { disk_.addFile(kMoviesStore + name, name, {fakes::FakeClock::kStart}); }
-  void salvage() { QVUnfinishedMovies(files_, *platform_.movieSalvage, localization_)._srSalvageUnfinishedMovies(); }
+  void salvage() {
+    (void)QVUnfinishedMovies(files_, *platform_.movieSalvage, localization_)._srSalvageUnfinishedMovies();
+  }
   /// Under which a movie of this name is kept, without the extension.
   std::string stemOf(const std::string& name) {
     return name + "_recovered_" + localization_.formatDate({fakes::FakeClock::kStart}, "MM-dd-yyyy HH-mm-ss");

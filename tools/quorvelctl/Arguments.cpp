@@ -43,13 +43,15 @@ const std::map<std::string, Option>& options() {
   static const Setter setOutput = [](Arguments& a, const std::string& value) { a.output = value; };
   static const std::map<std::string, Option> all{
       {"--json",
-       {false, " status watch record stop list save extensions metrics doctor ",
+       {false, " status watch record stop list save extensions metrics recover doctor ",
         [](Arguments& a, const std::string&) { a.json = true; }}},
       {"-o", {true, " record stop save ", setOutput}},
       {"--output", {true, " record stop save ", setOutput}},
       {"--seconds", {true, " record ", [](Arguments& a, const std::string& value) { a.seconds = secondsFrom(value); }}},
       {"--microphone", {false, " record ", [](Arguments& a, const std::string&) { a.microphone = true; }}},
       {"--bundle", {true, " status ", [](Arguments& a, const std::string& value) { a.bundle = value; }}},
+      {"--plot", {true, " metrics ", [](Arguments& a, const std::string& value) { a.plot = value; }}},
+      {"--look", {false, " recover ", [](Arguments& a, const std::string&) { a.look = true; }}},
       {"--size", {true, " record ", [](Arguments& a, const std::string& value) { a.size = sizeFrom(value); }}}};
   return all;
 }

@@ -17,6 +17,8 @@ struct Arguments {
   bool microphone = false;
   std::optional<std::string> bundle;        ///< an application's identifier
   std::optional<std::pair<int, int>> size;  ///< pixels of the picture
+  std::optional<std::string> plot;          ///< a file
+  bool look = false;                        ///< and change nothing
   std::vector<std::string> rest;
 
   /// Throws a Failure for an option that the verb does not have, or that has no good value.

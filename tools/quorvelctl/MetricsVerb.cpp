@@ -1,8 +1,11 @@
 #include <cerrno>
+#include <cstdio>
 #include <cstdlib>
 #include <cstring>
+#include <filesystem>
 #include <fstream>
 
+#include "tools/quorvelctl/MetricsPlot.h"
 #include "tools/quorvelctl/Verbs.h"
 #include "tools/quorvelctl/Wording.h"
 
@@ -49,7 +52,28 @@ std::string rowOf(const json& event) {
          clockText(static_cast<double>(seconds)) + "  " + number(payload, "VideoCaptureWidth") + "x" +
          number(payload, "VideoCaptureHeight") + "  " + rate + " of " + number(payload, "VideoCaptureRate") +
          " pictures/s  " + sizeText(payload.value("RecordedFileSize", uint64_t{0})) + "  " +
+         (event.contains("droppedPictures") ? number(event, "droppedPictures") + " dropped  " : "") +
          (reason == 0 ? "stopped" : "error " + std::to_string(reason));
+}
+
+[[noreturn]] void cannotWrite(const std::string& path) {
+  throw Failure{Exit::NotWritable, path + " cannot be written: " + std::strerror(errno)};
+}
+
+/// Whole or not at all, and in place of a former one. What is no plain file (a pipe, /dev/stdout) is written as it is.
+void writeFile(const std::string& path, const std::string& content) {
+  std::error_code error;
+  const bool isSpecial = std::filesystem::exists(path, error) && !std::filesystem::is_regular_file(path, error);
+  const std::string written = isSpecial ? path : path + ".part";
+  std::ofstream file(written);
+  file << content << std::flush;
+  if (!file) {
+    const int failure = errno;
+    if (!isSpecial) std::filesystem::remove(written, error);
+    errno = failure;
+    cannotWrite(path);
+  }
+  if (!isSpecial && std::rename(written.c_str(), path.c_str()) != 0) cannotWrite(path);
 }
 
 }  // namespace
@@ -58,8 +82,13 @@ std::string rowOf(const json& event) {
 Exit showMetrics(const Stage& stage) {
   const char* root = std::getenv("QUORVEL_DEVICE_ROOT");
   json events = readEvents((root != nullptr ? root : "") + std::string(kFile));
+  if (stage.arguments.plot) writeFile(*stage.arguments.plot, plotOf(events));
   if (stage.arguments.json) {
     stage.output.json({{"events", std::move(events)}});
+    return Exit::Success;
+  }
+  if (stage.arguments.plot) {
+    stage.output.line("drawn " + *stage.arguments.plot + ": " + std::to_string(events.size()) + " recordings");
     return Exit::Success;
   }
   if (events.empty()) stage.output.line("nothing was recorded yet");

@@ -25,6 +25,7 @@ Exit save(const Stage& stage);
 Exit listMovies(const Stage& stage);
 Exit listExtensions(const Stage& stage);
 Exit showMetrics(const Stage& stage);
+Exit recover(const Stage& stage);
 Exit doctor(const Stage& stage);
 
 }  // namespace ctl

@@ -24,7 +24,8 @@ constexpr const char kHelp[] =
     "  list                    the movies of the store\n"
     "  save [NAME] [-o FILE]   a movie of the store that waits for quorvelctl\n"
     "  extensions              the installed broadcast extensions\n"
-    "  metrics                 how the recordings of this device were\n"
+    "  metrics [--plot FILE]   how the recordings of this device were; as a picture (SVG)\n"
+    "  recover [--look]        finishes movies that a crash cut off\n"
     "  doctor                  what is wrong with this device, and what to do\n"
     "Every verb has --json. See quorvelctl(1).";
 
@@ -37,6 +38,7 @@ Exit run(int argc, char** argv, Output& output, const Signals& signals) {
                                                                    {"save", save},
                                                                    {"extensions", listExtensions},
                                                                    {"metrics", showMetrics},
+                                                                   {"recover", recover},
                                                                    {"doctor", doctor}};
   const std::string word = argc > 1 ? argv[1] : "";
   if (word == "--help" || word == "-h" || word == "help") {
