@@ -1,5 +1,5 @@
 #!/usr/bin/env bash
-# An application built against the installed client and extension libraries, as pkg-config tells it, starts.
+# An application built against the installed client and extension libraries, as pkg-config and as CMake tell it, starts.
 #   installed_sdk.sh BUILD_DIRECTORY
 set -euo pipefail
 image=$(mktemp -d)
@@ -16,3 +16,15 @@ export PKG_CONFIG_PATH=$libraries/pkgconfig
 # shellcheck disable=SC2046
 c++ "$image/user.cpp" -o "$image/user" $(pkg-config --cflags --libs quorvel quorvel-extension)
 LD_LIBRARY_PATH=$libraries "$image/user"
+
+cat >"$image/CMakeLists.txt" <<'CMAKE'
+cmake_minimum_required(VERSION 3.16)
+project(user LANGUAGES CXX)
+find_package(Quorvel 0.1 REQUIRED)
+find_package(QuorvelExtension 0.1 REQUIRED)
+add_executable(user-by-cmake user.cpp)
+target_link_libraries(user-by-cmake PRIVATE Quorvel::quorvel Quorvel::quorvel-extension)
+CMAKE
+cmake -S "$image" -B "$image/build" -DCMAKE_PREFIX_PATH="$image/opt" >"$image/cmake.log"
+cmake --build "$image/build" >>"$image/cmake.log"
+"$image/build/user-by-cmake"
