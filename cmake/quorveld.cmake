@@ -50,17 +50,21 @@ function(qv_module name)
   install(TARGETS ${name} LIBRARY DESTINATION lib/quorveld)
 endfunction()
 
-# qv_sdk_library(name LIBRARY static-library ENTRY source ... PC template HEADERS header ...)
-# The shared library that others link, and name_static, the same in a form for tests, which sanitizers see through.
+# qv_sdk_library(name LIBRARY static-library ENTRY source ... PC template PACKAGE Name HEADERS header ...)
+# The shared library that others link (with pkg-config, or as Quorvel::name of the CMake package Name), and name_static,
+# the same in a form for tests, which sanitizers see through.
 # Nothing but the public names leaves it, and it stays loaded: its threads live as long as the process.
 function(qv_sdk_library name)
-  cmake_parse_arguments(ARG "" "LIBRARY;PC" "ENTRY;HEADERS" ${ARGN})
+  cmake_parse_arguments(ARG "" "LIBRARY;PC;PACKAGE" "ENTRY;HEADERS" ${ARGN})
   include(GNUInstallDirs)
+  include(CMakePackageConfigHelpers)
   set(map ${PROJECT_SOURCE_DIR}/sdk/common/quorvel.map)
   add_library(${name} SHARED ${ARG_ENTRY})
   set_target_properties(${name} PROPERTIES QV_OWN_PLATFORM ON)
   target_link_libraries(${name} PRIVATE ${ARG_LIBRARY} qv_sdbus)
-  target_include_directories(${name} INTERFACE ${CMAKE_CURRENT_SOURCE_DIR} ${PROJECT_SOURCE_DIR}/sdk/common)
+  target_include_directories(${name} INTERFACE $<BUILD_INTERFACE:${CMAKE_CURRENT_SOURCE_DIR}>
+                             $<BUILD_INTERFACE:${PROJECT_SOURCE_DIR}/sdk/common>)
+  target_compile_features(${name} INTERFACE cxx_std_20)
   target_link_options(${name} PRIVATE -Wl,--whole-archive $<TARGET_FILE:${ARG_LIBRARY}> -Wl,--no-whole-archive
                       -Wl,--version-script=${map} -Wl,-z,nodelete)
   set_target_properties(${name} PROPERTIES VERSION ${PROJECT_VERSION} SOVERSION ${PROJECT_VERSION_MAJOR}
@@ -68,7 +72,12 @@ function(qv_sdk_library name)
   # Relative to the file itself: the prefix is chosen at the installation, and an image has a root of its own.
   file(RELATIVE_PATH include_from_pc /root/${CMAKE_INSTALL_LIBDIR}/pkgconfig /root/${CMAKE_INSTALL_INCLUDEDIR})
   configure_file(${ARG_PC}.in ${ARG_PC} @ONLY)
-  install(TARGETS ${name} LIBRARY DESTINATION ${CMAKE_INSTALL_LIBDIR})
+  install(TARGETS ${name} EXPORT ${ARG_PACKAGE} LIBRARY DESTINATION ${CMAKE_INSTALL_LIBDIR}
+          INCLUDES DESTINATION ${CMAKE_INSTALL_INCLUDEDIR})
+  set(package_folder ${CMAKE_INSTALL_LIBDIR}/cmake/${ARG_PACKAGE})
+  install(EXPORT ${ARG_PACKAGE} FILE ${ARG_PACKAGE}Config.cmake NAMESPACE Quorvel:: DESTINATION ${package_folder})
+  write_basic_package_version_file(${ARG_PACKAGE}ConfigVersion.cmake COMPATIBILITY SameMajorVersion)
+  install(FILES ${CMAKE_CURRENT_BINARY_DIR}/${ARG_PACKAGE}ConfigVersion.cmake DESTINATION ${package_folder})
   install(FILES ${ARG_HEADERS} ${PROJECT_SOURCE_DIR}/sdk/common/quorvel/Types.h
           DESTINATION ${CMAKE_INSTALL_INCLUDEDIR}/quorvel)
   install(FILES ${CMAKE_CURRENT_BINARY_DIR}/${ARG_PC} DESTINATION ${CMAKE_INSTALL_LIBDIR}/pkgconfig)
@@ -92,17 +101,26 @@ function(qv_test name)
 endfunction()
 
 # qv_extension(program DIRECTORY bundle INFO Info.json SOURCES source ... [LIBRARIES library ...])
-# A broadcast extension in a bundle of its own. It has the extension library in its bundle: an extension may read its
-# own bundle and the system's libraries, and no build directory.
+# A broadcast extension in a bundle of its own, a plug-in of the example game. Where it is built it has the extension
+# library in its bundle: an extension may read its own bundle and the system's libraries, and no build directory.
 function(qv_extension program)
   cmake_parse_arguments(ARG "" "DIRECTORY;INFO" "SOURCES;LIBRARIES" ${ARGN})
   add_executable(${program} ${ARG_SOURCES})
   target_link_libraries(${program} PRIVATE quorvel-extension ${ARG_LIBRARIES})
   set_target_properties(${program} PROPERTIES RUNTIME_OUTPUT_DIRECTORY ${ARG_DIRECTORY}/bin
-                        BUILD_WITH_INSTALL_RPATH ON INSTALL_RPATH "$ORIGIN/../lib")
+                        BUILD_RPATH "$ORIGIN/../lib")
   add_custom_command(TARGET ${program} POST_BUILD
     COMMAND ${CMAKE_COMMAND} -E make_directory ${ARG_DIRECTORY}/lib
     COMMAND ${CMAKE_COMMAND} -E copy $<TARGET_FILE:quorvel-extension>
             ${ARG_DIRECTORY}/lib/$<TARGET_SONAME_FILE_NAME:quorvel-extension> VERBATIM)
   configure_file(${ARG_INFO} ${ARG_DIRECTORY}/Info.json COPYONLY)
+  get_filename_component(bundle ${ARG_DIRECTORY} NAME)
+  qv_install_example(${program} Game.app/PlugIns/${bundle} ${ARG_INFO})
+endfunction()
+
+# qv_install_example(program bundle Info.json): as a device's application. Only where the component is asked for:
+#   cmake --install build/release --prefix /usr --component examples
+function(qv_install_example program bundle info)
+  install(TARGETS ${program} RUNTIME DESTINATION /Applications/${bundle}/bin COMPONENT examples EXCLUDE_FROM_ALL)
+  install(FILES ${info} DESTINATION /Applications/${bundle} COMPONENT examples EXCLUDE_FROM_ALL)
 endfunction()

@@ -1,7 +1,9 @@
 #include <malloc.h>
 #include <sys/stat.h>
 
+#include <cstdio>
 #include <cstdlib>
+#include <cstring>
 #include <future>
 
 #include "daemon/DeviceSleep.h"
@@ -30,7 +32,10 @@ void completeRecordings(qv::QVRecordingManager& manager) {
 
 }  // namespace
 
-int main() {
+int main(int count, char** arguments) {
+  if (count == 2 && std::strcmp(arguments[1], "--version") == 0) {
+    return std::puts("quorveld " QV_VERSION) < 0 ? EXIT_FAILURE : EXIT_SUCCESS;
+  }
   // Before any thread is made, so that all inherit it.
   qv::platform::blockTerminationSignals();
   // The allocator would raise this bound with the first picture that an encoder frees, and keep the heap of a

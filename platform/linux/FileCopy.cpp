@@ -8,6 +8,7 @@
 #include <unistd.h>
 
 #include <cerrno>
+#include <chrono>
 #include <cstdint>
 #include <utility>
 
@@ -20,7 +21,10 @@ constexpr size_t kChunk = size_t{64} << 20;  // bytes in one call
 /// Hard to foresee, for a directory in which others write too.
 std::string hiddenName() {
   uint64_t number = 0;
-  (void)::getrandom(&number, sizeof number, 0);
+  // A kernel that refuses leaves a name that can be foreseen, but another one each time.
+  if (::getrandom(&number, sizeof number, 0) < 0) {
+    number = static_cast<uint64_t>(std::chrono::steady_clock::now().time_since_epoch().count());
+  }
   return kUnfinishedCopyPrefix + std::to_string(number);
 }
 

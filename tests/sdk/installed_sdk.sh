@@ -1,5 +1,6 @@
 #!/usr/bin/env bash
-# Applications in C++ and C, built against the installed libraries as pkg-config tells it, start; so does one in Python.
+# Applications in C++ (as pkg-config and as CMake tell it) and C, built against the installed libraries, start; so does one
+# in Python.
 #   installed_sdk.sh BUILD_DIRECTORY
 set -euo pipefail
 image=$(mktemp -d)
@@ -31,3 +32,15 @@ C
 cc -std=c11 -Wall -Wextra -pedantic -Werror "$image/user.c" -o "$image/user-c" $(pkg-config --cflags --libs quorvel)
 LD_LIBRARY_PATH=$libraries "$image/user-c"
 PYTHONPATH=$libraries/python3/dist-packages PYTHONDONTWRITEBYTECODE=1 /usr/bin/python3 -c "import quorvel; quorvel.Recorder()"
+
+cat >"$image/CMakeLists.txt" <<'CMAKE'
+cmake_minimum_required(VERSION 3.16)
+project(user LANGUAGES CXX)
+find_package(Quorvel 0.1 REQUIRED)
+find_package(QuorvelExtension 0.1 REQUIRED)
+add_executable(user-by-cmake user.cpp)
+target_link_libraries(user-by-cmake PRIVATE Quorvel::quorvel Quorvel::quorvel-extension)
+CMAKE
+cmake -S "$image" -B "$image/build" -DCMAKE_PREFIX_PATH="$image/opt" >"$image/cmake.log"
+cmake --build "$image/build" >>"$image/cmake.log"
+"$image/build/user-by-cmake"
