@@ -80,7 +80,9 @@ class DamagedMoviesTest : public testing::Test {
   }
   void leaveInStore(const std::string& name, const std::string& movie) { device_.disk.addFile(store_ + name, movie); }
   void salvageStore() {
-    QVUnfinishedMovies(device_.files, salvage_, *device_.platform.localization)._srSalvageUnfinishedMovies();
+    const auto movies =
+        QVUnfinishedMovies(device_.files, salvage_, *device_.platform.localization)._srSalvageUnfinishedMovies();
+    EXPECT_TRUE(movies);
   }
   /// By the beginning of its name; empty where it is gone.
   std::string keptPath(const std::string& stem) {
