@@ -1,4 +1,6 @@
 add_compile_options(-Wall -Wextra -Wshadow -Werror)
+# A program carries none but the libraries that it uses (THIRD-PARTY.md).
+add_link_options(-Wl,--as-needed)
 # Sources are compiled eight at a time: most of a source's time goes into the headers that they share. So a name that
 # a source keeps for itself is one in its folder. The build for ThreadSanitizer (CMakePresets.json) compiles each alone,
 # which shows what a source forgot to include.
@@ -46,7 +48,7 @@ function(qv_module name)
     pkg_check_modules(${name}_packages REQUIRED IMPORTED_TARGET ${ARG_PACKAGES})
     target_link_libraries(${name} PRIVATE PkgConfig::${name}_packages)
   endif()
-  target_link_options(${name} PRIVATE -Wl,--exclude-libs,ALL -Wl,--as-needed)
+  target_link_options(${name} PRIVATE -Wl,--exclude-libs,ALL)
   install(TARGETS ${name} LIBRARY DESTINATION lib/quorveld)
 endfunction()
 

@@ -16,7 +16,8 @@ SOURCE = os.path.dirname(os.path.dirname(os.path.dirname(os.path.abspath(__file_
 MIRROR = "http://deb.debian.org/debian"
 # What the trials use besides the packages' own dependencies: a service manager, a display, and what the guides tell
 # their reader to have.
-TOOLS = ("systemd", "ca-certificates", "python3", "xvfb", "g++", "make", "cmake", "pkg-config")
+TOOLS = ("systemd", "ca-certificates", "python3", "xvfb", "gcc", "g++", "make", "cmake", "pkg-config", "libxcb1-dev", "ffmpeg",
+         "python3-numpy")
 PATH = "/usr/sbin:/usr/bin:/sbin:/bin"
 DEVICES = ("null", "zero", "full", "random", "urandom", "tty")
 # Runs as the first process of the service manager's namespaces, where what it mounts and hides is its own. What the

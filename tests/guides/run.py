@@ -91,7 +91,7 @@ class Terminal:
     """A bash, as readers have one. What was started in it ends with it."""
 
     def __init__(self, folder, environment):
-        self.log = tempfile.TemporaryFile("w+", errors="replace")
+        self.log = tempfile.TemporaryFile("a+", errors="replace")  # "a": reading must not move where it writes
         self.shell = subprocess.Popen(["bash", "--noprofile", "--norc", "-eo", "pipefail"], cwd=folder, env=environment,
                                       stdin=subprocess.PIPE, stdout=self.log, stderr=subprocess.STDOUT, text=True,
                                       start_new_session=True)

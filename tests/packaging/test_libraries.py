@@ -17,7 +17,7 @@ FREE = RUNTIME | {"linux-vdso.so.1", "libsystemd.so.0", "libcap.so.2", "libgcryp
 SDK = {"sdk/client/libquorvel.so.0": ("sdk/client", "sdk/c", "sdk/common"),
        "sdk/extension/libquorvel-extension.so.0": ("sdk/extension", "sdk/common")}
 PROGRAMS = ("bin/quorveld", "bin/quorveld-extensions", "bin/quorvel-extension-launcher", "bin/quorvelctl",
-            "lib/quorveld/*.so", "tools/quorvelctl/*.app/bin/*", "examples/*/*.app/bin/*", "examples/*/*.app/PlugIns/*/bin/*",
+            "lib/quorveld/*", "tools/quorvelctl/*.app/bin/*", "examples/*/*.app/bin/*", "examples/*/*.app/PlugIns/*/bin/*",
             "sdk/played-host/played-host", *SDK)
 
 
