@@ -76,4 +76,13 @@ uint64_t TonePlayer::sound() {
   return answer.empty() ? 0 : std::stoull(answer);
 }
 
+NativePlayer::NativePlayer(int frequency, const std::string& properties) {
+  const std::string file = folder_ / "tone.wav";
+  // Without the volume its amplitude is 4095.
+  Process maker("ffmpeg", {"-v", "error", "-f", "lavfi", "-i",
+                           "sine=" + std::to_string(frequency) + ":r=44100:d=60,volume=8000/4095", file});
+  if (maker.wait() != 0) throw std::runtime_error("no tone to play");
+  process_.emplace("pw-cat", std::vector<std::string>{"--playback", "--properties", "{ " + properties + " }", file});
+}
+
 }  // namespace qv::kit

@@ -57,6 +57,21 @@ class TonePlayer {
   Process process_;
 };
 
+/// A program that plays a tone for a minute, by libpipewire itself, into the default output of the newest PipeWire
+/// server.
+///
+/// Threading: one thread.
+class NativePlayer {
+ public:
+  /// With what its stream says of itself: "NAME = VALUE ...".
+  explicit NativePlayer(int frequency, const std::string& properties = {});
+  [[nodiscard]] pid_t pid() const { return process_->pid(); }
+
+ private:
+  ScratchFolder folder_;
+  std::optional<Process> process_;
+};
+
 /// Skips, visibly, where there is no sound server to start. One server for each case.
 ///
 /// Threading: one thread.

@@ -185,6 +185,28 @@ TEST_P(PulseTest, PlaysTheSystemSounds) {
   EXPECT_GE(low, 500);
 }
 
+class PipeWireTest : public PulseTest {};
+INSTANTIATE_TEST_SUITE_P(, PipeWireTest, testing::Values(SoundServerKind::PipeWire), kNameOfServer);
+
+/// Of what plays without the PulseAudio library the server knows the process.
+TEST_P(PipeWireTest, HearsTheNativeStreamsOfAProcessWhateverOthersClaim) {
+  const auto ofBoth = tap(::getpid());
+  ofBoth->sound.next(kTenth);
+  const kit::NativePlayer first(440);
+  const auto ofFirst = tap(first.pid());
+  const kit::NativePlayer second(1000, "application.process.id = " + std::to_string(first.pid()) +
+                                           " pipewire.sec.pid = " + std::to_string(first.pid()) +
+                                           " client.api = pipewire-pulse");
+  const auto ofSecond = tap(second.pid());
+  // A machine that is held up makes gaps, which have a little of every tone.
+  EXPECT_TRUE(ofBoth->sound.waitForTone(1000));
+  EXPECT_TRUE(ofBoth->sound.waitForTone(440));
+  EXPECT_TRUE(ofSecond->sound.waitForTone(1000));
+  EXPECT_LT(amplitudeOf(440, ofSecond->sound.next(3 * kTenth)), kTolerance);
+  EXPECT_TRUE(ofFirst->sound.waitForTone(440));
+  EXPECT_LT(amplitudeOf(1000, ofFirst->sound.next(3 * kTenth)), kTolerance);
+}
+
 TEST(PulsePlatform, FailsWhereNoServerAnswers) {
   const auto platform = PulsePlatform::connect("unix:/nonexistent/socket");
   ASSERT_FALSE(platform);
