@@ -22,11 +22,6 @@ pid_t parentOf(pid_t process) {
   return static_cast<pid_t>(std::strtol(line.c_str() + afterName + 4, nullptr, 10));
 }
 
-pid_t processOf(const pa_sink_input_info& input) {
-  const char* text = pa_proplist_gets(input.proplist, PA_PROP_APPLICATION_PROCESS_ID);
-  return text == nullptr ? 0 : static_cast<pid_t>(std::strtol(text, nullptr, 10));
-}
-
 }  // namespace
 
 bool isSameOrDescendant(pid_t process, pid_t ancestor) {
@@ -41,6 +36,7 @@ PulseTapSource::PulseTapSource(const std::string& server, pid_t process, const P
     : process_(process),
       format_(format),
       timeline_(std::make_shared<MixTimeline>(format.sampleRate)),
+      clients_({.learned = [this] { requestInputs(); }, .failed = [this] { connection_.retryLater(); }}),
       connection_(server, {.ready = [this](pa_context* context) { ready(context); }, .lost = [this] { lost(); }}) {}
 
 void PulseTapSource::render(uint64_t hostTime, std::span<int16_t> samples) {
@@ -49,24 +45,38 @@ void PulseTapSource::render(uint64_t hostTime, std::span<int16_t> samples) {
 
 void PulseTapSource::ready(pa_context* context) {
   context_ = context;
-  // Subscribed before the list is asked for, so that no stream falls between the two.
+  // Subscribed before any list is asked for, so that no stream falls between the two.
   pa_context_set_subscribe_callback(
       context,
       [](pa_context*, pa_subscription_event_type_t type, uint32_t index, void* self) {
-        const int operation = type & PA_SUBSCRIPTION_EVENT_TYPE_MASK;
-        if (operation != PA_SUBSCRIPTION_EVENT_REMOVE) static_cast<PulseTapSource*>(self)->requestInput(index);
+        static_cast<PulseTapSource*>(self)->changed(type, index);
       },
       this);
-  dropOperation(pa_context_subscribe(context, PA_SUBSCRIPTION_MASK_SINK_INPUT, nullptr, nullptr));
-  const auto found = [](pa_context*, const pa_sink_input_info* input, int end, void* self) {
-    if (end == 0) static_cast<PulseTapSource*>(self)->considerInput(*input);
-  };
-  dropOperation(pa_context_get_sink_input_info_list(context, found, this));
+  constexpr int kMask = PA_SUBSCRIPTION_MASK_SINK_INPUT | PA_SUBSCRIPTION_MASK_CLIENT;
+  dropOperation(pa_context_subscribe(context, static_cast<pa_subscription_mask_t>(kMask), nullptr, nullptr));
+  clients_.ready(context);
+}
+
+void PulseTapSource::changed(pa_subscription_event_type_t type, uint32_t index) {
+  const bool isGone = (type & PA_SUBSCRIPTION_EVENT_TYPE_MASK) == PA_SUBSCRIPTION_EVENT_REMOVE;
+  if ((type & PA_SUBSCRIPTION_EVENT_FACILITY_MASK) == PA_SUBSCRIPTION_EVENT_CLIENT) {
+    clients_.changed(index, isGone);
+  } else if (!isGone) {
+    requestInput(index);
+  }
 }
 
 void PulseTapSource::lost() {
   tracks_.clear();
+  clients_.lost();
   context_ = nullptr;
+}
+
+void PulseTapSource::requestInputs() {
+  const auto found = [](pa_context*, const pa_sink_input_info* input, int end, void* self) {
+    if (end == 0) static_cast<PulseTapSource*>(self)->considerInput(*input);
+  };
+  dropOperation(pa_context_get_sink_input_info_list(context_, found, this));
 }
 
 void PulseTapSource::requestInput(uint32_t index) {
@@ -78,14 +88,15 @@ void PulseTapSource::requestInput(uint32_t index) {
 
 void PulseTapSource::considerInput(const pa_sink_input_info& input) {
   const uint32_t index = input.index;
-  if (tracks_.contains(index) || !isSameOrDescendant(processOf(input), process_)) return;
+  const pid_t player = clients_.processOf(input).value_or(0);
+  if (tracks_.contains(index) || !isSameOrDescendant(player, process_)) return;
   auto track = std::make_unique<PulseTrack>(context_, PulseTrack::Target{index, {}}, timeline_,
                                             [this, index] { trackEnded(index); });
   if (!track->isConnecting()) {
     QV_LOG_ERROR(logs::kAudio, "stream %u cannot be tapped: %s", index, pa_strerror(pa_context_errno(context_)));
     return;
   }
-  QV_LOG_INFO(logs::kAudio, "tapping stream %u of process %d", index, processOf(input));
+  QV_LOG_INFO(logs::kAudio, "tapping stream %u of process %d", index, player);
   tracks_.emplace(index, std::move(track));
 }
 

@@ -4,6 +4,7 @@
 
 #include <map>
 
+#include "platform/pulse/PulseClients.h"
 #include "platform/pulse/PulseConnection.h"
 #include "platform/pulse/PulseTrack.h"
 #include "platform/sound/PCMSource.h"
@@ -19,7 +20,7 @@ inline constexpr std::chrono::milliseconds kPulsePatience{40};
 
 /// What a process and its descendants play, summed.
 ///
-/// The processes of streams are what their clients say they are; the server does not vouch for it.
+/// The processes of streams are those that the server vouches for, where it does (see PulseClients).
 ///
 /// Threading: as PCMSource; tracks live on the connection's thread.
 class PulseTapSource final : public PCMSource {
@@ -32,6 +33,8 @@ class PulseTapSource final : public PCMSource {
  private:
   void ready(pa_context* context);
   void lost();
+  void changed(pa_subscription_event_type_t type, uint32_t index);
+  void requestInputs();
   void requestInput(uint32_t index);
   void considerInput(const pa_sink_input_info& input);
   void trackEnded(uint32_t index);
@@ -40,6 +43,7 @@ class PulseTapSource final : public PCMSource {
   const PCMFormat format_;
   const std::shared_ptr<MixTimeline> timeline_;
   pa_context* context_ = nullptr;  // while connected
+  PulseClients clients_;
   std::map<uint32_t, std::unique_ptr<PulseTrack>> tracks_;
   PulseConnection connection_;  // last: ends first
 };

@@ -42,7 +42,7 @@ class Demo(Stage):
             self.environment["PULSE_SERVER"] = server.split("Server String: ")[1].split("\n")[0]
             return
         super().start_sound()
-        print("sound: PulseAudio with a null output")
+        print(f"sound: {self.sound} with a null output")
 
 
 def answer_alert(stage):
@@ -101,11 +101,12 @@ def is_good(movie):
     return good
 
 
-def main():
+def main(demo):
     build, output = sys.argv[1:]
-    with Demo(build) as stage:
+    with demo(build) as stage:
         movie = run_application(stage, output)
     report(movie, is_good(movie))
 
 
-main()
+if __name__ == "__main__":
+    main(Demo)

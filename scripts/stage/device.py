@@ -176,11 +176,12 @@ class Device:
 
 
 class Stage(Device):
-    """A device with Xvfb, and PulseAudio with a microphone stand-in."""
+    """A device with Xvfb, and a sound server, "PulseAudio" or "PipeWire", with a microphone stand-in."""
 
-    def __init__(self, build, screen=SCREEN):
+    def __init__(self, build, screen=SCREEN, sound="PulseAudio"):
         super().__init__(build)
         self.screen = screen
+        self.sound = sound
 
     def begin(self):
         self.prepare()
@@ -200,6 +201,14 @@ class Stage(Device):
         self.environment["DISPLAY"] = ":" + server.expect("")[1]
 
     def start_sound(self):
+        if self.sound == "PipeWire":
+            program = os.path.join(SOURCE, "scripts/stage/pipewire")
+            self.sound_server = self.start([program, self.directory, f"{self.directory}/pa.sock"])
+            self.sound_server.expect("ready")
+        else:
+            self.start_pulseaudio()
+
+    def start_pulseaudio(self):
         arguments = ["pulseaudio", "-n", "--daemonize=no", "--exit-idle-time=-1", "--disallow-exit=yes",
                      "--use-pid-file=no"]
         # Without rewinds the sinks render 50 ms ahead, like hardware, not two seconds.

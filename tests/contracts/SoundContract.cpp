@@ -33,15 +33,22 @@ class HeadlessStage final : public SoundStage {
   HeadlessPlatform platform_{{}};
 };
 
+template <kit::SoundServerKind kKind>
 class PulseStage final : public SoundStage {
   AppAudioTapService& taps() override { return platform_->appAudioTap(); }
   DeviceCaptureService& devices() override { return platform_->deviceCapture(); }
-  kit::SoundServer server_;
+  kit::SoundServer server_{kKind};
   const std::unique_ptr<PulsePlatform> platform_ = std::move(PulsePlatform::connect(server_.address()).value());
 };
 
+template <kit::SoundServerKind kKind>
+Backend<SoundStage> pulse(const char* name) {
+  return {name, make<SoundStage, PulseStage<kKind>>, kit::programsOf(kKind)};
+}
+
 const auto kBackends = testing::Values(Backend<SoundStage>{"headless", make<SoundStage, HeadlessStage>},
-                                       Backend<SoundStage>{"pulse", make<SoundStage, PulseStage>, {"pulseaudio"}});
+                                       pulse<kit::SoundServerKind::PulseAudio>("pulse"),
+                                       pulse<kit::SoundServerKind::PipeWire>("pipewire"));
 
 class AppAudioTapContract : public ContractTest<SoundStage> {};
 INSTANTIATE_TEST_SUITE_P(, AppAudioTapContract, kBackends, kNameOfBackend);

@@ -7,7 +7,16 @@
 
 namespace qv::kit {
 
-SoundServer::SoundServer() {
+std::ostream& operator<<(std::ostream& out, SoundServerKind kind) {
+  return out << (kind == SoundServerKind::PipeWire ? "PipeWire" : "PulseAudio");
+}
+
+std::vector<const char*> programsOf(SoundServerKind kind) {
+  if (kind == SoundServerKind::PulseAudio) return {"pulseaudio"};
+  return {"pipewire", "pipewire-pulse", "wireplumber", "pw-cat", "dbus-daemon", "pactl"};
+}
+
+SoundServer::SoundServer(SoundServerKind kind) : kind_(kind) {
   // The last command answers when the socket is there, and with it everything else.
   folder_.write("/script.pa",
                 "load-module module-null-sink norewinds=1 sink_name=appout\n"
@@ -25,6 +34,11 @@ SoundServer::SoundServer() {
 }
 
 void SoundServer::start() {
+  if (kind_ == SoundServerKind::PipeWire) {
+    process_.emplace(PIPEWIRE_PROGRAM, std::vector<std::string>{folder_.path(), folder_ / "socket"});
+    if (!process_->awaitLine("ready")) throw std::runtime_error("pipewire did not start");
+    return;
+  }
   process_.emplace("sh",
                    std::vector<std::string>{"-c",
                                             "exec pulseaudio -n --daemonize=no --exit-idle-time=-1 --disallow-exit=yes "
@@ -50,8 +64,8 @@ bool SoundServer::moveStreams(const std::string& output) {
   return move.wait() == 0;
 }
 
-TonePlayer::TonePlayer(const SoundServer& server, bool playsInChild)
-    : process_(TONE_PLAYER_PROGRAM, {server.address(), playsInChild ? "--fork" : "--stay"}) {}
+TonePlayer::TonePlayer(const SoundServer& server, bool playsInChild, std::vector<std::string> environment)
+    : process_(TONE_PLAYER_PROGRAM, {server.address(), playsInChild ? "--fork" : "--stay"}, std::move(environment)) {}
 
 bool TonePlayer::open(const std::string& output, const std::string& frequencies) {
   return process_.say("open " + output + " " + frequencies) && process_.readLine() == "opened";
@@ -60,6 +74,15 @@ bool TonePlayer::open(const std::string& output, const std::string& frequencies)
 uint64_t TonePlayer::sound() {
   const std::string answer = process_.say("sound") ? process_.readLine() : "";
   return answer.empty() ? 0 : std::stoull(answer);
+}
+
+NativePlayer::NativePlayer(int frequency, const std::string& properties) {
+  const std::string file = folder_ / "tone.wav";
+  // Without the volume its amplitude is 4095.
+  Process maker("ffmpeg", {"-v", "error", "-f", "lavfi", "-i",
+                           "sine=" + std::to_string(frequency) + ":r=44100:d=60,volume=8000/4095", file});
+  if (maker.wait() != 0) throw std::runtime_error("no tone to play");
+  process_.emplace("pw-cat", std::vector<std::string>{"--playback", "--properties", "{ " + properties + " }", file});
 }
 
 }  // namespace qv::kit
