@@ -122,15 +122,25 @@ class Terminal:
         self.log.seek(self.mark)
         return self.log.read()
 
+    def has_gone(self):
+        """With all that was started in it: a daemon that is still ending would answer in the place of the next."""
+        self.shell.poll()
+        try:
+            os.killpg(self.shell.pid, 0)
+        except ProcessLookupError:
+            return True
+        return False
+
     def close(self):
         for number in (signal.SIGTERM, signal.SIGKILL):
             try:
                 os.killpg(self.shell.pid, number)
-                self.shell.wait(15)
+                return wait_until("the end of a terminal", self.has_gone, seconds=15, step=0.02)
             except ProcessLookupError:
-                return
-            except subprocess.TimeoutExpired:
+                return None
+            except AssertionError:
                 continue
+        return None
 
 
 class Reader:

@@ -35,6 +35,8 @@ def read(path):
 
 
 class Libraries(unittest.TestCase):
+    maxDiff = None
+
     def test_what_applications_link_drags_nothing_under_the_gpl_in(self):
         for library in SDK:
             loaded = {os.path.basename(line.split()[0]) for line in output("ldd", os.path.join(BUILD, library)).splitlines()}
