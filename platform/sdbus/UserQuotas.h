@@ -7,8 +7,8 @@
 #include <memory>
 #include <mutex>
 
-#include "platform/sdbus/SdBusIPC.h"
 #include "platform/base/TokenBucket.h"
+#include "platform/sdbus/SdBusIPC.h"
 
 namespace qv::platform::sdbus {
 
