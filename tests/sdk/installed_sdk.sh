@@ -41,6 +41,6 @@ find_package(QuorvelExtension 0.1 REQUIRED)
 add_executable(user-by-cmake user.cpp)
 target_link_libraries(user-by-cmake PRIVATE Quorvel::quorvel Quorvel::quorvel-extension)
 CMAKE
-cmake -S "$image" -B "$image/build" -DCMAKE_PREFIX_PATH="$image/opt" >"$image/cmake.log"
+cmake -G Ninja -S "$image" -B "$image/build" -DCMAKE_PREFIX_PATH="$image/opt" >"$image/cmake.log"
 cmake --build "$image/build" >>"$image/cmake.log"
 "$image/build/user-by-cmake"
